@@ -1,0 +1,9 @@
+# The platform: every operation that the module calls, for an ordinary Linux machine.
+file(GLOB NAS_SOURCES CONFIGURE_DEPENDS nas/*/*.cpp)
+add_library(arbory_nas SHARED ${NAS_SOURCES})
+set_target_properties(arbory_nas PROPERTIES LINKER_LANGUAGE CXX)
+target_link_libraries(
+  arbory_nas
+  PUBLIC PkgConfig::JSONCPP
+  PRIVATE PkgConfig::SQLITE PkgConfig::UTF8PROC PkgConfig::PCRE2 PkgConfig::ACL Threads::Threads
+          ${CMAKE_DL_LIBS})

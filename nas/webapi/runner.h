@@ -1,0 +1,84 @@
+#pragma once
+// Runs one API call as the web API server does: finds the table row, forks a request child, calls
+// the row's entry function there and receives one reply.
+//
+// Protocol between child and caller: a pipe, on which the child writes one frame, a 64-bit
+// length in host order and that many bytes of payload. The caller takes the first whole frame and
+// ignores what follows (a worker that falls back into the request's path may write again). A child
+// that ends without a whole frame answers kNoReply.
+//
+// The child closes every inherited descriptor but the pipe, has /dev/null as its standard streams,
+// default signal handlers and the caller's identity; the module switches to the user. A search
+// worker that the call forks lives on after the child.
+
+#include <sys/types.h>
+
+#include <functional>
+#include <string>
+
+#include "nas/system/unique_fd.h"
+#include "platform/webapi.h"
+
+namespace nas {
+
+// A module, loaded for the rest of the process.
+class Module {
+ public:
+  // Loads the module at `path`; empty: the configured one, or the one beside the program. Throws
+  // std::runtime_error naming the file and the trouble.
+  explicit Module(const std::string& path);
+
+  // The row that serves the method: api and version exactly, the method ignoring letter case (a
+  // client reaches clean-all by the method "Clean" with "action" = "cleanall"). Null when none
+  // matches.
+  const NUVA::APIMethod* Find(const std::string& api, int version, const std::string& method) const;
+  // The table; ends with a row whose api is null.
+  const NUVA::APIMethod* table() const { return table_; }
+
+ private:
+  const NUVA::APIMethod* table_ = nullptr;
+};
+
+struct ApiCall {
+  std::string method;  // as the client spelled it
+  Json::Value params;  // an object, or null for none
+  std::string user;
+  std::string session;
+};
+
+// Turns the reply into the bytes that are sent. Runs in the request child, so that a caller that
+// needs only part of a large reply need not ship the rest of it.
+using ReplyEncoder = std::function<std::string(int code, const Json::Value& data)>;
+// {"code":N,"data":...} in one line of valid UTF-8, without a newline.
+std::string EncodeJsonReply(int code, const Json::Value& data);
+
+constexpr int kCodeUnknownFailure = 100;  // an exception or a death inside the call
+
+// A request child at work. For event loops: watch fd() and feed what it yields to a FrameReader.
+struct RunningCall {
+  pid_t pid = -1;
+  UniqueFd fd;  // readable end of the pipe, non-blocking not set
+};
+// Forks the request child. pid is -1 with errno set when that fails.
+RunningCall StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
+
+// Collects one frame.
+class FrameReader {
+ public:
+  // Takes bytes as they come. True once the frame is whole; later bytes are ignored.
+  bool Feed(const char* bytes, size_t count);
+  bool whole() const { return whole_; }
+  const std::string& payload() const { return payload_; }
+
+ private:
+  std::string header_;
+  std::string payload_;
+  unsigned long long expected_ = 0;
+  bool whole_ = false;
+};
+
+// Makes the call and waits for its reply and for the end of the request child. A call that cannot
+// be made or answers nothing yields encode(kCodeUnknownFailure, null).
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
+
+}  // namespace nas
