@@ -4,8 +4,9 @@
 //
 // Protocol between child and caller: a pipe, on which the child writes one frame, a 64-bit
 // length in host order and that many bytes of payload. The caller takes the first whole frame and
-// ignores what follows (a worker that falls back into the request's path may write again). A child
-// that ends without a whole frame answers kNoReply.
+// ignores what follows. Only the request child itself writes: what a worker leaves in its copy of
+// the response, when it falls back into the request's path, is dropped, as two writers of large
+// frames would tear each other's. A child that ends without a whole frame gives no reply.
 //
 // The child closes every inherited descriptor but the pipe, has /dev/null as its standard streams,
 // default signal handlers and the caller's identity; the module switches to the user. A search
@@ -47,7 +48,8 @@ struct ApiCall {
 };
 
 // Turns the reply into the bytes that are sent. Runs in the request child, so that a caller that
-// needs only part of a large reply need not ship the rest of it.
+// needs only part of a large reply need not ship the rest of it. Called when the entry function
+// sets its reply, so that a large one is not copied first.
 using ReplyEncoder = std::function<std::string(int code, const Json::Value& data)>;
 // {"code":N,"data":...} in one line of valid UTF-8, without a newline.
 std::string EncodeJsonReply(int code, const Json::Value& data);

@@ -1,0 +1,75 @@
+// The configuration in force, and the checks it must pass.
+
+#include "nas/system/config.h"
+
+#include <unistd.h>
+
+#include <cstdlib>
+#include <memory>
+#include <set>
+
+#include "nas/system/real_path.h"
+#include "nas/system/share_names.h"
+
+namespace nas {
+namespace {
+
+Config g_config;
+bool g_configured = false;
+
+std::string Absolute(const std::string& directory) {
+  if (directory.starts_with('/')) return directory;
+  const std::unique_ptr<char, void (*)(void*)> current(getcwd(nullptr, 0), std::free);
+  if (!current) throw ConfigError("the current directory cannot be told");
+  return directory.empty() ? directory : std::string(current.get()) + "/" + directory;
+}
+
+void CheckShare(ShareSetting* share) {
+  const auto fail = [&](const std::string& trouble) {
+    const std::string place = share->origin.empty() ? std::string() : share->origin + ": ";
+    throw ConfigError(place + "share \"" + share->name + "\": " + trouble);
+  };
+  std::string trouble = TroubleWithShareName(share->name);
+  if (!trouble.empty()) fail(trouble);
+  share->directory = Absolute(share->directory);
+  if (share->directory.empty()) fail("no directory is given");
+  std::string root = RealPath(share->directory).value_or(share->directory);
+  while (root.ends_with('/')) root.pop_back();
+  trouble = TroubleWithShareRoot(share->name, root);
+  if (!trouble.empty()) fail(trouble);
+}
+
+}  // namespace
+
+void Configure(Config config) {
+  if (!config.state_dir.starts_with('/')) {
+    throw ConfigError("the state directory must be an absolute path: " + config.state_dir);
+  }
+  while (config.state_dir.size() > 1 && config.state_dir.ends_with('/')) {
+    config.state_dir.pop_back();
+  }
+  for (const std::string& volume : config.volumes) {
+    if (!volume.starts_with('/')) {
+      throw ConfigError("a volume must be an absolute path: " + volume);
+    }
+  }
+  std::set<std::string> names;
+  for (ShareSetting& share : config.shares) {
+    CheckShare(&share);
+    if (!names.insert(share.name).second) {
+      throw ConfigError("share \"" + share.name + "\" is given twice");
+    }
+  }
+  g_config = std::move(config);
+  g_configured = true;
+}
+
+const Config& CurrentConfig() {
+  if (!g_configured) {
+    g_config = DefaultConfig();
+    g_configured = true;
+  }
+  return g_config;
+}
+
+}  // namespace nas

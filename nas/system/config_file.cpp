@@ -1,0 +1,160 @@
+// Reading of the configuration file:
+//
+//   state_dir = "/var/lib/arbory"
+//   volumes = ["/volume*"]
+//   module = "/usr/lib/arbory/NUVA.Arbory.Search.so"
+//   [shares]
+//   photo = "/srv/photo"
+//
+// A key that is not known is an error, so that a misspelt one is noticed.
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <toml++/toml.h>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <functional>
+#include <map>
+
+#include "nas/system/accounts.h"
+#include "nas/system/config.h"
+#include "nas/system/file_io.h"
+
+namespace nas {
+namespace {
+
+constexpr size_t kMaxFileBytes = size_t{1} << 20;
+constexpr char kSystemFile[] = "/etc/arbory/arbory.toml";
+constexpr char kSystemState[] = "/var/lib/arbory";
+
+std::string Environment(const char* name) {
+  const char* value = std::getenv(name);
+  return value == nullptr ? std::string() : std::string(value);
+}
+
+// An XDG base directory; a relative value counts as unset.
+std::string BaseDirectory(const char* variable, const char* below_home) {
+  const std::string value = Environment(variable);
+  if (value.starts_with('/')) return value;
+  std::string home = Environment("HOME");
+  if (home.empty()) {
+    const auto account = FindAccount(geteuid());
+    if (account) home = account->home;
+  }
+  return home.starts_with('/') ? home + "/" + below_home : std::string();
+}
+
+std::string DefaultStateDir() {
+  if (geteuid() == 0) return kSystemState;
+  const std::string base = BaseDirectory("XDG_STATE_HOME", ".local/state");
+  // A user without a home has nowhere to keep state; the first use then says so.
+  return (base.empty() ? "/nonexistent" : base) + "/arbory";
+}
+
+// The file to read; empty for none.
+std::string FindFile(const std::string& path) {
+  if (!path.empty()) return path;
+  const std::string named = Environment("ARBORY_CONFIG");
+  if (!named.empty()) return named;
+  const std::string base = BaseDirectory("XDG_CONFIG_HOME", ".config");
+  for (const std::string& file :
+       {std::string(kSystemFile), base.empty() ? base : base + "/arbory/arbory.toml"}) {
+    if (!file.empty() && access(file.c_str(), F_OK) == 0) return file;
+  }
+  return {};
+}
+
+class Reader {
+ public:
+  explicit Reader(const std::string& file) : file_(file) {}
+
+  void Read(Config* config) {
+    std::string text;
+    if (!ReadWholeFile(AT_FDCWD, file_.c_str(), kMaxFileBytes, &text)) {
+      throw ConfigError(file_ + ": " + std::strerror(errno));
+    }
+    const toml::table document = Parse(text);
+    const Keys keys = {
+        {"state_dir", [&](const toml::node& node) { config->state_dir = Path(node); }},
+        {"module", [&](const toml::node& node) { config->module = Path(node); }},
+        {"volumes", [&](const toml::node& node) { config->volumes = Paths(node); }},
+        {"shares", [&](const toml::node& node) { config->shares = Shares(node); }},
+    };
+    ReadTable(document, keys);
+  }
+
+ private:
+  using Keys = std::map<std::string_view, std::function<void(const toml::node&)>>;
+
+  toml::table Parse(const std::string& text) {
+    try {
+      return toml::parse(std::string_view(text), std::string_view(file_));
+    } catch (const toml::parse_error& error) {
+      throw ConfigError(Place(error.source()) + ": " + std::string(error.description()));
+    }
+  }
+
+  std::string Place(const toml::source_region& source) const {
+    return file_ + ":" + std::to_string(source.begin.line);
+  }
+
+  [[noreturn]] void Fail(const toml::source_region& source, const std::string& trouble) const {
+    throw ConfigError(Place(source) + ": " + trouble);
+  }
+
+  void ReadTable(const toml::table& table, const Keys& keys) {
+    for (const auto& [key, node] : table) {
+      const auto known = keys.find(key.str());
+      if (known == keys.end()) {
+        Fail(key.source(), "unknown key \"" + std::string(key.str()) + "\"");
+      }
+      known->second(node);
+    }
+  }
+
+  std::string Path(const toml::node& node) {
+    const auto* text = node.as_string();
+    if (text == nullptr) Fail(node.source(), "a text is expected here");
+    if (!text->get().starts_with('/')) Fail(node.source(), "an absolute path is expected here");
+    return text->get();
+  }
+
+  std::vector<std::string> Paths(const toml::node& node) {
+    const toml::array* array = node.as_array();
+    if (array == nullptr) Fail(node.source(), "a list of texts is expected here");
+    std::vector<std::string> paths;
+    for (const toml::node& item : *array) paths.push_back(Path(item));
+    return paths;
+  }
+
+  std::vector<ShareSetting> Shares(const toml::node& node) {
+    const toml::table* table = node.as_table();
+    if (table == nullptr) Fail(node.source(), "a table of shares is expected here");
+    std::vector<ShareSetting> shares;
+    for (const auto& [name, directory] : *table) {
+      shares.push_back({std::string(name.str()), Path(directory), Place(name.source())});
+    }
+    return shares;
+  }
+
+  std::string file_;
+};
+
+}  // namespace
+
+Config DefaultConfig() {
+  Config config;
+  config.state_dir = DefaultStateDir();
+  return config;
+}
+
+Config LoadConfig(const std::string& path) {
+  Config config = DefaultConfig();
+  const std::string file = FindFile(path);
+  if (!file.empty()) Reader(file).Read(&config);
+  return config;
+}
+
+}  // namespace nas

@@ -1,0 +1,173 @@
+// Running a shell command confined by bubblewrap. The command sees
+//
+//   /usr /bin /sbin /lib* /etc    the system's own, read-only
+//   /dev                          null, zero, random and the like
+//   /volumeN/@tmp                 each volume's temporary folder, writable
+//   /volume0/@tmp                 the scratch volume's
+//
+// and nothing else: no home, no share, no network, no other process. A volume that is not itself
+// called /volume-something appears under an unused /volumeN, so that "/volume*" reaches it.
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "nas/system/error.h"
+#include "nas/system/json_text.h"
+#include "nas/system/shares.h"
+#include "nas/system/unique_fd.h"
+#include "nas/system/volumes.h"
+#include "platform/system.h"
+
+namespace nas {
+namespace {
+
+constexpr char kBubblewrap[] = "/usr/bin/bwrap";
+constexpr char kCommandPath[] = "/usr/bin:/bin";
+constexpr const char* kSystemFolders[] = {"/usr",   "/bin",   "/sbin",   "/lib",
+                                          "/lib32", "/lib64", "/libx32", "/etc"};
+
+bool IsFolder(const std::string& path) {
+  struct stat info;
+  return lstat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+bool IsSeenByVolumePattern(const std::string& volume) {
+  return volume.starts_with("/volume") && volume.find('/', 1) == std::string::npos;
+}
+
+class CommandLine {
+ public:
+  void Add(std::initializer_list<std::string> words) { words_.insert(words_.end(), words); }
+
+  // Pointers into this object, with the final null.
+  std::vector<char*> Pointers() {
+    std::vector<char*> pointers;
+    for (std::string& word : words_) pointers.push_back(word.data());
+    pointers.push_back(nullptr);
+    return pointers;
+  }
+
+ private:
+  std::vector<std::string> words_;
+};
+
+// Binds the temporary folder of every volume that has one.
+void AddVolumes(CommandLine* line) {
+  std::set<std::string> names;
+  std::vector<std::string> others = {ScratchVolume()};  // first: it is /volume0 where that is free
+  for (const std::string& volume : ListVolumes()) {
+    if (IsSeenByVolumePattern(volume)) {
+      names.insert(volume);
+    } else {
+      others.push_back(volume);
+    }
+  }
+  const auto bind = [line](const std::string& volume, const std::string& name) {
+    const std::string folder = volume + "/" + kTemporaryFolder;
+    if (IsFolder(folder)) line->Add({"--bind", folder, name + "/" + kTemporaryFolder});
+  };
+  for (const std::string& volume : names) bind(volume, volume);
+  int number = 0;
+  for (const std::string& volume : others) {
+    std::string name;
+    do {
+      name = "/volume" + std::to_string(number++);
+    } while (names.contains(name));
+    bind(volume, name);
+  }
+}
+
+CommandLine Confine(const std::vector<const char*>& command, int status_fd) {
+  CommandLine line;
+  line.Add({kBubblewrap, "--unshare-all", "--die-with-parent", "--new-session", "--clearenv",
+            "--setenv", "PATH", kCommandPath, "--json-status-fd", std::to_string(status_fd)});
+  for (const char* folder : kSystemFolders) line.Add({"--ro-bind-try", folder, folder});
+  line.Add({"--dev", "/dev"});
+  AddVolumes(&line);
+  line.Add({"--chdir", "/", "--"});
+  for (const char* word : command) line.Add({word});
+  return line;
+}
+
+// bubblewrap's own failures and the command's exit status share one number; only its status
+// report, one JSON object a line, tells whether the command ran to its end.
+int ReportedStatus(const std::string& report) {
+  size_t start = 0;
+  while (start < report.size()) {
+    size_t end = report.find('\n', start);
+    if (end == std::string::npos) end = report.size();
+    Json::Value line;
+    if (ParseJson(report.substr(start, end - start), &line) && line.isObject() &&
+        line["exit-code"].isInt()) {
+      return line["exit-code"].asInt();
+    }
+    start = end + 1;
+  }
+  return -1;
+}
+
+std::string ReadToEnd(int fd) {
+  constexpr size_t kReadBytes = 4096;
+  std::string all;
+  char bytes[kReadBytes];
+  for (;;) {
+    const ssize_t count = read(fd, bytes, sizeof bytes);
+    if (count < 0 && errno == EINTR) continue;
+    if (count <= 0) return all;
+    all.append(bytes, static_cast<size_t>(count));
+  }
+}
+
+int Fail() {
+  SetLastError(ErrorFromErrno(errno));
+  return -1;
+}
+
+int RunConfined(const std::vector<const char*>& command) {
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) return Fail();
+  const UniqueFd report(ends[0]);
+  UniqueFd status(ends[1]);
+  CommandLine line = Confine(command, status.get());
+  const std::vector<char*> words = line.Pointers();
+  const pid_t child = fork();
+  if (child < 0) return Fail();
+  if (child == 0) {
+    // Kept open for bubblewrap alone, which closes it before it runs the command.
+    if (fcntl(status.get(), F_SETFD, 0) == 0) execv(kBubblewrap, words.data());
+    _exit(EXIT_FAILURE);
+  }
+  status.Reset();
+  const std::string text = ReadToEnd(report.get());
+  int ended = 0;
+  while (waitpid(child, &ended, 0) < 0 && errno == EINTR) {
+  }
+  const int code = ReportedStatus(text);
+  if (code < 0) SetLastError(kErrorOther);
+  return code;
+}
+
+}  // namespace
+}  // namespace nas
+
+int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3,
+              int /*flags*/) {
+  if (program == nullptr) return -1;
+  const gid_t group = getegid();
+  const uid_t user = geteuid();
+  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) return nas::Fail();
+  std::vector<const char*> command = {program};
+  for (const char* argument : {arg1, arg2, arg3}) {
+    if (argument == nullptr) break;
+    command.push_back(argument);
+  }
+  return nas::RunConfined(command);
+}

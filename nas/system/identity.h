@@ -1,0 +1,63 @@
+#pragma once
+// Who the process is. A process that started as root keeps root as its saved user id only: its
+// real and effective ids are the user's, so that access(2) and kill(2) judge it as the user and no
+// process id read from a user's record can reach a process of somebody else.
+//
+// All of these change the whole process, its threads included. Use them before threads start.
+
+#include <sys/types.h>
+
+#include <string>
+#include <vector>
+
+namespace nas {
+
+// Whether the process is root or could become root again.
+bool CanBeRoot();
+
+// Root for the time of a few system calls, then the identity before it. Does nothing where root
+// was never there. A process that cannot step down again aborts.
+class ScopedRoot {
+ public:
+  ScopedRoot();
+  ~ScopedRoot();
+  ScopedRoot(const ScopedRoot&) = delete;
+  ScopedRoot& operator=(const ScopedRoot&) = delete;
+
+ private:
+  uid_t user_;
+  gid_t group_;
+  bool raised_ = false;
+};
+
+// A user's identity for a time, then the one before it with its groups. A process that cannot
+// return aborts.
+class ScopedUser {
+ public:
+  explicit ScopedUser(const std::string& user);
+  ~ScopedUser();
+  ScopedUser(const ScopedUser&) = delete;
+  ScopedUser& operator=(const ScopedUser&) = delete;
+  // False, with errno and the last error set: the identity is unchanged.
+  bool ok() const { return ok_; }
+
+ private:
+  uid_t users_[3];
+  gid_t group_ids_[3];
+  std::vector<gid_t> groups_;
+  bool ok_ = false;
+};
+
+// Sets the umask for a time, where the exact mode of what is made matters.
+class ScopedUmask {
+ public:
+  explicit ScopedUmask(mode_t mask);
+  ~ScopedUmask();
+  ScopedUmask(const ScopedUmask&) = delete;
+  ScopedUmask& operator=(const ScopedUmask&) = delete;
+
+ private:
+  mode_t before_;
+};
+
+}  // namespace nas

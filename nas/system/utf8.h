@@ -1,0 +1,26 @@
+#pragma once
+// Cleaning of text for clients. Names on disk are bytes; what is sent to a client is always valid
+// UTF-8, with U+FFFD in the place of what is not.
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+
+namespace nas {
+
+struct Utf8Step {
+  size_t length;  // bytes taken, at least 1
+  bool valid;     // false: these bytes are one bad sequence
+};
+
+// Looks at the sequence that `text`, which must not be empty, begins with. A bad sequence takes as
+// many bytes as a valid one could have begun with, so that one broken character is replaced once.
+// Surrogates, overlong forms and values beyond U+10FFFF are bad.
+Utf8Step NextUtf8(std::string_view text);
+
+// `text` with each bad sequence replaced by U+FFFD.
+std::string ToValidUtf8(std::string_view text);
+
+inline constexpr std::string_view kReplacementCharacter = "\xEF\xBF\xBD";
+
+}  // namespace nas

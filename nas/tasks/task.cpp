@@ -1,0 +1,158 @@
+#include "platform/task.h"
+
+#include <map>
+#include <mutex>
+#include <stdexcept>
+
+#include "nas/tasks/pause.h"
+#include "nas/tasks/task_files.h"
+
+namespace OKT {
+
+// Guard: every member below `mutex` is used with it held.
+class Task::Record {
+ public:
+  Record(const char* owner, const char* id) : files_(owner) {
+    if (id == nullptr) {
+      id_ = files_.Create(&life_);
+      return;
+    }
+    if (!nas::IsTaskId(id)) throw std::runtime_error("not a task id");
+    id_ = id;
+    if (!Read()) throw std::runtime_error("no such task: " + id_);
+  }
+
+  const std::string& id() const { return id_; }
+
+  // Life first: a task found dead can no longer change, so what is read after that is complete.
+  bool Read() {
+    const bool alive = files_.IsAlive(id_);
+    nas::TaskState state;
+    if (!files_.Load(id_, &state)) return false;
+    Take(std::move(state));
+    finished_ = finished_ || !alive;
+    return true;
+  }
+
+  bool Write(bool finish) {
+    std::map<std::string, Json::Value> changes;
+    changes.swap(pending);
+    in_batch = false;
+    const nas::UniqueFd lock = files_.LockForWriting(id_);
+    nas::TaskState state;
+    if (!lock || !files_.Load(id_, &state)) return false;
+    for (auto& [name, value] : changes) state.properties[name].swap(value);
+    state.finished = state.finished || finish;
+    if (!files_.Store(id_, state)) return false;
+    Take(std::move(state));
+    return true;
+  }
+
+  Json::Value Property(const std::string& name) const {
+    const auto collected = pending.find(name);
+    return collected != pending.end() ? collected->second : properties_.get(name, Json::Value());
+  }
+
+  bool finished() const { return finished_; }
+  bool Remove() { return files_.Remove(id_); }
+
+  mutable std::mutex mutex;
+  bool in_batch = false;
+  std::map<std::string, Json::Value> pending;
+
+ private:
+  void Take(nas::TaskState&& state) {
+    properties_.swap(state.properties);
+    finished_ = finished_ || state.finished;
+  }
+
+  const nas::TaskFiles files_;
+  nas::UniqueFd life_;  // inherited by forks; the task lives while one of them has it open
+  std::string id_;
+  Json::Value properties_{Json::objectValue};
+  bool finished_ = false;  // never taken back, as neither a mark nor a death is
+};
+
+Task::Task(const char* owner, const char* id) : record_(std::make_unique<Record>(owner, id)) {}
+Task::~Task() = default;
+
+std::string Task::getTaskId() const { return record_->id(); }
+
+void Task::beginUpdate() {
+  const std::lock_guard guard(record_->mutex);
+  record_->in_batch = true;
+}
+
+bool Task::endUpdate() {
+  const std::lock_guard guard(record_->mutex);
+  return record_->Write(/*finish=*/false);
+}
+
+bool Task::setProperty(const char* name, const Json::Value& value) {
+  const std::lock_guard guard(record_->mutex);
+  if (name == nullptr) return false;
+  const bool collect = record_->in_batch;
+  record_->pending[name] = value;
+  return collect || record_->Write(/*finish=*/false);
+}
+
+bool Task::reload() {
+  const std::lock_guard guard(record_->mutex);
+  return record_->Read();
+}
+
+Json::Value Task::getProperty(const char* name) const {
+  const std::lock_guard guard(record_->mutex);
+  return name == nullptr ? Json::Value() : record_->Property(name);
+}
+
+bool Task::finish(bool keep_running) {
+  const std::lock_guard guard(record_->mutex);
+  return record_->Write(!keep_running);
+}
+
+bool Task::isFinished() const {
+  const std::lock_guard guard(record_->mutex);
+  return record_->finished();
+}
+
+bool Task::remove() {
+  const std::lock_guard guard(record_->mutex);
+  return record_->Remove();
+}
+
+TaskMgr::TaskMgr(const char* owner) : owner_(owner == nullptr ? "" : owner) {}
+
+Task* TaskMgr::getTaskWithThrow(const char* id) const {
+  if (id == nullptr) throw std::runtime_error("not a task id");
+  return new Task(owner_.c_str(), id);
+}
+
+}  // namespace OKT
+
+namespace {
+
+template <typename Shown>
+int WaitFor(OKT::Task* task, int bound, Shown shown) {
+  if (task == nullptr) return 0;
+  nas::GrowingPause pause(bound);
+  for (;;) {
+    if (!task->reload()) return 0;
+    if (shown()) return 1;
+    if (task->isFinished() || !pause.Wait()) return 0;
+  }
+}
+
+}  // namespace
+
+int WaitForTaskDataReady(OKT::Task* task, const char* name, int bound) {
+  return WaitFor(task, bound, [=] { return !task->getProperty(name).isNull(); });
+}
+
+int WaitForTaskDataKeyReady(OKT::Task* task, const char* name, const char* member, int bound) {
+  if (member == nullptr) return 0;
+  return WaitFor(task, bound, [=] {
+    const Json::Value value = task->getProperty(name);
+    return value.isObject() && value.isMember(member);
+  });
+}
