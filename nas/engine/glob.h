@@ -1,0 +1,47 @@
+#pragma once
+// Shell-style wildcards over a whole text: "*" any run, "?" one character, "[a-z]" and "[!a-z]" one
+// character of a set. A "[" that no "]" closes stands for itself. Texts and pattern are expected in
+// the form in which they are compared (folded_name.h). Bytes that are not UTF-8 count as one
+// character each. Matching takes at most text length x pattern length steps, whatever the pattern.
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace nas {
+
+class Glob {
+ public:
+  // Whether `text` holds any wildcard.
+  static bool HasWildcard(std::string_view text);
+
+  explicit Glob(std::string_view pattern);
+  bool Matches(std::string_view text) const;
+
+ private:
+  // One character: any, or one of (none of) the ranges.
+  struct Unit {
+    std::vector<std::pair<char32_t, char32_t>> ranges;
+    bool any = false;
+    bool negated = false;
+    bool Accepts(char32_t c) const;
+  };
+  // What stands between two stars: a plain text or, where it holds "?" or sets, units.
+  struct Segment {
+    std::string literal;
+    std::vector<Unit> units;  // empty: the segment is `literal`
+    // Position behind the match that begins at `at`, or npos.
+    size_t MatchAt(std::string_view text, size_t at) const;
+    // Position behind the first match that begins at `from` or later, or npos.
+    size_t FindFrom(std::string_view text, size_t from) const;
+    bool MatchesEnd(std::string_view text, size_t from) const;
+  };
+
+  static Segment ParseSegment(std::string_view pattern);
+
+  std::vector<Segment> segments_;  // n stars make n + 1 segments, some of them empty
+};
+
+}  // namespace nas

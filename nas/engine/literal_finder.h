@@ -1,0 +1,37 @@
+#pragma once
+// Finds a plain ASCII text in a large buffer, ignoring the case of letters.
+//
+// Two bytes of the text, the rarest in common files, are compared with 16 places of the buffer at
+// once; only where both fit is the whole text compared.
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+
+namespace nas {
+
+class LiteralFinder {
+ public:
+  // `text` is ASCII and not empty.
+  explicit LiteralFinder(std::string_view text);
+  bool Finds(std::string_view buffer) const;
+  size_t size() const { return lowered_.size(); }
+
+ private:
+  bool MatchesAt(const char* at) const;
+
+  // A byte fits where (byte | mask) == value: the mask folds the case of a letter.
+  struct Probe {
+    size_t offset = 0;
+    unsigned char mask = 0;
+    unsigned char value = 0;
+    bool Fits(char c) const { return (static_cast<unsigned char>(c) | mask) == value; }
+  };
+  Probe MakeProbe(size_t offset) const;
+
+  std::string lowered_;
+  Probe first_;   // the rarest byte
+  Probe second_;  // the next rarest
+};
+
+}  // namespace nas

@@ -1,0 +1,116 @@
+#include "nas/engine/location.h"
+
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+
+#include "nas/system/error.h"
+
+namespace nas {
+namespace {
+
+UniqueFd OpenAt2(int dir, const char* path, int flags, unsigned long long resolve) {
+  open_how how{};
+  how.flags = static_cast<unsigned long long>(flags | O_CLOEXEC);
+  how.resolve = resolve;
+  int fd;
+  do {
+    fd = static_cast<int>(syscall(SYS_openat2, dir, path, &how, sizeof(how)));
+  } while (fd < 0 && (errno == EINTR || errno == EAGAIN));
+  return UniqueFd(fd);
+}
+
+// Cuts "/SHARE/below" into its share and a path without empty and "." components. False for a
+// text that is no location.
+bool SplitLocation(std::string_view text, std::string& share, std::string& path) {
+  if (!text.starts_with('/') || text.find('\0') != std::string_view::npos) return false;
+  while (!text.empty()) {
+    text.remove_prefix(1);
+    const std::string_view component = text.substr(0, text.find('/'));
+    text.remove_prefix(component.size());
+    if (component == "..") return false;
+    if (component.empty() || component == ".") continue;
+    if (share.empty()) {
+      share = component;
+    } else {
+      if (!path.empty()) path.push_back('/');
+      path.append(component);
+    }
+  }
+  return !share.empty();
+}
+
+// A path that leads out of its share is not a missing folder but one that may not be asked for.
+PlatformError LocationError(int error_number) {
+  switch (error_number) {
+    case EXDEV:
+    case ELOOP:
+    case ENAMETOOLONG:
+      return kErrorIllegal;
+    case ENOENT:
+    case ENOTDIR:
+      return kErrorNoSuchFolder;
+    default:
+      return ErrorFromErrno(error_number);
+  }
+}
+
+std::optional<Location> Fail(PlatformError error) {
+  SetLastError(error);
+  return std::nullopt;
+}
+
+}  // namespace
+
+std::optional<Location> OpenLocation(const std::string& text) {
+  Location location;
+  std::string share_name;
+  if (!SplitLocation(text, share_name, location.path)) return Fail(kErrorIllegal);
+  const std::optional<Share> share = FindShare(share_name);
+  if (!share) return Fail(kErrorNoSuchFolder);
+  location.share = *share;
+
+  const std::string root = share->root.empty() ? "/" : share->root;
+  const UniqueFd root_fd(open(root.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!root_fd) return Fail(LocationError(errno));
+  location.fd = OpenAt2(root_fd.get(), location.path.empty() ? "." : location.path.c_str(),
+                        O_PATH | O_DIRECTORY, RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
+  if (!location.fd) return Fail(LocationError(errno));
+  // A folder that cannot be read is the location's own error, not one of a search inside it.
+  const UniqueFd readable(openat(location.fd.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  struct stat status;
+  if (!readable || fstat(readable.get(), &status) != 0) return Fail(LocationError(errno));
+  location.device = status.st_dev;
+  location.inode = status.st_ino;
+  return location;
+}
+
+UniqueFd OpenOnSameMount(int dir, const char* name, int flags) {
+  return OpenAt2(dir, name, flags, RESOLVE_NO_XDEV);
+}
+
+UniqueFd OpenBelow(int root, std::string_view path, int flags) {
+  constexpr unsigned long long kResolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
+  UniqueFd step;
+  while (path.size() >= PATH_MAX) {
+    const size_t cut = path.rfind('/', PATH_MAX - 1);
+    if (cut == std::string_view::npos) {
+      errno = ENAMETOOLONG;
+      return UniqueFd();
+    }
+    step = OpenAt2(step ? step.get() : root, std::string(path.substr(0, cut)).c_str(),
+                   O_PATH | O_DIRECTORY, kResolve);
+    if (!step) return step;
+    path.remove_prefix(cut + 1);
+  }
+  return OpenAt2(step ? step.get() : root, path.empty() ? "." : std::string(path).c_str(), flags,
+                 kResolve);
+}
+
+}  // namespace nas

@@ -1,0 +1,45 @@
+#pragma once
+// The language of name patterns. Terms separated by spaces must all match; "a|b" is either; "!a" is
+// not; double quotes make one literal term of what they hold; "regex:" makes the rest of the
+// pattern one regular expression. A term without wildcards matches anywhere in the name; with one
+// it is a glob (glob.h) over the whole name. A pattern without terms restricts nothing.
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "nas/engine/folded_name.h"
+#include "nas/engine/glob.h"
+#include "nas/engine/regex.h"
+
+namespace nas {
+
+class NamePattern {
+ public:
+  // One alternative of a term.
+  struct Alternative {
+    bool negated = false;
+    std::string text;    // as written, without quotes and prefix
+    std::string folded;  // `text` as names are compared
+    // At most one of the two; with neither, `text` is literal.
+    std::optional<Glob> glob;
+    std::shared_ptr<const Regex> regex;
+    bool is_literal() const { return !glob && !regex; }
+    bool Matches(FoldedName& name) const;
+  };
+  using Term = std::vector<Alternative>;  // either of them
+
+  // Nothing, with `error` saying what is wrong, for a broken regular expression or a NUL.
+  static std::optional<NamePattern> Parse(std::string_view text, std::string& error);
+
+  bool Matches(FoldedName& name) const;
+  // All of them must match.
+  const std::vector<Term>& terms() const { return terms_; }
+
+ private:
+  std::vector<Term> terms_;
+};
+
+}  // namespace nas

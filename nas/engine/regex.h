@@ -1,0 +1,35 @@
+#pragma once
+// Regular expressions (PCRE2, compiled to machine code). Case is ignored, texts are UTF-8 and may
+// hold bytes that are not: those match nothing. A search that would take exponentially long is
+// given up and counts as not matching.
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+namespace nas {
+
+class Regex {
+ public:
+  enum class Kind {
+    kName,     // the text is one name: "." matches a newline, "$" only the very end
+    kContent,  // the text holds lines: "^" and "$" match at each
+    kLiteral,  // the pattern is a plain text to be found in content
+  };
+
+  // Null, with `error` saying what is wrong and where, for a broken expression.
+  static std::shared_ptr<const Regex> Compile(std::string_view pattern, Kind kind,
+                                              std::string& error);
+  ~Regex();
+  Regex(const Regex&) = delete;
+  Regex& operator=(const Regex&) = delete;
+
+  // Whether the expression matches anywhere in `text`. Any number of threads may ask.
+  bool Finds(std::string_view text) const;
+
+ private:
+  explicit Regex(void* code) : code_(code) {}
+  void* code_;  // pcre2_code_8, kept out of this header
+};
+
+}  // namespace nas

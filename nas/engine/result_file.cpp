@@ -1,0 +1,80 @@
+#include "nas/engine/result_file.h"
+
+#include <dirent.h>
+#include <sys/random.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <ctime>
+#include <memory>
+#include <system_error>
+#include <vector>
+
+namespace nas {
+namespace {
+
+constexpr size_t kIdBytes = 16;
+constexpr std::string_view kSuffix = ".db";
+constexpr std::array<const char*, 3> kCompanions = {"", "-wal", "-shm"};
+constexpr time_t kKeepSeconds = 24 * 60 * 60;
+
+// When the result file or its log was last written; 0 when neither is there.
+time_t LastWritten(const std::string& path) {
+  time_t newest = 0;
+  for (const char* companion : kCompanions) {
+    struct stat status;
+    if (stat((path + companion).c_str(), &status) == 0) newest = std::max(newest, status.st_mtime);
+  }
+  return newest;
+}
+
+}  // namespace
+
+std::string NewResultId() {
+  std::array<unsigned char, kIdBytes> bytes;
+  if (getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) {
+    throw std::system_error(errno, std::generic_category(), "getrandom");
+  }
+  std::string id;
+  for (const unsigned char byte : bytes) {
+    id += "0123456789abcdef"[byte >> 4];
+    id += "0123456789abcdef"[byte & 15];
+  }
+  return id;
+}
+
+bool IsResultId(std::string_view id) {
+  return id.size() == 2 * kIdBytes &&
+         id.find_first_not_of("0123456789abcdef") == std::string_view::npos;
+}
+
+std::string ResultPath(const std::string& folder, const std::string& id) {
+  return folder + "/" + id + std::string(kSuffix);
+}
+
+bool RemoveResultFile(const std::string& path) {
+  const bool removed = unlink(path.c_str()) == 0;
+  for (const char* companion : kCompanions) unlink((path + companion).c_str());
+  return removed;
+}
+
+void SweepResultFolder(const std::string& folder) {
+  std::vector<std::string> stale;
+  const std::unique_ptr<DIR, int (*)(DIR*)> dir(opendir(folder.c_str()), closedir);
+  if (!dir) return;
+  const time_t oldest_kept = time(nullptr) - kKeepSeconds;
+  while (const dirent* entry = readdir(dir.get())) {
+    const std::string_view name = entry->d_name;
+    if (!name.ends_with(kSuffix) || !IsResultId(name.substr(0, name.size() - kSuffix.size()))) {
+      continue;
+    }
+    const std::string path = folder + "/" + entry->d_name;
+    if (LastWritten(path) < oldest_kept) stale.push_back(path);
+  }
+  for (const std::string& path : stale) RemoveResultFile(path);
+}
+
+}  // namespace nas

@@ -1,0 +1,173 @@
+// Result databases as listings see them.
+
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <algorithm>
+#include <memory>
+
+#include "nas/engine/file_kinds.h"
+#include "nas/engine/result_file.h"
+#include "nas/engine/result_reader.h"
+#include "nas/system/error.h"
+#include "nas/system/shares.h"
+#include "platform/filesearch.h"
+
+namespace FileSearch {
+namespace {
+
+std::string RelativePath(const nas::ResultRow& row) {
+  std::string path(row.folder);
+  if (!path.empty()) path.push_back('/');
+  return path.append(row.name);
+}
+
+std::string RealPath(const nas::ResultRow& row) {
+  return std::string(row.share_root) + "/" + RelativePath(row);
+}
+
+// Lends one row to a callback in the platform's form.
+BOOL Lend(nas::ResultReader& reader, const nas::ResultRow& row, SelectCallback callback,
+          void* context) {
+  std::string share_root(row.share_root);
+  std::string share_name(row.share_name);
+  std::string name(row.name);
+  std::string relative_path = RelativePath(row);
+  std::string extension(nas::ExtensionOf(row.name));
+  std::string owner = reader.UserName(row.attributes->uid);
+  std::string group = reader.GroupName(row.attributes->gid);
+  const nas::FileAttributes& file = *row.attributes;
+  const auto known = [](std::int64_t time) {
+    return time == nas::FileAttributes::kNoTime ? 0 : time;
+  };
+  __tag_FILE_INFO_DATA data{
+      share_root.data(), share_name.data(), name.data(),        relative_path.data(),
+      extension.data(),  file.mode,         owner.data(),       group.data(),
+      file.uid,          file.gid,          S_ISDIR(file.mode), file.size,
+      file.atime,        file.mtime,        file.ctime,         known(file.crtime)};
+  return callback(&data, context);
+}
+
+}  // namespace
+
+class WfmSearchDBTask::Impl {
+ public:
+  explicit Impl(const std::string& path) : path_(path), reader_(path) {}
+
+  bool Query(unsigned long offset, unsigned long limit, const nas::Selection& selection,
+             SelectCallback callback, void* context, unsigned long long* total);
+  bool Delete(const std::string& share_name, const std::string& real_path);
+  bool Remove() { return nas::RemoveResultFile(path_); }
+
+ private:
+  void FlushPurges();
+
+  const std::string path_;
+  nas::ResultReader reader_;
+  // Purges asked for by a running selection wait for its end: it reads one state of the file. Once
+  // storing them has failed (a full disk), further ones are refused, so that the caller does not
+  // ask for ever.
+  std::optional<std::uint32_t> current_;  // the row lent to the callback
+  std::vector<std::uint32_t> purges_;
+  bool purging_fails_ = false;
+};
+
+bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
+                                  const nas::Selection& selection, SelectCallback callback,
+                                  void* context, unsigned long long* total) {
+  reader_.Begin();
+  const std::optional<nas::Ordering> ordering = reader_.Select(selection);
+  const std::uint64_t count = ordering ? ordering->size() : reader_.rows();
+  *total = count;
+  const std::uint64_t end = std::min<std::uint64_t>(count, std::uint64_t{offset} + limit);
+  for (std::uint64_t i = offset; i < end; ++i) {
+    current_ = ordering ? (*ordering)[i] : static_cast<std::uint32_t>(i);
+    if (Lend(reader_, reader_.Row(*current_), callback, context) == 0) break;
+  }
+  current_.reset();
+  reader_.End();
+  FlushPurges();
+  return true;
+}
+
+void WfmSearchDBTask::Impl::FlushPurges() {
+  if (purges_.empty()) return;
+  try {
+    reader_.Purge(purges_);
+  } catch (const nas::SqliteError& error) {
+    syslog(LOG_ERR, "search results: %s", error.what());
+    purging_fails_ = true;
+  }
+  purges_.clear();
+}
+
+bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::string& real_path) {
+  if (purging_fails_) return false;
+  const auto is_the_file = [&](const nas::ResultRow& row) {
+    return row.share_name == share_name && RealPath(row) == real_path;
+  };
+  if (current_) {
+    if (!is_the_file(reader_.Row(*current_))) return false;
+    purges_.push_back(*current_);
+    return true;
+  }
+  reader_.Begin();
+  for (std::uint32_t row = 0; row < reader_.rows(); ++row) {
+    if (!reader_.purged(row) && is_the_file(reader_.Row(row))) purges_.push_back(row);
+  }
+  reader_.End();
+  const bool found = !purges_.empty();
+  FlushPurges();
+  return found && !purging_fails_;
+}
+
+WfmSearchDBTask::WfmSearchDBTask(std::unique_ptr<Impl> impl) : impl_(std::move(impl)) {}
+
+WfmSearchDBTask::~WfmSearchDBTask() = default;
+
+bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, const char* sort_by,
+                                  const bool* ascending, const _tag_dir_entry_type_* type,
+                                  const char* pattern, SelectCallback callback, void* context,
+                                  unsigned long long* total) const try {
+  nas::Selection selection;
+  if (sort_by != nullptr) {
+    const std::optional<nas::SortColumn> column = nas::ParseSortColumn(sort_by);
+    if (!column) return false;
+    selection.column = *column;
+  }
+  selection.ascending = ascending == nullptr || *ascending;
+  if (type != nullptr && *type != DIR_ENTRY_ALL) selection.directories = *type == DIR_ENTRY_DIR;
+  if (pattern != nullptr) {
+    std::string trouble;
+    selection.pattern = nas::NamePattern::Parse(pattern, trouble);
+    if (!selection.pattern) return false;
+    if (selection.pattern->terms().empty()) selection.pattern.reset();
+  }
+  return impl_->Query(offset, limit, selection, callback, context, total);
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return false;
+}
+
+bool WfmSearchDBTask::delRecs(std::string share_name, std::string real_path) try {
+  return impl_->Delete(share_name, real_path);
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return false;
+}
+
+bool WfmSearchDBTask::remove() { return impl_->Remove(); }
+
+WfmSearchDBTaskMgr::WfmSearchDBTaskMgr(const char* user) : user_(user) {}
+
+WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* id) const try {
+  if (!nas::IsResultId(id)) return nullptr;
+  const std::string folder = nas::ResultFolder(volume, user_);
+  if (folder.empty()) return nullptr;
+  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(nas::ResultPath(folder, id)));
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return nullptr;
+}
+
+}  // namespace FileSearch

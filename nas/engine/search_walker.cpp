@@ -1,0 +1,175 @@
+// The walker that a search worker runs: opens the locations, makes the result database, runs the
+// job and tells the task how it goes.
+
+#include <sys/resource.h>
+#include <syslog.h>
+
+#include <chrono>
+#include <system_error>
+
+#include "nas/engine/location.h"
+#include "nas/engine/result_file.h"
+#include "nas/engine/result_writer.h"
+#include "nas/engine/search_job.h"
+#include "nas/system/error.h"
+#include "nas/system/shares.h"
+#include "platform/filesearch.h"
+#include "platform/system.h"
+
+namespace FileSearch {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// The task record is written at most this often for the sake of progress.
+constexpr std::chrono::milliseconds kReportInterval(200);
+// Rows name their location in 16 bits.
+constexpr size_t kMostLocations = 65'535;
+
+// Each level of a tree that is being read holds a descriptor, so the usual soft bound of 1,024
+// would end at a chain of some hundred folders.
+void RaiseDescriptorLimit() {
+  rlimit limit;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+// Turns what a job threw into the last error. To be called in a catch block.
+void SetErrorFromException() {
+  try {
+    throw;
+  } catch (const nas::SqliteError& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(error.code() == SQLITE_FULL ? nas::kErrorNoSpace : nas::kErrorDatabase);
+  } catch (const std::system_error& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(nas::ErrorFromErrno(error.code().value()));
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(nas::kErrorOther);
+  }
+}
+
+}  // namespace
+
+class WfmSearchWalker::Impl {
+ public:
+  Impl(const char* user, OKT::Task* task, const int* stop_flag)
+      : user_(user), task_(task), stop_flag_(*stop_flag) {}
+
+  bool Init(const std::vector<std::string>& texts, const std::vector<FindComp*>& comps);
+  bool Walk(const Json::Value& options);
+  void set_current_only(bool current_only) { current_only_ = current_only; }
+  const char* id() const { return id_.c_str(); }
+  const char* volume() const { return volume_.c_str(); }
+
+ private:
+  void Report(const nas::WalkProgress& progress, bool last);
+
+  const std::string user_;
+  OKT::Task* const task_;
+  const int& stop_flag_;
+  std::vector<FindComp*> comps_;
+  std::vector<nas::Location> locations_;
+  std::string volume_;
+  std::string folder_;
+  std::string id_;
+  std::unique_ptr<nas::ResultWriter> writer_;
+  bool current_only_ = false;
+  bool told_ready_ = false;
+  Clock::time_point reported_;
+};
+
+bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
+                                 const std::vector<FindComp*>& comps) try {
+  comps_ = comps;
+  nas::PlatformError first_error = nas::kErrorNoSuchFolder;
+  bool failed = false;
+  for (const std::string& text : texts) {
+    if (locations_.size() == kMostLocations) break;
+    std::optional<nas::Location> location = nas::OpenLocation(text);
+    if (location) {
+      locations_.push_back(std::move(*location));
+    } else if (!failed) {
+      failed = true;
+      first_error = static_cast<nas::PlatformError>(NLIBCErrGet());
+    }
+  }
+  if (locations_.empty()) {
+    nas::SetLastError(first_error);
+    return false;
+  }
+  volume_ = nas::ResultVolume(locations_.front().share, user_);
+  if (volume_.empty()) return false;
+  folder_ = nas::ResultFolder(volume_, user_);
+  if (folder_.empty()) return false;
+  nas::SweepResultFolder(folder_);
+  id_ = nas::NewResultId();
+  writer_ = std::make_unique<nas::ResultWriter>(nas::ResultPath(folder_, id_));
+  for (size_t i = 0; i < locations_.size(); ++i) {
+    writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
+                         locations_[i].share.root);
+  }
+  return true;
+} catch (...) {
+  SetErrorFromException();
+  return false;
+}
+
+bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
+  RaiseDescriptorLimit();
+  nas::SearchJob job(
+      locations_, comps_, *writer_, stop_flag_,
+      {.recursive = !current_only_,
+       .search_content = options.get("search_content", false).asBool(),
+       .temporary_folder = folder_,
+       .report = [this](const nas::WalkProgress& progress) { Report(progress, false); }});
+  const bool completed = job.Run();
+  writer_->Complete();
+  Report(job.progress(), true);
+  return completed;
+} catch (...) {
+  SetErrorFromException();
+  return false;
+}
+
+void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {
+  const Clock::time_point now = Clock::now();
+  if (!last && told_ready_ && now - reported_ < kReportInterval) return;
+  reported_ = now;
+  task_->beginUpdate();
+  task_->setProperty("walk", progress.ToJson());
+  if (!told_ready_) task_->setProperty("result_ready", true);
+  // A task that was removed meanwhile has nobody left to tell.
+  task_->endUpdate();
+  told_ready_ = true;
+}
+
+WfmSearchWalker::WfmSearchWalker(const char* user, const char* /*session*/, OKT::Task* task,
+                                 int* stop_flag)
+    : impl_(std::make_unique<Impl>(user, task, stop_flag)) {}
+
+WfmSearchWalker::~WfmSearchWalker() = default;
+
+bool WfmSearchWalker::init(const std::vector<std::string>& locations,
+                           const std::vector<FindComp*>& comps) {
+  return impl_->Init(locations, comps);
+}
+
+void WfmSearchWalker::setSearchCurrentDir(bool current_only) {
+  impl_->set_current_only(current_only);
+}
+
+const char* WfmSearchWalker::getDBTaskId() { return impl_->id(); }
+
+const char* WfmSearchWalker::getDBVol() { return impl_->volume(); }
+
+// Access times are among the criteria given to init, and those are judged before any file is read,
+// so the separate list has nothing to add.
+bool WfmSearchWalker::Walk(const std::vector<FindATimeComp*>& /*atime_comps*/,
+                           const Json::Value& options) {
+  return impl_->Walk(options);
+}
+
+}  // namespace FileSearch

@@ -1,0 +1,58 @@
+#pragma once
+// What a walk has seen so far, as clients are told: the task property "walk"
+// {"phase", "folders", "entries", "matches", "skipped": {"permission", "vanished", "other"}}.
+
+#include <json/value.h>
+
+#include <atomic>
+#include <cerrno>
+#include <cstdint>
+
+namespace nas {
+
+class WalkProgress {
+ public:
+  enum class Phase { kNames, kContents, kDone };
+
+  // Counted by the threads of the walk, one call a folder or a match.
+  void AddFolder(std::uint64_t entries) {
+    folders_.fetch_add(1, std::memory_order_relaxed);
+    entries_.fetch_add(entries, std::memory_order_relaxed);
+  }
+  void AddMatch() { matches_.fetch_add(1, std::memory_order_relaxed); }
+  // Something could not be read; `error_number` says why.
+  void AddSkipped(int error_number) {
+    if (error_number == EACCES || error_number == EPERM) {
+      permission_.fetch_add(1, std::memory_order_relaxed);
+    } else if (error_number == ENOENT || error_number == ENOTDIR) {
+      vanished_.fetch_add(1, std::memory_order_relaxed);
+    } else {
+      other_.fetch_add(1, std::memory_order_relaxed);
+    }
+  }
+  void SetPhase(Phase phase) { phase_ = phase; }
+
+  Json::Value ToJson() const {
+    constexpr const char* kPhases[] = {"names", "contents", "done"};
+    Json::Value json;
+    json["phase"] = kPhases[static_cast<int>(phase_.load())];
+    json["folders"] = Json::UInt64{folders_};
+    json["entries"] = Json::UInt64{entries_};
+    json["matches"] = Json::UInt64{matches_};
+    json["skipped"]["permission"] = Json::UInt64{permission_};
+    json["skipped"]["vanished"] = Json::UInt64{vanished_};
+    json["skipped"]["other"] = Json::UInt64{other_};
+    return json;
+  }
+
+ private:
+  std::atomic<Phase> phase_ = Phase::kNames;
+  std::atomic<std::uint64_t> folders_ = 0;
+  std::atomic<std::uint64_t> entries_ = 0;
+  std::atomic<std::uint64_t> matches_ = 0;
+  std::atomic<std::uint64_t> permission_ = 0;
+  std::atomic<std::uint64_t> vanished_ = 0;
+  std::atomic<std::uint64_t> other_ = 0;
+};
+
+}  // namespace nas
