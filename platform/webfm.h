@@ -78,9 +78,10 @@ struct DIRENTRY_INFO {
 
 // Renders `entry` into the object `out`: "name", "path", "is_dir" always; and by the bits of
 // `additional` "real_path" (1), "size" (2), "owner" {user, group, uid, gid} (4), "time" {atime,
-// mtime, ctime, crtime} (8), "perm" {mode, privilege, acl_mode} (16), "type" (32). Bytes that are
-// not UTF-8 become U+FFFD. The last two arguments are reserved and must be 0. "mode" is the
-// permission bits as a decimal number whose digits are the octal ones (0644 shows as 644).
+// mtime, ctime, crtime} (8), "perm" {mode, privilege, acl_mode} (16), "type" (32). Names keep their
+// bytes: whoever sends the reply to a client makes it valid UTF-8. The last two arguments are
+// reserved and must be 0. "mode" is the permission bits as a decimal number whose digits are the
+// octal ones (0644 shows as 644).
 void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, int reserved1,
                   int reserved2);
 

@@ -7,7 +7,6 @@
 #include <string_view>
 
 #include "nas/system/json_text.h"
-#include "nas/system/utf8.h"
 
 namespace nas {
 namespace {
@@ -66,8 +65,8 @@ int ModeAsDecimal(std::uint32_t mode) {
 
 Json::Value OwnerOf(const DIRENTRY_INFO& entry) {
   Json::Value owner(Json::objectValue);
-  owner["user"] = ToValidUtf8(entry.user);
-  owner["group"] = ToValidUtf8(entry.group);
+  owner["user"] = entry.user;
+  owner["group"] = entry.group;
   owner["uid"] = entry.uid;
   owner["gid"] = entry.gid;
   return owner;
@@ -119,13 +118,13 @@ void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, 
   using namespace nas;
   enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
   out = Json::Value(Json::objectValue);
-  out["name"] = ToValidUtf8(entry.name);
-  out["path"] = ToValidUtf8(entry.path);
+  out["name"] = entry.name;
+  out["path"] = entry.path;
   out["is_dir"] = entry.is_dir;
-  if (additional & kRealPath) out["real_path"] = ToValidUtf8(entry.real_path);
+  if (additional & kRealPath) out["real_path"] = entry.real_path;
   if (additional & kSize) out["size"] = static_cast<Json::UInt64>(entry.size);
   if (additional & kOwner) out["owner"] = OwnerOf(entry);
   if (additional & kTime) out["time"] = TimesOf(entry);
   if (additional & kPerm) out["perm"] = PermissionsOf(entry);
-  if (additional & kType) out["type"] = ToValidUtf8(entry.type);
+  if (additional & kType) out["type"] = entry.type;
 }

@@ -118,6 +118,7 @@ std::string Serve(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEn
 void ServeInChild(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
                   int pipe_fd) {
   const pid_t self = getpid();
+  setpgid(0, 0);  // before the caller's signal handlers go
   ResetSignals();
   const int pipe = KeepOnly(pipe_fd);
   if (pipe >= 0) {

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <signal.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -35,25 +36,29 @@ bool ReadSome(int fd, std::string* buffer, FrameReader* frame) {
   return count > 0;
 }
 
-// Collects the frame. The pipe's end does not tell the child's death, since a worker the call
-// forked may hold the pipe open for hours; the process descriptor does. What the child wrote before
-// it died is still read.
-void Collect(const RunningCall& running, int process_fd, FrameReader* frame) {
+// Collects the frame; false when `go_on` ended the wait. The pipe's end does not tell the child's
+// death, since a worker the call forked may hold the pipe open for hours; the process descriptor
+// does. What the child wrote before it died is still read.
+bool Collect(const RunningCall& running, int process_fd, const std::function<bool()>& go_on,
+             FrameReader* frame) {
   std::string buffer;
   bool dead = false;
   while (!frame->whole()) {
     pollfd watched[] = {{running.fd.get(), POLLIN, 0}, {process_fd, POLLIN, 0}};
-    const int ready = poll(watched, process_fd < 0 || dead ? 1 : 2, dead ? 0 : kForever);
-    if (ready < 0 && errno != EINTR) return;
-    if (ready < 0) continue;
-    if (watched[0].revents != 0) {
-      if (!ReadSome(running.fd.get(), &buffer, frame)) return;
+    const int patience = dead ? 0 : go_on ? kAskMilliseconds : kForever;
+    const int ready = poll(watched, process_fd < 0 || dead ? 1 : 2, patience);
+    if (ready < 0 && errno != EINTR) return true;
+    if (!dead && ready <= 0) {
+      if (go_on && !go_on()) return false;
+    } else if (watched[0].revents != 0) {
+      if (!ReadSome(running.fd.get(), &buffer, frame)) return true;
     } else if (dead) {
-      return;
+      if (ready == 0) return true;
     } else {
       dead = watched[1].revents != 0;
     }
   }
+  return true;
 }
 
 }  // namespace
@@ -102,16 +107,20 @@ RunningCall StartCall(const NUVA::APIMethod& row, const ApiCall& call, const Rep
   return running;
 }
 
-std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
+                    const std::function<bool()>& go_on) {
   RunningCall running = StartCall(row, call, encode);
   FrameReader frame;
+  bool waited = true;
   if (running.pid > 0) {
     const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, running.pid, 0)));
-    Collect(running, process.get(), &frame);
+    waited = Collect(running, process.get(), go_on, &frame);
     running.fd.Reset();
+    if (!waited) kill(running.pid, SIGKILL);
     while (waitpid(running.pid, nullptr, 0) < 0 && errno == EINTR) {
     }
   }
+  if (!waited) return {};
   return frame.whole() ? frame.payload() : encode(kCodeUnknownFailure, Json::Value());
 }
 

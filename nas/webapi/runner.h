@@ -9,8 +9,9 @@
 // frames would tear each other's. A child that ends without a whole frame gives no reply.
 //
 // The child closes every inherited descriptor but the pipe, has /dev/null as its standard streams,
-// default signal handlers and the caller's identity; the module switches to the user. A search
-// worker that the call forks lives on after the child.
+// default signal handlers, a process group of its own (a terminal's interrupt must not cut down a
+// call that is about to tell a search's id) and the caller's identity; the module switches to the
+// user. A search worker that the call forks lives on after the child.
 
 #include <sys/types.h>
 
@@ -81,6 +82,11 @@ class FrameReader {
 
 // Makes the call and waits for its reply and for the end of the request child. A call that cannot
 // be made or answers nothing yields encode(kCodeUnknownFailure, null).
-std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
+//
+// `go_on`, where given, is asked every kAskMilliseconds while the call is waited for; when it
+// answers false the request child is killed and the result is empty.
+constexpr int kAskMilliseconds = 50;  // soon enough for a person's interrupt
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
+                    const std::function<bool()>& go_on = {});
 
 }  // namespace nas
