@@ -1,0 +1,69 @@
+// How a search worker remembers its search: in the user's history, and in the count of searches
+// among the user's personal settings. Remembering is a courtesy: whatever goes wrong here, the
+// search goes on.
+
+#include <syslog.h>
+
+#include <cstdint>
+
+#include "api/log.h"
+#include "history/history_store.h"
+#include "platform/json_file.h"
+#include "search/find_handler.h"
+
+namespace {
+
+constexpr char kSettingsFile[] = "/usersettings";
+constexpr char kSettingsKey[] = "NUVA.VTX.App.PersonalSettings.Instance";
+constexpr char kCountKey[] = "search_count";
+constexpr long kRecentSlots = 3;
+
+// The old record is found by the request's pattern; the new one carries that of the criteria.
+void RecordSearch(const NUVA::APIRequest& request, const Json::Value& criteria) {
+  NUVA::WEBFM::FileDB store(HistoryDBPath(request));
+  const std::string pattern = request.GetParam("pattern", "").asString();
+  if (!store.IsGood() || pattern.empty()) return;
+  ConfigureForWriting(store);
+  Json::Value record = criteria;
+  record["folder_path"] = request.GetParam("folder_path", "");
+  record["recursive"] = request.GetParam("recursive", false);
+  NUVA::WEBFM::FileDB::Condition same_pattern;
+  same_pattern.SetCondition("pattern", pattern);
+  store.Delete(same_pattern);
+  store.UpdateLastByTime(record, kRecentSlots);
+}
+
+// Two searches started at once may count as one; a lock on the desktop's own file would not be
+// worth that.
+void CountSearch(const NUVA::APIRequest& request) {
+  const std::string path = request.GetPreferenceDir() + kSettingsFile;
+  Json::Value settings;
+  if (!Json::fromFile(path, settings)) {
+    syslog(LOG_ERR, "%s:%d Failed to load usersettings, %m", kLogSource,
+           log_line::kSettingsUnreadable);
+    return;
+  }
+  if (!settings.isMember(kSettingsKey)) settings[kSettingsKey] = Json::Value(Json::objectValue);
+  Json::Value& personal = settings[kSettingsKey];
+  const std::uint32_t count = personal.get(kCountKey, 0).asUInt();
+  personal[kCountKey] = static_cast<Json::UInt>(count + 1);  // wraps to 0
+  Json::toFile(path, settings);
+}
+
+}  // namespace
+
+void ArboryFindHandler::SetSearchHistory(const Json::Value& criteria) {
+  try {
+    RecordSearch(*request(), criteria);
+  } catch (...) {
+    // A parameter of a type that names no history.
+  }
+}
+
+void ArboryFindHandler::SetSearchCount() {
+  try {
+    CountSearch(*request());
+  } catch (...) {
+    // Settings of another shape than ours are left as they are.
+  }
+}

@@ -1,0 +1,51 @@
+// What a search worker does once it has the user's identity.
+
+#include <syslog.h>
+
+#include "api/codes.h"
+#include "api/log.h"
+#include "platform/system.h"
+#include "search/find_handler.h"
+#include "search/owned_list.h"
+#include "search/search_state.h"
+
+namespace {
+
+// The codes that a failed walk is reported with, by the platform's error number.
+int WalkErrorCode(int platform_error) {
+  switch (platform_error) {
+    case 0x0300:
+      return kCodePermission;
+    case 0x0600:
+      return kCodeNoSuchFolder;
+    case 0x1800:
+    case 0x1D00:
+      return kCodeNoSuchAccount;
+    case 0x9A00:
+      return kCodeIllegalPath;
+    default:
+      return kCodeFailed;
+  }
+}
+
+}  // namespace
+
+// The search is remembered before the walk, so that one that is stopped or finds nothing counts
+// too. A walk that ended because the worker was told to stop is no failure.
+bool ArboryFindHandler::WebFMFindAction(const std::vector<std::string>& folders,
+                                        Json::Value& result) {
+  OwnedList<FileSearch::FindComp> comps;
+  if (!CreateFindOp(comps.items(), result)) {
+    SetError(WfmLibGetErr());
+    syslog(LOG_ERR, "%s:%d Failed To parse the find parameters, reason=[%X]", kLogSource,
+           log_line::kBadCriteria, static_cast<unsigned>(WfmLibGetErr()));
+    return false;
+  }
+  SetSearchHistory(result);
+  SetSearchCount();
+  if (Recursive_Find(folders, comps.items(), result) || StopRequested()) return true;
+  SetError(WalkErrorCode(NLIBCErrGet()));
+  syslog(LOG_ERR, "%s:%d Failed To parse the find parameters, reason=[%X]", kLogSource,
+         log_line::kWalkFailed, static_cast<unsigned>(NLIBCErrGet()));
+  return false;
+}
