@@ -1,0 +1,53 @@
+#include "arbory/call_command.h"
+
+#include <unistd.h>
+
+#include <string>
+
+#include "arbory/session.h"
+#include "arbory/terminal.h"
+#include "nas/system/json_text.h"
+
+namespace arbory {
+namespace {
+
+Json::Value ParseParams(const std::string& text) {
+  Json::Value params(Json::objectValue);
+  if (text.empty()) return params;
+  if (!nas::ParseJson(text, &params))
+    throw UsageError("the parameters are not valid JSON: " + text);
+  if (!params.isObject()) throw UsageError("the parameters must be a JSON object: " + text);
+  return params;
+}
+
+std::string Methods(const nas::Module& module) {
+  std::string text;
+  for (const NUVA::APIMethod* row = module.table(); row->api != nullptr; ++row) {
+    text += std::string(text.empty() ? "" : ", ") + row->api + " " + std::to_string(row->version) +
+            " " + row->method;
+  }
+  return text;
+}
+
+}  // namespace
+
+int RunCallCommand(const CallOptions& options) {
+  const Json::Value params = ParseParams(options.params);
+  Session session(options.common);
+  const NUVA::APIMethod* row = session.module().Find(options.api, options.version, options.method);
+  if (row == nullptr) {
+    throw UsageError("no method " + options.api + " " + std::to_string(options.version) + " " +
+                     options.method + "; there are " + Methods(session.module()));
+  }
+  // One byte ahead of the line tells the exit code.
+  const auto encode = [](int code, const Json::Value& data) {
+    return (code == 0 ? "0" : "1") + nas::EncodeJsonReply(code, data) + "\n";
+  };
+  const std::string reply = session.Call(*row, options.method, params, encode);
+  if (!WriteOut(STDOUT_FILENO, std::string_view(reply).substr(1))) {
+    throw std::runtime_error("the reply could not be written");
+  }
+  return reply.front() == '0' ? kExitSuccess : kExitNothing;
+}
+
+}  // namespace arbory

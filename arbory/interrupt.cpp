@@ -1,0 +1,38 @@
+#include "arbory/interrupt.h"
+
+#include <signal.h>
+#include <time.h>
+
+#include <initializer_list>
+
+namespace arbory {
+namespace {
+
+volatile sig_atomic_t interrupted = 0;
+
+void Note(int) { interrupted = 1; }
+
+}  // namespace
+
+void WatchForInterrupt() {
+  struct sigaction note = {};
+  note.sa_handler = Note;
+  note.sa_flags = static_cast<int>(SA_RESETHAND);
+  for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
+    // What nohup or a shell's background job chose to ignore stays ignored.
+    struct sigaction before = {};
+    sigaction(signal_number, nullptr, &before);
+    if (before.sa_handler != SIG_IGN) sigaction(signal_number, &note, nullptr);
+  }
+  signal(SIGPIPE, SIG_IGN);
+}
+
+bool Interrupted() { return interrupted != 0; }
+
+void Pause(int milliseconds) {
+  constexpr long kNanosecondsPerMillisecond = 1'000'000;
+  const timespec pause = {0, milliseconds * kNanosecondsPerMillisecond};
+  if (!Interrupted()) nanosleep(&pause, nullptr);
+}
+
+}  // namespace arbory

@@ -1,0 +1,15 @@
+#pragma once
+// Ctrl-C and its kin, noticed instead of obeyed at once, so that a search can be stopped and
+// cleaned up first.
+
+namespace arbory {
+
+// From now on SIGINT, SIGTERM and SIGHUP are noted; a second one of the same kind ends the program
+// at once. A reader that went away is a failed write instead of a signal.
+void WatchForInterrupt();
+bool Interrupted();
+
+// Waits; an interrupt ends the wait early.
+void Pause(int milliseconds);
+
+}  // namespace arbory

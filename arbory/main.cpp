@@ -1,0 +1,212 @@
+// The `arbory` program: reads its command line and hands each command its options.
+
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <cstdint>
+#include <exception>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "arbory/call_command.h"
+#include "arbory/options.h"
+#include "arbory/search_command.h"
+#include "arbory/terminal.h"
+
+namespace arbory {
+namespace {
+
+constexpr char kPatternHelp[] =
+    "PATTERN is compared with names, letter case ignored: a word matches anywhere in the name, "
+    "with\n"
+    "*, ? or [ ] the whole name. Words all have to match; a|b is either, !a is not, \"a b\" is "
+    "one\n"
+    "word, regex: begins a regular expression, '' is every name. A -- ends the options.\n"
+    "\n"
+    "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or crtime.\n"
+    "\n"
+    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31, 2026-01-31T12:00, an age "
+    "such\n"
+    "as 30m, 12h or 7d, or seconds since 1970. Bounds are inclusive; a date alone means the whole\n"
+    "day.\n"
+    "\n"
+    "Exit status: 0 found, 1 nothing found, 2 error, 130 interrupted.\n"
+    "\n"
+    "Examples:\n"
+    "  arbory search '*.conf' /etc\n"
+    "  arbory search holiday ~/photos -t image --mtime-from 2026-07-01 -l\n"
+    "  arbory search '' . --size-from 1G --sort size --desc --limit 10\n"
+    "  arbory search 'error code' /var/log --content\n";
+
+constexpr char kCallHelp[] =
+    "JSON is an object of parameters. Prints {\"code\":N,\"data\":...}.\n"
+    "\n"
+    "Exit status: 0 for code 0, 1 for any other code, 2 when the call could not be made.\n"
+    "\n"
+    "Example:\n"
+    "  arbory call NUVA.Arbory.Search 2 start '{\"folder_path\": \"/photo\", \"pattern\": "
+    "\"*.jpg\"}'\n";
+
+// Help without the parser's own notes on which options need or exclude each other.
+class Formatter : public CLI::Formatter {
+ public:
+  std::string make_option_opts(const CLI::Option* option) const override {
+    const std::string type = option->get_type_name();
+    const bool list = option->get_positional() && option->get_items_expected_max() > 1;
+    return (type.empty() || option->get_positional() ? "" : " " + type) + (list ? " ..." : "");
+  }
+};
+
+void AddCommon(CLI::App* app, CommonOptions* common) {
+  app->add_option("--user", common->user, "Act for this user (root only)")->type_name("NAME");
+  app->add_option("--share", common->shares, "Offer the directory as a share, for this run")
+      ->type_name("NAME=DIR")
+      ->allow_extra_args(false);
+  app->add_option("--config", common->config, "Configuration file")->type_name("FILE");
+}
+
+CLI::App* AddCall(CLI::App* app, CallOptions* options) {
+  CLI::App* call = app->add_subcommand("call", "Make one API call and print its reply");
+  call->add_option("API", options->api, "Name of the API")->required();
+  call->add_option("VERSION", options->version, "Version of the API")->required();
+  call->add_option("METHOD", options->method, "Method of the API")->required();
+  call->add_option("JSON", options->params, "Parameters");
+  AddCommon(call, &options->common);
+  call->footer(kCallHelp);
+  return call;
+}
+
+void AddTimes(CLI::App* search, const std::string& name, const std::string& verb,
+              TimeRange* range) {
+  search->add_option("--" + name + "-from", range->from, verb + " then or later")
+      ->type_name("TIME");
+  search->add_option("--" + name + "-to", range->to, verb + " then or earlier")->type_name("TIME");
+}
+
+void AddCriteria(CLI::App* search, SearchOptions* options) {
+  search->option_defaults()->group("Criteria");
+  search->add_option("-e,--extension", options->extensions, "Extensions: jpg, or jpg,png")
+      ->type_name("EXT")
+      ->allow_extra_args(false);
+  search
+      ->add_option("-t,--type", options->type,
+                   "file, dir, image, video, audio, document or archive")
+      ->type_name("TYPE");
+  search->add_option("--size-from", options->size_from, "At least this large")->type_name("SIZE");
+  search->add_option("--size-to", options->size_to, "At most this large")->type_name("SIZE");
+  AddTimes(search, "mtime", "Modified", &options->mtime);
+  AddTimes(search, "crtime", "Created", &options->crtime);
+  AddTimes(search, "atime", "Last read", &options->atime);
+  search->add_option("--owner", options->owner, "Owned by this user")->type_name("NAME");
+  search->add_option("--group", options->group, "Of this group")->type_name("NAME");
+  search->add_flag_function(
+      "--no-recursive", [options](std::int64_t) { options->recursive = false; },
+      "Do not enter the folders in FOLDER");
+  search->add_flag("--content", options->content, "Also files whose contents hold the pattern");
+}
+
+void AddOutput(CLI::App* search, SearchOptions* options) {
+  search->option_defaults()->group("Output");
+  CLI::Option* sort =
+      search->add_option("--sort", options->sort_by, "Print sorted, when the search has finished")
+          ->type_name("COLUMN")
+          ->check(CLI::IsMember({"name", "path", "size", "type", "user", "group", "mode", "mtime",
+                                 "atime", "ctime", "crtime"})
+                      .description(""));
+  search->add_flag("--desc", options->descending, "Largest, latest or last first")->needs(sort);
+  const auto count = CLI::Validator(CLI::NonNegativeNumber).description("");
+  search->add_option("--limit", options->limit, "Print at most N files")
+      ->type_name("N")
+      ->check(count);
+  search->add_option("--offset", options->offset, "Leave out the first N files")
+      ->type_name("N")
+      ->check(count);
+  CLI::Option* long_format = search->add_flag("-l,--long", options->long_format,
+                                              "Mode, owner, group, size and time of each file");
+  CLI::Option* json = search->add_flag("--json", options->json, "One JSON object a line");
+  search->add_flag("-0,--print0", options->null_separated, "End each path with a NUL byte")
+      ->excludes(json)
+      ->excludes(long_format);
+  json->excludes(long_format);
+}
+
+void AddSearch(CLI::App* app, SearchOptions* options) {
+  CLI::App* search = app->add_subcommand("search", "Search folders and print what is found");
+  search->add_option("PATTERN", options->pattern, "What to look for")->required();
+  search->add_option("FOLDER", options->folders, "Folders to search; the current one by default");
+  AddCriteria(search, options);
+  AddOutput(search, options);
+  search->option_defaults()->group("Where and as whom");
+  AddCommon(search, &options->common);
+  search->footer(kPatternHelp);
+}
+
+// The option parser takes "[a,b]" for a list of two values, but here it is the name of a folder. A
+// mark in front, taken off again after the parsing, keeps such a word whole.
+constexpr char kMark = '\x1f';
+
+std::vector<std::string> MarkedArguments(int argc, char** argv) {
+  std::vector<std::string> arguments;
+  for (int at = argc - 1; at > 0; --at) {  // the parser wants them in reverse
+    const std::string argument = argv[at];
+    arguments.push_back(argument.starts_with('[') ? kMark + argument : argument);
+  }
+  return arguments;
+}
+
+void Unmark(std::string* text) {
+  if (text->starts_with(kMark)) text->erase(0, 1);
+}
+
+std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
+  const auto chosen = app.get_subcommands();
+  if (chosen.empty()) {
+    if (first_word == nullptr) return "give a command; see arbory --help";
+    return "'" + std::string(first_word) + "' is no command; see arbory --help";
+  }
+  std::string text = error.what();
+  if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
+    text = "not understood: " + chosen.front()->remaining().front() +
+           " (put -- before a pattern or folder that begins with -)";
+  }
+  return text + "; see arbory " + chosen.front()->get_name() + " --help";
+}
+
+int Run(int argc, char** argv) {
+  CLI::App app("Searches folders by name, attributes and contents.", "arbory");
+  app.formatter(std::make_shared<Formatter>());
+  app.set_version_flag("--version", std::string("arbory ") + ARBORY_VERSION, "Print the version");
+  app.require_subcommand(1);
+  CallOptions call_options;
+  SearchOptions search_options;
+  CLI::App* call = AddCall(&app, &call_options);
+  AddSearch(&app, &search_options);
+  try {
+    app.parse(MarkedArguments(argc, argv));
+  } catch (const CLI::Success& asked) {
+    return app.exit(asked);
+  } catch (const CLI::ParseError& error) {
+    throw UsageError(Explain(app, error, argc > 1 ? argv[1] : nullptr));
+  }
+  if (call->parsed()) {
+    Unmark(&call_options.params);
+    return RunCallCommand(call_options);
+  }
+  Unmark(&search_options.pattern);
+  for (std::string& folder : search_options.folders) Unmark(&folder);
+  if (search_options.folders.empty()) search_options.folders = {"."};
+  return RunSearchCommand(search_options);
+}
+
+}  // namespace
+}  // namespace arbory
+
+int main(int argc, char** argv) {
+  try {
+    return arbory::Run(argc, argv);
+  } catch (const std::exception& error) {
+    arbory::WriteOut(STDERR_FILENO, "arbory: " + arbory::Escaped(error.what()) + "\n");
+    return arbory::kExitError;
+  }
+}

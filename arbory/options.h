@@ -1,0 +1,71 @@
+#pragma once
+// What the command line asked for, as plain values; main.cpp fills them.
+
+#include <cstdint>
+#include <optional>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+namespace arbory {
+
+// The exit codes of both commands.
+enum ExitCode : int {
+  kExitSuccess = 0,
+  kExitNothing = 1,  // no file found; or a reply with a code other than 0
+  kExitError = 2,
+  kExitInterrupted = 130,
+};
+
+// Something the user can put right. what() is one sentence without a final full stop.
+class UsageError : public std::runtime_error {
+  using std::runtime_error::runtime_error;
+};
+
+struct CommonOptions {
+  std::string config;               // path; empty: the usual places
+  std::string user;                 // empty: the caller
+  std::vector<std::string> shares;  // NAME=DIR
+};
+
+struct CallOptions {
+  CommonOptions common;
+  std::string api;
+  int version = 0;
+  std::string method;
+  std::string params;  // JSON text; empty: none
+};
+
+// Both bounds are inclusive.
+struct TimeRange {
+  std::string from;
+  std::string to;
+};
+
+struct SearchOptions {
+  CommonOptions common;
+  std::string pattern;
+  std::vector<std::string> folders;
+
+  std::vector<std::string> extensions;
+  std::string type;
+  std::string size_from;
+  std::string size_to;
+  TimeRange mtime;
+  TimeRange crtime;
+  TimeRange atime;
+  std::string owner;
+  std::string group;
+  bool recursive = true;
+  bool content = false;
+
+  std::string sort_by;
+  bool descending = false;
+  std::uint64_t limit = 0;  // 0: all
+  std::uint64_t offset = 0;
+  bool long_format = false;
+  bool json = false;
+  bool null_separated = false;
+};
+
+}  // namespace arbory

@@ -1,0 +1,145 @@
+#include "arbory/rows.h"
+
+#include <sys/stat.h>
+
+#include <cstdio>
+#include <ctime>
+
+#include "arbory/terminal.h"
+#include "nas/system/json_text.h"
+
+namespace arbory {
+namespace {
+
+std::string_view TextOf(const Json::Value& value) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (!value.isString() || !value.getString(&begin, &end)) return {};
+  return {begin, static_cast<size_t>(end - begin)};
+}
+
+void AppendName(std::string_view name, const RowFormat& format, std::string* out) {
+  if (format.escape) {
+    AppendEscaped(name, out);
+  } else {
+    *out += name;
+  }
+}
+
+// "drwxr-xr-x" from the listing's decimal number whose digits are the octal ones.
+std::string ModeText(const Json::Value& file, const std::string& real_path) {
+  constexpr int kTen = 10;
+  std::string text = "-";
+  struct stat info;
+  if (file["is_dir"].asBool()) {
+    text = "d";
+  } else if (lstat(real_path.c_str(), &info) == 0 && S_ISLNK(info.st_mode)) {
+    text = "l";
+  }
+  const int mode = file["perm"]["mode"].asInt();
+  for (int divisor = kTen * kTen; divisor > 0; divisor /= kTen) {
+    const int digit = mode / divisor % kTen;
+    text += (digit & S_IROTH) != 0 ? 'r' : '-';
+    text += (digit & S_IWOTH) != 0 ? 'w' : '-';
+    text += (digit & S_IXOTH) != 0 ? 'x' : '-';
+  }
+  return text;
+}
+
+std::string LocalTime(std::time_t seconds) {
+  std::tm local = {};
+  localtime_r(&seconds, &local);
+  char text[sizeof("-2147483648-12-31 23:59")];
+  return {text, std::strftime(text, sizeof text, "%Y-%m-%d %H:%M", &local)};
+}
+
+void AppendPadded(const std::string& text, size_t width, std::string* out) {
+  *out += text;
+  if (text.size() < width) out->append(width - text.size(), ' ');
+  *out += ' ';
+}
+
+// Columns have fixed least widths, as rows are printed before the next ones are known.
+void AppendLong(const Json::Value& file, const RowFormat& format, std::string* out) {
+  constexpr size_t kNameWidth = 8;
+  constexpr size_t kSizeWidth = 12;
+  const std::string path(TextOf(file["real_path"]));
+  *out += ModeText(file, path) + " ";
+  AppendPadded(Escaped(TextOf(file["owner"]["user"])), kNameWidth, out);
+  AppendPadded(Escaped(TextOf(file["owner"]["group"])), kNameWidth, out);
+  const std::string size = std::to_string(file["size"].asUInt64());
+  if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
+  *out += size + " " + LocalTime(file["time"]["mtime"].asInt64()) + " ";
+  AppendName(path, format, out);
+}
+
+// Control characters are escaped by JSON itself, all but DEL and those of the second set.
+void AppendJsonRow(const Json::Value& file, const RowFormat& format, std::string* out) {
+  std::string text = nas::JsonText(file, nas::JsonBytes::kClean);
+  if (format.escape) {
+    for (size_t at = 0; at < text.size(); ++at) {
+      const auto byte = static_cast<unsigned char>(text[at]);
+      const bool second_set =
+          byte == 0xC2 && at + 1 < text.size() && static_cast<unsigned char>(text[at + 1]) < 0xA0;
+      if (byte != 0x7F && !second_set) continue;
+      const unsigned code = second_set ? static_cast<unsigned char>(text[at + 1]) : byte;
+      char escape[sizeof("\\u009b")];
+      std::snprintf(escape, sizeof escape, "\\u%04x", code);
+      text.replace(at, second_set ? 2 : 1, escape);
+    }
+  }
+  *out += text;
+}
+
+void AppendRow(const Json::Value& file, const RowFormat& format, std::string* out) {
+  switch (format.kind) {
+    case RowFormat::Kind::kPath:
+      AppendName(TextOf(file["real_path"]), format, out);
+      break;
+    case RowFormat::Kind::kLong:
+      AppendLong(file, format, out);
+      break;
+    case RowFormat::Kind::kJson:
+      AppendJsonRow(file, format, out);
+      break;
+  }
+  *out += format.end;
+}
+
+}  // namespace
+
+Json::Value RowFormat::Additional() const {
+  Json::Value names(Json::arrayValue);
+  names.append("real_path");
+  if (kind == Kind::kPath) return names;
+  for (const char* name : {"size", "owner", "time", "perm", "type"}) names.append(name);
+  return names;
+}
+
+nas::ReplyEncoder PageEncoder(const RowFormat& format) {
+  return [format](int code, const Json::Value& data) {
+    const bool listed = data.isObject();
+    const Json::Value& files = listed ? data["files"] : Json::Value::nullSingleton();
+    const bool finished = listed && data["finished"].asBool();
+    std::string payload =
+        std::to_string(code) + (finished ? " 1 " : " 0 ") + std::to_string(files.size()) + "\n";
+    for (const Json::Value& file : files) AppendRow(file, format, &payload);
+    return payload;
+  };
+}
+
+Page::Page(std::string payload) : payload_(std::move(payload)) {
+  int finished = 0;
+  unsigned long long rows = 0;
+  int used = 0;
+  const int fields = std::sscanf(payload_.c_str(), "%d %d %llu%n", &code_, &finished, &rows, &used);
+  if (fields != 3) {
+    code_ = nas::kCodeUnknownFailure;
+    return;
+  }
+  finished_ = finished != 0;
+  rows_ = rows;
+  text_at_ = static_cast<size_t>(used) + 1;
+}
+
+}  // namespace arbory

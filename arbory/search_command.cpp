@@ -1,0 +1,242 @@
+// The search itself runs in a worker process that outlives every call, so whatever happens here,
+// the worker is stopped and what it stored removed before the program ends.
+
+#include "arbory/search_command.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <string>
+
+#include "arbory/folders.h"
+#include "arbory/interrupt.h"
+#include "arbory/rows.h"
+#include "arbory/search_request.h"
+#include "arbory/search_task.h"
+#include "arbory/session.h"
+#include "arbory/terminal.h"
+#include "nas/system/shares.h"
+
+namespace arbory {
+namespace {
+
+constexpr int kApiVersion = 2;
+// Rows of one page: few enough to be printed while the search goes on, enough to make the cost of a
+// call (about 2 ms) disappear.
+constexpr std::uint64_t kPageRows = 10000;
+// Between two looks at a search that had nothing more to show: a tenth of the time it has run, so
+// that a quick search is noticed at once and a long one is not slowed down by the asking.
+constexpr std::chrono::milliseconds kLeastPause{2};
+constexpr std::chrono::milliseconds kMostPause{40};
+constexpr int kPauseShare = 10;
+
+enum class Ending { kComplete, kEnough, kInterrupted, kReaderGone, kFailed };
+
+void Complain(const std::string& sentence) {
+  WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
+}
+
+// Codes of a failed search, see docs/api.md.
+std::string FailureSentence(int code, const std::vector<std::string>& folders) {
+  constexpr int kPermission = 407, kNoFolder = 408, kUnknownName = 405, kIllegal = 418;
+  std::string where;
+  for (const std::string& folder : folders) where += (where.empty() ? "'" : ", '") + folder + "'";
+  switch (code) {
+    case kPermission:
+      return "permission denied: " + where;
+    case kNoFolder:
+      return "no such folder: " + where;
+    case kUnknownName:
+      return "unknown user or group";
+    case kIllegal:
+      return "illegal pattern, file type or folder: " + where;
+    default:
+      return "the search failed (code " + std::to_string(code) + "); the system log may tell";
+  }
+}
+
+class Search {
+ public:
+  Search(Session* session, const SearchOptions& options)
+      : session_(*session), options_(options), started_(Clock::now()) {
+    if (options.json) format_.kind = RowFormat::Kind::kJson;
+    if (options.long_format) format_.kind = RowFormat::Kind::kLong;
+    if (options.null_separated) format_.end = '\0';
+    format_.escape = isatty(STDOUT_FILENO) != 0 && !options.null_separated;
+  }
+
+  int Run(const Json::Value& params) {
+    Start(params);
+    int exit_code = kExitError;
+    try {
+      exit_code = Report(options_.sort_by.empty() ? Stream() : ListSorted());
+    } catch (...) {
+      CleanUp();
+      throw;
+    }
+    CleanUp();
+    return exit_code;
+  }
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  std::string Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode,
+                   const std::function<bool()>& go_on = {}) {
+    const NUVA::APIMethod* row = session_.module().Find(kSearchApi, kApiVersion, method);
+    if (row == nullptr) throw std::runtime_error(std::string("the module has no ") + method);
+    return session_.Call(*row, method, params, encode, go_on);
+  }
+
+  void Start(const Json::Value& params) {
+    const auto encode = [](int code, const Json::Value& data) {
+      return code == 0 ? data["taskid"].asString() : " " + std::to_string(code);
+    };
+    // An interrupt waits for the search's id, without which the search could not be stopped.
+    const std::string reply = Call("start", params, encode);
+    if (!reply.starts_with(' ')) {
+      task_id_ = reply;
+      return;
+    }
+    const std::string why = WhyNoTask(session_);
+    throw std::runtime_error("the search cannot be started: " +
+                             (why.empty() ? "code" + reply : why));
+  }
+
+  Page List(std::uint64_t offset, std::uint64_t limit) {
+    Json::Value params(Json::objectValue);
+    params["taskid"] = task_id_;
+    params["offset"] = Json::UInt64{offset};
+    params["limit"] = Json::UInt64{limit};
+    params["additional"] = format_.Additional();
+    if (!options_.sort_by.empty()) params["sort_by"] = options_.sort_by;
+    if (options_.descending) params["sort_direction"] = "DESC";
+    return Page(Call("list", params, PageEncoder(format_), [this] {
+      ShowProgress();
+      return !Interrupted();
+    }));
+  }
+
+  // Prints rows in the order they are found.
+  Ending Stream() {
+    while (true) {
+      const std::uint64_t wanted = Wanted();
+      if (wanted == 0) return Ending::kEnough;
+      const Page page = List(options_.offset + printed_, wanted);
+      if (Interrupted()) return Ending::kInterrupted;
+      if (page.code() != 0) {
+        // No results to be had: because the search failed, or because it has not come so far yet.
+        const SearchState state = ReadSearch(session_.user(), task_id_);
+        failure_ = page.code();
+        if (state.finished || !state.exists) return Ending::kFailed;
+      }
+      if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kReaderGone;
+      if (page.rows() < wanted) {
+        if (page.finished()) return Ending::kComplete;
+        Wait();
+      }
+    }
+  }
+
+  // Prints the rows of the finished search.
+  Ending ListSorted() {
+    for (SearchState state; !state.finished; Wait()) {
+      if (Interrupted()) return Ending::kInterrupted;
+      state = ReadSearch(session_.user(), task_id_);
+      if (!state.exists) return Ending::kFailed;
+      if (state.finished) break;
+    }
+    return Stream();
+  }
+
+  std::uint64_t Wanted() const {
+    if (options_.limit == 0) return kPageRows;
+    return std::min(kPageRows, options_.limit - printed_);
+  }
+
+  // False when standard output does not take it.
+  bool Print(const Page& page) {
+    if (page.rows() == 0) return true;
+    progress_.Clear();
+    printed_ += page.rows();
+    return WriteOut(STDOUT_FILENO, page.text());
+  }
+
+  void Wait() {
+    ShowProgress();
+    const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
+    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, kMostPause).count()));
+  }
+
+  void ShowProgress() {
+    if (!progress_.Due()) return;
+    const auto ran = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - started_);
+    progress_.Show(ProgressText(ReadSearch(session_.user(), task_id_), ran.count()));
+  }
+
+  // Says what has to be said at the end and returns the exit code.
+  int Report(Ending ending) {
+    progress_.Clear();
+    if (ending == Ending::kInterrupted) return kExitInterrupted;
+    const SearchState state = ReadSearch(session_.user(), task_id_);
+    running_ = state.exists && !state.finished;
+    if (ending == Ending::kReaderGone) return kExitSuccess;
+    if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
+    ComplainOfSkipped(state.unreadable, "permission denied");
+    ComplainOfSkipped(state.troubled, "see the system log");
+    return printed_ > 0 ? kExitSuccess : kExitNothing;
+  }
+
+  bool CameToEnd(Ending ending, const SearchState& state) {
+    if (state.progress < 0) {
+      Complain(FailureSentence(state.error, options_.folders));
+    } else if (!state.exists || (state.finished && state.progress == 0)) {
+      Complain("the search was stopped before it was complete");
+    } else if (ending == Ending::kFailed) {
+      Complain("the results cannot be read (code " + std::to_string(failure_) + ")");
+    } else {
+      return true;
+    }
+    return false;
+  }
+
+  static void ComplainOfSkipped(std::uint64_t folders, const char* reason) {
+    if (folders == 0) return;
+    Complain(std::to_string(folders) + (folders == 1 ? " folder" : " folders") +
+             " could not be read (" + reason + ")");
+  }
+
+  // The cleaning goes on by itself after the reply.
+  void CleanUp() {
+    Json::Value params(Json::objectValue);
+    params["taskid"] = task_id_;
+    const auto ignore = [](int, const Json::Value&) { return std::string(); };
+    if (running_) Call("stop", params, ignore);
+    Call("clean", params, ignore);
+  }
+
+  Session& session_;
+  const SearchOptions& options_;
+  const Clock::time_point started_;
+  RowFormat format_;
+  ProgressLine progress_;
+  std::string task_id_;
+  std::uint64_t printed_ = 0;
+  int failure_ = 0;
+  bool running_ = true;
+};
+
+}  // namespace
+
+int RunSearchCommand(const SearchOptions& options) {
+  WatchForInterrupt();
+  Session session(options.common);
+  const Locations locations = LocateFolders(options.folders, nas::ListShares(), options.recursive);
+  session.AddShares(locations.added);
+  const Json::Value params = SearchRequest(options, locations.paths, std::time(nullptr));
+  return Search(&session, options).Run(params);
+}
+
+}  // namespace arbory

@@ -1,0 +1,87 @@
+#include "arbory/search_request.h"
+
+#include "arbory/parse.h"
+#include "platform/filesearch.h"
+#include "platform/system.h"
+
+namespace arbory {
+namespace {
+
+void CheckOwner(const std::string& name) {
+  NUVAUSER* user = nullptr;
+  if (NUVAUserGet(name.c_str(), &user) != 0) throw UsageError("there is no user '" + name + "'");
+  NUVAUserFree(user);
+}
+
+void CheckGroup(const std::string& name) {
+  NUVAGROUP* group = nullptr;
+  if (NUVAGroupGet(name.c_str(), &group) != 0) throw UsageError("there is no group '" + name + "'");
+  NUVAGroupFree(group);
+}
+
+// Asks the engine itself, so that what is refused here and there is the same.
+void CheckText(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const std::string& text,
+               const char* what) {
+  const bool is_type = field == FileSearch::FindFactory::FIND_FILETYPE;
+  std::vector<FileSearch::FindComp*> comps;
+  const int made = FileSearch::FindFactory::createFindOp(field, is_type ? text.c_str() : nullptr,
+                                                         is_type ? nullptr : text.c_str(), comps);
+  for (const FileSearch::FindComp* comp : comps) delete comp;
+  if (made == 0) throw UsageError("'" + text + "' is no " + what);
+}
+
+void SetTimes(const TimeRange& range, const std::string& name, std::time_t now,
+              Json::Value* params) {
+  if (!range.from.empty()) {
+    (*params)[name + "_from"] = Json::Int64{ParseTime(range.from, Bound::kFrom, now)};
+  }
+  if (!range.to.empty()) {
+    (*params)[name + "_to"] = Json::Int64{ParseTime(range.to, Bound::kTo, now)};
+  }
+}
+
+std::string Joined(const std::vector<std::string>& words) {
+  std::string text;
+  for (const std::string& word : words) text += (text.empty() ? "" : ",") + word;
+  return text;
+}
+
+}  // namespace
+
+Json::Value SearchRequest(const SearchOptions& options, const std::vector<std::string>& locations,
+                          std::time_t now) {
+  using Factory = FileSearch::FindFactory;
+  Json::Value params(Json::objectValue);
+  for (const std::string& location : locations) params["folder_path"].append(location);
+  CheckText(Factory::FIND_PATTERN, options.pattern,
+            "pattern that can be searched for; see arbory search --help");
+  params["pattern"] = options.pattern;
+  const std::string extensions = Joined(options.extensions);
+  if (!extensions.empty()) {
+    CheckText(Factory::FIND_EXTENSION, extensions, "list of extensions");
+    params["extension"] = extensions;
+  }
+  if (!options.type.empty()) {
+    CheckText(Factory::FIND_FILETYPE, options.type,
+              "file type; there are file, dir, image, video, audio, document and archive");
+    params["filetype"] = options.type;
+  }
+  if (!options.size_from.empty()) params["size_from"] = Json::Int64{ParseSize(options.size_from)};
+  if (!options.size_to.empty()) params["size_to"] = Json::Int64{ParseSize(options.size_to)};
+  SetTimes(options.mtime, "mtime", now, &params);
+  SetTimes(options.crtime, "crtime", now, &params);
+  SetTimes(options.atime, "atime", now, &params);
+  if (!options.owner.empty()) {
+    CheckOwner(options.owner);
+    params["owner"] = options.owner;
+  }
+  if (!options.group.empty()) {
+    CheckGroup(options.group);
+    params["group"] = options.group;
+  }
+  params["recursive"] = options.recursive;
+  params["search_content"] = options.content;
+  return params;
+}
+
+}  // namespace arbory

@@ -1,0 +1,20 @@
+#pragma once
+// The parameters of a search's start, from what the command line says.
+
+#include <json/value.h>
+
+#include <ctime>
+#include <string>
+#include <vector>
+
+#include "arbory/options.h"
+
+namespace arbory {
+
+// `now` is what ages count back from. Throws UsageError for a value that cannot be understood and
+// for what a search would otherwise leave out silently or refuse without saying which part was
+// wrong: an unknown owner or group, an illegal pattern, extension or file type.
+Json::Value SearchRequest(const SearchOptions& options, const std::vector<std::string>& locations,
+                          std::time_t now);
+
+}  // namespace arbory

@@ -1,0 +1,84 @@
+#include "arbory/search_task.h"
+
+#include <exception>
+#include <memory>
+
+#include "platform/task.h"
+#include "platform/webfm.h"
+
+namespace arbory {
+namespace {
+
+int IntOf(const Json::Value& value) { return value.isInt() ? value.asInt() : 0; }
+std::uint64_t CountOf(const Json::Value& value) { return value.isUInt64() ? value.asUInt64() : 0; }
+
+// The member of an object; null of anything else, as a record is no better than its last writer.
+const Json::Value& Member(const Json::Value& value, const char* name) {
+  return value.isObject() ? value[name] : Json::Value::nullSingleton();
+}
+
+std::string Grouped(std::uint64_t number) {
+  constexpr int kGroup = 3;
+  std::string text = std::to_string(number);
+  for (int at = static_cast<int>(text.size()) - kGroup; at > 0; at -= kGroup) text.insert(at, ",");
+  return text;
+}
+
+// A table row of the program's own: makes a task as the user and removes it again, because the
+// module keeps to itself why it could not make one.
+void TryTask(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  const std::string user = request->GetLoginUserName();
+  try {
+    if (WfmLibUGIDSet(nullptr, user.c_str()) < 0) throw std::runtime_error("no such user");
+    OKT::Task(user.c_str(), nullptr).remove();
+    response->SetError(0, "");
+  } catch (const std::exception& error) {
+    response->SetError(nas::kCodeUnknownFailure, error.what());
+  }
+}
+
+}  // namespace
+
+SearchState ReadSearch(const std::string& user, const std::string& task_id) {
+  SearchState state;
+  try {
+    const std::unique_ptr<OKT::Task> task(
+        OKT::TaskMgr(user.c_str()).getTaskWithThrow(task_id.c_str()));
+    state.exists = true;
+    state.finished = task->isFinished();
+    state.progress = IntOf(task->getProperty("progress"));
+    state.error = IntOf(Member(task->getProperty("data"), "errno"));
+    const Json::Value walk = task->getProperty("walk");
+    if (Member(walk, "phase").isString()) state.phase = walk["phase"].asString();
+    state.folders = CountOf(Member(walk, "folders"));
+    state.entries = CountOf(Member(walk, "entries"));
+    state.matches = CountOf(Member(walk, "matches"));
+    state.unreadable = CountOf(Member(Member(walk, "skipped"), "permission"));
+    state.troubled = CountOf(Member(Member(walk, "skipped"), "other"));
+  } catch (const std::exception&) {
+    // Somebody cleaned it: what was read so far is all there is.
+  }
+  return state;
+}
+
+std::string ProgressText(const SearchState& state, long seconds) {
+  std::string text = "Searching " + std::to_string(seconds) + " s";
+  if (state.phase.empty()) return text;
+  text += ": " + Grouped(state.folders) + " folders, " + Grouped(state.entries) + " entries, " +
+          Grouped(state.matches) + " found";
+  if (state.phase == "contents") text += ", reading contents";
+  return text;
+}
+
+std::string WhyNoTask(const Session& session) {
+  const NUVA::APIMethod row = {"", 1, "", TryTask};
+  const auto encode = [](int code, const Json::Value& data) {
+    // Without a text the call did not come as far as making a task.
+    if (data.isString()) return data.asString();
+    return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (code " +
+           std::to_string(code) + ")";
+  };
+  return session.Call(row, "", Json::Value(), encode);
+}
+
+}  // namespace arbory

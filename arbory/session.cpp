@@ -1,0 +1,51 @@
+#include "arbory/session.h"
+
+#include <unistd.h>
+
+#include "arbory/parse.h"
+#include "nas/system/accounts.h"
+
+namespace arbory {
+namespace {
+
+std::string ActingUser(const std::string& wanted) {
+  const auto caller = nas::FindAccount(getuid());
+  if (wanted.empty()) {
+    if (!caller) throw UsageError("the user " + std::to_string(getuid()) + " has no name here");
+    return caller->name;
+  }
+  const auto account = nas::FindAccount(wanted);
+  if (!account) throw UsageError("there is no user '" + wanted + "'");
+  if (geteuid() != 0 && account->uid != getuid()) {
+    throw UsageError("only root may act for another user (--user " + wanted + ")");
+  }
+  return account->name;
+}
+
+}  // namespace
+
+Session::Session(const CommonOptions& options) : config_(nas::LoadConfig(options.config)) {
+  for (const std::string& share : options.shares) config_.shares.push_back(ParseShare(share));
+  nas::Configure(config_);
+  user_ = ActingUser(options.user);
+}
+
+void Session::AddShares(const std::vector<nas::ShareSetting>& shares) {
+  if (shares.empty()) return;
+  config_.shares.insert(config_.shares.end(), shares.begin(), shares.end());
+  nas::Configure(config_);
+}
+
+const nas::Module& Session::module() {
+  if (!module_) module_ = std::make_unique<nas::Module>(std::string());
+  return *module_;
+}
+
+std::string Session::Call(const NUVA::APIMethod& row, const std::string& method,
+                          const Json::Value& params, const nas::ReplyEncoder& encode,
+                          const std::function<bool()>& go_on) const {
+  // The session's name only shows in log lines.
+  return nas::RunCall(row, {method, params, user_, "terminal"}, encode, go_on);
+}
+
+}  // namespace arbory

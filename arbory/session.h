@@ -1,0 +1,41 @@
+#pragma once
+// What every command needs before it can call the module: the configuration, the user it acts for
+// and the module itself.
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "arbory/options.h"
+#include "nas/system/config.h"
+#include "nas/webapi/runner.h"
+
+namespace arbory {
+
+inline constexpr char kSearchApi[] = "NUVA.Arbory.Search";
+
+class Session {
+ public:
+  // Reads the configuration and makes it the process's. Throws UsageError or nas::ConfigError, also
+  // for a user that the caller may not act for.
+  explicit Session(const CommonOptions& options);
+
+  // Offers more shares, for this run.
+  void AddShares(const std::vector<nas::ShareSetting>& shares);
+
+  const std::string& user() const { return user_; }
+  // Loads the module when first asked for. Throws std::runtime_error.
+  const nas::Module& module();
+
+  // Makes one call as this user; see nas::RunCall.
+  std::string Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
+                   const nas::ReplyEncoder& encode, const std::function<bool()>& go_on = {}) const;
+
+ private:
+  nas::Config config_;
+  std::string user_;
+  std::unique_ptr<nas::Module> module_;
+};
+
+}  // namespace arbory
