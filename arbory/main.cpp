@@ -115,7 +115,12 @@ void AddOutput(CLI::App* search, SearchOptions* options) {
                                  "atime", "ctime", "crtime"})
                       .description(""));
   search->add_flag("--desc", options->descending, "Largest, latest or last first")->needs(sort);
-  const auto count = CLI::Validator(CLI::NonNegativeNumber).description("");
+  const CLI::Validator count(
+      [](const std::string& text) {
+        const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
+        return digits ? std::string() : "'" + text + "' is not a number of files";
+      },
+      "");
   search->add_option("--limit", options->limit, "Print at most N files")
       ->type_name("N")
       ->check(count);
