@@ -24,6 +24,8 @@ constexpr char kCreate[] =
 constexpr std::int64_t kApplicationId = 1095909955;  // "ARBC"
 constexpr std::int64_t kVersion = 1;
 
+constexpr off_t kSmallestDatabaseBytes = 512;
+
 // Others hold the lock for one small transaction; longer means they are stopped.
 constexpr int kBusyMilliseconds = 5000;
 
@@ -134,6 +136,8 @@ class FileDB::Store {
     if (stat(path.c_str(), &info) != 0) return Fail(errno);
     if (S_ISDIR(info.st_mode)) return Fail(EISDIR);
     if (!S_ISREG(info.st_mode)) return Fail(EINVAL);
+    // SQLite would take so short a file as empty and write over it.
+    if (info.st_size > 0 && info.st_size < kSmallestDatabaseBytes) return Fail(EBADMSG);
     Run([&] {
       db_ = std::make_unique<nas::Database>(path, SQLITE_OPEN_READWRITE, kBusyMilliseconds);
       Verify();

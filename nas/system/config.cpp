@@ -24,19 +24,21 @@ std::string Absolute(const std::string& directory) {
   return directory.empty() ? directory : std::string(current.get()) + "/" + directory;
 }
 
+[[noreturn]] void Fail(const ShareSetting& share, const std::string& trouble) {
+  const std::string place = share.origin.empty() ? std::string() : share.origin + ": ";
+  throw ConfigError(place + "share \"" + share.name + "\": " + trouble);
+}
+
 void CheckShare(ShareSetting* share) {
-  const auto fail = [&](const std::string& trouble) {
-    const std::string place = share->origin.empty() ? std::string() : share->origin + ": ";
-    throw ConfigError(place + "share \"" + share->name + "\": " + trouble);
-  };
-  std::string trouble = TroubleWithShareName(share->name);
-  if (!trouble.empty()) fail(trouble);
+  const std::string name_trouble = TroubleWithShareName(share->name);
+  if (!name_trouble.empty()) Fail(*share, name_trouble);
   share->directory = Absolute(share->directory);
-  if (share->directory.empty()) fail("no directory is given");
+  if (share->directory.empty()) Fail(*share, "no directory is given");
+  // A directory that is not there yet is judged by its name for now, and again when it is used.
   std::string root = RealPath(share->directory).value_or(share->directory);
   while (root.ends_with('/')) root.pop_back();
-  trouble = TroubleWithShareRoot(share->name, root);
-  if (!trouble.empty()) fail(trouble);
+  const std::string root_trouble = TroubleWithShareRoot(share->name, root);
+  if (!root_trouble.empty()) Fail(*share, root_trouble);
 }
 
 }  // namespace
@@ -56,9 +58,7 @@ void Configure(Config config) {
   std::set<std::string> names;
   for (ShareSetting& share : config.shares) {
     CheckShare(&share);
-    if (!names.insert(share.name).second) {
-      throw ConfigError("share \"" + share.name + "\" is given twice");
-    }
+    if (!names.insert(share.name).second) Fail(share, "the name is given twice");
   }
   g_config = std::move(config);
   g_configured = true;

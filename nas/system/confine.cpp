@@ -92,7 +92,7 @@ CommandLine Confine(const std::vector<const char*>& command, int status_fd) {
   for (const char* folder : kSystemFolders) line.Add({"--ro-bind-try", folder, folder});
   line.Add({"--dev", "/dev"});
   AddVolumes(&line);
-  line.Add({"--chdir", "/", "--"});
+  line.Add({"--remount-ro", "/", "--chdir", "/", "--"});
   for (const char* word : command) line.Add({word});
   return line;
 }
@@ -160,10 +160,10 @@ int RunConfined(const std::vector<const char*>& command) {
 
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3,
               int /*flags*/) {
-  if (program == nullptr) return -1;
   const gid_t group = getegid();
   const uid_t user = geteuid();
   if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) return nas::Fail();
+  if (program == nullptr || access(program, X_OK) != 0) return nas::Fail();
   std::vector<const char*> command = {program};
   for (const char* argument : {arg1, arg2, arg3}) {
     if (argument == nullptr) break;

@@ -127,6 +127,19 @@ void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
   *out += '}';
 }
 
+// JsonCpp's reader passes over comments inside arrays and objects even when told not to allow them.
+bool HasComment(std::string_view text) {
+  bool in_string = false;
+  for (size_t at = 0; at < text.size(); ++at) {
+    if (text[at] == '/' && !in_string) return true;
+    if (text[at] == '\\')
+      ++at;
+    else if (text[at] == '"')
+      in_string = !in_string;
+  }
+  return false;
+}
+
 }  // namespace
 
 void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out) {
@@ -159,6 +172,7 @@ std::string JsonText(const Json::Value& value, JsonBytes bytes) {
 }
 
 bool ParseJson(std::string_view text, Json::Value* out) {
+  if (HasComment(text)) return false;
   Json::CharReaderBuilder settings;
   settings["collectComments"] = false;
   settings["allowComments"] = false;

@@ -103,7 +103,9 @@ std::string ResultFolder(const std::string& volume, const std::string& user) {
   const UniqueFd road = OpenResultRoad(volume);
   if (!road) return Fail(errno);
   const UniqueFd folder = OpenOrMakeFolder(road.get(), user, kPrivateMode);
-  if (!folder || !IsPrivateTo(folder.get(), geteuid())) return Fail(errno);
+  // Something else in its place was put there by somebody: not a missing folder.
+  if (!folder) return Fail(errno == ENOTDIR ? EPERM : errno);
+  if (!IsPrivateTo(folder.get(), geteuid())) return Fail(errno);
   std::string path = volume;
   for (const Step& step : kResultRoad) path += std::string("/") + step.name;
   return path + "/" + user;

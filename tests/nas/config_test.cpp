@@ -1,0 +1,293 @@
+// Configuration files, shares, volumes and what is kept per user.
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+
+#include "nas/system/config.h"
+#include "nas/system/shares.h"
+#include "nas/system/user_state.h"
+#include "platform/system.h"
+#include "platform/webfm.h"
+#include "tests/nas/fixture.h"
+
+namespace nas_test {
+namespace {
+
+class ConfigTest : public PlatformTest {
+ protected:
+  // The error's text after "FILE", or "" when the configuration is good.
+  std::string Trouble(const std::string& content) {
+    const std::string file = dir_ + "/arbory.toml";
+    WriteFile(file, content);
+    try {
+      nas::Configure(nas::LoadConfig(file));
+      return "";
+    } catch (const nas::ConfigError& error) {
+      const std::string what = error.what();
+      return what.starts_with(file) ? what.substr(file.size()) : "no file in: " + what;
+    }
+  }
+};
+
+TEST_F(ConfigTest, NamesTheLineOfTheTrouble) {
+  const struct {
+    const char* content;
+    const char* trouble;  // its beginning
+  } rows[] = {
+      {"", ""},
+      {"state_dir = \"/s\"\nvolumes = []\nmodule = \"/m.so\"\n[shares]\na = \"/tmp\"\n", ""},
+      {"# c\nstate-dir = \"/s\"\n", ":2: unknown key \"state-dir\""},
+      {"state_dir = 5\n", ":1: a text"},
+      {"\n\nstate_dir = \"s\"\n", ":3: an absolute path"},
+      {"volumes = \"/volume*\"\n", ":1: a list"},
+      {"volumes = [\n\"/a\",\n7]\n", ":3: a text"},
+      {"shares = 1\n", ":1: a table"},
+      {"[shares]\n\na = true\n", ":3: a text"},
+      {"[shares]\na = \"relative\"\n", ":2: an absolute path"},
+      {"[shares]\na = \"/tmp\"\nhome = \"/tmp\"\n", ":3: share \"home\": the name stands for"},
+      {"[shares]\n\"a,b\" = \"/tmp\"\n", ":2: share \"a,b\": the name holds"},
+      {"[shares]\nb = \"/x/homes/y\"\n", ":2: share \"b\": its directory lies in"},
+      {"state_dir = \"/s\"\nstate_dir = \"/t\"\n", ":2: "},
+      {"[shares\n", ":1: "},
+  };
+  for (const auto& row : rows) {
+    const std::string trouble = Trouble(row.content);
+    EXPECT_TRUE(row.trouble[0] == '\0' ? trouble.empty() : trouble.starts_with(row.trouble))
+        << row.content << " -> " << trouble;
+  }
+  EXPECT_THROW(nas::LoadConfig(dir_ + "/missing.toml"), nas::ConfigError);
+  EXPECT_THROW(nas::LoadConfig(dir_), nas::ConfigError);
+}
+
+TEST_F(ConfigTest, FindsTheFileByTheEnvironment) {
+  const std::string base = MakeFolder("xdg");
+  MakeFolder("xdg/arbory");
+  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
+    setenv("XDG_CONFIG_HOME", base.c_str(), 1);
+    setenv("XDG_STATE_HOME", (dir_ + "/mine").c_str(), 1);
+    unsetenv("ARBORY_CONFIG");
+    EXPECT_EQ(nas::LoadConfig("").state_dir, dir_ + "/mine/arbory");
+    setenv("ARBORY_CONFIG", (dir_ + "/none").c_str(), 1);
+    EXPECT_THROW(nas::LoadConfig(""), nas::ConfigError) << "a named file must exist";
+  }));
+  WriteFile(base + "/arbory/arbory.toml", "state_dir = \"/x\"");
+  WriteFile(dir_ + "/env", "state_dir = \"/e\"");
+  EXPECT_TRUE(InChild([&] {
+    setenv("XDG_CONFIG_HOME", base.c_str(), 1);
+    if (access("/etc/arbory/arbory.toml", F_OK) != 0) {
+      EXPECT_EQ(nas::LoadConfig("").state_dir, "/x");
+    }
+    setenv("ARBORY_CONFIG", (dir_ + "/env").c_str(), 1);
+    EXPECT_EQ(nas::LoadConfig("").state_dir, "/e");
+  }));
+}
+
+class SharesTest : public PlatformTest {};
+
+TEST_F(SharesTest, FollowTheirTable) {
+  for (const char* folder : {"volume1/photo", "volume2/photo", "volume2/music", "volume1/@tmp",
+                             "volume1/.hidden", "volume1/#recycle", "volume1/home", "volume1/a,b",
+                             "volume2/homes/ann", "elsewhere/below"}) {
+    MakeFolder(folder);
+  }
+  WriteFile(dir_ + "/volume1/file", "");
+  ASSERT_EQ(symlink("/", (dir_ + "/volume1/link").c_str()), 0);
+  ASSERT_EQ(symlink("elsewhere/below", (dir_ + "/detour").c_str()), 0);
+  Configure({{"all", "/"},
+             {"far", dir_ + "/detour"},
+             {"music", dir_ + "/volume1/photo/"},
+             {"later", dir_ + "/later"}});
+  const struct {
+    const char* name;
+    const char* root;    // below dir_; null: not a share
+    const char* volume;  // below dir_
+  } rows[] = {
+      {"photo", "/volume1/photo", "/volume1"},
+      {"music", "/volume1/photo", "/volume1"},  // configured before a volume's own
+      {"far", "/elsewhere/below", nullptr},
+      {"homes", "/volume2/homes", "/volume2"},
+      {"later", nullptr, nullptr},
+      {"@tmp", nullptr, nullptr},
+      {".hidden", nullptr, nullptr},
+      {"#recycle", nullptr, nullptr},
+      {"home", nullptr, nullptr},
+      {"a,b", nullptr, nullptr},
+      {"file", nullptr, nullptr},
+      {"link", nullptr, nullptr},
+      {"..", nullptr, nullptr},
+      {"", nullptr, nullptr},
+      {"photo/..", nullptr, nullptr},
+      {"PHOTO", nullptr, nullptr},
+  };
+  for (const auto& row : rows) {
+    const auto share = nas::FindShare(row.name);
+    ASSERT_EQ(share.has_value(), row.root != nullptr) << row.name;
+    if (!share) continue;
+    EXPECT_EQ(share->root, dir_ + row.root) << row.name;
+    EXPECT_EQ(share->volume, row.volume == nullptr ? "" : dir_ + row.volume) << row.name;
+  }
+  EXPECT_EQ(nas::FindShare("all")->root, "");
+  std::string names;
+  for (const nas::Share& share : nas::ListShares()) names += share.name + " ";
+  EXPECT_EQ(names, "all far homes music photo ");
+  MakeFolder("later");
+  EXPECT_TRUE(nas::FindShare("later")) << "seen as soon as it is there";
+
+  char home[4096];
+  EXPECT_EQ(NUVAServiceHomePathGet("ann", home, sizeof home), 0);
+  EXPECT_EQ(home, dir_ + "/volume2/homes/ann");
+  EXPECT_EQ(NUVAServiceHomePathGet("ann", home, dir_.size()), -1) << "does not fit";
+  for (const char* user : {"bob", "..", "", "ann/.."}) {
+    EXPECT_EQ(NUVAServiceHomePathGet(user, home, sizeof home), -1) << user;
+    EXPECT_EQ(errno, ENOENT) << user;
+  }
+}
+
+TEST_F(SharesTest, ThatCannotBeOfferedAreRefused) {
+  MakeFolder("homes/x");
+  MakeFolder("data/homes");
+  ASSERT_EQ(symlink("homes/x", (dir_ + "/innocent").c_str()), 0);
+  const struct {
+    const char* name;
+    const char* directory;
+    bool good;
+  } rows[] = {
+      {"homes", "/homes", true},    {"homes", "/homes/", true}, {"homes", "/data", false},
+      {"homes", "/homes/x", false}, {"data", "/data", true},    {"h", "/homes", false},
+      {"x", "/homes/x", false},     {"x", "/innocent", false},  {"", "/data", false},
+      {"a/b", "/data", false},      {"a\nb", "/data", false},   {"..", "/data", false},
+  };
+  for (const auto& row : rows) {
+    if (row.good) {
+      EXPECT_NO_THROW(Configure({{row.name, dir_ + row.directory}})) << row.name << row.directory;
+    } else {
+      EXPECT_THROW(Configure({{row.name, dir_ + row.directory}}), nas::ConfigError)
+          << row.name << " " << row.directory;
+    }
+  }
+  EXPECT_THROW(Configure({{"a", dir_}, {"a", dir_}}), nas::ConfigError) << "twice";
+  EXPECT_THROW(Configure({{"a", ""}}), nas::ConfigError) << "no directory";
+}
+
+class UserStateTest : public PlatformTest {};
+
+TEST_F(UserStateTest, IsMadeOnceAndPrivate) {
+  umask(0077);  // what is made must not depend on it
+  for (const std::string& user :
+       AmRoot() ? std::vector<std::string>{Me(), kOtherUser} : std::vector<std::string>{Me()}) {
+    ASSERT_TRUE(nas::PrepareUserState(user)) << user;
+    const std::string preference = nas::PreferenceFolder(user);
+    EXPECT_EQ(ReadFile(preference + "/usersettings"), "{}\n");
+    EXPECT_EQ(ModeOf(preference + "/usersettings"), 0600U);
+    for (const std::string& folder : {preference, preference + "/..", nas::TaskFolder(user)}) {
+      EXPECT_EQ(ModeOf(folder), 0700U) << folder;
+      struct stat info;
+      stat(folder.c_str(), &info);
+      NUVAUSER* account = nullptr;
+      ASSERT_EQ(NUVAUserGet(user.c_str(), &account), 0);
+      EXPECT_EQ(info.st_uid, account->nUid) << folder;
+      NUVAUserFree(account);
+    }
+    WriteFile(preference + "/usersettings", "kept");
+    ASSERT_TRUE(nas::PrepareUserState(user));
+    EXPECT_EQ(ReadFile(preference + "/usersettings"), "kept");
+  }
+  EXPECT_EQ(ModeOf(state_), AmRoot() ? 0755U : 0700U);
+  EXPECT_EQ(Me(), AmRoot() ? "root" : Me()) << "the caller's identity is back";
+}
+
+TEST_F(UserStateTest, IsRefusedWhereItIsNotTheUsersOwn) {
+  for (const char* name : {"", ".", "..", "../x", "a/b", "no-such-user-here", "a\nb"}) {
+    EXPECT_FALSE(nas::PrepareUserState(name)) << name;
+    EXPECT_EQ(NLIBCErrGet(), 0x1800) << name;
+  }
+  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  const std::string preference = nas::PreferenceFolder(Me());
+  ASSERT_EQ(chmod(preference.c_str(), 0750), 0);
+  EXPECT_FALSE(nas::PrepareUserState(Me())) << "open to a group";
+  EXPECT_EQ(NLIBCErrGet(), 0x0300);
+  ASSERT_EQ(rename(preference.c_str(), (dir_ + "/moved").c_str()), 0);
+  ASSERT_EQ(chmod((dir_ + "/moved").c_str(), 0700), 0);
+  ASSERT_EQ(symlink((dir_ + "/moved").c_str(), preference.c_str()), 0);
+  EXPECT_FALSE(nas::PrepareUserState(Me())) << "a link";
+  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
+    EXPECT_FALSE(nas::PrepareUserState("root")) << "another user's";
+    EXPECT_EQ(NLIBCErrGet(), 0x0300);
+    EXPECT_EQ(errno, EPERM);
+  }));
+}
+
+class ResultFolderTest : public PlatformTest {};
+
+TEST_F(ResultFolderTest, LiesOnTheVolumeOrInTheScratchVolume) {
+  const std::string share = MakeFolder("volume1/photo");
+  Configure({{"far", MakeFolder("far")}});
+  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  const std::string volume = dir_ + "/volume1";
+  EXPECT_EQ(nas::ResultVolume(*nas::FindShare("photo"), Me()), volume);
+  EXPECT_EQ(nas::ResultVolume(*nas::FindShare("far"), Me()), nas::ScratchVolume());
+  for (const std::string& on : {volume, nas::ScratchVolume()}) {
+    EXPECT_EQ(nas::ResultFolder(on, Me()), on + "/@tmp/webfm/FBSearch/" + Me());
+    EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch"), 01777U);
+    EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch/" + Me()), 0700U);
+  }
+  for (const std::string& other : {dir_ + "/far", std::string("/"), volume + "/photo"}) {
+    EXPECT_EQ(nas::ResultFolder(other, Me()), "") << "no volume: " << other;
+  }
+  EXPECT_EQ(nas::ResultFolder(volume, "../x"), "");
+}
+
+TEST_F(ResultFolderTest, IsNotTakenFromOthers) {
+  MakeFolder("volume1");
+  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  const std::string volume = dir_ + "/volume1";
+  const std::string mine = nas::ResultFolder(volume, Me());
+  ASSERT_NE(mine, "");
+  const struct {
+    const char* why;
+    std::function<void()> spoil;
+  } rows[] = {
+      {"open to others", [&] { ASSERT_EQ(chmod(mine.c_str(), 0711), 0); }},
+      {"a link",
+       [&] {
+         ASSERT_EQ(rmdir(mine.c_str()), 0);
+         ASSERT_EQ(symlink(MakeFolder("trap", 0700).c_str(), mine.c_str()), 0);
+       }},
+      {"a folder on the way that anybody can replace",
+       [&] {
+         ASSERT_EQ(unlink(mine.c_str()), 0);
+         ASSERT_EQ(chmod((volume + "/@tmp").c_str(), 0777), 0);
+       }},
+  };
+  for (const auto& row : rows) {
+    row.spoil();
+    EXPECT_EQ(nas::ResultFolder(volume, Me()), "") << row.why;
+    EXPECT_EQ(NLIBCErrGet(), 0x0300) << row.why;
+  }
+  const nas::Share share = {"x", volume, volume};
+  EXPECT_EQ(nas::ResultVolume(share, Me()), nas::ScratchVolume()) << "then the scratch volume";
+}
+
+TEST_F(ResultFolderTest, IsMadeByRootForTheUser) {
+  SKIP_UNLESS_ROOT();
+  MakeFolder("volume1");
+  ASSERT_TRUE(nas::PrepareUserState(kOtherUser));
+  EXPECT_TRUE(InChild([&] {
+    EXPECT_EQ(nas::ResultFolder(dir_ + "/volume1", kOtherUser), "") << "root is not that user";
+    ASSERT_EQ(WfmLibUGIDSet(nullptr, kOtherUser), 0);
+    const std::string folder = nas::ResultFolder(dir_ + "/volume1", kOtherUser);
+    struct stat info;
+    ASSERT_EQ(stat(folder.c_str(), &info), 0);
+    EXPECT_EQ(info.st_uid, geteuid());
+    ASSERT_EQ(stat((folder + "/..").c_str(), &info), 0);
+    EXPECT_EQ(info.st_uid, 0U);
+    EXPECT_NE(geteuid(), 0U) << "stepped down again";
+    EXPECT_NE(nas::ResultFolder(nas::ScratchVolume(), kOtherUser), "");
+  }));
+}
+
+}  // namespace
+}  // namespace nas_test

@@ -1,0 +1,168 @@
+// The record store: order, limits, replacement, and files that are not stores.
+
+#include <sqlite3.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "nas/system/json_text.h"
+#include "platform/filedb.h"
+#include "tests/nas/fixture.h"
+
+namespace nas_test {
+namespace {
+
+using NUVA::WEBFM::FileDB;
+
+Json::Value Record(const Json::Value& pattern, int number = 0) {
+  Json::Value record;
+  record["pattern"] = pattern;
+  record["n"] = number;
+  return record;
+}
+
+class FileDBTest : public PlatformTest {
+ protected:
+  // The patterns of the records selected, each followed by a space.
+  std::string Patterns(const FileDB::Condition& condition = {}) {
+    const FileDB db(path());
+    EXPECT_TRUE(db.IsGood());
+    std::vector<Json::Value> records;
+    EXPECT_TRUE(db.Select(condition, records));
+    std::string patterns;
+    for (const Json::Value& record : records) patterns += record["pattern"].asString() + " ";
+    return patterns;
+  }
+  bool Insert(const Json::Value& record, int limit = 10) {
+    FileDB db(path());
+    db.SetMaxRecordNum(limit);
+    db.SetPrimaryKey("pattern");
+    return db.Insert(record);
+  }
+  std::string path() const { return dir_ + "/history.db"; }
+};
+
+TEST_F(FileDBTest, KeepsTheNewestOfEachKey) {
+  EXPECT_EQ(Patterns(), "");
+  EXPECT_EQ(ModeOf(path()), 0600U);
+  for (int at = 1; at <= 11; ++at) ASSERT_TRUE(Insert(Record("p" + std::to_string(at), at)));
+  EXPECT_EQ(Patterns(), "p11 p10 p9 p8 p7 p6 p5 p4 p3 p2 ");
+  ASSERT_TRUE(Insert(Record("p5", 50)));
+  EXPECT_EQ(Patterns(), "p5 p11 p10 p9 p8 p7 p6 p4 p3 p2 ");
+  ASSERT_TRUE(Insert(Record("q"), 3));
+  EXPECT_EQ(Patterns(), "q p5 p11 ") << "a smaller bound takes effect with the next write";
+  ASSERT_TRUE(Insert(Record("r"), 0));
+  EXPECT_EQ(Patterns(), "r q p5 p11 ") << "0: no bound";
+  const struct {
+    int offset;
+    int limit;
+    const char* patterns;
+  } rows[] = {{0, 0, "r q p5 p11 "}, {1, 2, "q p5 "}, {-1, -1, "r q p5 p11 "},
+              {3, 0, "p11 "},        {4, 1, ""},      {0, 99, "r q p5 p11 "}};
+  for (const auto& row : rows) {
+    FileDB::Condition condition;
+    condition.offset = row.offset;
+    condition.limit = row.limit;
+    EXPECT_EQ(Patterns(condition), row.patterns) << row.offset << " " << row.limit;
+  }
+}
+
+TEST_F(FileDBTest, ComparesValuesAsText) {
+  for (const Json::Value& pattern : {Json::Value("5"), Json::Value("a'; DROP TABLE records;--"),
+                                     Json::Value("\xFF"), Json::Value(""), Json::Value(true)}) {
+    ASSERT_TRUE(Insert(Record(pattern)));
+  }
+  ASSERT_TRUE(Insert(Record(5, 1))) << "replaces the text 5";
+  FileDB db(path());
+  const auto matching = [&](const std::string& text) {
+    std::vector<Json::Value> records;
+    EXPECT_TRUE(db.Select(FileDB::Condition().SetCondition("pattern", text), records));
+    return records.size();
+  };
+  for (const char* text : {"5", "a'; DROP TABLE records;--", "\xFF", "", "true"}) {
+    EXPECT_EQ(matching(text), 1U) << text;
+  }
+  EXPECT_EQ(matching("missing"), 0U);
+  EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("pattern", "missing")));
+  EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("nokey", ""))) << "absent is not empty";
+  EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("pattern", "5").SetCondition("n", "0")));
+  EXPECT_EQ(matching("5"), 1U) << "all conditions must hold";
+  EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("pattern", "5")));
+  EXPECT_EQ(matching("5"), 0U);
+  EXPECT_EQ(matching("\xFF"), 1U);
+  EXPECT_FALSE(db.Insert(Json::Value("not an object")));
+  EXPECT_TRUE(db.Delete({}));
+  EXPECT_EQ(Patterns(), "");
+}
+
+TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
+  MakeFolder("directory");
+  const std::string garbage(5000, 'g');
+  sqlite3* other = nullptr;
+  ASSERT_EQ(sqlite3_open((dir_ + "/other").c_str(), &other), SQLITE_OK);
+  ASSERT_EQ(sqlite3_exec(other, "CREATE TABLE records(x)", nullptr, nullptr, nullptr), SQLITE_OK);
+  sqlite3_close(other);
+  ASSERT_TRUE(Insert(Record(std::string(20000, 'x'))));
+  const std::string store = ReadFile(path());
+  WriteFile(dir_ + "/one", "g");
+  WriteFile(dir_ + "/hundred", garbage.substr(0, 100));
+  WriteFile(dir_ + "/many", garbage);
+  WriteFile(dir_ + "/cut", store.substr(0, store.size() / 2));
+  std::string flipped = store;
+  for (size_t at = 4096; at < 4196; ++at) flipped[at] = static_cast<char>(~flipped[at]);
+  WriteFile(dir_ + "/flipped", flipped);
+  const struct {
+    const char* name;
+    int error;
+  } rows[] = {{"one", EBADMSG},      {"hundred", EBADMSG},        {"many", EBADMSG},
+              {"cut", EBADMSG},      {"flipped", EBADMSG},        {"other", EBADMSG},
+              {"directory", EISDIR}, {"missing/file.db", ENOENT}, {"one/file.db", ENOTDIR}};
+  for (const auto& row : rows) {
+    const std::string file = dir_ + "/" + row.name;
+    const std::string before = ReadFile(file);
+    FileDB db(file);
+    errno = 0;
+    EXPECT_FALSE(db.IsGood()) << row.name;
+    EXPECT_EQ(errno, row.error) << row.name;
+    std::vector<Json::Value> records;
+    EXPECT_FALSE(db.Insert(Record("a")) || db.Delete({}) || db.Select({}, records)) << row.name;
+    EXPECT_TRUE(ReadFile(file) == before) << row.name << " was changed";
+  }
+  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
+    FileDB db("/usr/history.db");
+    errno = 0;
+    EXPECT_FALSE(db.IsGood());
+    EXPECT_EQ(errno, EACCES);
+  }));
+  WriteFile(dir_ + "/empty", "");
+  EXPECT_TRUE(FileDB(dir_ + "/empty").IsGood()) << "an empty file becomes a store";
+}
+
+TEST_F(FileDBTest, ProcessesWriteOneFileTogether) {
+  constexpr int kWriters = 4;
+  constexpr int kRecords = 20;
+  std::vector<pid_t> writers;
+  for (int writer = 0; writer < kWriters; ++writer) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+      bool good = true;
+      for (int at = 0; at < kRecords; ++at) {
+        good = Insert(Record(std::to_string(writer) + "." + std::to_string(at)), 0) && good;
+      }
+      _exit(good ? 0 : 1);
+    }
+    writers.push_back(pid);
+  }
+  for (const pid_t pid : writers) {
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0);
+  }
+  std::vector<Json::Value> records;
+  ASSERT_TRUE(FileDB(path()).Select({}, records));
+  EXPECT_EQ(records.size(), static_cast<size_t>(kWriters * kRecords));
+}
+
+}  // namespace
+}  // namespace nas_test

@@ -1,0 +1,236 @@
+// Calls made in a request child: what comes back whatever the entry function does, and what the
+// child is given.
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <csignal>
+#include <filesystem>
+#include <stdexcept>
+
+#include "nas/system/json_text.h"
+#include "nas/system/user_state.h"
+#include "nas/webapi/runner.h"
+#include "platform/system.h"
+#include "platform/webfm.h"
+#include "tests/nas/fixture.h"
+
+namespace nas_test {
+namespace {
+
+using NUVA::APIRequest;
+using NUVA::APIResponse;
+
+constexpr char kNoReply[] = R"({"code":100,"data":null})";
+
+class RunnerTest : public PlatformTest {
+ protected:
+  std::string Run(NUVA::APIEntry entry, const Json::Value& params = Json::Value(),
+                  const std::string& user = Me()) {
+    const NUVA::APIMethod row = {"Api", 2, "method", entry};
+    return nas::RunCall(row, {"MeThod", params, user, "sid"}, nas::EncodeJsonReply);
+  }
+};
+
+void Echo(APIRequest* request, APIResponse* response) {
+  Json::Value data;
+  data["user"] = request->GetLoginUserName();
+  data["session"] = request->GetSessionID();
+  data["preference"] = request->GetPreferenceDir();
+  data["method"] = request->GetAPIMethod();
+  data["version"] = request->GetAPIVersion();
+  data["has"] = request->HasParam("a");
+  data["a"] = request->GetParam("a", "fallback");
+  data["b"] = request->GetParam("b", "fallback");
+  response->SetError(0, data);
+}
+
+TEST_F(RunnerTest, TheRequestIsWhatTheClientSent) {
+  Json::Value params;
+  params["a"] = "\xFFx";
+  const std::string head = "{\"code\":0,\"data\":{\"a\":";
+  const std::string tail = ",\"method\":\"MeThod\",\"preference\":\"" +
+                           nas::PreferenceFolder(Me()) + "\",\"session\":\"sid\",\"user\":\"" +
+                           Me() + "\",\"version\":2}}";
+  EXPECT_EQ(Run(Echo, params), head + "\"\xEF\xBF\xBDx\",\"b\":\"fallback\",\"has\":true" + tail);
+  for (const Json::Value& none : {Json::Value(), Json::Value("a"), Json::Value(Json::arrayValue)}) {
+    EXPECT_EQ(Run(Echo, none), head + "\"fallback\",\"b\":\"fallback\",\"has\":false" + tail);
+  }
+  EXPECT_EQ(ReadFile(nas::PreferenceFolder(Me()) + "/usersettings"), "{}\n");
+}
+
+void ForkWorker(APIResponse* response, void (*work)(APIResponse*)) {
+  if (NLIBCProcFork() == 0) {
+    work(response);
+    return;
+  }
+  response->SetError(0, "request");
+}
+
+TEST_F(RunnerTest, OneReplyComesWhateverTheEntryDoes) {
+  const struct {
+    const char* why;
+    NUVA::APIEntry entry;
+    std::string reply;
+  } rows[] = {
+      {"an error with detail", [](APIRequest*, APIResponse* r) { r->SetError(408, "x"); },
+       R"({"code":408,"data":"x"})"},
+      {"no reply at all", [](APIRequest*, APIResponse*) {}, kNoReply},
+      {"the last one counts",
+       [](APIRequest*, APIResponse* r) {
+         r->SetError(401, "x");
+         r->SetError(0, Json::Value());
+       },
+       R"({"code":0,"data":null})"},
+      {"an exception", [](APIRequest*, APIResponse*) { throw std::runtime_error("x"); }, kNoReply},
+      {"an exception after a reply",
+       [](APIRequest*, APIResponse* r) {
+         r->SetError(0, 1);
+         throw 5;
+       },
+       kNoReply},
+      {"killed", [](APIRequest*, APIResponse*) { raise(SIGKILL); }, kNoReply},
+      {"ended by itself", [](APIRequest*, APIResponse*) { _exit(0); }, kNoReply},
+      {"killed, while a worker holds the pipe",
+       [](APIRequest*, APIResponse*) {
+         if (fork() == 0) {
+           sleep(5);
+           _exit(0);
+         }
+         raise(SIGKILL);
+       },
+       kNoReply},
+      {"a worker that lives on",
+       [](APIRequest*, APIResponse* r) {
+         ForkWorker(r, [](APIResponse*) {
+           sleep(5);
+           _exit(0);
+         });
+       },
+       R"({"code":0,"data":"request"})"},
+      {"a worker that falls back and replies too",
+       [](APIRequest*, APIResponse* r) {
+         ForkWorker(r, [](APIResponse* copy) { copy->SetError(401, "worker"); });
+       },
+       R"({"code":0,"data":"request"})"},
+  };
+  for (const auto& row : rows) {
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_EQ(Run(row.entry), row.reply) << row.why;
+    const auto took = std::chrono::steady_clock::now() - start;
+    EXPECT_LT(took, std::chrono::seconds(4)) << row.why << ": waited for a worker";
+  }
+}
+
+TEST_F(RunnerTest, AReplyOfManyMegabytesComesWhole) {
+  constexpr size_t kBytes = 12 << 20;
+  const std::string reply =
+      Run([](APIRequest*, APIResponse* r) { r->SetError(0, std::string(kBytes, 'x')); });
+  EXPECT_EQ(reply.size(), kBytes + std::string(R"({"code":0,"data":""})").size());
+  EXPECT_EQ(reply.find_first_not_of('x', 18), reply.size() - 2);
+}
+
+TEST_F(RunnerTest, TheChildHasNothingOfItsCaller) {
+  const int leaked = open("/", O_RDONLY);
+  const int high = fcntl(leaked, F_DUPFD, 700);
+  openlog("test", LOG_NDELAY, LOG_USER);
+  signal(SIGTERM, SIG_IGN);
+  sigset_t blocked, before;
+  sigemptyset(&blocked);
+  sigaddset(&blocked, SIGUSR1);
+  sigprocmask(SIG_BLOCK, &blocked, &before);
+  fputs("buffered", stdout);  // must not be written a second time by the child
+
+  unsetenv("ARBORY_CHILD_STDERR");
+  const std::string reply = Run([](APIRequest*, APIResponse* r) {
+    Json::Value open_files(Json::arrayValue);
+    for (int fd = 0; fd < 1024; ++fd) {
+      struct stat info;
+      if (fstat(fd, &info) != 0) continue;
+      open_files.append(S_ISFIFO(info.st_mode) ? "pipe" : S_ISCHR(info.st_mode) ? "null" : "other");
+    }
+    Json::Value data;
+    data["files"] = open_files;
+    data["term"] = signal(SIGTERM, SIG_DFL) == SIG_DFL;
+    data["pipe"] = signal(SIGPIPE, SIG_IGN) == SIG_IGN;
+    sigset_t mask;
+    sigprocmask(SIG_SETMASK, nullptr, &mask);
+    data["mask"] = sigismember(&mask, SIGUSR1);
+    r->SetError(0, data);
+  });
+  EXPECT_EQ(reply, R"({"code":0,"data":{"files":["null","null","null","pipe"],)"
+                   R"("mask":0,"pipe":true,"term":true}})");
+  sigprocmask(SIG_SETMASK, &before, nullptr);
+  signal(SIGTERM, SIG_DFL);
+  closelog();
+  close(leaked);
+  close(high);
+}
+
+TEST_F(RunnerTest, WorksWithStandardStreamsClosed) {
+  EXPECT_TRUE(InChild([&] {
+    for (const int fd : {0, 1, 2}) close(fd);
+    const std::string reply = Run([](APIRequest*, APIResponse* r) { r->SetError(0, 1); });
+    if (reply != R"({"code":0,"data":1})") _exit(1);
+  }));
+}
+
+TEST_F(RunnerTest, WithoutAStateTheEntryIsNotCalled) {
+  const NUVA::APIEntry entry = [](APIRequest*, APIResponse* r) { r->SetError(0, "called"); };
+  EXPECT_EQ(Run(entry, Json::Value(), "no-such-user-here"), R"({"code":405,"data":null})");
+  WriteFile(state_, "a file where the folder should be");
+  const std::string reply = Run(entry);
+  EXPECT_EQ(reply.find("called"), std::string::npos);
+  EXPECT_EQ(reply, R"({"code":408,"data":null})");
+}
+
+TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
+  SKIP_UNLESS_ROOT();
+  const std::string reply = Run(
+      [](APIRequest* request, APIResponse* r) {
+        const uid_t before = geteuid();
+        if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) != 0) return;
+        const bool wrote = Json::Value(open((request->GetPreferenceDir() + "/x").c_str(),
+                                            O_CREAT | O_WRONLY | O_CLOEXEC, 0600) >= 0)
+                               .asBool();
+        Json::Value data;
+        data["before"] = before;
+        data["after"] = geteuid();
+        data["wrote"] = wrote;
+        r->SetError(0, data);
+      },
+      Json::Value(), kOtherUser);
+  EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":0,"wrote":true}})");
+}
+
+TEST_F(RunnerTest, FramesAreTakenInAnyPieces) {
+  const std::uint64_t length = 5;
+  const std::string frame =
+      std::string(reinterpret_cast<const char*>(&length), sizeof length) + "hello";
+  for (size_t piece = 1; piece <= frame.size() + 4; ++piece) {
+    nas::FrameReader reader;
+    const std::string bytes = frame + "more";
+    for (size_t at = 0; at < bytes.size(); at += piece) {
+      const size_t count = std::min(piece, bytes.size() - at);
+      EXPECT_EQ(reader.Feed(bytes.data() + at, count), at + count >= frame.size());
+    }
+    EXPECT_EQ(reader.payload(), "hello") << piece;
+  }
+  nas::FrameReader absurd;
+  EXPECT_FALSE(absurd.Feed(std::string(100, '\xFF').data(), 100));
+  EXPECT_TRUE(absurd.payload().empty());
+}
+
+TEST_F(RunnerTest, WhatIsNotAModuleIsRefused) {
+  WriteFile(dir_ + "/text.so", "not a library");
+  for (const std::string& path : {dir_ + "/none.so", dir_ + "/text.so", std::string("text.so")}) {
+    EXPECT_THROW(nas::Module module(path), std::runtime_error) << path;
+  }
+}
+
+}  // namespace
+}  // namespace nas_test

@@ -1,0 +1,304 @@
+// Task records: what several processes do to one record, and what any death leaves behind.
+
+#include <fcntl.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <csignal>
+#include <memory>
+#include <thread>
+
+#include "nas/system/file_io.h"
+#include "nas/system/user_state.h"
+#include "nas/tasks/task_files.h"
+#include "platform/task.h"
+#include "tests/nas/fixture.h"
+
+namespace nas_test {
+namespace {
+
+using OKT::Task;
+
+class TasksTest : public PlatformTest {
+ protected:
+  void SetUp() override {
+    PlatformTest::SetUp();
+    ASSERT_TRUE(nas::PrepareUserState(Me()));
+    me_ = Me();
+  }
+
+  std::unique_ptr<Task> New() { return std::make_unique<Task>(me_.c_str(), nullptr); }
+  std::unique_ptr<Task> Open(const std::string& id) {
+    return std::unique_ptr<Task>(OKT::TaskMgr(me_.c_str()).getTaskWithThrow(id.c_str()));
+  }
+  std::string RecordFile(const std::string& id) {
+    return nas::TaskFolder(me_) + "/" + id + ".json";
+  }
+  void Age(const std::string& path, long seconds) {
+    const timespec then = {time(nullptr) - seconds, 0};
+    const timespec times[] = {then, then};
+    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0) << path;
+  }
+
+  std::string me_;
+};
+
+long long MillisecondsOf(const std::function<void()>& work) {
+  const auto start = std::chrono::steady_clock::now();
+  work();
+  return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() -
+                                                               start)
+      .count();
+}
+
+TEST_F(TasksTest, ABatchIsSeenAtOnceAndTheMarkStays) {
+  const auto task = New();
+  const auto reader = Open(task->getTaskId());
+  EXPECT_TRUE(nas::IsTaskId(task->getTaskId()));
+  EXPECT_EQ(ModeOf(RecordFile(task->getTaskId())), 0600U);
+  task->beginUpdate();
+  EXPECT_TRUE(task->setProperty("progress", 0));
+  EXPECT_TRUE(task->setProperty("name", "\xFF"));
+  ASSERT_TRUE(reader->reload());
+  EXPECT_TRUE(reader->getProperty("progress").isNull());
+  EXPECT_TRUE(task->endUpdate());
+  EXPECT_TRUE(reader->getProperty("progress").isNull()) << "as of the last reading";
+  ASSERT_TRUE(reader->reload());
+  EXPECT_EQ(reader->getProperty("progress"), 0);
+  EXPECT_EQ(reader->getProperty("name"), "\xFF") << "bytes come back";
+  EXPECT_FALSE(reader->isFinished());
+
+  task->beginUpdate();
+  task->setProperty("progress", 1);
+  EXPECT_TRUE(task->finish(true)) << "keeps running";
+  ASSERT_TRUE(reader->reload());
+  EXPECT_EQ(reader->getProperty("progress"), 1);
+  EXPECT_FALSE(reader->isFinished());
+  EXPECT_TRUE(reader->finish(false));
+  EXPECT_TRUE(task->setProperty("late", 1)) << "may still be written";
+  EXPECT_TRUE(task->isFinished()) << "and the mark is not lost";
+}
+
+TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
+  constexpr int kWriters = 4;
+  constexpr int kRounds = 50;
+  const auto task = New();
+  const std::string id = task->getTaskId();
+  std::vector<pid_t> writers;
+  for (int writer = 0; writer < kWriters; ++writer) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+      bool good = true;
+      const auto mine = Open(id);
+      const std::string name = "w" + std::to_string(writer);
+      for (int round = 0; round <= kRounds; ++round) {
+        good = mine->setProperty(name.c_str(), round) && good;
+      }
+      if (writer == 0) good = mine->finish(false) && good;
+      _exit(good ? 0 : 1);
+    }
+    writers.push_back(pid);
+  }
+  std::thread walker([&] {
+    for (int round = 0; round <= kRounds; ++round) task->setProperty("walk", round);
+  });
+  for (int round = 0; round <= kRounds; ++round) EXPECT_TRUE(task->setProperty("main", round));
+  walker.join();
+  for (const pid_t pid : writers) {
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0);
+  }
+  ASSERT_TRUE(task->reload());
+  for (const char* name : {"w0", "w1", "w2", "w3", "walk", "main"}) {
+    EXPECT_EQ(task->getProperty(name), kRounds) << name;
+  }
+  EXPECT_TRUE(task->isFinished());
+}
+
+TEST_F(TasksTest, ARemovedTaskIsNotBroughtBack) {
+  const auto task = New();
+  const auto other = Open(task->getTaskId());
+  EXPECT_TRUE(other->remove());
+  EXPECT_FALSE(other->remove());
+  EXPECT_FALSE(task->setProperty("a", 1));
+  task->beginUpdate();
+  EXPECT_TRUE(task->setProperty("a", 1));
+  EXPECT_FALSE(task->endUpdate());
+  EXPECT_FALSE(task->finish(false));
+  EXPECT_FALSE(task->reload());
+  EXPECT_THROW(Open(task->getTaskId()), std::runtime_error);
+  EXPECT_EQ(ReadFile(RecordFile(task->getTaskId())), "(none)");
+}
+
+TEST_F(TasksTest, ADeadWorkersTaskIsFinished) {
+  auto task = New();
+  const auto reader = Open(task->getTaskId());
+  int ready[2];
+  ASSERT_EQ(pipe(ready), 0);
+  const pid_t worker = fork();
+  if (worker == 0) {
+    task->setProperty("step", 1);
+    (void)!write(ready[1], "x", 1);
+    for (;;) pause();
+  }
+  task.reset();  // the request that started it ends; the worker goes on
+  char byte;
+  ASSERT_EQ(read(ready[0], &byte, 1), 1);
+  ASSERT_TRUE(reader->reload());
+  EXPECT_FALSE(reader->isFinished());
+  kill(worker, SIGKILL);
+  waitpid(worker, nullptr, 0);
+  EXPECT_FALSE(reader->isFinished()) << "as of the last reading";
+  ASSERT_TRUE(reader->reload());
+  EXPECT_TRUE(reader->isFinished());
+  EXPECT_EQ(reader->getProperty("step"), 1);
+  close(ready[0]);
+  close(ready[1]);
+}
+
+TEST_F(TasksTest, OnlyIdsOfItsOwnFormBecomeAPath) {
+  const std::string id = New()->getTaskId();
+  WriteFile(dir_ + "/x.json", R"({"version":1,"finished":false,"properties":{}})");
+  const std::string rows[] = {"",
+                              ".",
+                              "../../../../x",
+                              id + "/",
+                              id.substr(1),
+                              id + "0",
+                              "ABCDEF" + id.substr(6),
+                              std::string(32, '0'),
+                              "../" + id.substr(3)};
+  for (const std::string& row : rows) EXPECT_THROW(Open(row), std::runtime_error) << row;
+  EXPECT_THROW(OKT::TaskMgr(me_.c_str()).getTaskWithThrow(nullptr), std::runtime_error);
+  for (const char* owner : {"", "..", "a/b", "nobody-here"}) {
+    EXPECT_THROW(Task(owner, nullptr), std::runtime_error) << owner;
+  }
+  EXPECT_THROW(Task(nullptr, nullptr), std::runtime_error);
+  EXPECT_NO_THROW(Open(id));
+}
+
+TEST_F(TasksTest, ATornRecordIsNoRecordAndStaysAsItIs) {
+  const auto task = New();
+  task->setProperty("long", std::string(200, 'x'));
+  const std::string file = RecordFile(task->getTaskId());
+  const std::string whole = ReadFile(file);
+  for (size_t length = 0; length < whole.size(); ++length) {
+    WriteFile(file, whole.substr(0, length));
+    ASSERT_FALSE(task->reload()) << length;
+    ASSERT_FALSE(task->setProperty("a", 1)) << length;
+    ASSERT_EQ(ReadFile(file).size(), length);
+  }
+  for (const char* bad : {"[]", "{}", R"({"version":2,"finished":false,"properties":{}})",
+                          R"({"version":1,"finished":0,"properties":{}})",
+                          R"({"version":1,"finished":true,"properties":[]})"}) {
+    WriteFile(file, bad);
+    EXPECT_FALSE(task->reload()) << bad;
+  }
+  EXPECT_EQ(task->getProperty("long").asString().size(), 200U) << "the old state stays";
+  WriteFile(file, whole);
+  EXPECT_TRUE(task->reload());
+}
+
+TEST_F(TasksTest, AFailedWriteLeavesTheRecordWhole) {
+  const auto task = New();
+  ASSERT_TRUE(task->setProperty("a", 1));
+  EXPECT_TRUE(InChild([&] {
+    signal(SIGXFSZ, SIG_IGN);
+    const rlimit small = {20, 20};  // as a full disk: bytes fit, the record does not
+    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &small), 0);
+    EXPECT_FALSE(task->setProperty("a", 2));
+    EXPECT_FALSE(task->finish(false));
+  }));
+  EXPECT_FALSE(task->setProperty("huge", std::string(20 << 20, 'x'))) << "beyond any record";
+  ASSERT_TRUE(task->reload());
+  EXPECT_EQ(task->getProperty("a"), 1);
+  EXPECT_FALSE(task->isFinished());
+}
+
+TEST_F(TasksTest, RunningTasksAreBoundedPerOwner) {
+  std::vector<std::unique_ptr<Task>> running;
+  for (int at = 0; at < nas::kMaxRunningTasks; ++at) running.push_back(New());
+  EXPECT_THROW(New(), std::runtime_error);
+  running[3]->finish(false);  // marked finished, though its process lives
+  running[3] = New();
+  EXPECT_THROW(New(), std::runtime_error);
+  running[5].reset();  // its process ended without a mark
+  EXPECT_NO_THROW(New());
+  running[6]->remove();
+  EXPECT_NO_THROW(New());
+}
+
+TEST_F(TasksTest, OldTasksAreSweptUnlessSomebodyWorksOnThem) {
+  const auto alive = New();
+  const std::string old = New()->getTaskId();
+  const std::string recent = New()->getTaskId();
+  const std::string torn = New()->getTaskId();
+  const std::string folder = nas::TaskFolder(me_);
+  WriteFile(RecordFile(torn), "{");
+  const std::string temporary = folder + "/" + std::string(nas::kTemporaryPrefix) + "x";
+  const std::string foreign = folder + "/notes.json";
+  WriteFile(temporary, "");
+  WriteFile(foreign, "");
+  for (const std::string& id : {alive->getTaskId(), old, torn, recent}) {
+    const long extra = id == recent ? -60 : 60;
+    Age(RecordFile(id), nas::kKeepSeconds + extra);
+    Age(folder + "/" + id + ".lock", nas::kKeepSeconds + 60);
+  }
+  Age(temporary, nas::kKeepSeconds + 60);
+  Age(foreign, nas::kKeepSeconds + 60);
+  New();
+  EXPECT_EQ(ReadFile(RecordFile(old)), "(none)");
+  EXPECT_EQ(ReadFile(folder + "/" + old + ".lock"), "(none)");
+  EXPECT_EQ(ReadFile(RecordFile(torn)), "(none)");
+  EXPECT_EQ(ReadFile(temporary), "(none)");
+  EXPECT_NE(ReadFile(RecordFile(recent)), "(none)");
+  EXPECT_NE(ReadFile(RecordFile(alive->getTaskId())), "(none)");
+  EXPECT_NE(ReadFile(foreign), "(none)") << "not ours";
+}
+
+TEST_F(TasksTest, WaitsEndAsSoonAsTheyCan) {
+  auto task = New();
+  const auto reader = Open(task->getTaskId());
+  EXPECT_EQ(WaitForTaskDataReady(reader.get(), "data", 0), 0);
+  const long long bound =
+      MillisecondsOf([&] { EXPECT_EQ(WaitForTaskDataReady(reader.get(), "data", 2), 0); });
+  EXPECT_GE(bound, 200);
+  EXPECT_LT(bound, 1000);
+
+  std::thread writer([&] {
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    task->setProperty("data", Json::Value(Json::objectValue));
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    Json::Value data;
+    data["pid"] = 5;
+    task->setProperty("data", data);
+  });
+  EXPECT_EQ(WaitForTaskDataReady(reader.get(), "data", 100), 1);
+  EXPECT_EQ(WaitForTaskDataKeyReady(reader.get(), "data", "pid", 100), 1);
+  EXPECT_EQ(reader->getProperty("data")["pid"], 5) << "reloaded";
+  writer.join();
+
+  const struct {
+    const char* why;
+    std::function<void()> end;
+  } rows[] = {{"the worker died", [&] { task.reset(); }},
+              {"marked finished", [&] { reader->finish(false); }},
+              {"removed", [&] { reader->remove(); }}};
+  for (const auto& row : rows) {
+    std::thread ender([&] {
+      std::this_thread::sleep_for(std::chrono::milliseconds(20));
+      row.end();
+    });
+    const long long waited = MillisecondsOf(
+        [&] { EXPECT_EQ(WaitForTaskDataKeyReady(reader.get(), "data", "sdbid", 100), 0); });
+    EXPECT_LT(waited, 2000) << row.why;
+    ender.join();
+  }
+}
+
+}  // namespace
+}  // namespace nas_test
