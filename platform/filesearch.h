@@ -163,7 +163,8 @@ class WfmSearchDBTask {
                    const bool* ascending, const _tag_dir_entry_type_* type, const char* pattern,
                    SelectCallback callback, void* context, unsigned long long* total) const;
   // Deletes the rows of that file; false when there was none or they could not be deleted. May be
-  // called from within a queryResult callback, where it does not disturb the running selection.
+  // called from within a queryResult callback, where it does not disturb the running selection; it
+  // then deletes nothing, and is false, for a file that is still there (a dangling symbolic link).
   bool delRecs(std::string share_name, std::string real_path);
   // Deletes the database.
   bool remove();

@@ -4,6 +4,7 @@
 #include <syslog.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <memory>
 
 #include "nas/engine/file_kinds.h"
@@ -24,6 +25,13 @@ std::string RelativePath(const nas::ResultRow& row) {
 
 std::string RealPath(const nas::ResultRow& row) {
   return std::string(row.share_root) + "/" + RelativePath(row);
+}
+
+// Listings take a file for vanished when it cannot be reached, but a dangling symbolic link and a
+// file in a folder that was closed meanwhile are still there.
+bool HasVanished(const std::string& path) {
+  struct stat info;
+  return lstat(path.c_str(), &info) != 0 && (errno == ENOENT || errno == ENOTDIR);
 }
 
 // Lends one row to a callback in the platform's form.
@@ -107,7 +115,7 @@ bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::str
     return row.share_name == share_name && RealPath(row) == real_path;
   };
   if (current_) {
-    if (!is_the_file(reader_.Row(*current_))) return false;
+    if (!is_the_file(reader_.Row(*current_)) || !HasVanished(real_path)) return false;
     purges_.push_back(*current_);
     return true;
   }
