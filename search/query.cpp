@@ -9,9 +9,7 @@
 #include <unistd.h>
 
 #include <cctype>
-#include <cstdarg>
 #include <cstdint>
-#include <cstdio>
 #include <cstring>
 #include <memory>
 
@@ -23,31 +21,27 @@
 
 namespace {
 
-constexpr size_t kPathBytes = 4096 + 1;  // longest path of the platform, and its end mark
+constexpr size_t kPathChars = 4096;
 constexpr char kHomesFolder[] = "/homes/";
 constexpr char kHomesShare[] = "homes";
 constexpr std::uint32_t kAllRows = 0x7FFFFFFF;
 constexpr int kAclNoFd = -1;
 constexpr int kAclMode = 2;
 
-// Formats a path, cut to what a path may hold.
-[[gnu::format(printf, 1, 2)]] std::string FormatPath(const char* format, ...) {
-  char buffer[kPathBytes] = {};
-  va_list args;
-  va_start(args, format);
-  vsnprintf(buffer, sizeof(buffer), format, args);
-  va_end(args);
-  return buffer;
+// Paths on this system end there; what is longer is cut.
+std::string CutPath(std::string path) {
+  if (path.size() > kPathChars) path.resize(kPathChars);
+  return path;
 }
 
 // A row of a user's own home root already names the user's folder in its relative path, so such
 // roots are taken as the "homes" share itself.
 std::string RealPath(const FileSearch::__tag_FILE_INFO_DATA& row) {
+  const std::string tail = std::string("/") + row.relative_path;
   const char* homes = strstr(row.share_root, kHomesFolder);
-  if (homes == nullptr) return FormatPath("%s/%s", row.share_root, row.relative_path);
+  if (homes == nullptr) return CutPath(row.share_root + tail);
   const size_t length = static_cast<size_t>(homes - row.share_root) + strlen("/homes");
-  const std::string root(row.share_root, length);
-  return FormatPath("%s/%s", root.c_str(), row.relative_path);
+  return CutPath(std::string(row.share_root, length) + tail);
 }
 
 void PurgeIfVanished(const FileSearch::__tag_FILE_INFO_DATA& row, const std::string& real_path,
@@ -66,7 +60,7 @@ bool HomeFolder(_tag_SELECTCBDATA_& page, std::string& folder) {
     return true;
   }
   if (page.home_folder.empty()) {
-    char buffer[kPathBytes] = {};
+    char buffer[kPathChars + 1] = {};
     if (NUVAServiceHomePathGet(page.user.c_str(), buffer, sizeof(buffer)) < 0) return false;
     const char* homes = strstr(buffer, kHomesFolder);
     if (homes == nullptr) return false;
@@ -82,7 +76,7 @@ void MapToHome(const std::string& folder, const char* relative_path, std::string
   const std::string prefix = folder + "/";
   if (strncasecmp(relative_path, prefix.c_str(), prefix.size()) != 0) return;
   const char* found = strstr(relative_path, folder.c_str());
-  if (found != nullptr) share_path = FormatPath("/home%s", found + folder.size());
+  if (found != nullptr) share_path = CutPath(std::string("/home") + (found + folder.size()));
 }
 
 std::string UpperCase(const char* text) {
@@ -137,7 +131,7 @@ BOOL SelectFileInfoCB(FileSearch::__tag_FILE_INFO_DATA* row, void* context) {
 
   file.name = row->name;
   file.is_dir = row->is_dir;
-  file.path = FormatPath("/%s/%s", row->share_name, row->relative_path);
+  file.path = CutPath(std::string("/") + row->share_name + "/" + row->relative_path);
   if (page.home_enabled && strcasecmp(row->share_name, kHomesShare) == 0) {
     std::string folder;
     if (!HomeFolder(page, folder)) return 0;

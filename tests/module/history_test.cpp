@@ -1,0 +1,174 @@
+// The history API, and how searches are remembered.
+
+#include <gtest/gtest.h>
+
+#include "api/table.h"
+#include "history/history_store.h"
+#include "search/find_handler.h"
+#include "tests/module/scripted_platform.h"
+
+namespace {
+
+struct Row {
+  const char* why;
+  const char* params;
+  const char* fail;
+  Trace expected;
+};
+
+const char kSimple[] = "FileDB(/prefs/search_history.db)";
+const char kAdvanced[] = "FileDB(/prefs/adv_search_history.db)";
+
+void Check(const Row& row, NUVA::APIEntry entry) {
+  Script play;
+  play.params = Parse(row.params);
+  play.fail = {row.fail};
+  play.history = {Parse(R"({"pattern":"b"})"), Parse(R"({"pattern":"a"})")};
+  EXPECT_EQ(Keep(Serve(play, entry), {"FileDB", "~FileDB", "log", "reply"}), row.expected)
+      << row.why;
+}
+
+TEST(History, KindSelectsTheFile) {
+  for (const char* kind : {"simple", "", "Advance", "ADVANCE", "adv", "advanced"}) {
+    EXPECT_EQ(HistoryDBFileName(kind), "search_history.db") << kind;
+  }
+  EXPECT_EQ(HistoryDBFileName("advance"), "adv_search_history.db");
+}
+
+TEST(History, Get) {
+  const Row rows[] = {
+      {"everything, in the store's order",
+       "{}",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Select(0,0)", "~FileDB",
+        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
+      {"counts pass unchanged",
+       R"({"offset":-2,"limit":3,"search_type":"advance"})",
+       "",
+       {kAdvanced, "FileDB.IsGood()", "FileDB.Select(-2,3)", "~FileDB",
+        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
+      {"an unusable store is empty",
+       "{}",
+       "FileDB.IsGood",
+       {kSimple, "FileDB.IsGood()",
+        "log NUVA.Arbory.Search:1060 db is not good, /prefs/search_history.db, Permission denied",
+        "~FileDB", R"(reply 0 {"history":[],"total":0})"}},
+  };
+  for (const Row& row : rows) Check(row, SearchHistoryGetEntry);
+}
+
+TEST(History, Set) {
+  const Row rows[] = {
+      {"defaults",
+       R"({"pattern":"x"})",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
+        R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}))", "~FileDB",
+        "reply 0 null"}},
+      {"values as received",
+       R"({"pattern":5,"folder_path":["/a"],"recursive":"yes"})",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
+        R"(FileDB.Insert({"folder_path":["/a"],"pattern":"5","recursive":"yes"}))", "~FileDB",
+        "reply 0 null"}},
+      {"no pattern: the store is not opened", R"({"folder_path":"/a"})", "", {"reply 401 null"}},
+      {"store",
+       R"({"pattern":"x","search_type":"advance"})",
+       "FileDB.IsGood",
+       {kAdvanced, "FileDB.IsGood()",
+        "log NUVA.Arbory.Search:1089 db is not good, /prefs/adv_search_history.db, "
+        "Permission denied",
+        "~FileDB", "reply 401 null"}},
+      {"insert",
+       R"({"pattern":"x"})",
+       "FileDB.Insert",
+       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
+        R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}))", "~FileDB",
+        "reply 401 null"}},
+  };
+  for (const Row& row : rows) Check(row, SearchHistorySetEntry);
+}
+
+TEST(History, Delete) {
+  const Row rows[] = {
+      {"everything",
+       R"({"pattern":"x"})",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Delete(0,0)", "~FileDB", "reply 0 null"}},
+      {"store",
+       "{}",
+       "FileDB.IsGood",
+       {kSimple, "FileDB.IsGood()",
+        "log NUVA.Arbory.Search:1111 db is not good, /prefs/search_history.db, Permission denied",
+        "~FileDB", "reply 401 null"}},
+      {"delete",
+       R"({"search_type":"advance"})",
+       "FileDB.Delete",
+       {kAdvanced, "FileDB.IsGood()", "FileDB.Delete(0,0)", "~FileDB", "reply 401 null"}},
+  };
+  for (const Row& row : rows) Check(row, SearchHistoryDeleteEntry);
+}
+
+TEST(Recording, WritesTheCriteriaUnderTheRequestsPattern) {
+  const Trace opened = {kSimple, "FileDB.IsGood()", "~FileDB"};
+  const Row rows[] = {
+      {"old record goes, new one comes",
+       R"({"pattern":"p","folder_path":"/a","recursive":true})",
+       "FileDB.Delete",  // its failure is ignored
+       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
+        "FileDB.Delete(0,0,pattern=p)",
+        R"(FileDB.Update({"folder_path":"/a","pattern":"c","recursive":true,"size_to":1},3))",
+        "~FileDB"}},
+      {"no pattern", "{}", "", opened},
+      {"unusable store: not a word", R"({"pattern":"p"})", "FileDB.IsGood", opened},
+      {"a kind that is none", R"({"pattern":"p","search_type":{}})", "", {}},
+  };
+  for (const Row& row : rows) {
+    Script play;
+    play.params = Parse(row.params);
+    play.fail = {row.fail};
+    const Trace trace = Play(play, [] {
+      ArboryFindHandler handler(Request(), Response());
+      handler.SetSearchHistory(Parse(R"({"pattern":"c","size_to":1,"folder_path":"old"})"));
+    });
+    EXPECT_EQ(Keep(trace, {"FileDB", "~FileDB", "log", "threw"}), row.expected) << row.why;
+  }
+}
+
+TEST(Recording, CountsSearches) {
+  const std::string key = R"("NUVA.VTX.App.PersonalSettings.Instance")";
+  const struct {
+    const char* why;
+    std::string before;
+    std::string after;  // empty: not written
+  } rows[] = {
+      {"first search", "{}", "{" + key + R"(:{"search_count":1}})"},
+      {"others are kept", "{" + key + R"(:{"a":[1],"search_count":41},"z":{"y":null}})",
+       "{" + key + R"(:{"a":[1],"search_count":42},"z":{"y":null}})"},
+      {"wraps", "{" + key + R"(:{"search_count":4294967295}})",
+       "{" + key + R"(:{"search_count":0}})"},
+      {"settings of another shape", "[1]", ""},
+      {"a count of another shape", "{" + key + R"(:{"search_count":"x"}})", ""},
+  };
+  const auto count = [](const Script& play) {
+    const Trace trace = Play(play, [] {
+      ArboryFindHandler handler(Request(), Response());
+      handler.SetSearchCount();
+    });
+    return Keep(trace, {"fromFile", "toFile", "log", "threw"});
+  };
+  for (const auto& row : rows) {
+    Script play;
+    play.settings = Parse(row.before);
+    Trace expected = {"fromFile(/prefs/usersettings)"};
+    if (!row.after.empty()) expected.push_back("toFile(/prefs/usersettings," + row.after + ")");
+    EXPECT_EQ(count(play), expected) << row.why;
+  }
+  Script missing;
+  missing.fail = {"fromFile"};
+  EXPECT_EQ(count(missing),
+            (Trace{"fromFile(/prefs/usersettings)",
+                   "log NUVA.Arbory.Search:801 Failed to load usersettings, Permission denied"}));
+}
+
+}  // namespace

@@ -1,0 +1,292 @@
+// Starting a search: locations, the request's side of the fork and the worker's.
+
+#include <gtest/gtest.h>
+
+#include <csignal>
+
+#include "api/table.h"
+#include "search/find_handler.h"
+#include "search/search_state.h"
+#include "tests/module/scripted_platform.h"
+
+namespace {
+
+using Arrange = std::function<void(Script&)>;
+
+TEST(Locations, AreNormalised) {
+  const struct {
+    const char* why;
+    const char* input;
+    const char* output;
+  } rows[] = {
+      {"home equals its homes entry", R"(["/home","/homes/ann"])", R"(["/homes/ann"])"},
+      {"home swallows what lies in it", R"(["/homes/ann/docs","/home"])", R"(["/homes/ann"])"},
+      {"home inside an entry is dropped", R"(["/homes","/home/docs"])", R"(["/homes"])"},
+      {"only the first entry is replaced", R"(["/homes/ann/a","/homes/ann/b","/home"])",
+       R"(["/homes/ann","/homes/ann/b"])"},
+      {"homes given twice keep to the text", R"(["/homes/ann/a/","/home/a"])",
+       R"(["/homes/ann/a"])"},
+      {"a longer name lies beside", R"(["/homes/ann/ab","/home/a"])",
+       R"(["/homes/ann/ab","/homes/ann/a"])"},
+      {"converted ones are merged too", R"(["/home/a","/home","/home/b"])", R"(["/homes/ann"])"},
+      {"homes entries are not compared", R"(["/homes/x","/homes/x","/homes/x/y"])",
+       R"(["/homes/x","/homes/x","/homes/x/y"])"},
+      {"others come first", R"(["/photo","/homes/ann","/music"])",
+       R"(["/photo","/music","/homes/ann"])"},
+      {"others are not compared", R"(["/photo","/photo","/photo/a"])",
+       R"(["/photo","/photo","/photo/a"])"},
+      {"near misses of the alias", R"(["/homework","/home1/x","/homesick","home"])",
+       R"(["/homework","/home1/x","/homesick","home"])"},
+      {"nothing", "[]", "[]"},
+  };
+  Script play;
+  play.homes["ann"] = "/volume1/homes/ann";
+  for (const auto& row : rows) {
+    const Trace trace = Play(play, [&] {
+      const ArboryFindHandler handler(Request(), Response());
+      Note("out " + Text(handler.RemoveDuplicatedLocations(Parse(row.input))));
+    });
+    EXPECT_EQ(Keep(trace, {"out"}), Trace{std::string("out ") + row.output}) << row.why;
+  }
+}
+
+TEST(Locations, AFailedHomeLookupDropsTheLocationAndIsLogged) {
+  Script play;
+  const auto run = [](const Script& s) {
+    return Keep(Play(s,
+                     [] {
+                       const ArboryFindHandler handler(Request(), Response());
+                       Note(Text(handler.RemoveDuplicatedLocations(Parse(R"(["/home","/x"])"))));
+                     }),
+                {"[", "log", "HomePath"});
+  };
+  EXPECT_EQ(run(play), (Trace{"HomePath(ann,4096)",
+                              "log NUVA.Arbory.Search:950 Failed to get homes path for ann, "
+                              "No such file or directory",
+                              R"(["/x"])"}));
+  play.homes["ann"] = "/root/ann";
+  EXPECT_EQ(run(play),
+            (Trace{"HomePath(ann,4096)",
+                   "log NUVA.Arbory.Search:955 Failed to find /homes/ in /root/ann", R"(["/x"])"}));
+}
+
+Script StartScript(const char* folders) {
+  Script play;
+  play.method = "start";
+  play.version = 2;
+  play.params["folder_path"] = folders;
+  return play;
+}
+
+TEST(Start, WritesTheTaskAndAnswers) {
+  Script play = StartScript("/indexed/a,/other");
+  play.indexed = {"indexed"};
+  play.fail = {"Task.end"};  // logged, no more
+  const Trace trace = Serve(play, SearchAPIEntry);
+  EXPECT_EQ(
+      Keep(trace, {"Explode", "Task", "NLIBC", "IsShare", "log", "reply", "~Task"}),
+      (Trace{"Explode(\"/indexed/a,/other\",,,2,keep)", "Task(ann,null)", "NLIBCProcFork()",
+             "Task.begin()", "Task.set(progress,0)",
+             R"(Task.set(data,{"location":["/indexed/a","/other"],"pid":4711,"taskid":"new"}))",
+             "Task.end()", "log NUVA.Arbory.Search:873 Failed to write progress.",
+             "IsShareIndexed(indexed)", "IsShareIndexed(other)", "~Task(new)",
+             R"(reply 0 {"has_not_index_share":true,"taskid":"new"})"}));
+}
+
+TEST(Start, TellsWhetherAShareIsNotIndexed) {
+  const std::pair<const char*, const char*> rows[] = {
+      {"/a/x,/b", "false"}, {"/a,/c,/b", "true"}, {"/a/b/c", "false"}, {"/c/a", "true"}};
+  for (const auto& [folders, expected] : rows) {
+    Script play = StartScript(folders);
+    play.indexed = {"a", "b"};
+    EXPECT_EQ(
+        Keep(Serve(play, SearchAPIEntry), {"reply"}),
+        Trace{std::string(R"(reply 0 {"has_not_index_share":)") + expected + R"(,"taskid":"new"})"})
+        << folders;
+  }
+}
+
+TEST(Start, FailuresAnswer401) {
+  Script no_task = StartScript("/a");
+  no_task.Throw("Task");
+  EXPECT_EQ(Keep(Serve(no_task, SearchAPIEntry), {"NLIBCProcFork", "log", "reply", "~Task"}),
+            Trace{"reply 401 null"});
+  Script no_fork = StartScript("/a");
+  no_fork.fail = {"NLIBCProcFork"};
+  EXPECT_EQ(
+      Keep(Serve(no_fork, SearchAPIEntry), {"log", "Task.", "reply", "~Task"}),
+      (Trace{"log NUVA.Arbory.Search:862 Failed to fork().", "~Task(new)", "reply 401 null"}));
+}
+
+Script WorkerScript() {
+  Script play = StartScript("/photo,/music");
+  play.fork_result = 0;
+  play.params["pattern"] = "a";
+  play.properties = Parse(R"({"data":{"pid":1}})");
+  return play;
+}
+
+void Terminate() { raise(SIGTERM); }
+
+const char kWalkData[] =
+    R"(Task.set(data,{"pattern":"a","pid":1,"sdbid":"db1","sdbvol":"/volume1"}))";
+
+TEST(Worker, RunsTheSearchInItsOrder) {
+  const Trace trace = Serve(WorkerScript(), SearchAPIEntry);
+  Trace kept;
+  for (const std::string& line : trace) {
+    if (!line.starts_with("GetParam")) kept.push_back(line);
+  }
+  const Trace expected = {
+      "WfmLibUmask()",
+      "RunIdentity(null,ann)",
+      "Explode(\"/photo,/music\",,,2,keep)",
+      "Task(ann,null)",
+      "NLIBCProcFork()",
+      "WaitReady(data,60)",
+      "SessionIdentity(sid,ann)",
+      "createFindOp 0()",
+      "FileDB(/prefs/search_history.db)",
+      "FileDB.IsGood()",
+      "FileDB.Max(10)",
+      "FileDB.Key(pattern)",
+      "FileDB.Delete(0,0,pattern=a)",
+      R"(FileDB.Update({"folder_path":"/photo,/music","pattern":"a","recursive":false},3))",
+      "~FileDB",
+      "fromFile(/prefs/usersettings)",
+      R"(toFile(/prefs/usersettings,{"NUVA.VTX.App.PersonalSettings.Instance":{"search_count":1}}))",
+      "Walker(ann,sid)",
+      "Walker.init(/photo /music [field 0 null,a])",
+      "Walker.current(false)",
+      "Task.reload()",
+      kWalkData,
+      R"(Walk([]{"pattern":"a","recursive":true,"search_content":true}))",
+      "~Walker",
+      "~field 0 null,a",
+      "Task.reload()",
+      "Task.begin()",
+      "Task.set(progress,1)",
+      kWalkData,
+      "Task.finish(new,false)",
+      "_exit(0)"};
+  EXPECT_EQ(kept, expected);
+}
+
+TEST(Worker, RecordsItsOutcome) {
+  const std::string failed =
+      R"(Task.set(data,{"errno":401,"pattern":"a","pid":1,"sdbid":"db1","sdbvol":"/volume1"}))";
+  const Trace early_401 = {"Task.set(progress,-1)", R"(Task.set(data,{"errno":401,"pid":1}))",
+                           "Task.finish(new,false)", "_exit(0)"};
+  const auto with = [](Trace first, const Trace& rest) {
+    first.insert(first.end(), rest.begin(), rest.end());
+    return first;
+  };
+  const std::string no_identity =
+      "log NUVA.Arbory.Search:891 Failed to set UGID for user=ann, sid=sid";
+  const struct {
+    const char* why;
+    Arrange arrange;
+    Trace expected;
+  } rows[] = {
+      {"a failing write is logged",
+       [](Script& s) { s.fail = {"Task.finish"}; },
+       {kWalkData, "Task.set(progress,1)", kWalkData, "Task.finish(new,false)",
+        "log NUVA.Arbory.Search:923 Failed to write progress.", "_exit(0)"}},
+      {"identity refused", [](Script& s) { s.fail = {"SessionIdentity"}; },
+       with({no_identity}, early_401)},
+      {"identity refused while told to stop: recorded, then ended",
+       [](Script& s) {
+         s.fail = {"SessionIdentity"};
+         s.at["SessionIdentity"] = Terminate;
+       },
+       {no_identity, early_401[0], early_401[1], early_401[2], "Task.finish(new,false)",
+        "_exit(0)"}},
+      {"criteria refused: neither remembered nor walked",
+       [](Script& s) {
+         s.fail = {"createFindOp 0"};
+         s.wfm_error = 418;
+       },
+       {"log NUVA.Arbory.Search:251 Failed To parse the find parameters, reason=[1A2]",
+        "Task.set(progress,-1)", R"(Task.set(data,{"errno":418,"pid":1}))",
+        "Task.finish(new,false)", "_exit(0)"}},
+      {"told to stop during the walk",
+       [](Script& s) {
+         s.at["Walk"] = Terminate;
+         s.fail = {"Walk"};
+       },
+       {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
+      {"told to stop before the walk",
+       [](Script& s) { s.at["WaitReady"] = Terminate; },
+       {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
+      {"told to stop while it records",
+       [](Script& s) { s.at["Task.begin"] = Terminate; },
+       {kWalkData, "Task.set(progress,1)", kWalkData, "Task.finish(new,false)",
+        "Task.finish(new,false)", "_exit(0)"}},
+      {"the walk throws",
+       [](Script& s) { s.Throw("Walk"); },
+       {kWalkData, "Task.set(progress,-1)", failed, "Task.finish(new,false)", "_exit(0)"}},
+      {"the wait throws", [](Script& s) { s.Throw("WaitReady"); }, early_401},
+      {"a criterion of the wrong type", [](Script& s) { s.params["size_from"] = "x"; }, early_401},
+      {"recording throws",
+       [](Script& s) { s.Throw("Task.begin"); },
+       {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
+      {"everything throws",
+       [](Script& s) {
+         s.Throw("Task.reload");
+         s.Throw("Task.finish");
+       },
+       {"Task.finish(new,false)", "_exit(0)"}},
+      {"no record, search failed: back through the request's path",
+       [](Script& s) {
+         s.at["Walk"] = [] { script.properties.clear(); };
+         s.fail = {"Walk"};
+       },
+       {kWalkData, "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[0]",
+        "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)", "reply 401 null",
+        "returned"}},
+      {"no record, search succeeded",
+       [](Script& s) { s.at["Walk"] = [] { script.properties.clear(); }; },
+       {kWalkData, "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)",
+        R"(reply 0 {"pattern":"a","recursive":true,"search_content":true})", "returned"}},
+      {"no record before the walk",
+       [](Script& s) { s.properties.clear(); },
+       {"log NUVA.Arbory.Search:100 Failed to get json data",
+        "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[0]",
+        "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)", "reply 401 null",
+        "returned"}},
+  };
+  for (const auto& row : rows) {
+    Script play = WorkerScript();
+    row.arrange(play);
+    const Trace trace = Serve(play, SearchAPIEntry);
+    EXPECT_EQ(Keep(trace, {"log", "Task.set", "Task.finish", "reply", "~Task", "_exit", "returned",
+                           "threw", "signal"}),
+              row.expected)
+        << row.why;
+    // Criteria and walker go on every road.
+    EXPECT_EQ(Keep(trace, {"Walker("}).size(), Keep(trace, {"~Walker"}).size()) << row.why;
+    const size_t made = play.fail.contains("createFindOp 0") ? 0 : Keep(trace, {"createF"}).size();
+    EXPECT_EQ(Keep(trace, {"~field"}).size(), made) << row.why;
+  }
+}
+
+TEST(Worker, MapsTheWalksErrors) {
+  const std::pair<int, int> rows[] = {{0x0300, 407}, {0x0600, 408}, {0x1800, 405}, {0x1D00, 405},
+                                      {0x9A00, 418}, {0x0200, 401}, {0, 401},      {0x0301, 401}};
+  for (const auto& [error, code] : rows) {
+    Script play = WorkerScript();
+    play.fail = {"Walker.init"};
+    play.platform_error = error;
+    const Trace trace = Serve(play, SearchAPIEntry);
+    char hex[8];
+    snprintf(hex, sizeof(hex), "%X", static_cast<unsigned>(error));
+    EXPECT_EQ(
+        Keep(trace, {"log", "Task.set(data"}),
+        (Trace{std::string(
+                   "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[") +
+                   hex + "]",
+               R"(Task.set(data,{"errno":)" + std::to_string(code) + R"(,"pid":1}))"}));
+  }
+}
+
+}  // namespace
