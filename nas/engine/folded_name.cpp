@@ -3,6 +3,7 @@
 #include <utf8proc.h>
 
 #include <cstdint>
+#include <cstring>
 #include <vector>
 
 namespace nas {
@@ -55,9 +56,51 @@ bool LowerInto(std::string_view text, std::string& out) {
 }  // namespace
 
 bool IsAscii(std::string_view text) {
-  unsigned char seen = 0;
-  for (const char c : text) seen |= static_cast<unsigned char>(c);
-  return seen < 0x80;
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::uint64_t seen = 0;
+  size_t i = 0;
+  for (std::uint64_t word; i + sizeof(word) <= text.size(); i += sizeof(word)) {
+    std::memcpy(&word, text.data() + i, sizeof(word));
+    seen |= word;
+  }
+  for (; i < text.size(); ++i) seen |= static_cast<unsigned char>(text[i]);
+  return (seen & kHighBits) == 0;
+}
+
+bool MayFoldToAscii(std::string_view text) {
+  if (IsAscii(text)) return false;
+  for (size_t i = 0; i + 1 < text.size(); ++i) {
+    const auto next = static_cast<unsigned char>(text[i + 1]);
+    switch (static_cast<unsigned char>(text[i])) {
+      case 0xc3:
+        if (next == 0x9f) return true;  // sharp s
+        break;
+      case 0xc4:
+        if (next == 0xb0) return true;  // capital i with dot
+        break;
+      case 0xc5:
+        if (next == 0x89 || next == 0xbf) return true;  // n with apostrophe, long s
+        break;
+      case 0xc7:
+        if (next == 0xb0) return true;  // j with caron
+        break;
+      case 0xcd:
+        if (next == 0xbe) return true;  // Greek question mark
+        break;
+      case 0xe1:
+        if (next == 0xba || next == 0xbf) return true;  // letters with marks below, Greek marks
+        break;
+      case 0xe2:
+        if (next == 0x84) return true;  // Kelvin sign
+        break;
+      case 0xef:
+        if (next == 0xac) return true;  // ligatures
+        break;
+      default:
+        break;
+    }
+  }
+  return false;
 }
 
 std::string AsciiLower(std::string_view text) {

@@ -9,6 +9,10 @@
 namespace nas {
 
 bool IsAscii(std::string_view text);
+// Whether folding may turn something in `text` that is not ASCII into ASCII characters: the Kelvin
+// sign into "k", the sharp s into "ss", a ligature into its letters. May say yes for a few others.
+// Where the answer is no, the ASCII parts of the folded text are those of the text itself.
+bool MayFoldToAscii(std::string_view text);
 std::string AsciiLower(std::string_view text);
 // The text as it is compared; `valid` (may be null) receives whether it was valid UTF-8.
 std::string FoldText(std::string_view text, bool* valid = nullptr);

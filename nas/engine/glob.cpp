@@ -94,6 +94,11 @@ Glob::Segment Glob::ParseSegment(std::string_view pattern) {
   return segment;
 }
 
+std::string_view Glob::LongestLiteral() const {
+  return std::ranges::max_element(segments_, {}, [](const Segment& s) { return s.literal.size(); })
+      ->literal;
+}
+
 bool Glob::Unit::Accepts(char32_t c) const {
   if (any) return true;
   const bool in = std::any_of(ranges.begin(), ranges.end(),

@@ -19,6 +19,8 @@ class Glob {
 
   explicit Glob(std::string_view pattern);
   bool Matches(std::string_view text) const;
+  // The longest plain text between two stars, which every match holds; may be empty.
+  std::string_view LongestLiteral() const;
 
  private:
   // One character: any, or one of (none of) the ranges.

@@ -88,24 +88,30 @@ std::optional<NamePattern> NamePattern::Parse(std::string_view text, std::string
     } else if (piece.kind == Scanner::Piece::Kind::kPlain && Glob::HasWildcard(piece.text)) {
       alternative.glob.emplace(alternative.folded);
     }
+    const std::string_view required = alternative.regex  ? std::string_view()
+                                      : alternative.glob ? alternative.glob->LongestLiteral()
+                                                         : alternative.folded;
+    if (!required.empty() && IsAscii(required)) alternative.required.emplace(required);
     if (!piece.joined || pattern.terms_.empty()) pattern.terms_.emplace_back();
     pattern.terms_.back().push_back(std::move(alternative));
   }
   return pattern;
 }
 
-bool NamePattern::Alternative::Matches(FoldedName& name) const {
-  if (regex) {
-    return regex->Finds(name.ascii() ? name.name() : ComposeText(name.name())) != negated;
+bool NamePattern::Alternative::Finds(FoldedName& name) const {
+  if (regex) return regex->Finds(name.ascii() ? name.name() : ComposeText(name.name()));
+  if (required) {
+    const bool there = required->Finds(name.name());
+    if (!there && !MayFoldToAscii(name.name())) return false;
+    if (there && is_literal() && IsAscii(name.name())) return true;
   }
   const std::string_view compared = name.folded();
-  bool found = glob ? glob->Matches(compared) : compared.find(folded) != std::string_view::npos;
-  if (!found && !name.valid_utf8()) {
-    // Byte by byte: the pattern as it was typed is what the name may hold.
-    const std::string bytes = AsciiLower(text);
-    found = glob ? Glob(bytes).Matches(compared) : compared.find(bytes) != std::string_view::npos;
-  }
-  return found != negated;
+  const bool found =
+      glob ? glob->Matches(compared) : compared.find(folded) != std::string_view::npos;
+  if (found || name.valid_utf8()) return found;
+  // Byte by byte: the pattern as it was typed is what the name may hold.
+  const std::string bytes = AsciiLower(text);
+  return glob ? Glob(bytes).Matches(compared) : compared.find(bytes) != std::string_view::npos;
 }
 
 bool NamePattern::Matches(FoldedName& name) const {

@@ -12,6 +12,7 @@
 
 #include "nas/engine/folded_name.h"
 #include "nas/engine/glob.h"
+#include "nas/engine/literal_finder.h"
 #include "nas/engine/regex.h"
 
 namespace nas {
@@ -26,8 +27,13 @@ class NamePattern {
     // At most one of the two; with neither, `text` is literal.
     std::optional<Glob> glob;
     std::shared_ptr<const Regex> regex;
+    // ASCII text without which a name cannot match: lets most names be told from their bytes.
+    std::optional<LiteralFinder> required;
     bool is_literal() const { return !glob && !regex; }
-    bool Matches(FoldedName& name) const;
+    bool Matches(FoldedName& name) const { return Finds(name) != negated; }
+
+   private:
+    bool Finds(FoldedName& name) const;
   };
   using Term = std::vector<Alternative>;  // either of them
 
