@@ -36,7 +36,7 @@ std::string Environment(const char* name) {
 
 // An XDG base directory; a relative value counts as unset.
 std::string BaseDirectory(const char* variable, const char* below_home) {
-  const std::string value = Environment(variable);
+  std::string value = Environment(variable);
   if (value.starts_with('/')) return value;
   std::string home = Environment("HOME");
   if (home.empty()) {
@@ -56,7 +56,7 @@ std::string DefaultStateDir() {
 // The file to read; empty for none.
 std::string FindFile(const std::string& path) {
   if (!path.empty()) return path;
-  const std::string named = Environment("ARBORY_CONFIG");
+  std::string named = Environment("ARBORY_CONFIG");
   if (!named.empty()) return named;
   const std::string base = BaseDirectory("XDG_CONFIG_HOME", ".config");
   for (const std::string& file :

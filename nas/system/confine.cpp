@@ -15,7 +15,6 @@
 
 #include <cerrno>
 #include <cstdlib>
-#include <set>
 #include <string>
 #include <vector>
 
@@ -39,10 +38,6 @@ bool IsFolder(const std::string& path) {
   return lstat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
 }
 
-bool IsSeenByVolumePattern(const std::string& volume) {
-  return volume.starts_with("/volume") && volume.find('/', 1) == std::string::npos;
-}
-
 class CommandLine {
  public:
   void Add(std::initializer_list<std::string> words) { words_.insert(words_.end(), words); }
@@ -61,27 +56,9 @@ class CommandLine {
 
 // Binds the temporary folder of every volume that has one.
 void AddVolumes(CommandLine* line) {
-  std::set<std::string> names;
-  std::vector<std::string> others = {ScratchVolume()};  // first: it is /volume0 where that is free
-  for (const std::string& volume : ListVolumes()) {
-    if (IsSeenByVolumePattern(volume)) {
-      names.insert(volume);
-    } else {
-      others.push_back(volume);
-    }
-  }
-  const auto bind = [line](const std::string& volume, const std::string& name) {
+  for (const auto& [volume, name] : NamesInSandbox(ListVolumes(), ScratchVolume())) {
     const std::string folder = volume + "/" + kTemporaryFolder;
     if (IsFolder(folder)) line->Add({"--bind", folder, name + "/" + kTemporaryFolder});
-  };
-  for (const std::string& volume : names) bind(volume, volume);
-  int number = 0;
-  for (const std::string& volume : others) {
-    std::string name;
-    do {
-      name = "/volume" + std::to_string(number++);
-    } while (names.contains(name));
-    bind(volume, name);
   }
 }
 

@@ -90,6 +90,7 @@ std::vector<Share> ListShares() {
     }
   }
   std::vector<Share> sorted;
+  sorted.reserve(shares.size());
   for (auto& [name, share] : shares) sorted.push_back(std::move(share));
   return sorted;
 }

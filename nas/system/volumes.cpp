@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -61,6 +62,10 @@ UniqueFd OpenResultRoad(const std::string& volume) {
   return folder;
 }
 
+bool IsSeenByVolumePattern(const std::string& volume) {
+  return volume.starts_with("/volume") && volume.find('/', 1) == std::string::npos;
+}
+
 bool MakeScratchVolume() {
   const ScopedRoot root;
   return MakeFolders(ScratchVolume(), geteuid() == 0 ? kPassMode : kPrivateMode);
@@ -88,6 +93,26 @@ std::vector<std::string> ListVolumes() {
 }
 
 std::string ScratchVolume() { return CurrentConfig().state_dir + "/" + kScratchFolder; }
+
+std::map<std::string, std::string> NamesInSandbox(const std::vector<std::string>& volumes,
+                                                  const std::string& scratch) {
+  std::map<std::string, std::string> names;
+  std::set<std::string> taken;
+  for (const std::string& volume : volumes) {
+    if (IsSeenByVolumePattern(volume)) taken.insert(names[volume] = volume);
+  }
+  int number = 0;
+  const auto give = [&](const std::string& volume) {
+    std::string& name = names[volume];
+    while (name.empty() || taken.contains(name)) name = "/volume" + std::to_string(number++);
+    taken.insert(name);
+  };
+  give(scratch);
+  for (const std::string& volume : volumes) {
+    if (!names.contains(volume)) give(volume);
+  }
+  return names;
+}
 
 std::string ResultFolder(const std::string& volume, const std::string& user) {
   const auto account = FindAccount(user);

@@ -22,7 +22,7 @@ std::string FindModule() {
   const std::string program = RealPath("/proc/self/exe").value_or("");
   const std::string folder = program.substr(0, program.rfind('/') + 1);
   for (const char* place : {"", "../lib/arbory/"}) {
-    const std::string path = folder + place + kModuleName;
+    std::string path = folder + place + kModuleName;
     if (access(path.c_str(), R_OK) == 0) return path;
   }
   return folder + kModuleName;

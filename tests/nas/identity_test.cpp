@@ -12,6 +12,7 @@
 #include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "nas/system/user_state.h"
+#include "nas/system/volumes.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
 #include "tests/nas/fixture.h"
@@ -154,6 +155,26 @@ class ConfineTest : public PlatformTest {
     return tree;
   }
 };
+
+TEST(SandboxNames, EachVolumeHasOneThatThePatternMatches) {
+  using Names = std::map<std::string, std::string>;
+  const struct {
+    std::vector<std::string> volumes;
+    Names names;
+  } rows[] = {
+      {{}, {{"/s", "/volume0"}}},
+      {{"/volume1", "/volume2"},
+       {{"/s", "/volume0"}, {"/volume1", "/volume1"}, {"/volume2", "/volume2"}}},
+      {{"/volume0", "/volumeUSB"},
+       {{"/s", "/volume1"}, {"/volume0", "/volume0"}, {"/volumeUSB", "/volumeUSB"}}},
+      {{"/a/volume1", "/b", "/volume1"},
+       {{"/s", "/volume0"},
+        {"/a/volume1", "/volume2"},
+        {"/b", "/volume3"},
+        {"/volume1", "/volume1"}}},
+  };
+  for (const auto& row : rows) EXPECT_EQ(nas::NamesInSandbox(row.volumes, "/s"), row.names);
+}
 
 TEST_F(ConfineTest, CleanAllRemovesPreciselyTheUsersResults) {
   const std::string user = "o'neil $(touch x)";

@@ -4,7 +4,6 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -137,7 +136,6 @@ TEST_F(RunnerTest, AReplyOfManyMegabytesComesWhole) {
 TEST_F(RunnerTest, TheChildHasNothingOfItsCaller) {
   const int leaked = open("/", O_RDONLY);
   const int high = fcntl(leaked, F_DUPFD, 700);
-  openlog("test", LOG_NDELAY, LOG_USER);
   signal(SIGTERM, SIG_IGN);
   sigset_t blocked, before;
   sigemptyset(&blocked);
@@ -166,7 +164,6 @@ TEST_F(RunnerTest, TheChildHasNothingOfItsCaller) {
                    R"("mask":0,"pipe":true,"term":true}})");
   sigprocmask(SIG_SETMASK, &before, nullptr);
   signal(SIGTERM, SIG_DFL);
-  closelog();
   close(leaked);
   close(high);
 }

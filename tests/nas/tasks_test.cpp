@@ -6,6 +6,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <csignal>
 #include <memory>
@@ -102,6 +103,11 @@ TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
     }
     writers.push_back(pid);
   }
+  std::atomic<bool> writing = true;
+  std::thread client([&] {
+    const auto reader = Open(id);
+    while (writing) ASSERT_TRUE(reader->reload()) << "a reader always finds a whole record";
+  });
   std::thread walker([&] {
     for (int round = 0; round <= kRounds; ++round) task->setProperty("walk", round);
   });
@@ -112,6 +118,8 @@ TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
     waitpid(pid, &status, 0);
     EXPECT_EQ(status, 0);
   }
+  writing = false;
+  client.join();
   ASSERT_TRUE(task->reload());
   for (const char* name : {"w0", "w1", "w2", "w3", "walk", "main"}) {
     EXPECT_EQ(task->getProperty(name), kRounds) << name;
