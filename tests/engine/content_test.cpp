@@ -1,0 +1,156 @@
+// Contents of files: literals and expressions wherever a piece may end, and what is not searched.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <random>
+
+#include "nas/engine/candidate_list.h"
+#include "nas/engine/content_query.h"
+
+namespace nas {
+namespace {
+
+constexpr size_t kPiece = 256 * 1024;  // as the scanner reads
+
+class Contents : public testing::Test {
+ protected:
+  Contents() {
+    std::filesystem::create_directories(folder_);
+    fd_ = UniqueFd(open(folder_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  }
+  ~Contents() override { std::filesystem::remove_all(folder_); }
+
+  ContentScanner::Result Scan(const std::string& pattern_text, const std::string& content) {
+    std::string trouble;
+    const auto query = ContentQuery::From(NamePattern::Parse(pattern_text, trouble).value());
+    EXPECT_TRUE(query) << pattern_text;
+    std::ofstream(folder_ + "/file", std::ios::binary) << content;
+    return ContentScanner(*query, stop_).Scan(fd_.get(), "file");
+  }
+  bool Finds(const std::string& pattern, const std::string& content) {
+    return Scan(pattern, content) == ContentScanner::Result::kMatch;
+  }
+
+  const std::string folder_ = testing::TempDir() + "contents-" + std::to_string(getpid());
+  UniqueFd fd_;
+  int stop_ = 0;
+};
+
+TEST_F(Contents, Table) {
+  using std::string_literals::operator""s;
+  const struct {
+    std::string pattern, content;
+    bool found;
+    const char* why;
+  } rows[] = {
+      {"needle", "hay NeedLe hay", true, "ignoring case"},
+      {"needle", "need le", false, ""},
+      {"needle", "", false, "an empty file"},
+      {"needle", "needl", false, "shorter than the text"},
+      {"a_b", "A_B", true, "only letters fold"},
+      {"a_b",
+       "a\x7f"
+       "b",
+       false, "an underscore is not its neighbour"},
+      {"[", "x[", true, ""},
+      {"one two", "two\none", true, "all terms, anywhere"},
+      {"one two", "one", false, ""},
+      {"one|two", "two", true, ""},
+      {"one !two", "one", true, ""},
+      {"one !two", "one two", false, ""},
+      {"straße", "STRAßE", true, "beyond ASCII"},
+      {"é", "e\u0301", true, "stored decomposed"},
+      {"e\u0301", "é", true, "stored composed"},
+      {"\"two words\"", "Two Words", true, ""},
+      {"regex:^b.d$", "a\nbad\nc", true, "each line"},
+      {"regex:a.b", "a\nb", false, "a dot stays in its line"},
+      {"regex:\\bint\\s+main", "int  main()", true, ""},
+      {"needle", "needle\0"s, false, "binary"},
+      {"needle", std::string(40'000, 'x') + "\0needle"s, true, "a NUL behind the first block"},
+      {"x", "\xff\xfex", true, "not UTF-8"},
+      {"regex:x", "\xff\xfex", true, "not UTF-8"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(Finds(row.pattern, row.content), row.found)
+        << row.pattern << " in «" << row.content.substr(0, 40) << "» " << row.why;
+  }
+}
+
+TEST_F(Contents, WhatAsksForNoContents) {
+  for (const char* pattern : {"", "*.txt", "a ?b", "!a", "!a !b", "a|!b"}) {
+    std::string trouble;
+    EXPECT_FALSE(ContentQuery::From(NamePattern::Parse(pattern, trouble).value())) << pattern;
+  }
+}
+
+TEST_F(Contents, NothingIsLostWherePiecesMeet) {
+  for (const char* pattern : {"needle", "regex:n..dle", "needlé"}) {
+    const std::string needle = std::string(pattern) == "needlé" ? "NEEDLÉ" : "NEEDLE";
+    for (size_t at = kPiece - 8; at <= kPiece + 1; ++at) {
+      EXPECT_TRUE(Finds(pattern, std::string(at, '-') + needle + std::string(100, '-')))
+          << pattern << " in one line at " << at;
+      std::string lines;
+      while (lines.size() < at) lines += "line of text\n";
+      lines.resize(at);
+      EXPECT_TRUE(Finds(pattern, lines + needle)) << pattern << " in lines at " << at;
+    }
+  }
+  EXPECT_TRUE(Finds("regex:^end$", std::string(3 * kPiece, '-') + "\nend\n"));
+  EXPECT_FALSE(Finds("regex:^-+x", std::string(3 * kPiece, '-') + "\nx\n"));
+  const std::string huge(kPiece, 'q');
+  EXPECT_TRUE(Finds(huge, "x" + huge)) << "a text as long as a piece";
+}
+
+TEST_F(Contents, LiteralAgainstPlainSearch) {
+  std::mt19937 random(7);
+  int found = 0;
+  for (int round = 0; round < 20'000; ++round) {
+    const auto letters = [&random](size_t count) {
+      std::string text;
+      while (text.size() < count) text.push_back("abAB@`["[random() % 7]);
+      return text;
+    };
+    const std::string needle = letters(1 + random() % 5);
+    const std::string hay = letters(random() % 70);
+    const bool expected = AsciiLower(hay).find(AsciiLower(needle)) != std::string::npos;
+    ASSERT_EQ(LiteralFinder(needle).Finds(hay), expected) << needle << " in " << hay;
+    found += expected;
+  }
+  EXPECT_GT(found, 1'000);
+}
+
+TEST_F(Contents, StopsAndFails) {
+  stop_ = 1;
+  EXPECT_EQ(Scan("x", "x"), ContentScanner::Result::kStopped);
+  stop_ = 0;
+  std::filesystem::remove(folder_ + "/file");
+  std::filesystem::create_symlink("/etc/passwd", folder_ + "/file");
+  std::string trouble;
+  const auto query = ContentQuery::From(NamePattern::Parse("root", trouble).value());
+  EXPECT_EQ(ContentScanner(*query, stop_).Scan(fd_.get(), "file"), ContentScanner::Result::kFailed)
+      << "links are not followed";
+}
+
+TEST_F(Contents, CandidatesComeBackWhole) {
+  CandidateList list(folder_);
+  std::map<std::string, std::string> expected;
+  for (int i = 0; i < 3'000; ++i) {
+    const std::string folder = "folder " + std::to_string(i);
+    std::string names;
+    for (int k = 0; k <= i % 64; ++k) names.append(std::string(30, 'n')).push_back('\0');
+    list.Add(static_cast<std::uint16_t>(i % 5), folder, names);
+    expected[folder] = names;
+  }
+  CandidateList::Record record;
+  while (list.Take(record)) {
+    EXPECT_EQ(record.names, expected[std::string(record.folder_path)]);
+    expected.erase(std::string(record.folder_path));
+  }
+  EXPECT_TRUE(expected.empty());
+}
+
+}  // namespace
+}  // namespace nas

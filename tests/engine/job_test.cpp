@@ -1,0 +1,242 @@
+// The walk itself, on trees that break walkers: deeper than a path may be long, wider than a
+// buffer, changing while they are read, given twice. What criteria select is tested through the
+// program.
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <thread>
+
+#include "nas/engine/result_reader.h"
+#include "nas/engine/search_job.h"
+#include "nas/system/config.h"
+#include "platform/system.h"
+
+namespace nas {
+namespace {
+
+size_t OpenDescriptors() {
+  size_t count = 0;
+  for ([[maybe_unused]] const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+    ++count;
+  }
+  return count;
+}
+
+class Job : public testing::Test {
+ protected:
+  Job() {
+    std::filesystem::create_directories(tree_);
+    std::filesystem::create_directories(base_ + "/results");
+    Config config;
+    config.state_dir = base_ + "/state";
+    config.volumes = {base_ + "/volume*"};
+    config.shares = {{"tree", tree_}};
+    Configure(config);
+    descriptors_ = OpenDescriptors();
+  }
+  ~Job() override {
+    EXPECT_EQ(OpenDescriptors(), descriptors_);
+    std::filesystem::remove_all(base_);
+  }
+
+  void Touch(const std::string& name, const std::string& content = "") {
+    std::ofstream(tree_ + "/" + name) << content;
+  }
+
+  // The paths that a search for `pattern` finds, each once.
+  std::set<std::string> Find(const std::string& pattern_text,
+                             const std::vector<std::string>& texts = {"/tree"},
+                             bool content = false) {
+    std::vector<Location> locations;
+    for (const std::string& text : texts) locations.push_back(OpenLocation(text).value());
+    std::string trouble;
+    PatternComp pattern(NamePattern::Parse(pattern_text, trouble).value());
+    const std::string path = ResultPath(base_ + "/results", NewResultId());
+    {
+      ResultWriter writer(path);
+      for (size_t i = 0; i < locations.size(); ++i) {
+        writer.AddLocation(static_cast<std::uint16_t>(i), locations[i].share.name,
+                           locations[i].share.root);
+      }
+      SearchJob job(locations, {&pattern}, writer, stop_,
+                    {.recursive = true,
+                     .search_content = content,
+                     .temporary_folder = base_ + "/results",
+                     .report = [this](const WalkProgress&) { ++reports_; }});
+      completed_ = job.Run();
+      progress_ = job.progress().ToJson();
+    }
+    std::set<std::string> found;
+    ResultReader reader(path);
+    reader.Begin();
+    for (std::uint32_t i = 0; i < reader.rows(); ++i) {
+      const ResultRow row = reader.Row(i);
+      std::string relative(row.folder);
+      relative.append(relative.empty() ? "" : "/").append(row.name);
+      EXPECT_TRUE(found.insert(relative).second) << relative << " twice";
+    }
+    reader.End();
+    return found;
+  }
+
+  const std::string base_ = testing::TempDir() + "job-" + NewResultId();
+  const std::string tree_ = base_ + "/tree";
+  int stop_ = 0;
+  std::atomic<int> reports_ = 0;
+  bool completed_ = false;
+  Json::Value progress_;
+  size_t descriptors_ = 0;
+};
+
+TEST_F(Job, ChainDeeperThanAPathMayBeLong) {
+  constexpr int kDepth = 1'000;
+  const std::string name = "a folder of the chain";  // 22,000 bytes of path in all
+  int fd = open(tree_.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  for (int i = 0; i < kDepth; ++i) {
+    ASSERT_EQ(mkdirat(fd, name.c_str(), 0755), 0);
+    const int below = openat(fd, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    close(fd);
+    fd = below;
+    const int file = openat(fd, "leaf", O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
+    ASSERT_EQ(write(file, "deep word", 9), 9);
+    close(file);
+  }
+  close(fd);
+  EXPECT_EQ(Find("leaf").size(), kDepth);
+  EXPECT_EQ(Find("word", {"/tree"}, true).size(), kDepth) << "contents too";
+  EXPECT_EQ(progress_["skipped"]["other"].asInt(), 0);
+}
+
+TEST_F(Job, HugeFolderAndManyFolders) {
+  constexpr int kFiles = 20'000;
+  constexpr int kFolders = 3'000;
+  for (int i = 0; i < kFiles; ++i) Touch("file " + std::to_string(i));
+  for (int i = 0; i < kFolders; ++i) {
+    std::filesystem::create_directory(tree_ + "/sub " + std::to_string(i));
+    Touch("sub " + std::to_string(i) + "/file");
+  }
+  EXPECT_EQ(Find("file").size(), kFiles + kFolders);
+  EXPECT_EQ(progress_["folders"].asInt(), kFolders + 1);
+  EXPECT_EQ(progress_["entries"].asInt(), kFiles + 2 * kFolders);
+  EXPECT_EQ(progress_["matches"].asInt(), kFiles + kFolders);
+  EXPECT_EQ(progress_["phase"], "done");
+}
+
+TEST_F(Job, LocationsInsideOneAnotherAreWalkedOnce) {
+  std::filesystem::create_directories(tree_ + "/a/b/c");
+  for (const char* name : {"x1", "a/x2", "a/b/x3", "a/b/c/x4"}) Touch(name);
+  const std::set<std::string> all = {"x1", "a/x2", "a/b/x3", "a/b/c/x4"};
+  EXPECT_EQ(Find("x", {"/tree", "/tree/a/b", "/tree/a"}), all);
+  EXPECT_EQ(Find("x", {"/tree/a/b", "/tree", "/tree//./a/b/"}), all);
+  EXPECT_EQ(Find("x", {"/tree/a/b"}), (std::set<std::string>{"a/b/x3", "a/b/c/x4"}));
+}
+
+TEST_F(Job, LinksLoopsPipesAndTemporaryFolders) {
+  std::filesystem::create_directories(tree_ + "/real");
+  Touch("real/x1", "needle");
+  std::filesystem::create_directory_symlink("..", tree_ + "/real/x2-loop");
+  std::filesystem::create_symlink("/etc/passwd", tree_ + "/x3-link");
+  ASSERT_EQ(mkfifo((tree_ + "/needle-pipe").c_str(), 0644), 0);
+  ASSERT_EQ(mkfifo((tree_ + "/pipe").c_str(), 0644), 0);
+  EXPECT_EQ(Find("x"), (std::set<std::string>{"real/x1", "real/x2-loop", "x3-link"}));
+  EXPECT_EQ(Find("needle", {"/tree"}, true), (std::set<std::string>{"real/x1", "needle-pipe"}));
+
+  // The tree now holds a volume: its @tmp is left out, a user's folder of that name is not.
+  std::filesystem::create_directories(base_ + "/volume1/@tmp/webfm");
+  std::filesystem::create_directories(base_ + "/volume1/docs/@tmp");
+  std::ofstream(base_ + "/volume1/@tmp/webfm/y1");
+  std::ofstream(base_ + "/volume1/docs/@tmp/y2");
+  Config config = CurrentConfig();
+  config.shares = {{"all", base_}};
+  Configure(config);
+  EXPECT_EQ(Find("y", {"/all"}), (std::set<std::string>{"volume1/docs/@tmp/y2"}));
+}
+
+TEST_F(Job, PseudoFileSystemsAreNotEntered) {
+  std::filesystem::create_directories(tree_ + "/proc");
+  std::filesystem::create_directories(tree_ + "/tmpfs");
+  if (mount("proc", (tree_ + "/proc").c_str(), "proc", 0, nullptr) != 0) {
+    GTEST_SKIP() << "mounting needs root";
+  }
+  ASSERT_EQ(mount("tmpfs", (tree_ + "/tmpfs").c_str(), "tmpfs", 0, nullptr), 0);
+  Touch("tmpfs/status");
+  EXPECT_EQ(Find("status"), (std::set<std::string>{"tmpfs/status"}));
+  umount((tree_ + "/proc").c_str());
+  umount((tree_ + "/tmpfs").c_str());
+}
+
+TEST_F(Job, FoldersVanishingDuringTheWalk) {
+  for (int i = 0; i < 500; ++i) {
+    std::filesystem::create_directories(tree_ + "/going/" + std::to_string(i) + "/a/b");
+    std::filesystem::create_directories(tree_ + "/staying/" + std::to_string(i));
+    Touch("staying/" + std::to_string(i) + "/x");
+  }
+  std::jthread remover([this] { std::filesystem::remove_all(tree_ + "/going"); });
+  EXPECT_EQ(Find("x").size(), 500u);
+  EXPECT_TRUE(completed_);
+  EXPECT_EQ(progress_["skipped"]["other"].asInt(), 0);
+}
+
+TEST_F(Job, TheStopFlagEndsIt) {
+  for (int i = 0; i < 200; ++i)
+    std::filesystem::create_directories(tree_ + std::to_string(i) + "/a");
+  // A file that takes far longer to read than a stop may take.
+  Touch("big");
+  ASSERT_EQ(truncate((tree_ + "/big").c_str(), off_t{1} << 40), 0);
+  std::fstream big(tree_ + "/big");
+  big << std::string(64 * 1024, 'x');
+  big.close();
+  std::jthread stopper([this] {
+    while (reports_ < 2) std::this_thread::yield();
+    __atomic_store_n(&stop_, 1, __ATOMIC_RELAXED);
+  });
+  EXPECT_TRUE(Find("needle", {"/tree"}, true).empty());
+  EXPECT_FALSE(completed_);
+  EXPECT_NE(progress_["phase"], "done");
+}
+
+TEST_F(Job, LocationErrors) {
+  std::filesystem::create_directories(tree_ + "/in");
+  Touch("file");
+  std::filesystem::create_directory_symlink("/etc", tree_ + "/out");
+  std::filesystem::create_directory_symlink("in", tree_ + "/alias");
+  const struct {
+    std::string text;
+    int error;
+  } rows[] = {
+      {"/tree", 0},
+      {"/tree/", 0},
+      {"//tree//in/.", 0},
+      {"/tree/alias", 0},
+      {"", 0x9A00},
+      {"tree", 0x9A00},
+      {"/", 0x9A00},
+      {"/tree/..", 0x9A00},
+      {"/tree/in/../in", 0x9A00},
+      {"/tree/out", 0x9A00},
+      {"/tree/file", 0x0600},
+      {"/tree/none", 0x0600},
+      {"/none", 0x0600},
+      {"/Tree", 0x0600},
+      {"/tree/" + std::string(5'000, 'a'), 0x9A00},
+      {std::string("/tree/in\0x", 10), 0x9A00},
+  };
+  for (const auto& row : rows) {
+    const auto location = OpenLocation(row.text);
+    EXPECT_EQ(location.has_value(), row.error == 0) << row.text;
+    if (location) continue;
+    EXPECT_EQ(NLIBCErrGet(), row.error) << row.text.substr(0, 40);
+  }
+}
+
+}  // namespace
+}  // namespace nas

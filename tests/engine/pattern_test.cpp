@@ -1,0 +1,256 @@
+// Names against patterns, extensions and kinds: what a person types against what is on disk.
+
+#include <gtest/gtest.h>
+#include <utf8proc.h>
+
+#include <algorithm>
+#include <memory>
+#include <string>
+
+#include "nas/engine/criteria.h"
+#include "nas/engine/folded_name.h"
+#include "nas/engine/glob.h"
+#include "nas/engine/name_pattern.h"
+#include "nas/engine/walk_entry.h"
+
+namespace nas {
+namespace {
+
+using std::string_literals::operator""s;
+
+bool Matches(const std::string& pattern_text, const std::string& name) {
+  std::string trouble;
+  const auto pattern = NamePattern::Parse(pattern_text, trouble);
+  EXPECT_TRUE(pattern) << pattern_text << ": " << trouble;
+  FoldedName folded;
+  folded.Set(name);
+  return pattern && pattern->Matches(folded);
+}
+
+TEST(NamePattern, Table) {
+  const struct Row {
+    std::string pattern, name;
+    bool matches;
+    const char* why;
+  } rows[] = {
+      {"", "anything", true, "no term restricts nothing"},
+      {"   ", "anything", true, "spaces are no term"},
+      {"voice", "My INVOICE.pdf", true, "anywhere, ignoring case"},
+      {"voices", "My INVOICE.pdf", false, ""},
+      {"invoice 2024", "2024-Invoice", true, "all terms, any order"},
+      {"invoice 2023", "2024-Invoice", false, "all terms"},
+      {"jpg|png", "a.PNG", true, "either"},
+      {"jpg | png", "a.png", true, "spaces around the bar"},
+      {"jpg|png holiday", "holiday.gif", false, "the bar binds closer than the space"},
+      {"!draft", "final.txt", true, "not"},
+      {"!draft", "Draft.txt", false, ""},
+      {"report !draft", "report draft", false, ""},
+      {"!", "wow!", true, "a lone mark is text"},
+      {"\"a b\"", "xa bx", true, "quotes hold a space"},
+      {"\"a b\"", "a  b", false, ""},
+      {"\"*\"", "a*b", true, "quotes hold a star"},
+      {"\"*\"", "ab", false, ""},
+      {"\"a|b\"", "a|b", true, ""},
+      {"\"open end", "an open end", true, "an unclosed quote runs to the end"},
+      {"\"\"", "x", true, "an empty quote is no term"},
+      {"5\"disk", "5\"disk", true, "a quote inside a word is text"},
+      {"*.conf", "resolv.CONF", true, ""},
+      {"*.conf", "resolv.conf.bak", false, "a glob is about the whole name"},
+      {"re*", "resolv", true, ""},
+      {"re*", "are", false, ""},
+      {"a*b*c", "aXbYbZc", true, ""},
+      {"a*b*c", "aXcYb", false, ""},
+      {"*ab*ab*", "abab", true, ""},
+      {"*ab*ab*", "aba", false, "pieces do not overlap"},
+      {"a?c", "abc", true, ""},
+      {"a?c", "aéc", true, "a character, not a byte"},
+      {"a?c", "ac", false, ""},
+      {"?", "", false, ""},
+      {"[a-c]1", "B1", true, ""},
+      {"[!a-c]1", "b1", false, ""},
+      {"[!a-c]1", "d1", true, ""},
+      {"[]x]1", "]1", true, "a bracket first in a set stands for itself"},
+      {"[draft", "my [draft] 1", true, "an unclosed set is text"},
+      {"[0-9]*[0-9]", "1x2", true, ""},
+      {"*[0-9]", "12", true, "the last set may touch the first"},
+      {"*?", "é", true, ""},
+      {"[α-ω]*", "Λίστα", true, "sets of folded letters"},
+      {"é", "e\u0301", true, "typed composed, stored decomposed"},
+      {"e\u0301", "É", true, "typed decomposed, stored composed"},
+      {"e", "e\u0301", false, "a decomposed letter is not its base"},
+      {"strasse", "STRAßE", true, "full case folding"},
+      {"STRASSE", "straße", true, ""},
+      {"ß", "gross", true, ""},
+      {"k", "\u212a", true, "the Kelvin sign"},
+      {"ffi", "o\ufb03ce", true, "a ligature"},
+      {"office", "o\ufb03ce", true, ""},
+      {"фото", "ФОТО.jpg", true, ""},
+      {"x", "\xff\xfex", true, "broken UTF-8 is matched by bytes"},
+      {"\xff",
+       "a\xff"
+       "b",
+       true, "and can be typed"},
+      {"É", "\xc3\x89\xff", true, "as it was typed"},
+      {"*\xff?", "a\xff\xfe", true, "one byte, one character"},
+      {"a?b",
+       "a\xff"
+       "b",
+       true, ""},
+      {"regex:^img_\\d+$", "IMG_0042", true, "regular expressions ignore case too"},
+      {"regex:^img_\\d+$", "IMG_0042.jpg", false, ""},
+      {"regex:a b", "xa bx", true, "a space belongs to the expression"},
+      {"holiday regex:\\.(jpg|png)$", "Holiday.png", true, "after other terms"},
+      {"!regex:^a", "b", true, ""},
+      {"regex:^.$", "\n", true, "a newline is a character of a name"},
+      {"regex:é", "e\u0301", true, "names are composed before"},
+      {"regex:x",
+       "\xff"
+       "x",
+       true, "broken UTF-8 around"},
+      {"regex:", "anything", true, "an empty expression is no term"},
+  };
+  for (const Row& row : rows) {
+    EXPECT_EQ(Matches(row.pattern, row.name), row.matches)
+        << "pattern «" << row.pattern << "» name «" << row.name << "» " << row.why;
+  }
+}
+
+TEST(NamePattern, RefusesWhatIsBroken) {
+  for (const std::string& pattern : {"regex:("s, "regex:[a"s, "a regex:*"s, "nul\0l"s}) {
+    std::string trouble;
+    EXPECT_FALSE(NamePattern::Parse(pattern, trouble)) << pattern;
+    EXPECT_FALSE(trouble.empty()) << pattern;
+  }
+}
+
+TEST(NamePattern, HostilePatternsEnd) {
+  EXPECT_FALSE(Matches("*a*a*a*a*a*a*a*a*a*a*b", std::string(255, 'a')));
+  EXPECT_FALSE(Matches("regex:^(a+)+$", std::string(255, 'a') + "b"));
+  EXPECT_FALSE(Matches(std::string(5'000, '?'), std::string(255, 'a')));
+}
+
+// Names are mostly judged by their bytes. That is right only if nothing but the characters that
+// MayFoldToAscii knows can become ASCII, alone or before a combining mark.
+TEST(FoldedName, OnlyKnownCharactersFoldToAscii) {
+  int checked = 0;
+  for (utf8proc_int32_t point = 0x80; point < 0x110000; ++point) {
+    if (point >= 0xd800 && point < 0xe000) continue;
+    utf8proc_uint8_t bytes[4];
+    const auto length = static_cast<size_t>(utf8proc_encode_char(point, bytes));
+    const std::string text(reinterpret_cast<char*>(bytes), length);
+    for (const std::string& with_mark : {text, text + "\u0301"}) {
+      const std::string folded = FoldText(with_mark);
+      const bool has_ascii =
+          std::any_of(folded.begin(), folded.end(), [](char c) { return (c & 0x80) == 0; });
+      ASSERT_TRUE(!has_ascii || MayFoldToAscii(with_mark)) << std::hex << point;
+      ++checked;
+    }
+  }
+  EXPECT_GT(checked, 2'000'000);
+}
+
+struct Judged {
+  explicit Judged(std::string text, bool is_dir = false) : name(std::move(text)) {
+    folded.Set(name);
+    entry.name = &folded;
+    entry.is_dir = is_dir;
+    entry.attributes = &attributes;
+  }
+  const std::string name;
+  FoldedName folded;
+  FileAttributes attributes;
+  FileSearch::WalkEntry entry;
+};
+
+TEST(Criteria, Extensions) {
+  const struct {
+    const char *list, *name;
+    bool matches;
+  } rows[] = {
+      {"", "a", true},
+      {" , ;", "a", true},
+      {"jpg", "A.JPG", true},
+      {".jpg", "a.jpg", true},
+      {"*.jpg", "a.jpg", true},
+      {"jpg", "ajpg", false},
+      {"jpg;png", "a.png", true},
+      {"jpg, png", "a.png", true},
+      {"jpg png", "a.gif", false},
+      {"tar.gz", "a.tar.gz", true},
+      {"tar.gz", "a.gz", false},
+      {"gz", "a.tar.gz", true},
+      {"bashrc", ".bashrc", false},
+      {"é", "x.e\u0301", true},
+  };
+  for (const auto& row : rows) {
+    const Judged judged(row.name);
+    EXPECT_EQ(ExtensionComp(row.list).match(judged.entry), row.matches)
+        << row.list << " " << row.name;
+  }
+}
+
+TEST(Criteria, Kinds) {
+  const struct {
+    const char *word, *name;
+    bool is_dir, matches;
+  } rows[] = {
+      {"", "a", true, true},
+      {"file", "a", false, true},
+      {"file", "a", true, false},
+      {"DIR", "a", true, true},
+      {"dir", "a", false, false},
+      {"image", "a.JPeG", false, true},
+      {"image", "a.jpg", true, false},
+      {"audio", "a.flac", false, true},
+      {"video", "a.flac", false, false},
+      {"document", "a.pdf", false, true},
+      {"archive", "a.tar.gz", false, true},
+      {"archive", "gz", false, false},
+  };
+  for (const auto& row : rows) {
+    const Judged judged(row.name, row.is_dir);
+    const auto comp = KindComp::Parse(row.word);
+    ASSERT_TRUE(comp) << row.word;
+    EXPECT_EQ(comp->match(judged.entry), row.matches) << row.word << " " << row.name;
+  }
+  EXPECT_FALSE(KindComp::Parse("files"));
+}
+
+TEST(Criteria, BoundsAreInclusive) {
+  const struct {
+    const char* what;
+    std::unique_ptr<FileSearch::FindComp> comp;
+    bool below, at, above, folder;
+  } rows[] = {
+      {"size from", std::make_unique<FileSearch::FindSizeComp>("greater", 100), false, true, true,
+       false},
+      {"size to", std::make_unique<FileSearch::FindSizeComp>("less", 100), true, true, false,
+       false},
+      {"mtime from", std::make_unique<FileSearch::FindMTimeComp>("after", 100), false, true, true,
+       true},
+      {"mtime to", std::make_unique<FileSearch::FindMTimeComp>("before", 100), true, true, false,
+       true},
+      {"atime from", std::make_unique<FileSearch::FindATimeComp>("after", 100), false, true, true,
+       true},
+      {"crtime to", std::make_unique<FileSearch::FindCRTimeComp>("before", 100), true, true, false,
+       true},
+  };
+  for (const auto& row : rows) {
+    const auto judge = [&row](int value, bool is_dir) {
+      Judged judged("x", is_dir);
+      judged.attributes.size = static_cast<std::uint64_t>(value);
+      judged.attributes.atime = judged.attributes.mtime = judged.attributes.crtime = value;
+      return row.comp->match(judged.entry);
+    };
+    EXPECT_EQ(judge(99, false), row.below) << row.what;
+    EXPECT_EQ(judge(100, false), row.at) << row.what;
+    EXPECT_EQ(judge(101, false), row.above) << row.what;
+    EXPECT_EQ(judge(100, true), row.folder) << row.what;
+  }
+  Judged unknown("x");
+  EXPECT_FALSE(FileSearch::FindCRTimeComp("before", 100).match(unknown.entry))
+      << "a file whose creation time is not recorded";
+}
+
+}  // namespace
+}  // namespace nas

@@ -1,0 +1,231 @@
+// Result databases: paging, every order, filters, purging, and a listing beside a writer.
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <thread>
+
+#include "nas/engine/result_reader.h"
+#include "nas/engine/result_writer.h"
+
+namespace nas {
+namespace {
+
+class Results : public testing::Test {
+ protected:
+  Results() { std::filesystem::create_directories(folder_); }
+  ~Results() override { std::filesystem::remove_all(folder_); }
+
+  const std::string folder_ = testing::TempDir() + "results-" + NewResultId();
+  const std::string path_ = ResultPath(folder_, NewResultId());
+};
+
+std::vector<std::string> Names(ResultReader& reader, const Selection& selection) {
+  reader.Begin();
+  std::vector<std::string> names;
+  const auto ordering = reader.Select(selection);
+  const std::uint64_t count = ordering ? ordering->size() : reader.rows();
+  for (std::uint32_t i = 0; i < count; ++i) {
+    names.emplace_back(reader.Row(ordering ? (*ordering)[i] : i).name);
+  }
+  reader.End();
+  return names;
+}
+
+TEST_F(Results, EveryColumnSorts) {
+  ResultWriter writer(path_);
+  writer.AddLocation(0, "share", "/s");
+  writer.AddLocation(1, "Alpha", "/a");
+  const struct {
+    const char* name;
+    const char* folder;
+    std::uint16_t location;
+    FileAttributes file;
+  } rows[] = {
+      {"IMG10.png",
+       "b",
+       0,
+       {.size = 5,
+        .atime = 1,
+        .mtime = -5,
+        .ctime = 3,
+        .crtime = 9,
+        .mode = S_IFREG | 0644,
+        .uid = 0,
+        .gid = 0}},
+      {"img2.PNG",
+       "a/x",
+       0,
+       {.size = 1u << 30,
+        .atime = 3,
+        .mtime = 7,
+        .ctime = 2,
+        .crtime = 8,
+        .mode = S_IFREG | 0600,
+        .uid = 65534,
+        .gid = 0}},
+      {"Zoo",
+       "a",
+       0,
+       {.size = 0, .atime = 2, .mtime = 0, .ctime = 1, .mode = S_IFDIR | 0755, .uid = 1, .gid = 0}},
+      {"img002a.doc",
+       "z",
+       1,
+       {.size = 300,
+        .atime = 4,
+        .mtime = 1,
+        .ctime = 4,
+        .crtime = 7,
+        .mode = S_IFREG | 0640,
+        .uid = 0,
+        .gid = 65534}},
+  };
+  for (const auto& row : rows) {
+    RowBlock block;
+    block.SetFolder(row.location, row.folder);
+    block.Add(row.name, row.file);
+    writer.Append(block);
+  }
+  writer.Complete();
+
+  ResultReader reader(path_);
+  const std::string a = "IMG10.png", b = "img2.PNG", c = "Zoo", d = "img002a.doc";
+  const struct {
+    const char* column;
+    std::vector<std::string> ascending;
+  } orders[] = {
+      {"name", {b, d, a, c}},  {"path", {d, c, b, a}},   {"size", {c, a, d, b}},
+      {"type", {c, d, a, b}},  {"user", {c, b, a, d}},   {"group", {d, a, b, c}},
+      {"mode", {b, d, a, c}},  {"atime", {a, c, b, d}},  {"mtime", {a, c, d, b}},
+      {"ctime", {c, b, a, d}}, {"crtime", {c, d, b, a}},
+  };
+  for (const auto& order : orders) {
+    Selection selection;
+    selection.column = ParseSortColumn(order.column).value();
+    EXPECT_EQ(Names(reader, selection), order.ascending) << order.column;
+    selection.ascending = false;
+    std::vector<std::string> descending(order.ascending.rbegin(), order.ascending.rend());
+    EXPECT_EQ(Names(reader, selection), descending) << order.column;
+  }
+  EXPECT_FALSE(ParseSortColumn("name; DROP TABLE names"));
+
+  Selection files;
+  files.directories = false;
+  EXPECT_EQ(Names(reader, files), (std::vector<std::string>{a, b, d}));
+  Selection pngs;
+  std::string trouble;
+  pngs.pattern = NamePattern::Parse("*.png", trouble);
+  EXPECT_EQ(Names(reader, pngs), (std::vector<std::string>{a, b}));
+}
+
+TEST(Ordering, NaturalKeys) {
+  const char* ascending[] = {"",   "a",   "A b",  "a0",    "a1",  "a01b",
+                             "a2", "a10", "a10b", "a010c", "a11", "a99999999999999999999999",
+                             "ab", "é",   "日"};
+  for (size_t i = 0; i + 1 < std::size(ascending); ++i) {
+    std::string lower, higher;
+    AppendNaturalKey(ascending[i], lower);
+    AppendNaturalKey(ascending[i + 1], higher);
+    EXPECT_LT(lower, higher) << ascending[i] << " before " << ascending[i + 1];
+  }
+}
+
+TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
+  constexpr std::uint32_t kRows = 3 * RowBlock::kMostRows + 17;
+  ResultWriter writer(path_);
+  writer.AddLocation(0, "share", "/s");
+  RowBlock block;
+  block.SetFolder(0, "folder");
+  for (std::uint32_t i = 0; i < kRows; ++i) {
+    block.Add("f" + std::to_string(i), {.size = kRows - i, .mode = S_IFREG});
+    if (block.full()) writer.Append(block);
+  }
+  writer.Append(block);
+  writer.Complete();
+
+  Selection by_size;
+  by_size.column = SortColumn::kSize;
+  std::vector<std::string> expected;
+  for (std::uint32_t i = kRows; i-- > 0;) expected.push_back("f" + std::to_string(i));
+  ResultReader reader(path_);
+  EXPECT_EQ(Names(reader, by_size), expected);
+  reader.Purge({0, RowBlock::kMostRows, kRows - 1});
+  reader.Purge({0});
+  std::erase_if(expected, [](const std::string& name) {
+    return name == "f0" || name == "f2048" || name == "f" + std::to_string(kRows - 1);
+  });
+  ResultReader another(path_);
+  EXPECT_EQ(Names(another, by_size), expected) << "a kept ordering leaves purged rows out";
+  reader.Begin();
+  const ResultRow row = reader.Row(RowBlock::kMostRows + 1);
+  EXPECT_EQ(row.name, "f2049");
+  EXPECT_EQ(row.folder, "folder");
+  reader.End();
+}
+
+// Pages of a search that runs: no row twice, none missing, in the order found.
+TEST_F(Results, PagesBesideAWriter) {
+  constexpr std::uint32_t kRows = 20'000;
+  ResultWriter writer(path_);
+  writer.AddLocation(0, "share", "/s");
+  std::jthread appender([&writer] {
+    RowBlock block;
+    for (std::uint32_t i = 0; i < kRows; ++i) {
+      block.SetFolder(0, "d" + std::to_string(i / 7));
+      block.Add(std::to_string(i), {});
+      if (i % 97 == 0) writer.Append(block);
+    }
+    writer.Append(block);
+  });
+  ResultReader reader(path_);
+  std::uint32_t next = 0;
+  while (next < kRows) {
+    reader.Begin();
+    for (; next < reader.rows(); ++next) {
+      const ResultRow row = reader.Row(next);
+      ASSERT_EQ(row.name, std::to_string(next));
+      ASSERT_EQ(row.folder, "d" + std::to_string(next / 7));
+    }
+    reader.End();
+  }
+}
+
+TEST_F(Results, FilesThatAreNone) {
+  EXPECT_THROW(ResultReader{path_}, SqliteError) << "a missing file is not made";
+  EXPECT_FALSE(std::filesystem::exists(path_));
+  std::ofstream(path_) << std::string(5'000, 'x');
+  EXPECT_ANY_THROW(ResultReader{path_});
+  EXPECT_EQ(std::filesystem::file_size(path_), 5'000u) << "and is left as it was";
+  const std::string other = ResultPath(folder_, NewResultId());
+  { Database(other, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, 0).Execute("CREATE TABLE t(a)"); }
+  EXPECT_ANY_THROW(ResultReader{other}) << "another version";
+  for (const char* id : {"", "x", "../x", "0123456789abcdef0123456789abcde/",
+                         "0123456789ABCDEF0123456789ABCDEF", "0123456789abcdef0123456789abcdef0"}) {
+    EXPECT_FALSE(IsResultId(id)) << id;
+  }
+}
+
+TEST_F(Results, SweepKeepsWhatIsInUse) {
+  const std::string fresh = ResultPath(folder_, NewResultId());
+  const std::string stale = ResultPath(folder_, NewResultId());
+  const std::string written = ResultPath(folder_, NewResultId());
+  const std::string foreign = folder_ + "/notes.db";
+  const auto long_ago = std::filesystem::file_time_type::clock::now() - std::chrono::hours(25);
+  for (const std::string& path : {fresh, stale, written, foreign}) std::ofstream(path) << "x";
+  std::ofstream(written + "-wal") << "x";
+  for (const std::string& path : {stale, written, foreign}) {
+    std::filesystem::last_write_time(path, long_ago);
+  }
+  SweepResultFolder(folder_);
+  EXPECT_TRUE(std::filesystem::exists(fresh));
+  EXPECT_FALSE(std::filesystem::exists(stale));
+  EXPECT_TRUE(std::filesystem::exists(written)) << "its log is new";
+  EXPECT_TRUE(std::filesystem::exists(foreign)) << "not one of ours";
+}
+
+}  // namespace
+}  // namespace nas
