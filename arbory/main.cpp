@@ -170,10 +170,11 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error, const cha
     if (first_word == nullptr) return "give a command; see arbory --help";
     return "'" + std::string(first_word) + "' is no command; see arbory --help";
   }
+  const auto left = chosen.front()->remaining();
   std::string text = error.what();
-  if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
-    text = "not understood: " + chosen.front()->remaining().front() +
-           " (put -- before a pattern or folder that begins with -)";
+  if (!left.empty()) {
+    text = "not understood: " + left.front();
+    if (left.front().starts_with('-')) text += " (put -- before a pattern that begins with -)";
   }
   return text + "; see arbory " + chosen.front()->get_name() + " --help";
 }

@@ -6,8 +6,9 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
-#include <cstdio>
+#include <cstring>
 #include <string>
 
 #include "arbory/folders.h"
@@ -32,7 +33,7 @@ constexpr std::chrono::milliseconds kLeastPause{2};
 constexpr std::chrono::milliseconds kMostPause{40};
 constexpr int kPauseShare = 10;
 
-enum class Ending { kComplete, kEnough, kInterrupted, kReaderGone, kFailed };
+enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
 void Complain(const std::string& sentence) {
   WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
@@ -132,7 +133,7 @@ class Search {
         failure_ = page.code();
         if (state.finished || !state.exists) return Ending::kFailed;
       }
-      if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kReaderGone;
+      if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
       if (page.rows() < wanted) {
         if (page.finished()) return Ending::kComplete;
         Wait();
@@ -161,7 +162,9 @@ class Search {
     if (page.rows() == 0) return true;
     progress_.Clear();
     printed_ += page.rows();
-    return WriteOut(STDOUT_FILENO, page.text());
+    if (WriteOut(STDOUT_FILENO, page.text())) return true;
+    failure_ = errno;
+    return false;
   }
 
   void Wait() {
@@ -182,7 +185,12 @@ class Search {
     if (ending == Ending::kInterrupted) return kExitInterrupted;
     const SearchState state = ReadSearch(session_.user(), task_id_);
     running_ = state.exists && !state.finished;
-    if (ending == Ending::kReaderGone) return kExitSuccess;
+    if (ending == Ending::kUnwritable) {
+      // A reader that has seen enough, such as head, is no failure.
+      if (failure_ == EPIPE) return kExitSuccess;
+      Complain(std::string("cannot write the results: ") + std::strerror(failure_));
+      return kExitError;
+    }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
     ComplainOfSkipped(state.unreadable, "permission denied");
     ComplainOfSkipped(state.troubled, "see the system log");
@@ -204,8 +212,7 @@ class Search {
 
   static void ComplainOfSkipped(std::uint64_t folders, const char* reason) {
     if (folders == 0) return;
-    Complain(std::to_string(folders) + (folders == 1 ? " folder" : " folders") +
-             " could not be read (" + reason + ")");
+    Complain(Counted(folders, "folder", "folders") + " could not be read (" + reason + ")");
   }
 
   // The cleaning goes on by itself after the reply.
@@ -224,7 +231,7 @@ class Search {
   ProgressLine progress_;
   std::string task_id_;
   std::uint64_t printed_ = 0;
-  int failure_ = 0;
+  int failure_ = 0;  // the code of kFailed, errno of kUnwritable
   bool running_ = true;
 };
 

@@ -61,11 +61,15 @@ SearchState ReadSearch(const std::string& user, const std::string& task_id) {
   return state;
 }
 
+std::string Counted(std::uint64_t number, const char* one, const char* many) {
+  return Grouped(number) + " " + (number == 1 ? one : many);
+}
+
 std::string ProgressText(const SearchState& state, long seconds) {
   std::string text = "Searching " + std::to_string(seconds) + " s";
   if (state.phase.empty()) return text;
-  text += ": " + Grouped(state.folders) + " folders, " + Grouped(state.entries) + " entries, " +
-          Grouped(state.matches) + " found";
+  text += ": " + Counted(state.folders, "folder", "folders") + ", " +
+          Counted(state.entries, "entry", "entries") + ", " + Grouped(state.matches) + " found";
   if (state.phase == "contents") text += ", reading contents";
   return text;
 }

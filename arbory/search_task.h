@@ -23,6 +23,8 @@ struct SearchState {
 };
 SearchState ReadSearch(const std::string& user, const std::string& task_id);
 
+// "1 folder", "1,204 folders".
+std::string Counted(std::uint64_t number, const char* one, const char* many);
 // "Searching 3 s: 1,204 folders, 23,456 entries, 42 found".
 std::string ProgressText(const SearchState& state, long seconds);
 

@@ -49,6 +49,13 @@ Reply MakeCall(const std::string& api, int version, const std::string& method,
   return {reply["code"].asInt(), reply["data"]};
 }
 
+std::vector<std::string> FilesIn(const std::string& folder) {
+  std::vector<std::string> files;
+  std::error_code none;
+  for (const auto& entry : fs::directory_iterator(folder, none)) files.push_back(entry.path());
+  return files;
+}
+
 }  // namespace
 
 bool Eventually(const std::function<bool()>& holds) {
@@ -171,21 +178,23 @@ Json::Value ProgramTest::TaskProperty(const std::string& id, const char* name,
   }
 }
 
-std::vector<std::string> ProgramTest::ResultFiles(const std::string& volume,
-                                                  const std::string& user) {
-  std::vector<std::string> files;
-  std::error_code none;
-  const std::string folder = volume + "/@tmp/webfm/FBSearch/" + user;
-  for (const auto& entry : fs::directory_iterator(folder, none)) files.push_back(entry.path());
-  return files;
+std::vector<std::string> ProgramTest::Databases(const std::string& volume,
+                                                const std::string& user) {
+  std::vector<std::string> databases;
+  for (const std::string& file : FilesIn(volume + "/@tmp/webfm/FBSearch/" + user)) {
+    if (file.ends_with(".db")) databases.push_back(file);
+  }
+  return databases;
 }
 
 std::vector<std::string> ProgramTest::Remains(const std::string& user) {
-  std::vector<std::string> remains = ResultFiles(dir_ + "/volume1", user);
-  for (const std::string& file : ResultFiles(state_ + "/volume0", user)) remains.push_back(file);
-  std::error_code none;
-  for (const auto& entry : fs::directory_iterator(nas::TaskFolder(user), none)) {
-    if (entry.path().filename() != "lock") remains.push_back(entry.path());
+  std::vector<std::string> remains;
+  const std::string results = "/@tmp/webfm/FBSearch/" + user;
+  for (const std::string& folder :
+       {dir_ + "/volume1" + results, state_ + "/volume0" + results, nas::TaskFolder(user)}) {
+    for (const std::string& file : FilesIn(folder)) {
+      if (file != nas::TaskFolder(user) + "/lock") remains.push_back(file);
+    }
   }
   return remains;
 }

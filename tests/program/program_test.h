@@ -2,7 +2,9 @@
 // Searches from end to end: the built program and the built module over real folders, each test
 // with volumes and a state directory of its own.
 
+#include <gmock/gmock.h>
 #include <json/value.h>
+#include <pwd.h>
 
 #include <functional>
 #include <string>
@@ -52,7 +54,7 @@ class ProgramTest : public nas_test::PlatformTest {
 
   // Where everything that a user's searches leave behind would be.
   std::vector<std::string> Remains(const std::string& user = nas_test::Me());
-  std::vector<std::string> ResultFiles(const std::string& volume, const std::string& user);
+  std::vector<std::string> Databases(const std::string& volume, const std::string& user);
 
   // A search over this text file never comes to its end: its contents are read for hours.
   void MakeEndlessFile(const std::string& path);

@@ -1,0 +1,239 @@
+// The life of a search: killed, stopped, cleaned, interrupted, and what each leaves behind.
+
+#include <signal.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+
+#include "nas/system/user_state.h"
+#include "tests/program/program_test.h"
+
+namespace program_test {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class Lifecycle : public ProgramTest {
+ protected:
+  void SetUp() override {
+    ProgramTest::SetUp();
+    for (const char* name : {"one.txt", "two.txt", "three.jpg"})
+      WriteFile(share_ + "/" + name, "x");
+  }
+
+  // A search that finds its names at once and then reads on and on.
+  std::string StartEndless() {
+    MakeEndlessFile(share_ + "/endless.log");
+    return Start(Json_(R"({"folder_path": "/share", "pattern": "one", "search_content": true})"));
+  }
+  std::string StartQuick(const std::string& pattern) {
+    Json::Value params = Json_(R"({"folder_path": "/share", "search_content": false})");
+    params["pattern"] = pattern;
+    const std::string id = Start(params);
+    ListToEnd(id);
+    return id;
+  }
+  bool Reaches(const std::string& id, const std::string& stage) {
+    return Eventually([&] {
+      const Json::Value data = TaskProperty(id, "data");
+      const Json::Value walk = TaskProperty(id, "walk");
+      if (stage == "started") return data.isMember("pid");
+      if (stage == "located") return data.isMember("sdbid");
+      return walk.isObject() && walk["phase"].asString() == stage;
+    });
+  }
+  pid_t Worker(const std::string& id) { return TaskProperty(id, "data")["pid"].asInt(); }
+  static bool Lives(pid_t process) {
+    const std::string stat = nas_test::ReadFile("/proc/" + std::to_string(process) + "/stat");
+    return stat != "(none)" && stat.find(") Z") == std::string::npos;
+  }
+  static Json::Value Id(const std::string& id) {
+    Json::Value params;
+    params["taskid"] = id;
+    return params;
+  }
+};
+
+TEST_F(Lifecycle, AKilledWorkerLeavesAFinishedSearchThatCanBeCleaned) {
+  for (const char* stage : {"started", "located", "contents"}) {
+    SCOPED_TRACE(stage);
+    const std::string id = StartEndless();
+    ASSERT_TRUE(Reaches(id, stage));
+    ASSERT_EQ(kill(Worker(id), SIGKILL), 0);
+    const Reply list = ListToEnd(id);
+    // Killed before it had a result database, there is nothing to list, and that is said at once.
+    EXPECT_TRUE(list.code == 0 || (list.code == 600 && std::string(stage) == "started"));
+    EXPECT_EQ(TaskProperty(id, "progress"), 0);
+    EXPECT_EQ(Call("stop", Id(id)).code, 0);
+    EXPECT_EQ(Call("clean", Id(id)).code, 0);
+    EXPECT_TRUE(Eventually([&] { return Remains().empty(); })) << Remains().front();
+  }
+}
+
+TEST_F(Lifecycle, StopEndsTheWorkerAndKeepsWhatWasFound) {
+  const std::string id = StartEndless();
+  ASSERT_TRUE(Reaches(id, "contents"));
+  const pid_t worker = Worker(id);
+  const auto begin = std::chrono::steady_clock::now();
+  EXPECT_EQ(Call("stop", Id("00000000000000000000000000000000," + id)).code, 0);
+  EXPECT_TRUE(Eventually([&] { return !Lives(worker); }));
+  EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(2));
+  const Reply list = ListToEnd(id);
+  ASSERT_EQ(list.data["files"].size(), 1U);
+  EXPECT_EQ(list.data["files"][0]["name"], "one.txt");
+  EXPECT_EQ(TaskProperty(id, "progress"), 0);
+}
+
+TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
+  const std::string first = StartQuick("one");
+  const std::string running = StartEndless();
+  ASSERT_TRUE(Reaches(running, "contents"));
+  const std::string kept = StartQuick("two");
+  const pid_t worker = Worker(running);
+  EXPECT_EQ(Call("clean", Id(first + "," + running)).code, 0);
+  EXPECT_TRUE(Eventually([&] {
+    return TaskProperty(first, "data") == "gone" && TaskProperty(running, "data") == "gone";
+  }));
+  EXPECT_TRUE(Eventually([&] { return !Lives(worker); })) << "clean stops what it removes";
+  EXPECT_EQ(Databases(dir_ + "/volume1", nas_test::Me()).size(), 1U);
+  const Reply gone = Call("list", Id(first));
+  EXPECT_EQ(gone.data, Json_(R"({"finished": true})"));
+  EXPECT_EQ(ListToEnd(kept).data["total"], 1);
+}
+
+TEST_F(Lifecycle, CleanAllRemovesTheUsersResultFoldersAndNothingElse) {
+  if (system("bwrap --unshare-all --ro-bind / / true 2>/dev/null") != 0) {
+    GTEST_SKIP() << "bubblewrap cannot run here, so no shell command does";
+  }
+  MakeFolder("outside");
+  StartQuick("one");
+  const std::string temporary = dir_ + "/volume1/@tmp/webfm/FBSearch/";
+  fs::create_directory(temporary + "somebody");
+  WriteFile(temporary + "somebody/results", "theirs");
+  WriteFile(share_ + "/results", "a file");
+  ASSERT_EQ(Databases(dir_ + "/volume1", nas_test::Me()).size(), 1U);
+  EXPECT_EQ(Call("Clean", Json_(R"({"action": "CleanAll"})")).code, 0);
+  EXPECT_TRUE(Eventually([&] { return !fs::exists(temporary + nas_test::Me()); }));
+  EXPECT_EQ(nas_test::ReadFile(temporary + "somebody/results"), "theirs");
+  EXPECT_EQ(nas_test::ReadFile(share_ + "/results"), "a file");
+}
+
+TEST_F(Lifecycle, FilesThatVanishedLeaveTheListing) {
+  for (int number = 0; number < 30; ++number) {
+    WriteFile(share_ + "/many" + std::to_string(number) + ".dat", "x");
+  }
+  const std::string id = StartQuick("many");
+  for (int number = 5; number < 15; ++number) {
+    fs::remove(share_ + "/many" + std::to_string(number) + ".dat");
+  }
+  Json::Value params = Id(id);
+  params["sort_by"] = "name";
+  params["offset"] = 3;
+  params["limit"] = 4;
+  const Reply page = Call("list", params);
+  ASSERT_EQ(page.code, 0);
+  std::vector<std::string> names;
+  for (const Json::Value& file : page.data["files"]) names.push_back(file["name"].asString());
+  EXPECT_THAT(names, ElementsAre("many3.dat", "many4.dat", "many15.dat", "many16.dat"));
+  EXPECT_EQ(ListToEnd(id).data["total"], 20);
+}
+
+TEST_F(Lifecycle, HistoryIsWrittenByBothRoads) {
+  const auto patterns = [&](const char* kind) {
+    Json::Value params;
+    params["search_type"] = kind;
+    const Reply reply = CallHistory("get", params);
+    EXPECT_EQ(reply.data["total"].asUInt(), reply.data["history"].size());
+    std::vector<std::string> list;
+    for (const Json::Value& record : reply.data["history"]) {
+      list.push_back(record["pattern"].asString());
+    }
+    return list;
+  };
+  EXPECT_THAT(patterns("simple"), IsEmpty());
+  StartQuick("first");
+  StartQuick("second");
+  EXPECT_EQ(CallHistory("set", Json_(R"({"pattern": "third"})")).code, 0);
+  StartQuick("first");
+  EXPECT_EQ(CallHistory("set", Json_(R"({"pattern": "x", "search_type": "advance"})")).code, 0);
+  EXPECT_EQ(CallHistory("set", Json_(R"({"folder_path": "/share"})")).code, 401);
+  EXPECT_THAT(patterns("simple"), ElementsAre("first", "third", "second"));
+  EXPECT_EQ(CallHistory("delete", Json::Value()).code, 0);
+  EXPECT_THAT(patterns("simple"), IsEmpty());
+  EXPECT_THAT(patterns("advance"), ElementsAre("x"));
+  const Json::Value settings =
+      Json_(nas_test::ReadFile(nas::PreferenceFolder(nas_test::Me()) + "/usersettings"));
+  EXPECT_EQ(settings["NUVA.VTX.App.PersonalSettings.Instance"]["search_count"], 3);
+}
+
+// However the program is made to end, the search it ran is stopped and nothing of it stays.
+TEST_F(Lifecycle, AnInterruptedProgramCleansUp) {
+  MakeEndlessFile(share_ + "/endless.log");
+  for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
+    SCOPED_TRACE(strsignal(signal_number));
+    const pid_t program = Launch({"search", "one", "--content"});
+    const std::string tasks = nas::TaskFolder(nas_test::Me());
+    std::string id;
+    ASSERT_TRUE(Eventually([&] {
+      std::error_code none;
+      for (const auto& entry : fs::directory_iterator(tasks, none)) {
+        if (entry.path().extension() == ".json") id = entry.path().stem();
+      }
+      return !id.empty() && TaskProperty(id, "walk").isObject();
+    }));
+    const pid_t worker = Worker(id);
+    ASSERT_TRUE(Lives(worker));
+    kill(program, signal_number);
+    const Output output = Finish(program);
+    EXPECT_EQ(output.exit_code, 130);
+    EXPECT_TRUE(Eventually([&] { return !Lives(worker) && Remains().empty(); }));
+  }
+}
+
+// Two users of one machine: neither sees the other's searches, results or history.
+TEST_F(Lifecycle, UsersAreStrangersToEachOther) {
+  SKIP_UNLESS_ROOT();
+  const char* const ann = "daemon";
+  const char* const bob = "nobody";
+  for (const char* user : {ann, bob}) {
+    const std::string folder = MakeFolder("volume1/share/" + std::string(user));
+    WriteFile(folder + "/secret.txt", user);
+    const passwd* account = getpwnam(user);
+    ASSERT_EQ(chown(folder.c_str(), account->pw_uid, account->pw_gid), 0);
+    ASSERT_EQ(chmod(folder.c_str(), 0700), 0);
+  }
+  const Json::Value search = Json_(R"({"folder_path": "/share", "pattern": "secret"})");
+  const std::string anns = Start(search, ann);
+  const Reply hers = ListToEnd(anns, ann);
+  ASSERT_EQ(hers.data["files"].size(), 1U);
+  EXPECT_EQ(hers.data["files"][0]["path"], "/share/daemon/secret.txt");
+  EXPECT_EQ(TaskProperty(anns, "walk", ann)["skipped"]["permission"], 1);
+
+  EXPECT_EQ(Call("list", Id(anns), bob).data, Json_(R"({"finished": true})"));
+  EXPECT_EQ(Call("stop", Id(anns), bob).code, 0);
+  EXPECT_EQ(Call("clean", Id(anns), bob).code, 0);
+  usleep(200'000);  // the cleaning goes on behind the reply
+  EXPECT_EQ(ListToEnd(anns, ann).data["total"], 1) << "bob cleaned it";
+
+  const std::string folder = nas::PreferenceFolder(ann);
+  for (const std::string& path :
+       {folder, nas::TaskFolder(ann), dir_ + "/volume1/@tmp/webfm/FBSearch/" + ann}) {
+    EXPECT_EQ(nas_test::ModeOf(path), 0700U) << path;
+  }
+  Json::Value own;
+  own["folder_path"] = "/share/daemon";
+  own["pattern"] = "secret";
+  const std::string bobs = Start(own, bob);
+  EXPECT_EQ(ListToEnd(bobs, bob).code, 600);
+  EXPECT_EQ(TaskProperty(bobs, "data", bob)["errno"], 407);
+  const Output output = Run({"search", "secret", share_, "--user", "nobody"});
+  EXPECT_EQ(output.out, share_ + "/nobody/secret.txt\n");
+  EXPECT_EQ(output.err, "arbory: 1 folder could not be read (permission denied)\n");
+}
+
+}  // namespace
+}  // namespace program_test

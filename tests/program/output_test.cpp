@@ -1,0 +1,240 @@
+// What a person or a script gets to see, and the values they may write.
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <ctime>
+
+#include "arbory/folders.h"
+#include "arbory/options.h"
+#include "arbory/parse.h"
+#include "arbory/terminal.h"
+#include "tests/program/program_test.h"
+
+namespace program_test {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+
+constexpr int kRefused = -1;
+
+TEST(Values, Sizes) {
+  const struct {
+    const char* text;
+    std::int64_t bytes;
+  } rows[] = {
+      {"0", 0},
+      {"10", 10},
+      {"10k", 10240},
+      {"5M", 5 << 20},
+      {"1GiB", 1 << 30},
+      {"2tb", kRefused},
+      {"2TB", std::int64_t{2} << 40},
+      {"8191P", std::int64_t{8191} << 50},
+      {"8192P", kRefused},
+      {"9223372036854775807", INT64_MAX},
+      {"9223372036854775808", kRefused},
+      {"", kRefused},
+      {"-1", kRefused},
+      {"1.5G", kRefused},
+      {"k", kRefused},
+      {"1 k", kRefused},
+      {"0x10", kRefused},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.text);
+    if (row.bytes == kRefused) {
+      EXPECT_THROW(arbory::ParseSize(row.text), arbory::UsageError);
+    } else {
+      EXPECT_EQ(arbory::ParseSize(row.text), row.bytes);
+    }
+  }
+}
+
+TEST(Values, Times) {
+  setenv("TZ", "Europe/Berlin", 1);
+  tzset();
+  constexpr std::time_t kNow = 1'800'000'000;
+  const struct {
+    const char* text;
+    std::int64_t from;
+    std::int64_t to;
+  } rows[] = {
+      {"0", 0, 0},
+      {"1700000000", 1'700'000'000, 1'700'000'000},
+      {"2147483647", INT32_MAX, INT32_MAX},
+      {"2147483648", kRefused, kRefused},
+      {"2026-01-31", 1'769'814'000, 1'769'900'399},
+      {"2026-03-29", 1'774'738'800, 1'774'821'599},  // 23 hours: summer time begins
+      {"2026-01-31T12:00", 1'769'857'200, 1'769'857'200},
+      {"2026-01-31T12:00:07", 1'769'857'207, 1'769'857'207},
+      {"2024-02-29", 1'709'161'200, 1'709'247'599},
+      {"2026-02-29", kRefused, kRefused},
+      {"2026-13-01", kRefused, kRefused},
+      {"2026-1-1", kRefused, kRefused},
+      {"2026-01-31T25:00", kRefused, kRefused},
+      {"2026-01-31x", kRefused, kRefused},
+      {"2039-01-01", kRefused, kRefused},
+      {"1900-01-01", kRefused, kRefused},
+      {"30m", kNow - 1800, kNow - 1800},
+      {"12h", kNow - 43'200, kNow - 43'200},
+      {"7d", kNow - 604'800, kNow - 604'800},
+      {"2w", kNow - 1'209'600, kNow - 1'209'600},
+      {"7x", kRefused, kRefused},
+      {"99999999999999999d", kRefused, kRefused},
+      {"", kRefused, kRefused},
+      {"yesterday", kRefused, kRefused},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.text);
+    if (row.from == kRefused) {
+      EXPECT_THROW(arbory::ParseTime(row.text, arbory::Bound::kFrom, kNow), arbory::UsageError);
+    } else {
+      EXPECT_EQ(arbory::ParseTime(row.text, arbory::Bound::kFrom, kNow), row.from);
+      EXPECT_EQ(arbory::ParseTime(row.text, arbory::Bound::kTo, kNow), row.to);
+    }
+  }
+}
+
+TEST(Values, SharesOfTheirOwnHaveAllowedNames) {
+  const std::vector<std::string> taken = {"photo", "photo-2"};
+  const struct {
+    const char* folder;
+    std::string name;
+  } rows[] = {
+      {"", "root"},        {"/srv/music", "music"}, {"/srv/photo", "photo-3"},
+      {"/home", "home-2"}, {"/a/Homes", "Homes-2"}, {"/a/b,c\n", "b_c_"},
+      {"/a/.hid", ".hid"},
+  };
+  for (const auto& row : rows) EXPECT_EQ(arbory::FreeShareName(row.folder, taken), row.name);
+}
+
+TEST(Values, NamesOnATerminal) {
+  const struct {
+    std::string name;
+    std::string shown;
+  } rows[] = {
+      {"plain caf\u00e9 \u65e5\u672c", "plain caf\u00e9 \u65e5\u672c"},
+      {"red\x1b[31m\n\r\t\x7f", "red\\x1B[31m\\x0A\\x0D\\x09\\x7F"},
+      {"bad\xff\xc3", "bad\\xFF\\xC3"},
+      {"csi\u009b1m", "csi\\xC2\\x9B1m"},
+      {"exe\u202etxt.", "exe\\xE2\\x80\\xAEtxt."},
+      {"nbsp\u00a0", "nbsp\u00a0"},
+  };
+  for (const auto& row : rows) EXPECT_EQ(arbory::Escaped(row.name), row.shown);
+}
+
+class PrintedRows : public ProgramTest {
+ protected:
+  void SetUp() override {
+    ProgramTest::SetUp();
+    const std::pair<const char*, size_t> files[] = {
+        {"IMG2.jpg", 300}, {"img10.jpg", 100}, {"IMG1.jpg", 200}, {"bro\xffken\n.jpg", 0}};
+    for (const auto& [name, size] : files) WriteFile(share_ + "/" + name, std::string(size, 'x'));
+  }
+  std::vector<std::string> Names(std::vector<std::string> words) {
+    words.insert(words.begin(), {"search", "-0", "jpg"});
+    std::vector<std::string> names;
+    for (const std::string& path : Pieces(Run(words).out, '\0')) {
+      names.push_back(path.substr(share_.size() + 1));
+    }
+    return names;
+  }
+};
+
+TEST_F(PrintedRows, SortedPages) {
+  EXPECT_THAT(Names({"--sort", "size", "--desc"}),
+              ElementsAre("IMG2.jpg", "IMG1.jpg", "img10.jpg", "bro\xffken\n.jpg"));
+  EXPECT_THAT(Names({"--sort", "name", "--offset", "2"}), ElementsAre("IMG2.jpg", "img10.jpg"));
+  EXPECT_THAT(Names({"--sort", "name", "--offset", "1", "--limit", "1"}), ElementsAre("IMG1.jpg"));
+  EXPECT_EQ(Names({"--limit", "3"}).size(), 3U);
+  EXPECT_EQ(Names({"--offset", "3"}).size(), 1U);
+  EXPECT_EQ(Run({"search", "jpg", "--offset", "4"}).exit_code, 1);
+}
+
+TEST_F(PrintedRows, JsonIsOneValidObjectALine) {
+  const Output output = Run({"search", "jpg", "--json", "--sort", "name"});
+  const auto lines = Pieces(output.out, '\n');
+  ASSERT_EQ(lines.size(), 4U);
+  const Json::Value broken = Json_(lines[0]);
+  EXPECT_EQ(broken["name"], "bro\uFFFDken\n.jpg");
+  EXPECT_EQ(broken["path"], "/share/bro\uFFFDken\n.jpg");
+  const Json::Value file = Json_(lines[3]);
+  EXPECT_EQ(file["real_path"], share_ + "/img10.jpg");
+  EXPECT_EQ(file["size"], 100);
+  EXPECT_EQ(file["type"], "JPG");
+  EXPECT_EQ(file["owner"]["user"], nas_test::Me());
+  EXPECT_TRUE(file["time"].isMember("mtime") && file["perm"].isMember("mode"));
+}
+
+TEST_F(PrintedRows, LongRowsTellModeOwnerSizeAndTime) {
+  ASSERT_EQ(chmod((share_ + "/IMG2.jpg").c_str(), 0640), 0);
+  const Output output = Run({"search", "img2", "-l"});
+  EXPECT_THAT(output.out,
+              testing::MatchesRegex("-rw-r----- [^ ]+ +[^ ]+ +300 [0-9-]+ [0-9:]+ /.*\n"));
+  EXPECT_THAT(Run({"search", "share", dir_ + "/volume1", "-l"}).out, testing::StartsWith("drwx"));
+}
+
+// A reader that goes away (head) ends the search quietly; a full disk is an error.
+TEST_F(PrintedRows, OutputThatNobodyTakes) {
+  for (int number = 0; number < 3000; ++number) {
+    WriteFile(share_ + "/a long name that fills the pipe " + std::to_string(number) + ".jpg", "");
+  }
+  const std::string config = "ARBORY_CONFIG=" + dir_ + "/as-" + nas_test::Me() + "/arbory.toml ";
+  const auto shell = [&](const std::string& command) {
+    return WEXITSTATUS(system(("bash -c '" + command + "'").c_str()));
+  };
+  EXPECT_EQ(shell(config + program_ + " search jpg " + share_ +
+                  " | head -n 1 >/dev/null; exit ${PIPESTATUS[0]}"),
+            0);
+  EXPECT_EQ(shell(config + program_ + " search jpg " + share_ + " >/dev/full 2>/dev/null"), 2);
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
+}
+
+TEST_F(PrintedRows, CallPrintsTheReply) {
+  const Output output =
+      Run({"call", "NUVA.Arbory.Search.History", "1", "set", "{\"pattern\": \"\xff\"}"});
+  EXPECT_EQ(output.out, "{\"code\":0,\"data\":null}\n");
+  EXPECT_EQ(output.exit_code, 0);
+  const Output history = Run({"call", "NUVA.Arbory.Search.History", "1", "GET"});
+  EXPECT_THAT(history.out, HasSubstr("\"pattern\":\"\uFFFD\""));
+  const Output refused = Run({"call", "NUVA.Arbory.Search", "2", "list"});
+  EXPECT_EQ(refused.out, "{\"code\":400,\"data\":null}\n");
+  EXPECT_EQ(refused.exit_code, 1);
+}
+
+// On a terminal names are escaped and a long search shows how far it is.
+TEST_F(PrintedRows, Terminal) {
+  MakeEndlessFile(share_ + "/endless.log");
+  const int terminal = posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC);
+  ASSERT_TRUE(terminal >= 0 && grantpt(terminal) == 0 && unlockpt(terminal) == 0);
+  const std::string name = ptsname(terminal);
+  const std::string config = dir_ + "/as-" + nas_test::Me() + "/arbory.toml";
+  const pid_t program = fork();
+  if (program == 0) {
+    const int side = open(name.c_str(), O_RDWR | O_NOCTTY);
+    dup2(side, STDOUT_FILENO);
+    dup2(side, STDERR_FILENO);
+    setenv("ARBORY_CONFIG", config.c_str(), 1);
+    execl(program_.c_str(), "arbory", "search", "jpg", share_.c_str(), "--content", nullptr);
+    _exit(127);
+  }
+  std::string seen;
+  EXPECT_TRUE(Eventually([&] {
+    char bytes[4096];
+    const ssize_t count = read(terminal, bytes, sizeof bytes);
+    if (count > 0) seen.append(bytes, size_t(count));
+    return seen.find("reading contents") != std::string::npos;
+  })) << seen;
+  EXPECT_THAT(seen, HasSubstr("bro\\xFFken\\x0A.jpg"));
+  EXPECT_THAT(seen, HasSubstr("Searching 0 s: 1 folder, 5 entries, 4 found, reading contents"));
+  kill(program, SIGINT);
+  EXPECT_EQ(Finish(program).exit_code, 130);
+  close(terminal);
+}
+
+}  // namespace
+}  // namespace program_test
