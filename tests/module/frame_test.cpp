@@ -92,7 +92,7 @@ TEST(Run, ExceptionPassesWithoutAReplyButNothingIsLeaked) {
   EXPECT_EQ(Keep(Serve(play, SearchAPIEntry), {"reply", "~Task", "WfmLibRestore", "threw"}).size(),
             3U);
   play.params["folder_path"][0] = "/x";
-  play.Throw("IsShareIndexed");
+  play.Arrange("throw IsShareIndexed");
   EXPECT_EQ(Keep(Serve(play, SearchAPIEntry), {"reply", "~Task", "WfmLibRestore", "threw"}),
             (Trace{"~Task(new)", "WfmLibRestoreUmask(18)", "threw IsShareIndexed"}));
 }
@@ -147,8 +147,7 @@ TEST(DelSigHandler, RaisesTheFlagForSigtermAlone) {
     DelSigHandler(15);
     Note(StopRequested() ? "set" : "clear");
   });
-  EXPECT_EQ(trace,
-            (Trace{"log NUVA.Arbory.Search:57 Unknown Signal: 1", "clear", "set", "returned"}));
+  EXPECT_EQ(trace, (Trace{"log S:57 Unknown Signal: 1", "clear", "set", "returned"}));
 }
 
 }  // namespace

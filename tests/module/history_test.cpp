@@ -51,8 +51,8 @@ TEST(History, Get) {
        "{}",
        "FileDB.IsGood",
        {kSimple, "FileDB.IsGood()",
-        "log NUVA.Arbory.Search:1060 db is not good, /prefs/search_history.db, Permission denied",
-        "~FileDB", R"(reply 0 {"history":[],"total":0})"}},
+        "log S:1060 db is not good, /prefs/search_history.db, Permission denied", "~FileDB",
+        R"(reply 0 {"history":[],"total":0})"}},
   };
   for (const Row& row : rows) Check(row, SearchHistoryGetEntry);
 }
@@ -76,7 +76,7 @@ TEST(History, Set) {
        R"({"pattern":"x","search_type":"advance"})",
        "FileDB.IsGood",
        {kAdvanced, "FileDB.IsGood()",
-        "log NUVA.Arbory.Search:1089 db is not good, /prefs/adv_search_history.db, "
+        "log S:1089 db is not good, /prefs/adv_search_history.db, "
         "Permission denied",
         "~FileDB", "reply 401 null"}},
       {"insert",
@@ -99,8 +99,8 @@ TEST(History, Delete) {
        "{}",
        "FileDB.IsGood",
        {kSimple, "FileDB.IsGood()",
-        "log NUVA.Arbory.Search:1111 db is not good, /prefs/search_history.db, Permission denied",
-        "~FileDB", "reply 401 null"}},
+        "log S:1111 db is not good, /prefs/search_history.db, Permission denied", "~FileDB",
+        "reply 401 null"}},
       {"delete",
        R"({"search_type":"advance"})",
        "FileDB.Delete",
@@ -166,9 +166,8 @@ TEST(Recording, CountsSearches) {
   }
   Script missing;
   missing.fail = {"fromFile"};
-  EXPECT_EQ(count(missing),
-            (Trace{"fromFile(/prefs/usersettings)",
-                   "log NUVA.Arbory.Search:801 Failed to load usersettings, Permission denied"}));
+  EXPECT_EQ(count(missing), (Trace{"fromFile(/prefs/usersettings)",
+                                   "log S:801 Failed to load usersettings, Permission denied"}));
 }
 
 }  // namespace

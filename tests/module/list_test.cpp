@@ -57,41 +57,34 @@ TEST(List, AnswersEachFailureWithItsCode) {
   };
   const struct {
     const char* why;
-    std::function<void(Script&)> arrange;
+    const char* arrange;
     Trace expected;
   } rows[] = {
-      {"cleaned: finished", [](Script& s) { s.tasks.clear(); }, {R"(reply 0 {"finished":true})"}},
+      {"cleaned: finished", "no tasks", {R"(reply 0 {"finished":true})"}},
       {"identity",
-       [](Script& s) { s.fail = {"SessionIdentity"}; },
-       {"SessionIdentity(sid,ann)",
-        "log NUVA.Arbory.Search:528 Failed to set UGID for user=ann, sid=sid.", "reply 401 null"}},
-      {"no database yet", [](Script& s) { s.fail = {"WaitKeyReady"}; },
-       after({"log NUVA.Arbory.Search:540 Failed to get json data, t1.", "reply 600 null"})},
-      {"no data", [](Script& s) { s.properties.clear(); },
-       after({"log NUVA.Arbory.Search:546 Failed to get json data, t1.", "reply 401 null"})},
-      {"no volume: nothing to query",
-       [](Script& s) { s.properties["data"].removeMember("sdbvol"); },
+       "fail SessionIdentity",
+       {"SessionIdentity(sid,ann)", "log S:528 Failed to set UGID for user=ann, sid=sid.",
+        "reply 401 null"}},
+      {"no database yet", "fail WaitKeyReady",
+       after({"log S:540 Failed to get json data, t1.", "reply 600 null"})},
+      {"no data", "no data", after({"log S:546 Failed to get json data, t1.", "reply 401 null"})},
+      {"no volume: nothing to query", "no volume",
        after({"WaitReady(result_ready,100)", R"(reply 0 {"finished":false})"})},
-      {"not ready in time is no failure",
-       [](Script& s) {
-         s.fail = {"WaitReady"};
-         s.finished = true;
-       },
+      {"not ready in time is no failure", "fail WaitReady, finished",
        after({"WaitReady(result_ready,100)", "getDBTask(/volume1,db1)",
               R"(reply 0 {"files":[],"finished":true,"offset":0,"total":0})"})},
-      {"no such user", [](Script& s) { s.accounts.clear(); },
-       after({"WaitReady(result_ready,100)", "reply 600 null"})},
-      {"no such database", [](Script& s) { s.fail = {"getDBTask"}; },
+      {"no such user", "no accounts", after({"WaitReady(result_ready,100)", "reply 600 null"})},
+      {"no such database", "fail getDBTask",
        after({"WaitReady(result_ready,100)", "getDBTask(/volume1,db1)", "reply 600 null"})},
-      {"no number", [](Script& s) { s.params["offset"] = "x"; },
+      {"no number", "text offset",
        after({"WaitReady(result_ready,100)", "getDBTask(/volume1,db1)", "reply 600 null"})},
-      {"query", [](Script& s) { s.fail = {"DBTask.query"}; },
+      {"query", "fail DBTask.query",
        after({"WaitReady(result_ready,100)", "getDBTask(/volume1,db1)",
-              "log NUVA.Arbory.Search:451 Fail to select data from DB by ann", "reply 600 null"})},
+              "log S:451 Fail to select data from DB by ann", "reply 600 null"})},
   };
   for (const auto& row : rows) {
     Script play = ListScript();
-    row.arrange(play);
+    play.Arrange(row.arrange);
     const Trace trace = Serve(play, SearchAPIEntry);
     EXPECT_EQ(Keep(trace, {"SessionIdentity", "Wait", "getDBTask", "log", "reply"}), row.expected)
         << row.why;

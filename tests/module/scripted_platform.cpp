@@ -5,10 +5,12 @@
 #include <json/writer.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
@@ -27,6 +29,7 @@ Script script;
 namespace {
 
 int trace_fd = -1;
+constexpr char kSource[] = "NUVA.Arbory.Search:";
 
 // Traces the call and lets the script act in it. True when it is to succeed.
 bool Called(const std::string& operation, const std::string& arguments = "") {
@@ -92,10 +95,15 @@ pid_t RealFork() {
 void LogLine(int priority, const char* format, va_list args) {
   char line[8192];
   vsnprintf(line, sizeof(line), format, args);
-  Note((priority == 3 ? "log " : "log at another priority ") + std::string(line));
+  std::string text = line;
+  if (text.starts_with(kSource)) text.replace(0, strlen(kSource), "S:");
+  Note((priority == LOG_ERR ? "log " : "log at another priority ") + text);
 }
 
 }  // namespace
+
+// There only in builds with the leak sanitizer.
+extern "C" int __lsan_do_recoverable_leak_check() __attribute__((weak));
 
 // The C library's own, as far as the module's calls to them matter.
 extern "C" {
@@ -130,8 +138,26 @@ int access(const char* path, int /*mode*/) noexcept {
 }
 }
 
-void Script::Throw(const std::string& operation) {
-  at[operation] = [operation] { throw std::runtime_error(operation); };
+void Script::Arrange(const std::string& words) {
+  std::istringstream in(words);
+  for (std::string item; std::getline(in >> std::ws, item, ',');) {
+    const std::string verb = item.substr(0, item.find(' '));
+    const std::string what = verb == item ? "" : item.substr(verb.size() + 1);
+    if (verb == "child") fork_result = 0;
+    if (verb == "finished") finished = true;
+    if (verb == "error") wfm_error = std::stoi(what);
+    if (verb == "text") params[what] = "x";
+    if (verb == "fail") fail.insert(what);
+    if (verb == "throw") at[what] = [what] { throw std::runtime_error(what); };
+    if (verb == "stop") at[what] = [] { raise(SIGTERM); };
+    if (verb == "lose") at[what] = [] { script.properties.clear(); };
+    if (verb != "no") continue;
+    if (what == "tasks") tasks.clear();
+    if (what == "accounts") accounts.clear();
+    if (what == "data") properties.clear();
+    if (what == "volume") properties["data"].removeMember("sdbvol");
+    if (what == "taskid") params.removeMember("taskid");
+  }
 }
 
 void Note(const std::string& line) {
@@ -173,6 +199,9 @@ Trace Play(const Script& play, const std::function<void()>& body) {
     trace_fd = ends[1];
     try {
       body();
+      if (&__lsan_do_recoverable_leak_check != nullptr && __lsan_do_recoverable_leak_check() != 0) {
+        Note("reply: memory was leaked");
+      }
       Note("returned");
     } catch (const std::exception& e) {
       Note(std::string("threw ") + e.what());

@@ -2,8 +2,9 @@
 // A platform that does what a script says and keeps a trace of every call, in order, so that the
 // module can be taken down each of its roads without a disk, a task store or a second user.
 //
-// A call is traced as "Operation(arguments)"; the module's log lines as "log TEXT", its reply as
-// "reply CODE DATA", and how it ended as "returned", "threw TEXT", "_exit(N)" or "signal N".
+// A call is traced as "Operation(arguments)"; the module's log lines as "log TEXT" (with "S" for
+// its source name "NUVA.Arbory.Search"), its reply as "reply CODE DATA", and how it ended as
+// "returned", "threw TEXT", "_exit(N)" or "signal N".
 
 #include <json/value.h>
 
@@ -31,7 +32,12 @@ struct Script {
 
   std::set<std::string> fail;                       // operations that report failure (EACCES)
   std::map<std::string, std::function<void()>> at;  // what happens inside an operation
-  void Throw(const std::string& operation);         // it throws
+
+  // Takes what happens in words, separated by ", ": "child" (forks are seen from the child),
+  // "finished" (so are the tasks), "error N" (WfmLibGetErr), "no KEY" (of what there is), "text
+  // KEY" (as a parameter's value); and in operation OP "fail OP", "throw OP", "stop OP" (SIGTERM
+  // comes), "lose OP" (the tasks' properties are gone).
+  void Arrange(const std::string& words);
 
   std::map<std::string, unsigned> accounts;  // users and groups
   std::map<std::string, std::string> homes;  // user, home directory

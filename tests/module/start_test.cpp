@@ -2,16 +2,12 @@
 
 #include <gtest/gtest.h>
 
-#include <csignal>
-
 #include "api/table.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
 #include "tests/module/scripted_platform.h"
 
 namespace {
-
-using Arrange = std::function<void(Script&)>;
 
 TEST(Locations, AreNormalised) {
   const struct {
@@ -61,13 +57,12 @@ TEST(Locations, AFailedHomeLookupDropsTheLocationAndIsLogged) {
                 {"[", "log", "HomePath"});
   };
   EXPECT_EQ(run(play), (Trace{"HomePath(ann,4096)",
-                              "log NUVA.Arbory.Search:950 Failed to get homes path for ann, "
+                              "log S:950 Failed to get homes path for ann, "
                               "No such file or directory",
                               R"(["/x"])"}));
   play.homes["ann"] = "/root/ann";
-  EXPECT_EQ(run(play),
-            (Trace{"HomePath(ann,4096)",
-                   "log NUVA.Arbory.Search:955 Failed to find /homes/ in /root/ann", R"(["/x"])"}));
+  EXPECT_EQ(run(play), (Trace{"HomePath(ann,4096)", "log S:955 Failed to find /homes/ in /root/ann",
+                              R"(["/x"])"}));
 }
 
 Script StartScript(const char* folders) {
@@ -88,8 +83,8 @@ TEST(Start, WritesTheTaskAndAnswers) {
       (Trace{"Explode(\"/indexed/a,/other\",,,2,keep)", "Task(ann,null)", "NLIBCProcFork()",
              "Task.begin()", "Task.set(progress,0)",
              R"(Task.set(data,{"location":["/indexed/a","/other"],"pid":4711,"taskid":"new"}))",
-             "Task.end()", "log NUVA.Arbory.Search:873 Failed to write progress.",
-             "IsShareIndexed(indexed)", "IsShareIndexed(other)", "~Task(new)",
+             "Task.end()", "log S:873 Failed to write progress.", "IsShareIndexed(indexed)",
+             "IsShareIndexed(other)", "~Task(new)",
              R"(reply 0 {"has_not_index_share":true,"taskid":"new"})"}));
 }
 
@@ -108,14 +103,13 @@ TEST(Start, TellsWhetherAShareIsNotIndexed) {
 
 TEST(Start, FailuresAnswer401) {
   Script no_task = StartScript("/a");
-  no_task.Throw("Task");
+  no_task.Arrange("throw Task");
   EXPECT_EQ(Keep(Serve(no_task, SearchAPIEntry), {"NLIBCProcFork", "log", "reply", "~Task"}),
             Trace{"reply 401 null"});
   Script no_fork = StartScript("/a");
   no_fork.fail = {"NLIBCProcFork"};
-  EXPECT_EQ(
-      Keep(Serve(no_fork, SearchAPIEntry), {"log", "Task.", "reply", "~Task"}),
-      (Trace{"log NUVA.Arbory.Search:862 Failed to fork().", "~Task(new)", "reply 401 null"}));
+  EXPECT_EQ(Keep(Serve(no_fork, SearchAPIEntry), {"log", "Task.", "reply", "~Task"}),
+            (Trace{"log S:862 Failed to fork().", "~Task(new)", "reply 401 null"}));
 }
 
 Script WorkerScript() {
@@ -125,8 +119,6 @@ Script WorkerScript() {
   play.properties = Parse(R"({"data":{"pid":1}})");
   return play;
 }
-
-void Terminate() { raise(SIGTERM); }
 
 const char kWalkData[] =
     R"(Task.set(data,{"pattern":"a","pid":1,"sdbid":"db1","sdbvol":"/volume1"}))";
@@ -181,83 +173,65 @@ TEST(Worker, RecordsItsOutcome) {
     first.insert(first.end(), rest.begin(), rest.end());
     return first;
   };
-  const std::string no_identity =
-      "log NUVA.Arbory.Search:891 Failed to set UGID for user=ann, sid=sid";
+  const std::string no_identity = "log S:891 Failed to set UGID for user=ann, sid=sid";
   const struct {
     const char* why;
-    Arrange arrange;
+    const char* arrange;
     Trace expected;
   } rows[] = {
       {"a failing write is logged",
-       [](Script& s) { s.fail = {"Task.finish"}; },
+       "fail Task.finish",
        {kWalkData, "Task.set(progress,1)", kWalkData, "Task.finish(new,false)",
-        "log NUVA.Arbory.Search:923 Failed to write progress.", "_exit(0)"}},
-      {"identity refused", [](Script& s) { s.fail = {"SessionIdentity"}; },
-       with({no_identity}, early_401)},
+        "log S:923 Failed to write progress.", "_exit(0)"}},
+      {"identity refused", "fail SessionIdentity", with({no_identity}, early_401)},
       {"identity refused while told to stop: recorded, then ended",
-       [](Script& s) {
-         s.fail = {"SessionIdentity"};
-         s.at["SessionIdentity"] = Terminate;
-       },
+       "fail SessionIdentity, stop SessionIdentity",
        {no_identity, early_401[0], early_401[1], early_401[2], "Task.finish(new,false)",
         "_exit(0)"}},
       {"criteria refused: neither remembered nor walked",
-       [](Script& s) {
-         s.fail = {"createFindOp 0"};
-         s.wfm_error = 418;
-       },
-       {"log NUVA.Arbory.Search:251 Failed To parse the find parameters, reason=[1A2]",
-        "Task.set(progress,-1)", R"(Task.set(data,{"errno":418,"pid":1}))",
-        "Task.finish(new,false)", "_exit(0)"}},
+       "fail createFindOp 0, error 418",
+       {"log S:251 Failed To parse the find parameters, reason=[1A2]", "Task.set(progress,-1)",
+        R"(Task.set(data,{"errno":418,"pid":1}))", "Task.finish(new,false)", "_exit(0)"}},
+      {"a failure without a code is a failure",
+       "fail createFindOp 0",
+       {"log S:251 Failed To parse the find parameters, reason=[0]", "Task.set(progress,-1)",
+        R"(Task.set(data,{"errno":0,"pid":1}))", "Task.finish(new,false)", "_exit(0)"}},
       {"told to stop during the walk",
-       [](Script& s) {
-         s.at["Walk"] = Terminate;
-         s.fail = {"Walk"};
-       },
+       "stop Walk, fail Walk",
        {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
       {"told to stop before the walk",
-       [](Script& s) { s.at["WaitReady"] = Terminate; },
+       "stop WaitReady",
        {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
       {"told to stop while it records",
-       [](Script& s) { s.at["Task.begin"] = Terminate; },
+       "stop Task.begin",
        {kWalkData, "Task.set(progress,1)", kWalkData, "Task.finish(new,false)",
         "Task.finish(new,false)", "_exit(0)"}},
       {"the walk throws",
-       [](Script& s) { s.Throw("Walk"); },
+       "throw Walk",
        {kWalkData, "Task.set(progress,-1)", failed, "Task.finish(new,false)", "_exit(0)"}},
-      {"the wait throws", [](Script& s) { s.Throw("WaitReady"); }, early_401},
-      {"a criterion of the wrong type", [](Script& s) { s.params["size_from"] = "x"; }, early_401},
-      {"recording throws",
-       [](Script& s) { s.Throw("Task.begin"); },
-       {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
+      {"the wait throws", "throw WaitReady", early_401},
+      {"a criterion of the wrong type", "text size_from", early_401},
+      {"recording throws", "throw Task.begin", {kWalkData, "Task.finish(new,false)", "_exit(0)"}},
       {"everything throws",
-       [](Script& s) {
-         s.Throw("Task.reload");
-         s.Throw("Task.finish");
-       },
+       "throw Task.reload, throw Task.finish",
        {"Task.finish(new,false)", "_exit(0)"}},
       {"no record, search failed: back through the request's path",
-       [](Script& s) {
-         s.at["Walk"] = [] { script.properties.clear(); };
-         s.fail = {"Walk"};
-       },
-       {kWalkData, "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[0]",
-        "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)", "reply 401 null",
-        "returned"}},
+       "lose Walk, fail Walk",
+       {kWalkData, "log S:281 Failed To parse the find parameters, reason=[0]",
+        "log S:909 Failed to get json data.", "~Task(new)", "reply 401 null", "returned"}},
       {"no record, search succeeded",
-       [](Script& s) { s.at["Walk"] = [] { script.properties.clear(); }; },
-       {kWalkData, "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)",
+       "lose Walk",
+       {kWalkData, "log S:909 Failed to get json data.", "~Task(new)",
         R"(reply 0 {"pattern":"a","recursive":true,"search_content":true})", "returned"}},
       {"no record before the walk",
-       [](Script& s) { s.properties.clear(); },
-       {"log NUVA.Arbory.Search:100 Failed to get json data",
-        "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[0]",
-        "log NUVA.Arbory.Search:909 Failed to get json data.", "~Task(new)", "reply 401 null",
-        "returned"}},
+       "no data",
+       {"log S:100 Failed to get json data",
+        "log S:281 Failed To parse the find parameters, reason=[0]",
+        "log S:909 Failed to get json data.", "~Task(new)", "reply 401 null", "returned"}},
   };
   for (const auto& row : rows) {
     Script play = WorkerScript();
-    row.arrange(play);
+    play.Arrange(row.arrange);
     const Trace trace = Serve(play, SearchAPIEntry);
     EXPECT_EQ(Keep(trace, {"log", "Task.set", "Task.finish", "reply", "~Task", "_exit", "returned",
                            "threw", "signal"}),
@@ -282,9 +256,7 @@ TEST(Worker, MapsTheWalksErrors) {
     snprintf(hex, sizeof(hex), "%X", static_cast<unsigned>(error));
     EXPECT_EQ(
         Keep(trace, {"log", "Task.set(data"}),
-        (Trace{std::string(
-                   "log NUVA.Arbory.Search:281 Failed To parse the find parameters, reason=[") +
-                   hex + "]",
+        (Trace{std::string("log S:281 Failed To parse the find parameters, reason=[") + hex + "]",
                R"(Task.set(data,{"errno":)" + std::to_string(code) + R"(,"pid":1}))"}));
   }
 }

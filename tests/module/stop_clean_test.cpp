@@ -22,7 +22,7 @@ Script EndScript(const char* method, const char* ids) {
 struct Row {
   const char* why;
   const char* ids;
-  std::function<void(Script&)> arrange;
+  const char* arrange;
   Trace expected;
 };
 
@@ -32,14 +32,14 @@ TEST(KillSearchWorker, LogsWhatIsNotAnEndedWorker) {
     int error;
     Trace expected;
   } rows[] = {
-      {0, 0, {"log NUVA.Arbory.Search:580 invalid process id", "false"}},
-      {-1, 0, {"log NUVA.Arbory.Search:580 invalid process id", "false"}},
+      {0, 0, {"log S:580 invalid process id", "false"}},
+      {-1, 0, {"log S:580 invalid process id", "false"}},
       {5, 0, {"kill(5,15)", "true"}},
       {5, ESRCH, {"kill(5,15)", "false"}},
       {5,
        EPERM,
        {"kill(5,15)",
-        "log NUVA.Arbory.Search:586 Failed to kill delete process, "
+        "log S:586 Failed to kill delete process, "
         "reason=Operation not permitted(1)",
         "false"}},
   };
@@ -56,31 +56,29 @@ TEST(Stop, EndsEachSearchThatItCanOpen) {
   const Row rows[] = {
       {"an unknown id is skipped",
        R"("gone,t1")",
-       [](Script&) {},
+       "",
        {"Task(ann,gone)", "Task(ann,t1)", "WaitKeyReady(data,pid,60)", "kill(77,15)",
         "Task.finish(t1,false)", "~Task(t1)", "reply 0 null"}},
       {"finished: no signal",
        R"(["t1",{}])",
-       [](Script& s) { s.finished = true; },
+       "finished",
        {"Task(ann,t1)", "WaitKeyReady(data,pid,60)", "Task.finish(t1,false)", "~Task(t1)",
         "reply 0 null"}},
       {"never ready",
        R"("t1")",
-       [](Script& s) { s.fail = {"WaitKeyReady"}; },
-       {"Task(ann,t1)", "WaitKeyReady(data,pid,60)",
-        "log NUVA.Arbory.Search:620 Failed to get json data", "Task.finish(t1,false)", "~Task(t1)",
-        "reply 0 null"}},
+       "fail WaitKeyReady",
+       {"Task(ann,t1)", "WaitKeyReady(data,pid,60)", "log S:620 Failed to get json data",
+        "Task.finish(t1,false)", "~Task(t1)", "reply 0 null"}},
       {"no data",
        R"("t1")",
-       [](Script& s) { s.properties.clear(); },
-       {"Task(ann,t1)", "WaitKeyReady(data,pid,60)",
-        "log NUVA.Arbory.Search:624 Failed to get json data", "Task.finish(t1,false)", "~Task(t1)",
-        "reply 0 null"}},
-      {"no ids at all", "{}", [](Script&) {}, {"reply 0 null"}},
+       "no data",
+       {"Task(ann,t1)", "WaitKeyReady(data,pid,60)", "log S:624 Failed to get json data",
+        "Task.finish(t1,false)", "~Task(t1)", "reply 0 null"}},
+      {"no ids at all", "{}", "", {"reply 0 null"}},
   };
   for (const auto& row : rows) {
     Script play = EndScript("stop", row.ids);
-    row.arrange(play);
+    play.Arrange(row.arrange);
     EXPECT_EQ(Keep(Serve(play, SearchAPIEntry),
                    {"Task", "~Task", "Wait", "kill", "log", "reply", "threw"}),
               row.expected)
@@ -95,7 +93,6 @@ TEST(Clean, AnswersAtOnce) {
 }
 
 TEST(Clean, RemovesTheDatabaseBeforeTheTask) {
-  const auto child = [](Script& s) { s.fork_result = 0; };
   const Trace database = {"getDBTask(/volume1,db1)", "DBTask.remove()", "~DBTask"};
   const Trace task = {"Task.remove(t1)", "~Task(t1)", "_exit(0)"};
   const Trace open = {"Task(ann,t1)", "WaitKeyReady(data,sdbid,60)"};
@@ -105,58 +102,27 @@ TEST(Clean, RemovesTheDatabaseBeforeTheTask) {
     return all;
   };
   const Row rows[] = {
-      {"running", R"("t1")", child, join({open, {"kill(77,15)"}, database, task})},
-      {"two, of which one is gone: nothing of the first is removed twice", R"("t2,gone")", child,
+      {"running", R"("t1")", "child", join({open, {"kill(77,15)"}, database, task})},
+      {"two, of which one is gone: nothing of the first is removed twice", R"("t2,gone")", "child",
        join({{"Task(ann,t2)", open[1], "kill(77,15)"},
              database,
              {"Task.remove(t2)", "~Task(t2)", "Task(ann,gone)", "_exit(0)"}})},
-      {"finished", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.finished = true;
-       },
-       join({open, database, task})},
-      {"never ready", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.fail = {"WaitKeyReady"};
-       },
-       join({open, {"log NUVA.Arbory.Search:682 Failed to get json data"}, task})},
-      {"no data", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.properties.clear();
-       },
-       join({open, {"log NUVA.Arbory.Search:687 Failed to get json data"}, task})},
-      {"no volume", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.properties["data"].removeMember("sdbvol");
-       },
-       join({open, {"kill(77,15)"}, task})},
-      {"no database", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.fail = {"getDBTask"};
-       },
+      {"finished", R"("t1")", "child, finished", join({open, database, task})},
+      {"never ready", R"("t1")", "child, fail WaitKeyReady",
+       join({open, {"log S:682 Failed to get json data"}, task})},
+      {"no data", R"("t1")", "child, no data",
+       join({open, {"log S:687 Failed to get json data"}, task})},
+      {"no volume", R"("t1")", "child, no volume", join({open, {"kill(77,15)"}, task})},
+      {"no database", R"("t1")", "child, fail getDBTask",
        join({open, {"kill(77,15)", database[0]}, task})},
-      {"no child: the request process does the work and ends", R"("t1")",
-       [](Script& s) { s.fail = {"NLIBCProcFork"}; },
-       join({{"log NUVA.Arbory.Search:668 Failed to fork()."},
-             open,
-             {"kill(77,15)"},
-             database,
-             task})},
-      {"an exception ends the child", R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.Throw("getDBTask");
-       },
+      {"no child: the request process does the work and ends", R"("t1")", "fail NLIBCProcFork",
+       join({{"log S:668 Failed to fork()."}, open, {"kill(77,15)"}, database, task})},
+      {"an exception ends the child", R"("t1")", "child, throw getDBTask",
        join({open, {"kill(77,15)", database[0], "_exit(0)"}})},
   };
   for (const auto& row : rows) {
     Script play = EndScript("clean", row.ids);
-    row.arrange(play);
+    play.Arrange(row.arrange);
     EXPECT_EQ(Keep(Serve(play, SearchAPIEntry), {"Task", "~Task", "Wait", "kill", "getDB", "DBTask",
                                                  "~DBTask", "log", "reply", "_exit", "threw"}),
               row.expected)
@@ -169,41 +135,29 @@ TEST(CleanAll, RemovesTheUsersFoldersByShell) {
                         "NLIBCExec(/bin/sh,-c,rm -rf /volume*/@tmp/webfm/FBSearch/<escaped>,null)",
                         "_exit(0)"};
   const Row rows[] = {
-      {"the parent answers", "null", [](Script&) {}, {"fork()", "reply 0 null"}},
+      {"the parent answers", "null", "", {"fork()", "reply 0 null"}},
       {"no child",
        "null",
-       [](Script& s) { s.fail = {"fork"}; },
-       {"fork()", "log NUVA.Arbory.Search:741 Failed to fork().", "reply 401 null"}},
+       "fail fork",
+       {"fork()", "log S:741 Failed to fork().", "reply 401 null"}},
       {"searches are stopped first",
        R"("t1")",
-       [](Script& s) { s.fork_result = 0; },
+       "child",
        {"fork()", "kill(77,15)", "Task.finish(t1,false)", remove[0], remove[1], remove[2]}},
-      {"no ids",
-       "null",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.params.removeMember("taskid");
-       },
-       {"fork()", remove[0], remove[1], remove[2]}},
+      {"no ids", "null", "child, no taskid", {"fork()", remove[0], remove[1], remove[2]}},
       {"a name that cannot be escaped reaches no shell",
        "[]",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.fail = {"NLIBCEncShParam"};
-       },
-       {"fork()", remove[0], "log NUVA.Arbory.Search:764 Failed to escape string: ann", remove[2]}},
+       "child, fail NLIBCEncShParam",
+       {"fork()", remove[0], "log S:764 Failed to escape string: ann", remove[2]}},
       {"an exception ends the child",
        R"("t1")",
-       [](Script& s) {
-         s.fork_result = 0;
-         s.Throw("WaitKeyReady");
-       },
+       "child, throw WaitKeyReady",
        {"fork()", "_exit(0)"}},
   };
   for (const auto& row : rows) {
     Script play = EndScript("Clean", row.ids);
     play.params["action"] = "cleanall";
-    row.arrange(play);
+    play.Arrange(row.arrange);
     EXPECT_EQ(Keep(Serve(play, SearchAPIEntry),
                    {"fork", "kill", "Task.", "NLIBC", "log", "reply", "_exit", "threw"}),
               row.expected)

@@ -1,0 +1,24 @@
+#!/bin/sh
+# What a server sees of the module: one exported function, and no library but the platform's, JsonCpp
+# and the language's own. And the module is written against platform/ alone.
+# Usage: check_exports.sh MODULE SOURCE_DIR
+set -eu
+failed=0
+expect_none() {
+  [ -z "$2" ] || { echo "$1:"; echo "$2"; failed=1; }
+}
+
+exports=$(nm -D --defined-only "$1" | awk '{print $3}')
+[ "$exports" = GetAPITable ] || { echo "exported: $exports"; failed=1; }
+
+needed=$(readelf -d "$1" | sed -n 's/.*(NEEDED).*\[\(.*\)\]/\1/p')
+[ -n "$needed" ] || { echo "no libraries listed"; failed=1; }
+expect_none "other libraries" "$(echo "$needed" |
+  grep -Ev '^(libarbory_nas|libjsoncpp|libstdc\+\+|libgcc_s|libc|libm|ld-linux.*)\.so' || true)"
+
+cd "$2"
+expect_none "other includes" "$(grep -En '^#include "' api/* search/* history/* |
+  grep -Ev '"(platform|api|search|history)/' || true)"
+expect_none "the platform's own libraries" "$(grep -EHn '#include <(sqlite3|utf8proc|pcre2|boost)' \
+  api/* search/* history/* || true)"
+exit $failed
