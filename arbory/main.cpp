@@ -17,19 +17,17 @@
 namespace arbory {
 namespace {
 
+// Lines of these texts fit a terminal of 80 columns.
 constexpr char kPatternHelp[] =
-    "PATTERN is compared with names, letter case ignored: a word matches anywhere in the name, "
-    "with\n"
-    "*, ? or [ ] the whole name. Words all have to match; a|b is either, !a is not, \"a b\" is "
-    "one\n"
-    "word, regex: begins a regular expression, '' is every name. A -- ends the options.\n"
+    "PATTERN is compared with names, letter case ignored: a word matches anywhere in\n"
+    "the name, with *, ? or [ ] the whole name. Several words must all match; a|b is\n"
+    "either, !a is not, \"a b\" is one word, regex: begins a regular expression and ''\n"
+    "is every name. A -- ends the options.\n"
     "\n"
-    "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or crtime.\n"
-    "\n"
-    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31, 2026-01-31T12:00, an age "
-    "such\n"
-    "as 30m, 12h or 7d, or seconds since 1970. Bounds are inclusive; a date alone means the whole\n"
-    "day.\n"
+    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31,\n"
+    "2026-01-31T12:00, an age such as 30m, 12h or 7d, or seconds since 1970. Bounds\n"
+    "are inclusive; a date alone means the whole day. COLUMN is name, path, size,\n"
+    "type, user, group, mode, mtime, atime, ctime or crtime.\n"
     "\n"
     "Exit status: 0 found, 1 nothing found, 2 error, 130 interrupted.\n"
     "\n"
@@ -40,13 +38,13 @@ constexpr char kPatternHelp[] =
     "  arbory search 'error code' /var/log --content\n";
 
 constexpr char kCallHelp[] =
-    "JSON is an object of parameters. Prints {\"code\":N,\"data\":...}.\n"
+    "JSON is an object of parameters. Prints {\"code\":N,\"data\":...} in one line.\n"
     "\n"
-    "Exit status: 0 for code 0, 1 for any other code, 2 when the call could not be made.\n"
+    "Exit status: 0 for code 0, 1 for any other code, 2 when no call was made.\n"
     "\n"
     "Example:\n"
-    "  arbory call NUVA.Arbory.Search 2 start '{\"folder_path\": \"/photo\", \"pattern\": "
-    "\"*.jpg\"}'\n";
+    "  arbory call NUVA.Arbory.Search 2 start \\\n"
+    "    '{\"folder_path\": \"/photo\", \"pattern\": \"*.jpg\"}'\n";
 
 // Help without the parser's own notes on which options need or exclude each other.
 class Formatter : public CLI::Formatter {
@@ -90,8 +88,7 @@ void AddCriteria(CLI::App* search, SearchOptions* options) {
       ->type_name("EXT")
       ->allow_extra_args(false);
   search
-      ->add_option("-t,--type", options->type,
-                   "file, dir, image, video, audio, document or archive")
+      ->add_option("-t,--type", options->type, "file, dir, image, video, audio, document, archive")
       ->type_name("TYPE");
   search->add_option("--size-from", options->size_from, "At least this large")->type_name("SIZE");
   search->add_option("--size-to", options->size_to, "At most this large")->type_name("SIZE");
@@ -180,8 +177,11 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error, const cha
 }
 
 int Run(int argc, char** argv) {
+  constexpr size_t kHelpColumn = 24;  // where descriptions begin
   CLI::App app("Searches folders by name, attributes and contents.", "arbory");
-  app.formatter(std::make_shared<Formatter>());
+  const auto formatter = std::make_shared<Formatter>();
+  formatter->column_width(kHelpColumn);
+  app.formatter(formatter);
   app.set_version_flag("--version", std::string("arbory ") + ARBORY_VERSION, "Print the version");
   app.require_subcommand(1);
   CallOptions call_options;
