@@ -1,6 +1,7 @@
 #include "tests/module/scripted_platform.h"
 
 #include <dlfcn.h>
+#include <gtest/gtest.h>
 #include <json/reader.h>
 #include <json/writer.h>
 #include <sys/syscall.h>
@@ -12,6 +13,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdarg>
+#include <cstdint>
 #include <cstdio>
 #include <cstring>
 #include <sstream>
@@ -42,13 +44,17 @@ bool Called(const std::string& operation, const std::string& arguments = "") {
 
 std::string Or(const char* text) { return text == nullptr ? "null" : text; }
 
-// Criteria by the arguments that made them; times do not know their own kind when they are made.
-std::map<const FileSearch::FindComp*, std::string> made_with;
+// The arguments that a criterion was made with. The key is not its address, in which a leak check
+// would see an owner.
+std::string& MadeWith(const FileSearch::FindComp* comp) {
+  static std::map<std::uintptr_t, std::string> arguments;
+  return arguments[~reinterpret_cast<std::uintptr_t>(comp)];
+}
 
 class TextComp : public FileSearch::FindComp {
  public:
-  explicit TextComp(const std::string& text) { made_with[this] = text; }
-  ~TextComp() override { Note("~" + made_with[this]); }
+  explicit TextComp(const std::string& text) { MadeWith(this) = text; }
+  ~TextComp() override { Note("~" + MadeWith(this)); }
   Needs needs() const override { return Needs::kName; }
   bool match(const FileSearch::WalkEntry& /*entry*/) const override { return true; }
 };
@@ -61,7 +67,7 @@ std::string Describe(const Comps& comps) {
     if (dynamic_cast<const FileSearch::FindMTimeComp*>(comp) != nullptr) kind = "mtime ";
     if (dynamic_cast<const FileSearch::FindCRTimeComp*>(comp) != nullptr) kind = "crtime ";
     if (dynamic_cast<const FileSearch::FindATimeComp*>(comp) != nullptr) kind = "atime ";
-    text += (text.empty() ? "" : "; ") + std::string(kind) + made_with[comp];
+    text += (text.empty() ? "" : "; ") + std::string(kind) + MadeWith(comp);
   }
   return "[" + text + "]";
 }
@@ -197,16 +203,15 @@ Trace Play(const Script& play, const std::function<void()>& body) {
     close(ends[0]);
     script = play;
     trace_fd = ends[1];
+    bool leaked = false;
     try {
       body();
-      if (&__lsan_do_recoverable_leak_check != nullptr && __lsan_do_recoverable_leak_check() != 0) {
-        Note("reply: memory was leaked");
-      }
+      leaked = &__lsan_do_recoverable_leak_check != nullptr && __lsan_do_recoverable_leak_check();
       Note("returned");
     } catch (const std::exception& e) {
       Note(std::string("threw ") + e.what());
     }
-    syscall(SYS_exit_group, 0);
+    syscall(SYS_exit_group, leaked ? 1 : 0);
   }
   close(ends[1]);
   FILE* in = fdopen(ends[0], "r");
@@ -218,7 +223,7 @@ Trace Play(const Script& play, const std::function<void()>& body) {
   fclose(in);
   int status = 0;
   waitpid(pid, &status, 0);
-  if (WIFSIGNALED(status)) trace.push_back("signal " + std::to_string(WTERMSIG(status)));
+  EXPECT_EQ(status, 0) << "killed, leaking or found wanting by a sanitizer";
   return trace;
 }
 
@@ -437,11 +442,11 @@ int WaitForTaskDataKeyReady(OKT::Task* /*task*/, const char* name, const char* m
 namespace FileSearch {
 
 FindSizeComp::FindSizeComp(const char* op, long long bytes) : at_least_(*op == 'g'), bytes_(bytes) {
-  made_with[this] = std::string("size ") + op + " " + std::to_string(bytes);
+  MadeWith(this) = std::string("size ") + op + " " + std::to_string(bytes);
 }
 bool FindSizeComp::match(const WalkEntry& /*entry*/) const { return at_least_ && bytes_ != 0; }
 FindTimeComp::FindTimeComp(const char* op, long seconds) : after_(*op == 'a'), seconds_(seconds) {
-  made_with[this] = std::string(op) + " " + std::to_string(seconds);
+  MadeWith(this) = std::string(op) + " " + std::to_string(seconds);
 }
 bool FindTimeComp::InRange(std::int64_t file_seconds) const {
   return after_ == (file_seconds >= seconds_);

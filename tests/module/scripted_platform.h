@@ -4,13 +4,12 @@
 //
 // A call is traced as "Operation(arguments)"; the module's log lines as "log TEXT" (with "S" for
 // its source name "NUVA.Arbory.Search"), its reply as "reply CODE DATA", and how it ended as
-// "returned", "threw TEXT", "_exit(N)" or "signal N".
+// "returned", "threw TEXT" or "_exit(N)". A child that is killed or leaks fails the test.
 
 #include <json/value.h>
 
 #include <functional>
 #include <map>
-#include <optional>
 #include <set>
 #include <string>
 #include <vector>
