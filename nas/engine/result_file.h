@@ -14,8 +14,11 @@
 //   attributes(first, data)                  FileAttributes for each row, as in memory
 //   purged(row)                              rows whose file has vanished
 //   complete(rows)                           one row once no more rows will follow
-//   ordering(sort_column, data)              all rows in ascending order of a column, as 32-bit
-//                                            numbers; kept only once the file is complete
+//   ordering(id, data)                       all rows in ascending order of a column, as 32-bit
+//                                            numbers in pieces of kOrderingPiece, so that a page is
+//                                            read without the rest; id is the column * 2^32 + the
+//                                            piece's number. Kept only once the file is complete,
+//                                            each column's pieces in one transaction
 //
 // One worker appends, any number of listings read and purge (WAL). Blocks are never changed. The
 // file stays on the machine that made it, so numbers are in its own byte order, and it need not
@@ -31,6 +34,9 @@
 namespace nas {
 
 constexpr int kResultVersion = 1;
+
+// Rows in one piece of a kept ordering: 64 KB.
+constexpr std::uint64_t kOrderingPiece = 16 * 1024;
 
 // How long a writer waits for another: longer than any listing holds its short write transaction.
 constexpr int kResultBusyMilliseconds = 10'000;

@@ -3,6 +3,7 @@
 #include <grp.h>
 #include <pwd.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -40,6 +41,10 @@ Database OpenResultFile(const std::string& path) {
   return db;
 }
 
+std::int64_t OrderingId(SortColumn column, std::uint64_t piece) {
+  return (std::int64_t{static_cast<int>(column)} << 32) + static_cast<std::int64_t>(piece);
+}
+
 std::uint64_t NumberKey(SortColumn column, const FileAttributes& file) {
   switch (column) {
     case SortColumn::kSize:
@@ -68,7 +73,7 @@ std::optional<SortColumn> ParseSortColumn(std::string_view word) {
   return std::nullopt;
 }
 
-ResultReader::ResultReader(const std::string& path) : db_(OpenResultFile(path)) {}
+ResultReader::ResultReader(const std::string& path) : path_(path), db_(OpenResultFile(path)) {}
 
 void ResultReader::Begin() {
   transaction_.emplace(db_, Transaction::Kind::kRead);
@@ -179,16 +184,37 @@ void ResultReader::ForEachAttributes(Visitor visit) {
   }
 }
 
-std::optional<Ordering> ResultReader::Select(const Selection& selection) {
-  if (selection.column == SortColumn::kFound && !selection.filters() && purged_.empty()) {
-    return std::nullopt;
+ResultReader::Page ResultReader::Select(const Selection& selection, std::uint64_t offset,
+                                        std::uint64_t limit) {
+  Page page;
+  const bool reversed = !selection.ascending && selection.column != SortColumn::kFound;
+  if (purged_.empty() && !selection.filters()) {
+    // All rows: only the page itself need be known of their order.
+    page.total = rows_;
+    const std::uint64_t begin = std::min(offset, rows_);
+    const std::uint64_t count = std::min(limit, rows_ - begin);
+    const std::uint64_t first = reversed ? rows_ - begin - count : begin;
+    if (!ReadKept(selection.column, first, count, page.numbers)) {
+      const Ordering all = OrderingOf(selection.column);
+      const auto from = all.begin() + static_cast<std::ptrdiff_t>(first);
+      page.numbers.assign(from, from + static_cast<std::ptrdiff_t>(count));
+    }
+    if (reversed) std::ranges::reverse(page.numbers);
+    return page;
   }
-  Ordering ordering = OrderingOf(selection.column);
-  if (!selection.ascending && selection.column != SortColumn::kFound) {
-    std::reverse(ordering.begin(), ordering.end());
-  }
-  if (purged_.empty() && !selection.filters()) return ordering;
+  Ordering passing = OrderingOf(selection.column);
+  std::erase_if(passing, [passes = Passing(selection)](std::uint32_t row) { return !passes[row]; });
+  if (reversed) std::ranges::reverse(passing);
+  page.total = passing.size();
+  const std::uint64_t begin = std::min(offset, page.total);
+  const std::uint64_t end = begin + std::min(limit, page.total - begin);
+  page.numbers.assign(passing.begin() + static_cast<std::ptrdiff_t>(begin),
+                      passing.begin() + static_cast<std::ptrdiff_t>(end));
+  return page;
+}
 
+// For each row whether it passes the filters and has not been purged.
+std::vector<bool> ResultReader::Passing(const Selection& selection) {
   std::vector<bool> passes(rows_, true);
   for (const std::uint32_t row : purged_) {
     if (row < rows_) passes[row] = false;
@@ -207,26 +233,40 @@ std::optional<Ordering> ResultReader::Select(const Selection& selection) {
       }
     });
   }
-  std::erase_if(ordering, [&passes](std::uint32_t row) { return !passes[row]; });
-  return ordering;
+  return passes;
+}
+
+// Appends to `out` the rows [offset, offset + limit) of a kept ordering; false where none is kept.
+bool ResultReader::ReadKept(SortColumn column, std::uint64_t offset, std::uint64_t limit,
+                            Ordering& out) {
+  if (column == SortColumn::kFound) {
+    for (std::uint64_t i = 0; i < limit; ++i) out.push_back(static_cast<std::uint32_t>(offset + i));
+    return true;
+  }
+  out.reserve(limit);
+  Statement pieces(db_, "SELECT data FROM ordering WHERE id BETWEEN ? AND ? ORDER BY id");
+  pieces.Bind(1, OrderingId(column, offset / kOrderingPiece))
+      .Bind(2, OrderingId(column, (offset + limit) / kOrderingPiece));
+  std::uint64_t skip = offset % kOrderingPiece;
+  while (out.size() < limit && pieces.Step()) {
+    const std::string_view data = pieces.Bytes(0);
+    const std::uint64_t there = data.size() / sizeof(std::uint32_t);
+    const std::uint64_t count = std::min(there - std::min(there, skip), limit - out.size());
+    const size_t before = out.size();
+    out.resize(before + count);
+    std::memcpy(out.data() + before, data.data() + skip * sizeof(std::uint32_t),
+                count * sizeof(std::uint32_t));
+    skip = 0;
+  }
+  if (out.size() == limit && (limit > 0 || rows_ == 0)) return true;
+  out.clear();
+  return false;
 }
 
 Ordering ResultReader::OrderingOf(SortColumn column) {
-  if (column == SortColumn::kFound) {
-    Ordering found(rows_);
-    for (std::uint32_t i = 0; i < found.size(); ++i) found[i] = i;
-    return found;
-  }
-  Statement kept(db_, "SELECT data FROM ordering WHERE sort_column = ?");
-  if (kept.Bind(1, static_cast<int>(column)).Step()) {
-    const std::string_view data = kept.Bytes(0);
-    if (data.size() == rows_ * sizeof(std::uint32_t)) {
-      Ordering ordering(rows_);
-      std::memcpy(ordering.data(), data.data(), data.size());
-      return ordering;
-    }
-  }
-  Ordering ordering = MakeOrdering(column);
+  Ordering ordering;
+  if (ReadKept(column, 0, rows_, ordering)) return ordering;
+  ordering = MakeOrdering(column);
   KeepOrdering(column, ordering);
   return ordering;
 }
@@ -333,14 +373,29 @@ Ordering ResultReader::OrderByOwner(std::uint32_t FileAttributes::*id, NameOf na
 // Keeping is a convenience: where it fails (a full disk, a busy file) the page is served all the
 // same and the next listing sorts again.
 void ResultReader::KeepOrdering(SortColumn column, const Ordering& ordering) {
-  if (ordering.size() < kWorthKeeping || !Statement(db_, "SELECT 1 FROM complete").Step()) return;
+  if (ordering.size() < kWorthKeeping || !complete()) return;
   try {
-    Statement(db_, "INSERT OR REPLACE INTO ordering VALUES(?,?)")
-        .Bind(1, static_cast<int>(column))
-        .BindBlob(2, {reinterpret_cast<const char*>(ordering.data()),
-                      ordering.size() * sizeof(Ordering::value_type)})
-        .Run();
+    Statement insert(db_, "INSERT OR REPLACE INTO ordering VALUES(?,?)");
+    const std::string_view bytes(reinterpret_cast<const char*>(ordering.data()),
+                                 ordering.size() * sizeof(Ordering::value_type));
+    constexpr size_t kPieceBytes = kOrderingPiece * sizeof(Ordering::value_type);
+    for (size_t piece = 0; piece * kPieceBytes < bytes.size(); ++piece) {
+      insert.Bind(1, OrderingId(column, piece))
+          .BindBlob(2, bytes.substr(piece * kPieceBytes, kPieceBytes))
+          .Run();
+    }
   } catch (const SqliteError&) {
+  }
+}
+
+bool ResultReader::complete() { return Statement(db_, "SELECT 1 FROM complete").Step(); }
+
+void ResultReader::KeepAllOrderings() {
+  for (const auto& known : kSortColumns) {
+    Begin();
+    if (rows_ < kWorthKeeping || !complete() || access(path_.c_str(), F_OK) != 0) return;
+    OrderingOf(known.column);
+    End();
   }
 }
 

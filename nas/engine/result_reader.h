@@ -61,13 +61,20 @@ class ResultReader {
   void Begin();
   void End();
 
-  // The rows that pass, in their order: numbers for Row. Nothing stands for "all rows in the order
-  // found", which needs no list.
-  std::optional<Ordering> Select(const Selection& selection);
+  // A page of the rows that pass, in their order, and how many pass in all.
+  struct Page {
+    std::vector<std::uint32_t> numbers;  // for Row
+    std::uint64_t total = 0;
+  };
+  Page Select(const Selection& selection, std::uint64_t offset, std::uint64_t limit);
   bool purged(std::uint32_t row) const { return purged_.contains(row); }
   // How many rows there are, purged ones included.
   std::uint64_t rows() const { return rows_; }
   ResultRow Row(std::uint32_t number);
+
+  // Sorts by every column and keeps the orderings that are not yet kept, so that listings need not.
+  // Stops between columns where a file is not complete or has been deleted.
+  void KeepAllOrderings();
 
   // Marks rows as purged, outside Begin and End. Throws SqliteError.
   void Purge(const std::vector<std::uint32_t>& numbers);
@@ -103,6 +110,8 @@ class ResultReader {
   void ForEachNames(Visitor visit);
   template <typename Visitor>
   void ForEachAttributes(Visitor visit);
+  std::vector<bool> Passing(const Selection& selection);
+  bool ReadKept(SortColumn column, std::uint64_t offset, std::uint64_t limit, Ordering& out);
   Ordering OrderingOf(SortColumn column);
   Ordering MakeOrdering(SortColumn column);
   Ordering OrderByPath();
@@ -111,6 +120,9 @@ class ResultReader {
   Ordering OrderByOwner(std::uint32_t FileAttributes::*id, NameOf name_of);
   void KeepOrdering(SortColumn column, const Ordering& ordering);
 
+  bool complete();
+
+  const std::string path_;
   Database db_;
   std::optional<Transaction> transaction_;
   std::uint64_t rows_ = 0;

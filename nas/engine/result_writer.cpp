@@ -16,7 +16,7 @@ constexpr char kMakeFile[] =
     "CREATE TABLE attributes(first INTEGER PRIMARY KEY, data BLOB);"
     "CREATE TABLE purged(row INTEGER PRIMARY KEY);"
     "CREATE TABLE complete(rows INTEGER);"
-    "CREATE TABLE ordering(sort_column INTEGER PRIMARY KEY, data BLOB);"
+    "CREATE TABLE ordering(id INTEGER PRIMARY KEY, data BLOB);"
     "PRAGMA user_version=1;"
     "COMMIT;";
 static_assert(kResultVersion == 1, "the version is written above");

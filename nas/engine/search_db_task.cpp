@@ -84,13 +84,11 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
                                   const nas::Selection& selection, SelectCallback callback,
                                   void* context, unsigned long long* total) {
   reader_.Begin();
-  const std::optional<nas::Ordering> ordering = reader_.Select(selection);
-  const std::uint64_t count = ordering ? ordering->size() : reader_.rows();
-  *total = count;
-  const std::uint64_t end = std::min<std::uint64_t>(count, std::uint64_t{offset} + limit);
-  for (std::uint64_t i = offset; i < end; ++i) {
-    current_ = ordering ? (*ordering)[i] : static_cast<std::uint32_t>(i);
-    if (Lend(reader_, reader_.Row(*current_), callback, context) == 0) break;
+  const nas::ResultReader::Page page = reader_.Select(selection, offset, limit);
+  *total = page.total;
+  for (const std::uint32_t number : page.numbers) {
+    current_ = number;
+    if (Lend(reader_, reader_.Row(number), callback, context) == 0) break;
   }
   current_.reset();
   reader_.End();

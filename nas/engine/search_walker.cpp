@@ -1,14 +1,19 @@
 // The walker that a search worker runs: opens the locations, makes the result database, runs the
 // job and tells the task how it goes.
 
+#include <signal.h>
 #include <sys/resource.h>
 #include <syslog.h>
+#include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
 #include <system_error>
+#include <thread>
 
 #include "nas/engine/location.h"
 #include "nas/engine/result_file.h"
+#include "nas/engine/result_reader.h"
 #include "nas/engine/result_writer.h"
 #include "nas/engine/search_job.h"
 #include "nas/system/error.h"
@@ -49,6 +54,31 @@ void SetErrorFromException() {
     syslog(LOG_ERR, "search: %s", error.what());
     nas::SetLastError(nas::kErrorOther);
   }
+}
+
+// Results from this many on take noticeably long to sort for the first time.
+constexpr std::uint64_t kWorthSorting = 20'000;
+// A client that only wanted the rows, such as a terminal, has removed them by then.
+constexpr std::chrono::milliseconds kBeforeSorting(200);
+constexpr int kSortingNiceness = 10;
+
+// Sorts a finished search's results by every column, so that no listing has to wait for it. Done in
+// a process of its own, which lives a second or two, because the search counts as finished only
+// when the worker has gone. It gives up every descriptor first: one of them says that the search's
+// worker is alive. No SQLite handle may be open in this process.
+void SortInBackground(const std::string& path) {
+  const pid_t child = fork();
+  if (child != 0) return;  // where no process can be had, listings sort for themselves
+  signal(SIGTERM, SIG_DFL);
+  closelog();
+  close_range(0, ~0U, 0);
+  if (nice(kSortingNiceness) == -1) errno = 0;
+  std::this_thread::sleep_for(kBeforeSorting);
+  try {
+    if (access(path.c_str(), F_OK) == 0) nas::ResultReader(path).KeepAllOrderings();
+  } catch (const std::exception&) {
+  }
+  _exit(0);
 }
 
 }  // namespace
@@ -128,6 +158,10 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
   const bool completed = job.Run();
   writer_->Complete();
   Report(job.progress(), true);
+  if (writer_->rows() >= kWorthSorting) {
+    writer_.reset();
+    SortInBackground(nas::ResultPath(folder_, id_));
+  }
   return completed;
 } catch (...) {
   SetErrorFromException();

@@ -27,11 +27,14 @@ class Results : public testing::Test {
 std::vector<std::string> Names(ResultReader& reader, const Selection& selection) {
   reader.Begin();
   std::vector<std::string> names;
-  const auto ordering = reader.Select(selection);
-  const std::uint64_t count = ordering ? ordering->size() : reader.rows();
-  for (std::uint32_t i = 0; i < count; ++i) {
-    names.emplace_back(reader.Row(ordering ? (*ordering)[i] : i).name);
-  }
+  // In pages, so that what a page is cut from does not matter.
+  constexpr std::uint64_t kPage = 1'000;
+  ResultReader::Page page;
+  do {
+    page = reader.Select(selection, names.size(), kPage);
+    for (const std::uint32_t number : page.numbers) names.emplace_back(reader.Row(number).name);
+  } while (page.numbers.size() == kPage);
+  EXPECT_EQ(page.total, names.size());
   reader.End();
   return names;
 }
@@ -135,7 +138,7 @@ TEST(Ordering, NaturalKeys) {
 }
 
 TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
-  constexpr std::uint32_t kRows = 3 * RowBlock::kMostRows + 17;
+  constexpr std::uint32_t kRows = 2 * kOrderingPiece + 17;
   ResultWriter writer(path_);
   writer.AddLocation(0, "share", "/s");
   RowBlock block;
@@ -153,6 +156,11 @@ TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
   for (std::uint32_t i = kRows; i-- > 0;) expected.push_back("f" + std::to_string(i));
   ResultReader reader(path_);
   EXPECT_EQ(Names(reader, by_size), expected);
+  reader.KeepAllOrderings();
+  EXPECT_EQ(Names(reader, by_size), expected) << "as kept";
+  by_size.ascending = false;
+  EXPECT_EQ(Names(reader, by_size), std::vector<std::string>(expected.rbegin(), expected.rend()));
+  by_size.ascending = true;
   reader.Purge({0, RowBlock::kMostRows, kRows - 1});
   reader.Purge({0});
   std::erase_if(expected, [](const std::string& name) {
