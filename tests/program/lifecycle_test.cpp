@@ -59,18 +59,20 @@ class Lifecycle : public ProgramTest {
 };
 
 TEST_F(Lifecycle, AKilledWorkerLeavesAFinishedSearchThatCanBeCleaned) {
-  for (const char* stage : {"started", "located", "contents"}) {
+  for (const std::string stage : {"contents", "located", "started"}) {
     SCOPED_TRACE(stage);
     const std::string id = StartEndless();
     ASSERT_TRUE(Reaches(id, stage));
     ASSERT_EQ(kill(Worker(id), SIGKILL), 0);
     const Reply list = ListToEnd(id);
     // Killed before it had a result database, there is nothing to list, and that is said at once.
-    EXPECT_TRUE(list.code == 0 || (list.code == 600 && std::string(stage) == "started"));
+    EXPECT_TRUE(list.code == 0 || (list.code == 600 && stage == "started"));
     EXPECT_EQ(TaskProperty(id, "progress"), 0);
     EXPECT_EQ(Call("stop", Id(id)).code, 0);
     EXPECT_EQ(Call("clean", Id(id)).code, 0);
-    EXPECT_TRUE(Eventually([&] { return Remains().empty(); })) << Remains().front();
+    EXPECT_TRUE(Eventually([&] { return TaskProperty(id, "data") == "gone"; }));
+    // A database that was made but not yet named in the task goes with the day's sweep.
+    EXPECT_TRUE(stage == "started" || Eventually([&] { return Remains().empty(); }));
   }
 }
 
