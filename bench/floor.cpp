@@ -34,7 +34,7 @@ bool g_read_files = false;
 
 // A descriptor that several waiting sub-folders share.
 struct Handle {
-  explicit Handle(int fd) : fd(fd) {}
+  explicit Handle(int opened) : fd(opened) {}
   ~Handle() { close(fd); }
   Handle(const Handle&) = delete;
   Handle& operator=(const Handle&) = delete;
