@@ -1,0 +1,99 @@
+// The server's routes as functions. Everything goes to the page's own origin.
+import { ApiError, callFailure, UNREACHABLE } from './errors.ts';
+import type {
+  HistoryKind,
+  HistoryRecord,
+  Page,
+  Progress,
+  Session,
+  Shares,
+  Started,
+} from './types.ts';
+
+const SEARCH = 'NUVA.Arbory.Search/2';
+const HISTORY = 'NUVA.Arbory.Search.History/1';
+
+// A busy server says when to come back; this often it is asked again before a person is told.
+const BUSY_TRIES = 4;
+const BUSY_SECONDS_MOST = 5;
+
+const wait = (ms: number) => new Promise((done) => setTimeout(done, ms));
+
+async function request(path: string, init: RequestInit = {}): Promise<unknown> {
+  for (let tries = 1; ; ++tries) {
+    let response: Response;
+    try {
+      response = await fetch(path, { credentials: 'same-origin', cache: 'no-store', ...init });
+    } catch (error) {
+      if ((error as Error).name === 'AbortError') throw error;
+      throw new ApiError(UNREACHABLE, 0);
+    }
+    const body = (await response.json().catch(() => null)) as Record<string, unknown> | null;
+    if (response.ok && body) return body;
+    if (response.status === 503 && tries < BUSY_TRIES) {
+      const seconds = Number(response.headers.get('Retry-After')) || 1;
+      await wait(Math.min(seconds, BUSY_SECONDS_MOST) * 1000);
+      continue;
+    }
+    const mode = typeof body?.mode === 'string' ? body.mode : '';
+    const code = Number(body?.code ?? 0);
+    throw new ApiError(sentence(response.status, body), response.status, code, mode);
+  }
+}
+
+function sentence(status: number, body: Record<string, unknown> | null): string {
+  if (typeof body?.error === 'string' && body.error) {
+    const text = body.error[0]!.toUpperCase() + body.error.slice(1);
+    return /[.!?]$/.test(text) ? text : text + '.';
+  }
+  return status === 503 ? 'The server is busy. Try again in a moment.' : UNREACHABLE;
+}
+
+function post(path: string, body: object, init: RequestInit = {}): Promise<unknown> {
+  const headers = { 'Content-Type': 'application/json' };
+  return request(path, { method: 'POST', headers, body: JSON.stringify(body), ...init });
+}
+
+async function call<T>(api: string, method: string, params: object, init?: RequestInit) {
+  const reply = (await post(`api/${api}/${method}`, params, init)) as { code: number; data: T };
+  if (reply.code !== 0) throw new ApiError(callFailure(method, reply.code), 200, reply.code);
+  return reply.data;
+}
+
+export const startSearch = (params: object) => call<Started>(SEARCH, 'start', params);
+export const stopSearch = (taskid: string) => call<null>(SEARCH, 'stop', { taskid: [taskid] });
+// Outlives the page, so that leaving it leaves nothing behind.
+export const cleanSearch = (taskid: string) =>
+  call<object>(SEARCH, 'clean', { taskid: [taskid] }, { keepalive: true });
+export const searchProgress = (taskid: string) =>
+  request(`searches/${encodeURIComponent(taskid)}`) as Promise<Progress>;
+
+export interface ListParams {
+  taskid: string;
+  offset: number;
+  limit: number;
+  sort_by?: string;
+  sort_direction?: 'ASC' | 'DESC';
+}
+
+export async function listResults(params: ListParams, signal?: AbortSignal): Promise<Page> {
+  const additional = ['size', 'owner', 'time', 'type'];
+  const page = await call<Partial<Page>>(SEARCH, 'list', { additional, ...params }, { signal });
+  return { files: [], total: 0, offset: params.offset, finished: true, ...page };
+}
+
+export const getHistory = (search_type: HistoryKind) =>
+  call<{ history: HistoryRecord[] }>(HISTORY, 'get', { search_type });
+export const clearHistory = (search_type: HistoryKind) =>
+  call<null>(HISTORY, 'delete', { search_type });
+
+export const getSession = () => request('session') as Promise<Session>;
+export const getShares = () => request('shares') as Promise<Shares>;
+export const logIn = (user: string, password: string) => post('login', { user, password });
+export const logOut = () => post('logout', { stop_searches: true });
+
+// Where a listed file is fetched from; `path` is as listed, "/SHARE/below".
+export function fileAddress(path: string, preview = false): string {
+  const segments = path.replace(/^\/+/, '').split('/').map(encodeURIComponent).join('/');
+  return `files/${segments}${preview ? '?preview=1' : ''}`;
+}

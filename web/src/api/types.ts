@@ -1,0 +1,57 @@
+// What the server replies.
+export interface FileRow {
+  name: string;
+  path: string;
+  is_dir: boolean;
+  size?: number;
+  type?: string;
+  owner?: { user: string; group: string };
+  time?: { mtime: number; atime: number; ctime: number; crtime: number };
+}
+
+export interface Page {
+  files: FileRow[];
+  total: number;
+  offset: number;
+  finished: boolean;
+}
+
+export interface Started {
+  taskid: string;
+  has_not_index_share: boolean;
+}
+
+export interface Walk {
+  phase: 'names' | 'contents' | 'done';
+  folders: number;
+  entries: number;
+  matches: number;
+  skipped: { permission: number; vanished: number; other: number };
+}
+
+export interface Progress {
+  taskid: string;
+  finished: boolean;
+  progress: number; // 0 running or stopped, 1 done, -1 failed
+  errno?: number;
+  walk?: Partial<Walk>;
+}
+
+export interface Session {
+  user: string;
+  mode: 'single' | 'login';
+  version?: string;
+}
+
+export interface Share {
+  name: string;
+  indexed: boolean;
+}
+
+export interface Shares {
+  shares: Share[];
+  homes: boolean;
+}
+
+export type HistoryKind = 'simple' | 'advance';
+export type HistoryRecord = Record<string, unknown>;

@@ -1,0 +1,65 @@
+// The search in the address bar. It stands behind the "#", which is never sent to the server, so
+// that what people look for does not end up in the logs of a proxy.
+import { KINDS, NO_CRITERIA, type Criteria } from './criteria.ts';
+import { timeBounds } from './times.ts';
+
+export const SORT_COLUMNS = ['name', 'path', 'type', 'size', 'mtime'] as const;
+export type SortColumn = (typeof SORT_COLUMNS)[number];
+
+// No sort: as found, which is the order that never moves a row while the search runs.
+export interface Sort {
+  column: SortColumn;
+  descending: boolean;
+}
+
+export interface Address {
+  criteria: Criteria;
+  sort: Sort | null;
+}
+
+const TEXTS = [
+  ['type', 'kind'],
+  ['ext', 'extension'],
+  ['min', 'sizeFrom'],
+  ['max', 'sizeTo'],
+  ['modified', 'modified'],
+  ['created', 'created'],
+  ['accessed', 'accessed'],
+  ['owner', 'owner'],
+  ['group', 'group'],
+] as const;
+
+export function toHash({ criteria, sort }: Address): string {
+  const query = new URLSearchParams();
+  query.set('q', criteria.pattern);
+  for (const folder of criteria.folders) query.append('in', folder);
+  for (const [key, field] of TEXTS) if (criteria[field]) query.set(key, criteria[field]);
+  if (criteria.contents) query.set('contents', '1');
+  if (!criteria.subfolders) query.set('subfolders', '0');
+  if (sort) query.set('sort', (sort.descending ? '-' : '') + sort.column);
+  return '#' + query.toString();
+}
+
+// Null when the address holds no search. Parts that cannot be right are left out: an address is
+// anyone's to write.
+export function fromHash(hash: string): Address | null {
+  const query = new URLSearchParams(hash.replace(/^#/, ''));
+  if (!query.has('q')) return null;
+  const criteria: Criteria = { ...NO_CRITERIA, pattern: query.get('q') ?? '' };
+  criteria.folders = query.getAll('in').filter((folder) => /^\/[^/]/.test(folder));
+  for (const [key, field] of TEXTS) criteria[field] = query.get(key) ?? '';
+  if (!KINDS.some(([kind]) => kind === criteria.kind)) criteria.kind = '';
+  const now = new Date();
+  for (const field of ['modified', 'created', 'accessed'] as const) {
+    if (!timeBounds(criteria[field], now)) criteria[field] = '';
+  }
+  criteria.contents = query.get('contents') === '1';
+  criteria.subfolders = query.get('subfolders') !== '0';
+  return { criteria, sort: parseSort(query.get('sort')) };
+}
+
+function parseSort(text: string | null): Sort | null {
+  const descending = text?.startsWith('-') ?? false;
+  const column = SORT_COLUMNS.find((name) => name === text?.replace(/^-/, ''));
+  return column ? { column, descending } : null;
+}

@@ -1,0 +1,84 @@
+// Names as they are shown. A file name may hold anything but "/" and NUL: line breaks, escape codes,
+// marks that turn the direction of what follows. Those are replaced by signs that can be seen, so
+// that a name never looks like another one; the rest is left to the browser.
+export interface Piece {
+  text: string;
+  marked: boolean; // part of what was searched for
+  sign: boolean; // stands for a character that cannot be seen
+}
+
+export type Range = [start: number, end: number];
+
+// Controls, direction marks, invisible spaces and separators. Joiners (U+200C, U+200D) are left:
+// scripts and emoji need them.
+const UNSEEN =
+  /[\u0000-\u001f\u007f-\u009f\u00ad\u061c\u180e\u200b\u200e\u200f\u2028-\u202e\u2060-\u206f\ufeff\ufff9-\ufffb]/g;
+const CONTROL_PICTURES = 0x2400;
+const DELETE_PICTURE = '\u2421';
+
+function signFor(character: string): string {
+  const code = character.charCodeAt(0);
+  if (code < 0x20) return String.fromCharCode(CONTROL_PICTURES + code);
+  if (code === 0x7f) return DELETE_PICTURE;
+  return `U+${code.toString(16).toUpperCase().padStart(4, '0')}`;
+}
+
+// `ranges` are ordered and do not overlap.
+export function pieces(text: string, ranges: Range[] = []): Piece[] {
+  const out: Piece[] = [];
+  let at = 0;
+  for (const [start, end] of ranges) {
+    addPlain(out, text.slice(at, start), false);
+    addPlain(out, text.slice(start, end), true);
+    at = end;
+  }
+  addPlain(out, text.slice(at), false);
+  return out;
+}
+
+function addPlain(out: Piece[], text: string, marked: boolean): void {
+  let at = 0;
+  for (const match of text.matchAll(UNSEEN)) {
+    if (match.index > at) out.push({ text: text.slice(at, match.index), marked, sign: false });
+    out.push({ text: signFor(match[0]), marked, sign: true });
+    at = match.index + match[0].length;
+  }
+  if (at < text.length) out.push({ text: text.slice(at), marked, sign: false });
+}
+
+// For titles and sentences, where there is only text.
+export function visible(text: string): string {
+  return text.replace(UNSEEN, signFor);
+}
+
+// A name that the server could not tell as text: its real bytes are not known here.
+export function hasLostBytes(text: string): boolean {
+  return text.includes('\ufffd');
+}
+
+const counts = new Intl.NumberFormat('en');
+export function count(n: number): string {
+  return counts.format(n);
+}
+
+export function plural(n: number, one: string, many = one + 's'): string {
+  return `${count(n)} ${n === 1 ? one : many}`;
+}
+
+export function elapsed(milliseconds: number): string {
+  const seconds = milliseconds / 1000;
+  if (seconds < 59.95) return `${seconds.toFixed(seconds < 9.995 ? 2 : 1)} s`;
+  const whole = Math.round(seconds);
+  return `${Math.floor(whole / 60)} min ${whole % 60} s`;
+}
+
+// The folder of "/share/a/b.txt" is "/share/a".
+export function folderOf(path: string): string {
+  const cut = path.lastIndexOf('/');
+  return cut > 0 ? path.slice(0, cut) : path;
+}
+
+export function extensionOf(name: string): string {
+  const dot = name.lastIndexOf('.');
+  return dot > 0 && dot + 1 < name.length ? name.slice(dot + 1).toLowerCase() : '';
+}

@@ -1,0 +1,213 @@
+// What the page knows: who is signed in, which folders there are, what is typed, and the search that
+// is shown. Views read it and call it; it tells them when to draw again.
+import * as client from '../api/client.ts';
+import { ApiError } from '../api/errors.ts';
+import type { FileRow, Session, Share } from '../api/types.ts';
+import { fromHash, toHash, type Sort } from '../model/address.ts';
+import {
+  CriterionError,
+  hasCriteria,
+  NO_CRITERIA,
+  startParams,
+  type Criteria,
+} from '../model/criteria.ts';
+import { fromRecord } from '../model/history.ts';
+import { Search } from './search.ts';
+
+export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
+
+export interface Remembered {
+  criteria: Criteria;
+  advanced: boolean;
+}
+
+const NOTICE_MS = 4000;
+
+export class App {
+  gate: Gate = 'loading';
+  session: Session | null = null;
+  shares: Share[] = [];
+  homes = false;
+  draft: Criteria = NO_CRITERIA;
+  draftError: CriterionError | null = null;
+  search: Search | null = null;
+  history: Remembered[] = [];
+  unfolded = false;
+  active = -1; // the row the keyboard is at
+  detailed: FileRow | null = null; // the row shown beside the table
+  notice = '';
+  problem = ''; // why the page cannot work, when it cannot
+  private noticeTimer = 0;
+  private drawing = 0;
+
+  constructor(private readonly draw: () => void) {
+    addEventListener('popstate', () => this.followAddress());
+    addEventListener('pagehide', () => this.search?.close());
+    addEventListener('pageshow', (event) => {
+      if (event.persisted) this.followAddress();
+    });
+  }
+
+  // Draws at most once a frame.
+  changed = (): void => {
+    if (this.drawing) return;
+    this.drawing = requestAnimationFrame(() => {
+      this.drawing = 0;
+      this.draw();
+    });
+  };
+
+  set(values: Partial<App>): void {
+    Object.assign(this, values);
+    this.changed();
+  }
+
+  async open(): Promise<void> {
+    try {
+      this.session = await client.getSession();
+      const { shares, homes } = await client.getShares();
+      Object.assign(this, { shares, homes, gate: 'ready', problem: '' });
+      this.followAddress();
+      void this.loadHistory();
+    } catch (error) {
+      this.closeGate(error);
+    }
+    this.changed();
+  }
+
+  private closeGate(error: unknown): void {
+    this.search?.close();
+    this.search = null;
+    if (error instanceof ApiError && error.signedOut) {
+      this.gate = error.mode === 'single' ? 'open-address' : 'sign-in';
+    } else {
+      this.gate = 'unreachable';
+      this.problem = error instanceof Error ? error.message : String(error);
+    }
+  }
+
+  private signedOut = (): void => {
+    // Asks the server how to sign in here, and shows that.
+    void this.open();
+  };
+
+  async signIn(user: string, password: string): Promise<void> {
+    await client.logIn(user, password);
+    await this.open();
+  }
+
+  async signOut(): Promise<void> {
+    this.search?.close();
+    try {
+      await client.logOut();
+    } catch {
+      // The session may have ended by itself.
+    }
+    location.hash = '';
+    location.reload();
+  }
+
+  get everywhere(): string[] {
+    const folders = this.shares.map((share) => '/' + share.name);
+    return this.homes ? [...folders, '/home'] : folders;
+  }
+
+  edit(change: Partial<Criteria>): void {
+    this.draftError = null;
+    this.draft = { ...this.draft, ...change };
+    this.changed();
+  }
+
+  // Searches for what is typed, and puts it into the address bar.
+  submit(change: Partial<Criteria> = {}): void {
+    this.edit(change);
+    const hash = toHash({ criteria: this.draft, sort: this.search?.sort ?? null });
+    if (!this.start(this.draft, this.search?.sort ?? null)) return;
+    if (hash === location.hash) history.replaceState(null, '', hash);
+    else history.pushState(null, '', hash);
+  }
+
+  private followAddress(): void {
+    const address = fromHash(location.hash);
+    if (!address) {
+      this.reset();
+      return;
+    }
+    this.draft = address.criteria;
+    this.start(address.criteria, address.sort);
+  }
+
+  reset(): void {
+    this.search?.close();
+    Object.assign(this, { search: null, detailed: null, active: -1, draft: NO_CRITERIA });
+    this.draftError = null;
+    this.setTitle();
+    this.changed();
+  }
+
+  private start(criteria: Criteria, sort: Sort | null): boolean {
+    this.draftError = null;
+    try {
+      const params = startParams(criteria, this.everywhere, new Date());
+      this.search?.close();
+      this.search = new Search(criteria, params, sort, this.changed, this.signedOut);
+    } catch (error) {
+      if (!(error instanceof CriterionError)) throw error;
+      this.draftError = error;
+      if (error.field !== 'pattern') this.unfolded = true;
+      this.changed();
+      return false;
+    }
+    Object.assign(this, { detailed: null, active: -1 });
+    this.setTitle();
+    void this.search.run().then(() => this.loadHistory());
+    this.changed();
+    return true;
+  }
+
+  private setTitle(): void {
+    const pattern = this.search?.criteria.pattern.trim();
+    document.title = pattern ? `${pattern} · Arbory Search` : 'Arbory Search';
+  }
+
+  setSort(sort: Sort | null): void {
+    if (!this.search) return;
+    this.active = -1;
+    this.search.setSort(sort);
+    history.replaceState(null, '', toHash({ criteria: this.search.criteria, sort }));
+    this.changed();
+  }
+
+  async loadHistory(): Promise<void> {
+    try {
+      const [simple, advanced] = await Promise.all([
+        client.getHistory('simple'),
+        client.getHistory('advance'),
+      ]);
+      const turned = [...simple.history, ...advanced.history].flatMap((record) => {
+        const criteria = fromRecord(record, this.everywhere);
+        return criteria ? [{ criteria, advanced: hasCriteria(criteria) }] : [];
+      });
+      this.set({ history: turned });
+    } catch {
+      // Suggestions are a convenience; their absence is no reason to speak.
+    }
+  }
+
+  async forgetHistory(): Promise<void> {
+    try {
+      await Promise.all([client.clearHistory('simple'), client.clearHistory('advance')]);
+      this.set({ history: [] });
+      this.tell('The history is cleared.');
+    } catch (error) {
+      this.tell(error instanceof Error ? error.message : String(error));
+    }
+  }
+
+  // A short word at the edge of the page.
+  tell(notice: string): void {
+    clearTimeout(this.noticeTimer);
+    this.noticeTimer = window.setTimeout(() => this.set({ notice: '' }), NOTICE_MS);
+    this.set({ notice });
+  }
+}

@@ -1,0 +1,119 @@
+// The pages of a result that have been fetched, around what is seen. At most two requests are under
+// way and the next one is chosen when one ends, so that dragging the scroll bar through a million
+// rows fetches where it stands, not everything it passes.
+import type { FileRow, Page } from '../api/types.ts';
+
+export const PAGE_ROWS = 200;
+// Some 100 bytes a row: a few megabytes, and enough to scroll back without waiting.
+const KEPT_PAGES = 80;
+const REQUESTS = 2;
+
+type Fetch = (offset: number, limit: number, signal: AbortSignal) => Promise<Page>;
+
+interface Kept {
+  rows: FileRow[];
+  stale: boolean;
+}
+
+export class Pages {
+  total = 0;
+  private kept = new Map<number, Kept>(); // least recently wanted first
+  private before = new Map<number, Kept>(); // of the order before; shown until the first new page
+  private flying = new Set<number>();
+  private first = 0;
+  private last = 0;
+  private abort = new AbortController();
+  private closed = false;
+
+  constructor(
+    private readonly fetchPage: Fetch,
+    private readonly changed: () => void,
+    private readonly failed: (error: unknown) => void,
+  ) {}
+
+  row(index: number): FileRow | undefined {
+    const pages = this.kept.size > 0 ? this.kept : this.before;
+    return pages.get(Math.floor(index / PAGE_ROWS))?.rows[index % PAGE_ROWS];
+  }
+
+  // Which rows are seen; fetches what is missing there, then one page beyond either end.
+  show(first: number, last: number): void {
+    this.first = first;
+    this.last = Math.max(first, last);
+    this.pump();
+  }
+
+  // More has been found. In found order full pages never change; in any other, all may.
+  grown(total: number, foundOrder: boolean): void {
+    this.total = Math.max(total, this.total);
+    for (const page of this.kept.values()) {
+      if (!foundOrder || page.rows.length < PAGE_ROWS) page.stale = true;
+    }
+    this.pump();
+  }
+
+  // Everything is fetched anew, in a new order or for the last time; the old is shown meanwhile.
+  renew(): void {
+    this.abort.abort();
+    this.abort = new AbortController();
+    this.flying.clear();
+    if (this.kept.size > 0) this.before = this.kept;
+    this.kept = new Map();
+    this.pump();
+  }
+
+  close(): void {
+    this.closed = true;
+    this.abort.abort();
+  }
+
+  private pump(): void {
+    while (!this.closed && this.flying.size < REQUESTS) {
+      const page = this.wanted().find((number) => this.needs(number));
+      if (page === undefined) return;
+      void this.fetch(page);
+    }
+  }
+
+  private wanted(): number[] {
+    const first = Math.floor(this.first / PAGE_ROWS);
+    const last = Math.floor(this.last / PAGE_ROWS);
+    const seen = Array.from({ length: last - first + 1 }, (_, i) => first + i);
+    const around = [last + 1, first - 1].filter((page) => page >= 0 && page * PAGE_ROWS < this.total);
+    return [...seen, ...around];
+  }
+
+  private needs(page: number): boolean {
+    const kept = this.kept.get(page);
+    return !this.flying.has(page) && (!kept || kept.stale);
+  }
+
+  private async fetch(number: number): Promise<void> {
+    const { signal } = this.abort;
+    this.flying.add(number);
+    try {
+      const page = await this.fetchPage(number * PAGE_ROWS, PAGE_ROWS, signal);
+      if (signal.aborted) return;
+      this.keep(number, page);
+      this.flying.delete(number);
+      this.changed();
+      this.pump();
+    } catch (error) {
+      if (signal.aborted) return;
+      this.flying.delete(number);
+      this.failed(error);
+    }
+  }
+
+  private keep(number: number, page: Page): void {
+    this.kept.delete(number);
+    this.kept.set(number, { rows: page.files, stale: false });
+    this.before.clear();
+    // While a search runs a page may have been counted before the newest matches were.
+    this.total = page.finished ? page.total : Math.max(this.total, page.total);
+    for (const old of this.kept.keys()) {
+      if (this.kept.size <= KEPT_PAGES) break;
+      this.kept.delete(old);
+    }
+  }
+}

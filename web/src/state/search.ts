@@ -1,0 +1,187 @@
+// One search, from its start to the moment it is cleaned up: asks how it goes, keeps the pages that
+// are seen up to date, and tells when anything changed.
+import * as client from '../api/client.ts';
+import { ApiError, walkFailure } from '../api/errors.ts';
+import type { Page, Progress, Walk } from '../api/types.ts';
+import type { Sort } from '../model/address.ts';
+import type { Criteria, StartParams } from '../model/criteria.ts';
+import { Pages } from './pages.ts';
+
+export type Status = 'starting' | 'running' | 'done' | 'stopped' | 'failed';
+
+// How often a running search is asked: often at first, when most searches end.
+const QUICK_MS = 120;
+const STEADY_MS = 400;
+const HIDDEN_MS = 2000;
+const QUICK_FOR_MS = 1500;
+// So many unanswered questions in a row, and the search is given up.
+const MISSES = 5;
+
+const wait = (ms: number) => new Promise((done) => setTimeout(done, ms));
+
+export class Search {
+  status: Status = 'starting';
+  error = '';
+  walk: Walk = {
+    phase: 'names',
+    folders: 0,
+    entries: 0,
+    matches: 0,
+    skipped: { permission: 0, vanished: 0, other: 0 },
+  };
+  readonly pages: Pages;
+  private taskid = '';
+  private closed = false;
+  private stopAsked = false;
+  private readonly startedAt = performance.now();
+  private endedAt = 0;
+
+  constructor(
+    readonly criteria: Criteria,
+    private readonly params: StartParams,
+    public sort: Sort | null,
+    private readonly changed: () => void,
+    private readonly signedOut: () => void,
+  ) {
+    this.pages = new Pages(
+      (offset, limit, signal) => this.list(offset, limit, signal),
+      changed,
+      (error) => this.pageFailed(error),
+    );
+  }
+
+  get over(): boolean {
+    return this.status !== 'starting' && this.status !== 'running';
+  }
+
+  get elapsed(): number {
+    return (this.over ? this.endedAt : performance.now()) - this.startedAt;
+  }
+
+  // What is known to have been found.
+  get found(): number {
+    return this.over ? this.pages.total : Math.max(this.pages.total, this.walk.matches);
+  }
+
+  async run(): Promise<void> {
+    try {
+      this.taskid = (await client.startSearch(this.params)).taskid;
+    } catch (error) {
+      this.fail(error);
+      return;
+    }
+    if (this.closed) {
+      this.clean();
+      return;
+    }
+    this.status = 'running';
+    this.changed();
+    this.pages.show(0, 0);
+    await this.follow();
+  }
+
+  private async follow(): Promise<void> {
+    for (let misses = 0; !this.closed; ) {
+      try {
+        const progress = await client.searchProgress(this.taskid);
+        misses = 0;
+        if (this.closed) return;
+        this.learn(progress);
+        if (progress.finished) return this.finish(progress);
+      } catch (error) {
+        const final = error instanceof ApiError && (error.signedOut || error.gone);
+        if (final || ++misses >= MISSES) return this.fail(error);
+      }
+      const quick = this.elapsed < QUICK_FOR_MS;
+      await wait(document.hidden ? HIDDEN_MS : quick ? QUICK_MS : STEADY_MS);
+    }
+  }
+
+  private learn(progress: Progress): void {
+    const walk = progress.walk;
+    if (!walk) return;
+    const grew = (walk.matches ?? 0) > this.walk.matches;
+    this.walk = { ...this.walk, ...walk, skipped: { ...this.walk.skipped, ...walk.skipped } };
+    if (grew) this.pages.grown(this.walk.matches, this.sort === null);
+    this.changed();
+  }
+
+  private finish(progress: Progress): void {
+    this.endedAt = performance.now();
+    if (progress.progress === -1) {
+      this.status = 'failed';
+      this.error = walkFailure(progress.errno ?? 0);
+    } else if (progress.progress === 1) {
+      this.status = 'done';
+    } else {
+      this.status = 'stopped';
+      if (!this.stopAsked) {
+        this.error = 'The search ended early on the server. Search again to see everything.';
+      }
+    }
+    // The walk's count may run ahead of what is listed; the last pages say how it is.
+    if (this.status !== 'failed') this.pages.renew();
+    this.changed();
+  }
+
+  private fail(error: unknown): void {
+    this.endedAt = performance.now();
+    this.status = 'failed';
+    if (error instanceof ApiError) {
+      if (error.signedOut) this.signedOut();
+      this.error = error.gone
+        ? 'The server no longer has this search. Search again to see the results.'
+        : error.message;
+    } else {
+      this.error = String(error);
+    }
+    this.changed();
+  }
+
+  private pageFailed(error: unknown): void {
+    if (this.closed) return;
+    if (error instanceof ApiError && error.signedOut) this.signedOut();
+    // A running search asks again with its next progress; only the end is final.
+    if (this.over) this.error = error instanceof Error ? error.message : String(error);
+    this.changed();
+  }
+
+  list(offset: number, limit: number, signal?: AbortSignal): Promise<Page> {
+    const order = this.sort
+      ? {
+          sort_by: this.sort.column,
+          sort_direction: this.sort.descending ? ('DESC' as const) : ('ASC' as const),
+        }
+      : {};
+    return client.listResults({ taskid: this.taskid, offset, limit, ...order }, signal);
+  }
+
+  setSort(sort: Sort | null): void {
+    this.sort = sort;
+    if (this.taskid) this.pages.renew();
+    this.changed();
+  }
+
+  async stop(): Promise<void> {
+    if (!this.taskid || this.over) return;
+    this.stopAsked = true;
+    try {
+      await client.stopSearch(this.taskid);
+    } catch (error) {
+      this.pageFailed(error);
+    }
+  }
+
+  // Leaves nothing behind on the server.
+  close(): void {
+    if (this.closed) return;
+    this.closed = true;
+    this.pages.close();
+    this.clean();
+  }
+
+  private clean(): void {
+    // A search that cannot be cleaned now is removed by the server when it is a day old.
+    if (this.taskid) client.cleanSearch(this.taskid).catch(() => {});
+  }
+}

@@ -1,0 +1,42 @@
+import { useEffect, useRef } from 'preact/hooks';
+
+const KEYS = [
+  ['/', 'to the search field'],
+  ['Enter', 'search; in the table, open'],
+  ['↓ ↑', 'past searches; in the table, move'],
+  ['Page ↓ ↑, Home, End', 'move far'],
+  ['Space', 'show or hide the details'],
+  ['d', 'download'],
+  ['c', 'copy the path'],
+  ['f', 'criteria'],
+  ['Esc', 'stop the search; back to the field'],
+  ['?', 'this list'],
+] as const;
+
+export function Help({ close }: { close: () => void }) {
+  const dialog = useRef<HTMLDialogElement>(null);
+  useEffect(() => dialog.current?.showModal(), []);
+  return (
+    <dialog
+      ref={dialog}
+      aria-labelledby="keys"
+      onClose={close}
+      onClick={(event) => event.target === dialog.current && dialog.current?.close()}
+    >
+      <h2 id="keys">Keyboard</h2>
+      <dl class="keys">
+        {KEYS.map(([key, meaning]) => (
+          <div key={key}>
+            <dt>
+              <kbd>{key}</kbd>
+            </dt>
+            <dd>{meaning}</dd>
+          </div>
+        ))}
+      </dl>
+      <form method="dialog">
+        <button class="tool">Close</button>
+      </form>
+    </dialog>
+  );
+}

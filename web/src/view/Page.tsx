@@ -1,0 +1,188 @@
+// The page as a whole, and what the keyboard does anywhere on it.
+import { useEffect, useMemo, useState } from 'preact/hooks';
+import { fileAddress } from '../api/client.ts';
+import type { FileRow } from '../api/types.ts';
+import { previewKind } from '../model/preview.ts';
+import { hasLostBytes, visible } from '../model/text.ts';
+import type { App } from '../state/app.ts';
+import { copyText, follow } from '../state/save.ts';
+import { nextTheme, themeName } from '../state/theme.ts';
+import { Failed, Nothing, Welcome } from './Blank.tsx';
+import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
+import { Details } from './Details.tsx';
+import { FolderPicker } from './FolderPicker.tsx';
+import { Gate } from './Gate.tsx';
+import { Help } from './Help.tsx';
+import { Icon, Wordmark } from './icons.tsx';
+import { Popover } from './Popover.tsx';
+import { ResultTable, type RowActions } from './ResultTable.tsx';
+import { SearchBar } from './SearchBar.tsx';
+import { StatusLine } from './StatusLine.tsx';
+
+export function Page({ app }: { app: App }) {
+  const [help, setHelp] = useState(false);
+  useEffect(() => {
+    const onKeyDown = (event: KeyboardEvent) => pageKey(app, event, () => setHelp(true));
+    addEventListener('keydown', onKeyDown);
+    return () => removeEventListener('keydown', onKeyDown);
+  }, [app]);
+  const actions = useMemo(() => rowActions(app), [app]);
+  if (app.gate !== 'ready') return <Gate app={app} />;
+  return (
+    <>
+      <header class="top">
+        <a
+          class="home"
+          href="#"
+          aria-label="Arbory Search, start"
+          onClick={(event) => {
+            event.preventDefault();
+            history.pushState(null, '', location.pathname);
+            app.reset();
+          }}
+        >
+          <Wordmark />
+        </a>
+        <SearchBar app={app} />
+        <Menu app={app} help={() => setHelp(true)} />
+      </header>
+      <div class="toolbar">
+        <FolderPicker app={app} />
+        <button
+          type="button"
+          class="tool"
+          aria-expanded={app.unfolded}
+          aria-controls="criteria"
+          onClick={() => app.set({ unfolded: !app.unfolded })}
+        >
+          <Icon name="sliders" size={15} />
+          Criteria
+          <Icon name={app.unfolded ? 'up' : 'down'} size={11} />
+        </button>
+        <CriteriaTags app={app} />
+      </div>
+      {app.unfolded && <CriteriaPanel app={app} />}
+      {!app.unfolded && app.draftError && (
+        <p class="wrong band" role="alert">
+          {app.draftError.message}
+        </p>
+      )}
+      <Result app={app} actions={actions} />
+      {app.notice && (
+        <p class="notice" role="status">
+          {app.notice}
+        </p>
+      )}
+      {help && <Help close={() => setHelp(false)} />}
+    </>
+  );
+}
+
+function Result({ app, actions }: { app: App; actions: RowActions }) {
+  const { search } = app;
+  if (!search) {
+    return (
+      <main>
+        <Welcome app={app} />
+      </main>
+    );
+  }
+  const failed = search.status === 'failed' && search.found === 0;
+  const nothing = search.over && !failed && search.found === 0;
+  return (
+    <main>
+      {!failed && <StatusLine app={app} search={search} />}
+      {search.error && !failed && (
+        <p class="wrong band" role="alert">
+          {search.error}
+        </p>
+      )}
+      {failed && <Failed app={app} search={search} />}
+      {nothing && <Nothing app={app} search={search} />}
+      {!failed && !nothing && (
+        <div class={`result ${app.detailed ? 'with-details' : ''}`}>
+          <ResultTable key={search} app={app} search={search} actions={actions} />
+          {app.detailed && (
+            <Details app={app} row={app.detailed} pattern={search.criteria.pattern} actions={actions} />
+          )}
+        </div>
+      )}
+    </main>
+  );
+}
+
+function Menu({ app, help }: { app: App; help: () => void }) {
+  const [theme, setTheme] = useState(themeName());
+  return (
+    <Popover
+      className="quiet menubutton"
+      title="Menu"
+      panelLabel="Menu"
+      panelClass="menu right"
+      label={<Icon name="more" size={18} />}
+    >
+      {(close) => (
+        <>
+          {app.session && (
+            <p class="who">
+              {visible(app.session.user)}
+              {app.session.version && <span class="aside"> · version {app.session.version}</span>}
+            </p>
+          )}
+          <button type="button" onClick={() => setTheme(nextTheme())}>
+            Colours <span class="aside">{theme}</span>
+          </button>
+          <button type="button" onClick={() => (close(), help())}>
+            Keyboard <span class="aside">?</span>
+          </button>
+          {app.session?.mode === 'login' && (
+            <button type="button" onClick={() => void app.signOut()}>
+              Sign out
+            </button>
+          )}
+        </>
+      )}
+    </Popover>
+  );
+}
+
+function pageKey(app: App, event: KeyboardEvent, help: () => void): void {
+  if (event.ctrlKey || event.metaKey || event.altKey || event.defaultPrevented) return;
+  const target = event.target as HTMLElement;
+  if (target.closest('input, select, textarea, dialog') || app.gate !== 'ready') return;
+  if (event.key === '/') {
+    const field = document.querySelector<HTMLInputElement>('#pattern');
+    field?.focus();
+    field?.select();
+  } else if (event.key === '?') {
+    help();
+  } else if (event.key === 'f') {
+    app.set({ unfolded: !app.unfolded });
+  } else {
+    return;
+  }
+  event.preventDefault();
+}
+
+const LOST = 'This name holds bytes that are not text, so it cannot be fetched from here.';
+
+function rowActions(app: App): RowActions {
+  const download = (row: FileRow) => {
+    if (row.is_dir) app.tell('A folder cannot be downloaded. Search in it, and download its files.');
+    else if (hasLostBytes(row.path)) app.tell(LOST);
+    else follow(fileAddress(row.path), row.name);
+  };
+  return {
+    download,
+    open: (row) => {
+      if (row.is_dir) app.submit({ folders: [row.path] });
+      else if (hasLostBytes(row.path)) app.tell(LOST);
+      else if (previewKind(row.name) === 'none') download(row);
+      else window.open(fileAddress(row.path, true), '_blank', 'noopener');
+    },
+    copy: async (row) => {
+      const done = await copyText(row.path);
+      app.tell(done ? 'The path is copied.' : 'The browser did not let the path be copied.');
+    },
+  };
+}

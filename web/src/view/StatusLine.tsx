@@ -1,0 +1,191 @@
+// How the search goes: the count, the time, what could not be read; and what can be done with the
+// whole result.
+import { useEffect, useRef, useState } from 'preact/hooks';
+import type { Sort, SortColumn } from '../model/address.ts';
+import { count, elapsed, plural } from '../model/text.ts';
+import type { App } from '../state/app.ts';
+import { exportResults, type ExportFormat } from '../state/export.ts';
+import type { Search } from '../state/search.ts';
+import { COLUMNS } from './columns.ts';
+import { Icon } from './icons.tsx';
+import { Popover } from './Popover.tsx';
+
+const TICK_MS = 100;
+// How often a screen reader is told of the count while a search runs.
+const SPOKEN_MS = 5000;
+
+export function StatusLine({ app, search }: { app: App; search: Search }) {
+  const running = !search.over;
+  return (
+    <div class={`status ${running ? 'running' : ''}`}>
+      <p class="figures">
+        <strong>{plural(search.found, 'match', 'matches')}</strong>
+        {search.status === 'stopped' && <span class="word">stopped</span>}
+        {search.status === 'failed' && <span class="word">failed</span>}
+        <span class="aside">
+          {running && search.walk.phase === 'contents' ? 'reading files' : 'in'} <Elapsed search={search} />
+        </span>
+        <span class="aside seen">
+          {plural(search.walk.entries, 'name')} seen in {plural(search.walk.folders, 'folder')}
+        </span>
+      </p>
+      <Skipped search={search} />
+      <span class="grow" />
+      <SortChoice app={app} search={search} />
+      {search.pages.total > 0 && <Export app={app} search={search} />}
+      {running && <div class="bar" role="progressbar" aria-label="Searching" />}
+      <Spoken search={search} />
+    </div>
+  );
+}
+
+function Elapsed({ search }: { search: Search }) {
+  const [, tick] = useState(0);
+  useEffect(() => {
+    if (search.over) return;
+    const timer = setInterval(() => tick((n) => n + 1), TICK_MS);
+    return () => clearInterval(timer);
+  }, [search, search.over]);
+  return <time class="elapsed">{elapsed(search.elapsed)}</time>;
+}
+
+// The only part that is announced; it changes seldom enough to be listened to.
+function Spoken({ search }: { search: Search }) {
+  const said = useRef({ at: 0, text: '', search });
+  const found = plural(search.found, 'match', 'matches');
+  const now = performance.now();
+  if (said.current.search !== search) said.current = { at: 0, text: '', search };
+  if (search.over || now - said.current.at > SPOKEN_MS) {
+    const state = search.over ? { done: 'Finished', stopped: 'Stopped', failed: 'Failed' } : {};
+    const word = (state as Record<string, string>)[search.status] ?? 'Searching';
+    said.current = { at: now, text: `${word}: ${found}`, search };
+  }
+  return (
+    <span class="visually-hidden" role="status">
+      {said.current.text}
+    </span>
+  );
+}
+
+function Skipped({ search }: { search: Search }) {
+  const { permission, other } = search.walk.skipped;
+  const unread = permission + other;
+  if (unread === 0) return null;
+  const title = `${plural(unread, 'folder')} could not be read`;
+  return (
+    <Popover
+      className="tool caution"
+      panelLabel={title}
+      panelClass="note"
+      label={
+        <>
+          <Icon name="warning" size={14} />
+          {title}
+        </>
+      }
+    >
+      {() => (
+        <>
+          <p>The result may not be complete.</p>
+          {permission > 0 && (
+            <p>
+              {count(permission)} {permission === 1 ? 'is' : 'are'} closed to you. Ask the owner for
+              permission to read.
+            </p>
+          )}
+          {other > 0 && (
+            <p>
+              {count(other)} could not be read for another reason, such as a faulty disk. Search
+              again; if it stays, tell who runs the server.
+            </p>
+          )}
+        </>
+      )}
+    </Popover>
+  );
+}
+
+// For narrow screens, where the table has no head.
+function SortChoice({ app, search }: { app: App; search: Search }) {
+  const { sort } = search;
+  const change = (column: SortColumn | '', descending: boolean) =>
+    app.setSort(column ? ({ column, descending } satisfies Sort) : null);
+  return (
+    <span class="sortchoice">
+      <select
+        aria-label="Sort by"
+        value={sort?.column ?? ''}
+        onChange={(event) => {
+          const column = event.currentTarget.value as SortColumn | '';
+          change(column, column === 'mtime' || column === 'size');
+        }}
+      >
+        <option value="">As found</option>
+        {COLUMNS.map(({ column, title }) => (
+          <option key={column} value={column}>
+            {title}
+          </option>
+        ))}
+      </select>
+      {sort && (
+        <button
+          type="button"
+          class="quiet"
+          aria-label={sort.descending ? 'Sort ascending' : 'Sort descending'}
+          onClick={() => change(sort.column, !sort.descending)}
+        >
+          <Icon name={sort.descending ? 'down' : 'up'} size={12} />
+        </button>
+      )}
+    </span>
+  );
+}
+
+function Export({ app, search }: { app: App; search: Search }) {
+  const [part, setPart] = useState<number | null>(null);
+  const cancelled = useRef(false);
+  const run = async (format: ExportFormat) => {
+    cancelled.current = false;
+    setPart(0);
+    try {
+      const done = await exportResults(search, format, setPart, () => cancelled.current);
+      if (done) app.tell(search.over ? 'The result is saved.' : 'What was found so far is saved.');
+    } catch (error) {
+      app.tell(error instanceof Error ? error.message : String(error));
+    }
+    setPart(null);
+  };
+  if (part !== null) {
+    return (
+      <button type="button" class="tool" onClick={() => (cancelled.current = true)}>
+        Saving {Math.min(100, Math.floor(part * 100))} % · Cancel
+      </button>
+    );
+  }
+  return (
+    <Popover
+      className="tool"
+      panelClass="menu right"
+      panelLabel="Save the result"
+      label={
+        <>
+          <Icon name="download" size={14} />
+          Save result
+        </>
+      }
+    >
+      {(close) =>
+        (
+          [
+            ['csv', 'CSV', 'for spreadsheets'],
+            ['jsonl', 'JSON lines', 'for programs'],
+          ] as const
+        ).map(([format, name, use]) => (
+          <button type="button" key={format} onClick={() => (close(), void run(format))}>
+            {name} <span class="aside">{use}</span>
+          </button>
+        ))
+      }
+    </Popover>
+  );
+}
