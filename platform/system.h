@@ -49,8 +49,8 @@ pid_t NLIBCProcFork();
 // process has only its effective identity from then on.
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3, int flags);
 
-// Writes `text` as one shell word into `buffer` (NUL-terminated, `size` bytes in all). Returns 0, or
-// -1 if it does not fit.
+// Writes `text` as one shell word into `buffer` (NUL-terminated, `size` bytes in all). Returns 0,
+// or -1 if it does not fit.
 int NLIBCEncShParam(const char* text, char* buffer, size_t size);
 
 // The last platform error number of this process: 0x0300 permission denied, 0x0600 no such folder,

@@ -29,12 +29,12 @@ int WfmLibGetErr();
 // The paths name what the error is about and do not change the code; either may be null.
 int WfmParseErrnoToError(int error, const char* path, const char* other_path);
 
-// Splits a request parameter into a JSON array of strings. An array of strings is returned as it is;
-// in any other, numbers and truth values become their text and what has none is left out. A string
-// is split at `separator`; a backslash before a separator keeps that separator as part of the
-// piece. From API version 2 on, a string that is the text of a JSON array stands for that array.
-// `drop_empty` leaves out the empty pieces of a string. An empty string gives an empty array, as
-// does any other type of value.
+// Splits a request parameter into a JSON array of strings. An array of strings is returned as it
+// is; in any other, numbers and truth values become their text and what has none is left out. A
+// string is split at `separator`; a backslash before a separator keeps that separator as part of
+// the piece. From API version 2 on, a string that is the text of a JSON array stands for that
+// array. `drop_empty` leaves out the empty pieces of a string. An empty string gives an empty
+// array, as does any other type of value.
 Json::Value StringExplodeEx(const Json::Value& value, const char* separator, int api_version,
                             bool drop_empty);
 
