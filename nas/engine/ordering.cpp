@@ -15,41 +15,85 @@ struct KeyedRow {
   std::uint32_t row;
 };
 
-// Least significant digit first, one byte a pass; passes in which all keys agree are left out, so
-// that sizes and times of a few years take three or four of the eight.
-void RadixSort(std::vector<KeyedRow>& rows) {
+using KeyedRows = std::vector<KeyedRow>;
+
+// Sorts [begin, end) by key, equal keys in the order they stand. Least significant digit first, one
+// byte a pass; passes in which all keys agree are left out, so that sizes and times of a few years
+// take three or four of the eight. `spare` is as long as `rows`.
+void RadixSort(KeyedRows& rows, size_t begin, size_t end, KeyedRows& spare) {
   constexpr int kDigits = 8;
   std::array<std::array<std::uint32_t, 256>, kDigits> counts{};
-  for (const KeyedRow& row : rows) {
-    for (int digit = 0; digit < kDigits; ++digit) ++counts[digit][(row.key >> (8 * digit)) & 255];
+  for (size_t i = begin; i < end; ++i) {
+    for (int digit = 0; digit < kDigits; ++digit) {
+      ++counts[digit][(rows[i].key >> (8 * digit)) & 255];
+    }
   }
-  std::vector<KeyedRow> sorted(rows.size());
+  KeyedRow* from = rows.data() + begin;
+  KeyedRow* to = spare.data() + begin;
+  const size_t size = end - begin;
   for (int digit = 0; digit < kDigits; ++digit) {
     auto& count = counts[digit];
-    if (std::ranges::any_of(count, [&](std::uint32_t c) { return c == rows.size(); })) continue;
+    if (count[(from->key >> (8 * digit)) & 255] == size) continue;
     std::uint32_t before = 0;
     for (std::uint32_t& c : count) before += std::exchange(c, before);
-    for (const KeyedRow& row : rows) sorted[count[(row.key >> (8 * digit)) & 255]++] = row;
-    rows.swap(sorted);
+    for (size_t i = 0; i < size; ++i) to[count[(from[i].key >> (8 * digit)) & 255]++] = from[i];
+    std::swap(from, to);
   }
+  if (from != rows.data() + begin) std::copy_n(from, size, rows.data() + begin);
 }
 
-Ordering RowsOf(const std::vector<KeyedRow>& keyed) {
+Ordering RowsOf(const KeyedRows& keyed) {
   Ordering ordering;
   ordering.reserve(keyed.size());
   for (const KeyedRow& row : keyed) ordering.push_back(row.row);
   return ordering;
 }
 
-constexpr size_t kPrefixBytes = 8;
+// Runs shorter than this are quicker compared than counted.
+constexpr size_t kFewRows = 200;
+constexpr size_t kStepBytes = 8;
 
-// The first bytes of a key as a number that orders like them.
-std::uint64_t Prefix(std::string_view key) {
-  std::array<unsigned char, kPrefixBytes> bytes{};
-  std::memcpy(bytes.data(), key.data(), std::min(key.size(), kPrefixBytes));
-  std::uint64_t prefix = 0;
-  for (const unsigned char byte : bytes) prefix = (prefix << 8) | byte;
-  return prefix;
+// The bytes of a key from `at` on, as a number that orders like them.
+std::uint64_t Step(std::string_view key, size_t at) {
+  std::array<unsigned char, kStepBytes> bytes{};
+  if (at < key.size())
+    std::memcpy(bytes.data(), key.data() + at, std::min(key.size() - at, kStepBytes));
+  std::uint64_t step = 0;
+  for (const unsigned char byte : bytes) step = (step << 8) | byte;
+  return step;
+}
+
+// Sorts the rows [begin, end), whose keys agree in their first `depth` bytes: eight bytes at a
+// time, and within each run of rows that agree in those, the next eight.
+void SortByText(const TextKeys& keys, KeyedRows& rows, size_t begin, size_t end, size_t depth,
+                KeyedRows& spare) {
+  if (end - begin < kFewRows) {
+    std::sort(rows.begin() + static_cast<std::ptrdiff_t>(begin),
+              rows.begin() + static_cast<std::ptrdiff_t>(end),
+              [&keys, depth](const KeyedRow& a, const KeyedRow& b) {
+                const auto rest = [&keys, depth](std::uint32_t row) {
+                  const std::string_view key = keys[row];
+                  return key.substr(std::min(depth, key.size()));
+                };
+                const int order = rest(a.row).compare(rest(b.row));
+                return order != 0 ? order < 0 : a.row < b.row;
+              });
+    return;
+  }
+  bool longer = false;
+  for (size_t i = begin; i < end; ++i) {
+    const std::string_view key = keys[rows[i].row];
+    rows[i].key = Step(key, depth);
+    longer |= key.size() > depth;
+  }
+  if (!longer) return;  // all equal, and already in the order of their numbers
+  RadixSort(rows, begin, end, spare);
+  for (size_t run = begin; run < end;) {
+    size_t next = run + 1;
+    while (next < end && rows[next].key == rows[run].key) ++next;
+    if (next - run > 1) SortByText(keys, rows, run, next, depth + kStepBytes, spare);
+    run = next;
+  }
 }
 
 bool IsDigit(char c) { return c >= '0' && c <= '9'; }
@@ -71,16 +115,18 @@ void AppendNaturalKey(std::string_view text, std::string& key) {
     size_t end = i;
     while (end < folded.size() && IsDigit(folded[end]) && end - i < kMostDigits) ++end;
     key.push_back('0');
-    key.push_back(static_cast<char>(end - i));
+    key.push_back(static_cast<char>(end - i + 1));
     key.append(folded, i, end - i);
     i = end;
   }
 }
 
 Ordering OrderByNumber(const std::vector<std::uint64_t>& keys) {
+  if (keys.empty()) return {};
   std::vector<KeyedRow> rows(keys.size());
   for (size_t i = 0; i < keys.size(); ++i) rows[i] = {keys[i], static_cast<std::uint32_t>(i)};
-  RadixSort(rows);
+  KeyedRows spare(rows.size());
+  RadixSort(rows, 0, rows.size(), spare);
   return RowsOf(rows);
 }
 
@@ -90,23 +136,10 @@ void TextKeys::AddNatural(std::string_view text) {
 }
 
 Ordering TextKeys::Order() const {
-  std::vector<KeyedRow> rows(size());
-  for (size_t i = 0; i < size(); ++i) rows[i] = {Prefix((*this)[i]), static_cast<std::uint32_t>(i)};
-  RadixSort(rows);
-  // Only runs of rows that agree in their first bytes need their whole keys compared.
-  for (size_t begin = 0; begin < rows.size();) {
-    size_t end = begin + 1;
-    while (end < rows.size() && rows[end].key == rows[begin].key) ++end;
-    if (end - begin > 1) {
-      std::sort(rows.begin() + static_cast<std::ptrdiff_t>(begin),
-                rows.begin() + static_cast<std::ptrdiff_t>(end),
-                [this](const KeyedRow& a, const KeyedRow& b) {
-                  const int order = (*this)[a.row].compare((*this)[b.row]);
-                  return order != 0 ? order < 0 : a.row < b.row;
-                });
-    }
-    begin = end;
-  }
+  KeyedRows rows(size());
+  for (size_t i = 0; i < size(); ++i) rows[i].row = static_cast<std::uint32_t>(i);
+  KeyedRows spare(size());
+  SortByText(*this, rows, 0, size(), 0, spare);
   return RowsOf(rows);
 }
 

@@ -22,7 +22,7 @@ inline std::uint64_t UnsignedKey(std::int64_t value) {
   return static_cast<std::uint64_t>(value) ^ (std::uint64_t{1} << 63);
 }
 
-// Byte strings, one for each row, kept end to end.
+// Byte strings without NUL, one for each row, kept end to end.
 class TextKeys {
  public:
   // Appends the natural key of `text` as the next row's.

@@ -6,6 +6,8 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <numeric>
+#include <random>
 #include <set>
 #include <thread>
 
@@ -135,6 +137,22 @@ TEST(Ordering, NaturalKeys) {
     AppendNaturalKey(ascending[i + 1], higher);
     EXPECT_LT(lower, higher) << ascending[i] << " before " << ascending[i + 1];
   }
+}
+
+// Against the plain sort, with keys that agree in long beginnings and end inside others.
+TEST(Ordering, TextsAgainstPlainSort) {
+  std::mt19937 random(11);
+  TextKeys keys;
+  for (int i = 0; i < 30'000; ++i) {
+    std::string text(random() % 40, 'a');
+    if (random() % 2 == 0) text += "b" + std::to_string(random() % 50);
+    if (random() % 9 == 0) text += "00";
+    keys.AddNatural(text);
+  }
+  Ordering expected(keys.size());
+  std::iota(expected.begin(), expected.end(), 0);
+  std::ranges::stable_sort(expected, [&keys](auto a, auto b) { return keys[a] < keys[b]; });
+  EXPECT_EQ(keys.Order(), expected);
 }
 
 TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
