@@ -1,7 +1,7 @@
 #include "arbory/interrupt.h"
 
+#include <poll.h>
 #include <signal.h>
-#include <time.h>
 
 #include <initializer_list>
 
@@ -29,10 +29,9 @@ void WatchForInterrupt() {
 
 bool Interrupted() { return interrupted != 0; }
 
-void Pause(int milliseconds) {
-  constexpr long kNanosecondsPerMillisecond = 1'000'000;
-  const timespec pause = {0, milliseconds * kNanosecondsPerMillisecond};
-  if (!Interrupted()) nanosleep(&pause, nullptr);
+void Pause(int milliseconds, int pidfd) {
+  pollfd ended = {pidfd, POLLIN, 0};
+  if (!Interrupted()) poll(&ended, 1, milliseconds);
 }
 
 }  // namespace arbory

@@ -9,7 +9,8 @@ namespace arbory {
 void WatchForInterrupt();
 bool Interrupted();
 
-// Waits; an interrupt ends the wait early.
-void Pause(int milliseconds);
+// Waits; an interrupt ends the wait early, and so does the end of the process that `pidfd` stands
+// for (-1: none).
+void Pause(int milliseconds, int pidfd);
 
 }  // namespace arbory

@@ -3,6 +3,7 @@
 
 #include "arbory/search_command.h"
 
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -19,6 +20,7 @@
 #include "arbory/session.h"
 #include "arbory/terminal.h"
 #include "nas/system/shares.h"
+#include "nas/system/unique_fd.h"
 
 namespace arbory {
 namespace {
@@ -27,11 +29,12 @@ constexpr int kApiVersion = 2;
 // Rows of one page: few enough to be printed while the search goes on, enough to make the cost of a
 // call (about 2 ms) disappear.
 constexpr std::uint64_t kPageRows = 10000;
-// Between two looks at a search that had nothing more to show: a tenth of the time it has run, so
-// that a quick search is noticed at once and a long one is not slowed down by the asking.
-constexpr std::chrono::milliseconds kLeastPause{2};
-constexpr std::chrono::milliseconds kMostPause{40};
-constexpr int kPauseShare = 10;
+// Between two looks at a search that had nothing more to show: a part of the time it has run, so
+// that first results are seen at once and the asking slows nothing down. The end of the search ends
+// the pause as well.
+constexpr std::chrono::milliseconds kLeastPause{3};
+constexpr std::chrono::milliseconds kMostPause{100};
+constexpr int kPauseShare = 4;
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -99,6 +102,9 @@ class Search {
     const std::string reply = Call("start", params, encode);
     if (!reply.starts_with(' ')) {
       task_id_ = reply;
+      // Only ever waited for, so it does no harm where the id has come to mean another process.
+      worker_.Reset(
+          static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(session_.user(), task_id_).pid, 0)));
       return;
     }
     const std::string why = WhyNoTask(session_);
@@ -170,7 +176,8 @@ class Search {
   void Wait() {
     ShowProgress();
     const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
-    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, kMostPause).count()));
+    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, kMostPause).count()),
+          worker_.get());
   }
 
   void ShowProgress() {
@@ -230,6 +237,7 @@ class Search {
   RowFormat format_;
   ProgressLine progress_;
   std::string task_id_;
+  nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
   std::uint64_t printed_ = 0;
   int failure_ = 0;  // the code of kFailed, errno of kUnwritable
   bool running_ = true;

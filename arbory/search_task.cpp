@@ -47,7 +47,9 @@ SearchState ReadSearch(const std::string& user, const std::string& task_id) {
     state.exists = true;
     state.finished = task->isFinished();
     state.progress = IntOf(task->getProperty("progress"));
-    state.error = IntOf(Member(task->getProperty("data"), "errno"));
+    const Json::Value data = task->getProperty("data");
+    state.error = IntOf(Member(data, "errno"));
+    state.pid = IntOf(Member(data, "pid"));
     const Json::Value walk = task->getProperty("walk");
     if (Member(walk, "phase").isString()) state.phase = walk["phase"].asString();
     state.folders = CountOf(Member(walk, "folders"));

@@ -14,6 +14,7 @@ struct SearchState {
   bool finished = false;
   int progress = 0;   // 1: complete, -1: failed with `error`, 0: running, or ended before its end
   int error = 0;      // web API code
+  int pid = 0;        // of the worker, which may have ended
   std::string phase;  // empty until the walk has begun
   std::uint64_t folders = 0;
   std::uint64_t entries = 0;
