@@ -12,6 +12,7 @@
 #include "arbory/call_command.h"
 #include "arbory/options.h"
 #include "arbory/search_command.h"
+#include "arbory/serve_command.h"
 #include "arbory/terminal.h"
 
 namespace arbory {
@@ -46,6 +47,15 @@ constexpr char kCallHelp[] =
     "  arbory call NUVA.Arbory.Search 2 start \\\n"
     "    '{\"folder_path\": \"/photo\", \"pattern\": \"*.jpg\"}'\n";
 
+constexpr char kServeHelp[] =
+    "As an ordinary user it serves that user and prints an address to open; it works once, and\n"
+    "SIGHUP prints another. As root people log in with their own accounts, unless --user names\n"
+    "the one user to serve. SIGTERM and SIGINT stop it.\n"
+    "\n"
+    "Examples:\n"
+    "  arbory serve --share photos=$HOME/Pictures\n"
+    "  arbory serve --config /etc/arbory/arbory.toml --listen 192.168.1.2:8750\n";
+
 // Help without the parser's own notes on which options need or exclude each other.
 class Formatter : public CLI::Formatter {
  public:
@@ -73,6 +83,15 @@ CLI::App* AddCall(CLI::App* app, CallOptions* options) {
   AddCommon(call, &options->common);
   call->footer(kCallHelp);
   return call;
+}
+
+CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
+  CLI::App* serve = app->add_subcommand("serve", "Serve the search page and the API over HTTP");
+  serve->add_option("--listen", options->listen, "Address to listen on; 127.0.0.1:8750 by default")
+      ->type_name("HOST:PORT");
+  AddCommon(serve, &options->common);
+  serve->footer(kServeHelp);
+  return serve;
 }
 
 void AddTimes(CLI::App* search, const std::string& name, const std::string& verb,
@@ -186,7 +205,9 @@ int Run(int argc, char** argv) {
   app.require_subcommand(1);
   CallOptions call_options;
   SearchOptions search_options;
+  ServeOptions serve_options;
   CLI::App* call = AddCall(&app, &call_options);
+  CLI::App* serve = AddServe(&app, &serve_options);
   AddSearch(&app, &search_options);
   try {
     app.parse(MarkedArguments(argc, argv));
@@ -199,6 +220,7 @@ int Run(int argc, char** argv) {
     Unmark(&call_options.params);
     return RunCallCommand(call_options);
   }
+  if (serve->parsed()) return RunServeCommand(serve_options);
   Unmark(&search_options.pattern);
   for (std::string& folder : search_options.folders) Unmark(&folder);
   if (search_options.folders.empty()) search_options.folders = {"."};

@@ -36,6 +36,11 @@ struct CallOptions {
   std::string params;  // JSON text; empty: none
 };
 
+struct ServeOptions {
+  CommonOptions common;
+  std::string listen;  // HOST:PORT; empty: as configured
+};
+
 // Both bounds are inclusive.
 struct TimeRange {
   std::string from;

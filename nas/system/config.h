@@ -14,11 +14,35 @@ struct ShareSetting {
   std::string origin = {};  // "FILE:LINE" for messages; empty when no file says so
 };
 
+// What `arbory serve` goes by. Each number is a limit that keeps one client from taking the server
+// from the others; the defaults suit a household or an office on a small machine.
+struct ServerSettings {
+  std::string listen = "127.0.0.1:8750";  // ADDRESS:PORT, an IPv6 address in brackets
+  std::string web_dir;                    // the built page; empty: the one beside the program
+  bool behind_tls = false;                // a proxy in front speaks HTTPS
+  std::vector<std::string> origins;       // what browsers may call it, such as "https://nas.home"
+  std::string pam_service = "arbory";
+  std::string pam_dir;  // folder of PAM service files; empty: the system's
+  bool access_log = true;
+
+  int max_connections = 512;
+  int max_calls = 64;          // request children at once
+  int body_bytes = 1 << 20;    // of one request
+  int header_seconds = 10;     // for a request to arrive whole, once begun
+  int idle_seconds = 60;       // that a connection may wait for its next request
+  int stall_seconds = 30;      // that a client may take nothing of a reply
+  int call_seconds = 120;      // for a child to begin or go on with its reply
+  int logins_per_minute = 10;  // refused ones, by address and by user
+  int session_minutes = 12 * 60;
+  int searches_per_user = 8;  // running at once
+};
+
 struct Config {
   std::string state_dir;                            // absolute
   std::vector<std::string> volumes = {"/volume*"};  // shell patterns of absolute directories
   std::string module;                               // path of the module; empty: beside the program
   std::vector<ShareSetting> shares;
+  ServerSettings server;
 };
 
 // A configuration that cannot be used. what() names the file, the line and the trouble.

@@ -5,6 +5,8 @@
 //   module = "/usr/lib/arbory/NUVA.Arbory.Search.so"
 //   [shares]
 //   photo = "/srv/photo"
+//   [server]
+//   listen = "127.0.0.1:8750"
 //
 // A key that is not known is an error, so that a misspelt one is noticed.
 
@@ -26,6 +28,7 @@ namespace nas {
 namespace {
 
 constexpr size_t kMaxFileBytes = size_t{1} << 20;
+constexpr int kMaxLimit = 1'000'000'000;  // so that no sum or product of limits overflows 64 bits
 constexpr char kSystemFile[] = "/etc/arbory/arbory.toml";
 constexpr char kSystemState[] = "/var/lib/arbory";
 
@@ -81,6 +84,7 @@ class Reader {
         {"module", [&](const toml::node& node) { config->module = Path(node); }},
         {"volumes", [&](const toml::node& node) { config->volumes = Paths(node); }},
         {"shares", [&](const toml::node& node) { config->shares = Shares(node); }},
+        {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
     };
     ReadTable(document, keys);
   }
@@ -114,19 +118,77 @@ class Reader {
     }
   }
 
-  std::string Path(const toml::node& node) {
+  void ReadServer(const toml::node& node, ServerSettings* server) {
+    const toml::table* table = node.as_table();
+    if (table == nullptr) Fail(node.source(), "a table is expected here");
+    Keys keys = {
+        {"listen", [&](const toml::node& value) { server->listen = Text(value); }},
+        {"web_dir", [&](const toml::node& value) { server->web_dir = Path(value); }},
+        {"behind_tls", [&](const toml::node& value) { server->behind_tls = Truth(value); }},
+        {"origins", [&](const toml::node& value) { server->origins = Texts(value); }},
+        {"pam_service", [&](const toml::node& value) { server->pam_service = Text(value); }},
+        {"pam_dir", [&](const toml::node& value) { server->pam_dir = Path(value); }},
+        {"access_log", [&](const toml::node& value) { server->access_log = Truth(value); }},
+    };
+    const std::pair<const char*, int*> limits[] = {
+        {"max_connections", &server->max_connections},
+        {"max_calls", &server->max_calls},
+        {"body_bytes", &server->body_bytes},
+        {"header_seconds", &server->header_seconds},
+        {"idle_seconds", &server->idle_seconds},
+        {"stall_seconds", &server->stall_seconds},
+        {"call_seconds", &server->call_seconds},
+        {"logins_per_minute", &server->logins_per_minute},
+        {"session_minutes", &server->session_minutes},
+        {"searches_per_user", &server->searches_per_user},
+    };
+    for (const auto& [name, limit] : limits) {
+      keys[name] = [this, limit = limit](const toml::node& value) { *limit = Limit(value); };
+    }
+    ReadTable(*table, keys);
+  }
+
+  std::string Text(const toml::node& node) {
     const auto* text = node.as_string();
     if (text == nullptr) Fail(node.source(), "a text is expected here");
-    if (!text->get().starts_with('/')) Fail(node.source(), "an absolute path is expected here");
     return text->get();
   }
 
-  std::vector<std::string> Paths(const toml::node& node) {
+  std::string Path(const toml::node& node) {
+    const std::string path = Text(node);
+    if (!path.starts_with('/')) Fail(node.source(), "an absolute path is expected here");
+    return path;
+  }
+
+  bool Truth(const toml::node& node) {
+    const auto* truth = node.as_boolean();
+    if (truth == nullptr) Fail(node.source(), "true or false is expected here");
+    return truth->get();
+  }
+
+  int Limit(const toml::node& node) {
+    const auto* number = node.as_integer();
+    if (number == nullptr || number->get() < 1 || number->get() > kMaxLimit) {
+      Fail(node.source(), "a number from 1 to " + std::to_string(kMaxLimit) + " is expected here");
+    }
+    return static_cast<int>(number->get());
+  }
+
+  template <typename Item>
+  auto ListOf(const toml::node& node, Item item) {
     const toml::array* array = node.as_array();
     if (array == nullptr) Fail(node.source(), "a list of texts is expected here");
-    std::vector<std::string> paths;
-    for (const toml::node& item : *array) paths.push_back(Path(item));
-    return paths;
+    std::vector<std::string> texts;
+    for (const toml::node& element : *array) texts.push_back(item(element));
+    return texts;
+  }
+
+  std::vector<std::string> Paths(const toml::node& node) {
+    return ListOf(node, [this](const toml::node& item) { return Path(item); });
+  }
+
+  std::vector<std::string> Texts(const toml::node& node) {
+    return ListOf(node, [this](const toml::node& item) { return Text(item); });
   }
 
   std::vector<ShareSetting> Shares(const toml::node& node) {

@@ -115,12 +115,16 @@ std::string Serve(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEn
 
 }  // namespace
 
+int EnterChild(int fd) {
+  setpgid(0, 0);  // before the caller's signal handlers go
+  ResetSignals();
+  return KeepOnly(fd);
+}
+
 void ServeInChild(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
                   int pipe_fd) {
   const pid_t self = getpid();
-  setpgid(0, 0);  // before the caller's signal handlers go
-  ResetSignals();
-  const int pipe = KeepOnly(pipe_fd);
+  const int pipe = EnterChild(pipe_fd);
   if (pipe >= 0) {
     try {
       const std::string reply = Serve(row, call, encode);

@@ -10,4 +10,9 @@ namespace nas {
 [[noreturn]] void ServeInChild(const NUVA::APIMethod& row, const ApiCall& call,
                                const ReplyEncoder& encode, int pipe_fd);
 
+// For servers that fork children of other kinds: makes the process that was just forked a plain
+// one, as above, with only the standard streams (/dev/null) and `fd` open, whose new number is the
+// result. -1 on failure.
+int EnterChild(int fd);
+
 }  // namespace nas

@@ -1,0 +1,93 @@
+#include "arbory/serve_command.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <string>
+
+#include "arbory/server/http_server.h"
+#include "arbory/server/pages.h"
+#include "arbory/server/sample_share.h"
+#include "arbory/server/service.h"
+#include "arbory/session.h"
+#include "arbory/terminal.h"
+#include "nas/system/shares.h"
+
+namespace arbory {
+namespace {
+
+void Say(const std::string& line) { WriteOut(STDOUT_FILENO, line + "\n"); }
+void Warn(const std::string& line) { WriteOut(STDERR_FILENO, "arbory: " + line + "\n"); }
+
+nas::ServerSettings SettingsOf(const ServeOptions& options) {
+  nas::ServerSettings settings = nas::CurrentConfig().server;
+  if (!options.listen.empty()) settings.listen = options.listen;
+  // On a terminal the lines would push the address away that is to be opened.
+  if (isatty(STDERR_FILENO) != 0) settings.access_log = false;
+  return settings;
+}
+
+// A share to try it with, where there is nothing else to search.
+void OfferSample(Session* session) {
+  if (!nas::ListShares().empty() || !nas::CurrentConfig().shares.empty()) return;
+  const std::string folder = MakeSampleShare(nas::CurrentConfig().state_dir);
+  session->AddShares({{kSampleShare, folder}});
+  Say("No share is configured: offering the sample share in " + folder);
+}
+
+// The program as root without --user: people log in, and each request runs as its user.
+bool HasLogins(const ServeOptions& options) {
+  return geteuid() == 0 && options.common.user.empty();
+}
+
+Service::Setup SetupOf(const ServeOptions& options, const nas::ServerSettings& settings,
+                       const Session& session, const HttpServer& server) {
+  Service::Setup setup;
+  setup.settings = settings;
+  if (!HasLogins(options)) setup.single_user = session.user();
+  // Browsers keep one cookie jar for all ports of a machine; the prefix binds it to this host.
+  setup.cookie = settings.behind_tls ? "__Host-arbory" : "arbory_" + std::to_string(server.port());
+  setup.site = {server.on_loopback(), settings.behind_tls, settings.origins};
+  setup.web_dir = FindWebFolder(settings.web_dir);
+  setup.counts = [&server] { return server.counts(); };
+  return setup;
+}
+
+void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& settings,
+                     const HttpServer& server) {
+  if (!server.on_loopback() && !settings.behind_tls) {
+    Warn(
+        "listening beyond this machine without TLS: passwords and files can be read on the way; "
+        "put a proxy with TLS in front and set behind_tls");
+  }
+  const std::string service = settings.pam_dir + "/" + settings.pam_service;
+  const bool found = settings.pam_dir.empty() ? access(("/etc/pam.d" + service).c_str(), R_OK) == 0
+                                              : access(service.c_str(), R_OK) == 0;
+  if (HasLogins(options) && !found) {
+    Warn("there is no PAM service file " + settings.pam_service +
+         ", so every login will be refused; see packaging/pam/arbory");
+  }
+}
+
+}  // namespace
+
+int RunServeCommand(const ServeOptions& options) {
+  Session session(options.common);
+  OfferSample(&session);
+  const nas::ServerSettings settings = SettingsOf(options);
+  HttpServer server(settings);
+  Service service(SetupOf(options, settings, session, server), session.module());
+  WarnOfOpenDoors(options, settings, server);
+  const std::string base = "http://" + server.address() + "/";
+  if (HasLogins(options)) {
+    Say("Open " + base);
+  } else {
+    const auto offer = [&] { Say("Open " + base + "open?token=" + service.NewToken()); };
+    offer();
+    server.OnHangup(offer);
+  }
+  server.Run(&service);
+  return kExitSuccess;
+}
+
+}  // namespace arbory

@@ -1,0 +1,87 @@
+#pragma once
+// What the HTTP machinery (connection.cpp, http_server.cpp) and the service that answers requests
+// (service.cpp) tell each other. Nothing here needs the network library, whose headers compile
+// slowly.
+//
+// A request is answered at once, or by a child process: whatever looks at a user's files or may
+// take its time runs in a child, so that the loop never waits and the server keeps its own
+// identity.
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "nas/webapi/runner.h"
+
+namespace arbory {
+
+using Clock = std::chrono::steady_clock;
+using Fields = std::vector<std::pair<std::string, std::string>>;
+
+struct HttpRequest {
+  std::string method;
+  std::string target;  // as sent
+  Fields fields;       // names in lower case
+  std::string body;
+  std::string peer;  // the client's address
+  bool from_loopback = false;
+  Clock::time_point begun;
+
+  // For the access log, filled in by the service.
+  std::string user;
+
+  // The first field of that name (in lower case); null when there is none.
+  const std::string* Field(std::string_view name) const;
+  size_t CountOf(std::string_view name) const;
+  // What the target holds before and after "?".
+  std::string_view path() const;
+  std::string_view query() const;
+};
+
+struct HttpReply {
+  int status = 200;
+  Fields fields;  // beside those every reply has
+  std::string body;
+  bool child_follows = false;  // the body is what the child sends after its head
+  std::optional<Clock::time_point> not_before = {};  // hides how long the answer took to find
+};
+
+// How a child begins its reply; see child.h.
+struct ChildHead {
+  int status = 0;
+  int code = 0;
+  Fields fields;
+};
+
+struct ChildAnswer {
+  nas::RunningCall child;
+  // Turns the head, or null when the child ended or stayed silent without one, into the reply.
+  std::function<HttpReply(const ChildHead* head)> make_reply;
+  // Lives as long as the child, which may be longer than the exchange.
+  std::shared_ptr<void> token;
+};
+
+using Answer = std::variant<HttpReply, ChildAnswer>;
+
+class HttpService {
+ public:
+  virtual ~HttpService() = default;
+  virtual Answer Handle(HttpRequest* request) = 0;
+  // The reply went out, or the client went away in the midst of it.
+  virtual void Finished(const HttpRequest& request, int status, std::uint64_t bytes) = 0;
+};
+
+// What a running server can be asked.
+struct ServerCounts {
+  size_t connections = 0;
+  size_t children = 0;  // those that answer requests
+};
+
+}  // namespace arbory

@@ -1,0 +1,111 @@
+#include "arbory/server/login.h"
+
+#include <security/pam_appl.h>
+#include <syslog.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include "arbory/server/child.h"
+#include "arbory/server/http_text.h"
+#include "nas/system/accounts.h"
+
+namespace arbory {
+namespace {
+
+constexpr int kLetIn = 200;
+constexpr int kRefused = 403;
+constexpr int kNoAnswer = 503;
+
+// Answers what PAM asks: a hidden question is taken for the password, a shown one for the name.
+int Converse(int count, const pam_message** questions, pam_response** answers, void* data) {
+  const auto* credentials = static_cast<const Credentials*>(data);
+  if (count <= 0 || count > PAM_MAX_NUM_MSG) return PAM_CONV_ERR;
+  // PAM frees it with the texts in it.
+  auto* given = static_cast<pam_response*>(std::calloc(count, sizeof(pam_response)));
+  if (given == nullptr) return PAM_BUF_ERR;
+  for (int at = 0; at < count; ++at) {
+    const int style = questions[at]->msg_style;
+    if (style == PAM_PROMPT_ECHO_OFF) given[at].resp = strdup(credentials->password.c_str());
+    if (style == PAM_PROMPT_ECHO_ON) given[at].resp = strdup(credentials->user.c_str());
+  }
+  *answers = given;
+  return PAM_SUCCESS;
+}
+
+// The server itself delays every refusal alike.
+void NoDelay(int /*status*/, unsigned /*microseconds*/, void* /*data*/) {}
+
+class Pam {
+ public:
+  Pam(const Credentials& credentials, const PamService& service) {
+    conversation_ = {Converse, const_cast<Credentials*>(&credentials)};
+    status_ =
+        pam_start_confdir(service.name.c_str(), credentials.user.c_str(), &conversation_,
+                          service.folder.empty() ? nullptr : service.folder.c_str(), &handle_);
+    if (status_ == PAM_SUCCESS) {
+      pam_set_item(handle_, PAM_FAIL_DELAY, reinterpret_cast<const void*>(&NoDelay));
+    }
+  }
+  ~Pam() {
+    if (handle_ != nullptr) pam_end(handle_, status_);
+  }
+  Pam(const Pam&) = delete;
+  Pam& operator=(const Pam&) = delete;
+
+  int Check() {
+    if (status_ == PAM_SUCCESS) status_ = pam_authenticate(handle_, PAM_DISALLOW_NULL_AUTHTOK);
+    if (status_ == PAM_SUCCESS) status_ = pam_acct_mgmt(handle_, PAM_DISALLOW_NULL_AUTHTOK);
+    return status_;
+  }
+
+  // Modules may map the name given to another one.
+  std::string User() const {
+    const void* name = nullptr;
+    if (pam_get_item(handle_, PAM_USER, &name) != PAM_SUCCESS || name == nullptr) return {};
+    return static_cast<const char*>(name);
+  }
+
+ private:
+  pam_conv conversation_;
+  pam_handle_t* handle_ = nullptr;
+  int status_ = PAM_ABORT;
+};
+
+int StatusOf(int pam_status) {
+  switch (pam_status) {
+    case PAM_SUCCESS:
+      return kLetIn;
+    case PAM_ABORT:
+    case PAM_BUF_ERR:
+    case PAM_SYSTEM_ERR:
+    case PAM_SERVICE_ERR:
+    case PAM_OPEN_ERR:
+    case PAM_SYMBOL_ERR:
+      return kNoAnswer;
+    default:
+      return kRefused;
+  }
+}
+
+ChildHead CheckLogin(const Credentials& credentials, const PamService& service) {
+  Pam pam(credentials, service);
+  const int status = pam.Check();
+  ChildHead head{StatusOf(status), 0, {}};
+  if (head.status == kNoAnswer) {
+    syslog(LOG_ERR, "login service %s: %s", service.name.c_str(), pam_strerror(nullptr, status));
+  }
+  if (head.status != kLetIn) return head;
+  const auto account = nas::FindAccount(pam.User());
+  if (!account) return {kRefused, 0, {}};
+  head.fields.emplace_back(kLoginUser, PercentEncoded(account->name));
+  return head;
+}
+
+}  // namespace
+
+nas::RunningCall StartLogin(const Credentials& credentials, const PamService& service) {
+  return StartChild([&](int pipe) { SendReply(pipe, CheckLogin(credentials, service), ""); });
+}
+
+}  // namespace arbory

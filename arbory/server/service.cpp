@@ -1,0 +1,422 @@
+#include "arbory/server/service.h"
+
+#include <unistd.h>
+
+#include <charconv>
+#include <ctime>
+
+#include "arbory/server/child.h"
+#include "arbory/server/files.h"
+#include "arbory/server/http_text.h"
+#include "arbory/server/login.h"
+#include "arbory/server/openapi.h"
+#include "arbory/server/pages.h"
+#include "arbory/server/processes.h"
+#include "arbory/server/user_calls.h"
+#include "nas/system/file_io.h"
+#include "nas/system/json_text.h"
+
+namespace arbory {
+namespace {
+
+constexpr int kOk = 200;
+constexpr int kSeeOther = 303;
+constexpr int kBadRequest = 400;
+constexpr int kUnauthorized = 401;
+constexpr int kForbidden = 403;
+constexpr int kNotFound = 404;
+constexpr int kNotAllowed = 405;
+constexpr int kNotJson = 415;
+constexpr int kTooMany = 429;
+constexpr int kUnavailable = 503;
+
+// What callers of the API are told when no row of the table serves them.
+constexpr int kNoSuchApi = 102;
+constexpr int kNoSuchMethod = 103;
+constexpr int kNoSuchVersion = 104;
+
+constexpr std::chrono::seconds kMinute{60};
+// Every refused login takes this long, so that its time tells nothing of the user; far longer than
+// hashing a password, and what PAM's own modules let a wrong one wait.
+constexpr std::chrono::seconds kRefusalTime{2};
+constexpr char kRetrySeconds[] = "1";
+// Names and passwords longer than this are not looked at.
+constexpr size_t kMaxCredentialBytes = 1024;
+constexpr char kSearchApi[] = "NUVA.Arbory.Search";
+constexpr char kStopMethod[] = "stop";
+
+bool SameText(const std::string& a, const std::string& b) {
+  unsigned char difference = a.size() == b.size() ? 0 : 1;
+  for (size_t at = 0; at < std::min(a.size(), b.size()); ++at) {
+    difference |= static_cast<unsigned char>(a[at] ^ b[at]);
+  }
+  return difference == 0;
+}
+
+HttpReply NotAllowed(const char* allowed) {
+  HttpReply reply = ErrorReply(kNotAllowed, std::string("Use ") + allowed + " here.");
+  reply.fields.emplace_back("Allow", allowed);
+  return reply;
+}
+
+HttpReply Busy(int status, const char* sentence, const std::string& seconds) {
+  HttpReply reply = ErrorReply(status, sentence);
+  reply.fields.emplace_back("Retry-After", seconds);
+  return reply;
+}
+
+// The reply as the child says it.
+HttpReply ChildsReply(const ChildHead* head) {
+  if (head == nullptr) return ErrorReply(kUnavailable, "The server failed here; try again.");
+  HttpReply reply;
+  reply.status = head->status;
+  reply.child_follows = true;
+  reply.fields = head->fields;
+  if (reply.fields.empty()) reply.fields = JsonReply(kOk, "").fields;
+  return reply;
+}
+
+std::string ListRows(const nas::Module& module) {
+  Json::Value rows(Json::arrayValue);
+  for (const NUVA::APIMethod* row = module.table(); row->api != nullptr; ++row) {
+    Json::Value entry;
+    entry["api"] = row->api;
+    entry["version"] = row->version;
+    entry["method"] = row->method;
+    rows.append(entry);
+  }
+  return nas::JsonText(rows, nas::JsonBytes::kClean);
+}
+
+}  // namespace
+
+Service::Service(Setup setup, const nas::Module& module)
+    : setup_(std::move(setup)),
+      module_(module),
+      sessions_(setup_.settings.session_minutes * kMinute),
+      login_limit_(setup_.settings.logins_per_minute),
+      api_list_(ListRows(module)),
+      openapi_(OpenApiText(module)) {}
+
+const std::string& Service::NewToken() { return token_ = nas::RandomName(); }
+
+void Service::Finished(const HttpRequest& request, int status, std::uint64_t bytes) {
+  metrics_.CountReply(status, bytes);
+  if (setup_.settings.access_log) {
+    nas::WriteAll(STDERR_FILENO, AccessLine(request, status, bytes));
+  }
+}
+
+Answer Service::Handle(HttpRequest* request) {
+  const std::string host_trouble = TroubleWithHost(*request, setup_.site);
+  if (!host_trouble.empty()) return ErrorReply(kForbidden, host_trouble);
+  const auto path = SplitPath(request->path());
+  if (!path) {
+    return ErrorReply(kBadRequest, "This address is not well-formed; check its path.");
+  }
+  return Route(request, *path);
+}
+
+Answer Service::Route(HttpRequest* request, const Path& path) {
+  const bool posts = (path.size() == 1 && (path[0] == "login" || path[0] == "logout")) ||
+                     (path.size() == 4 && path[0] == "api");
+  if (posts) {
+    if (request->method != "POST") return NotAllowed("POST");
+    return RoutePost(request, path);
+  }
+  if (request->method != "GET" && request->method != "HEAD") return NotAllowed("GET, HEAD");
+  return RouteGet(request, path);
+}
+
+Answer Service::RoutePost(HttpRequest* request, const Path& path) {
+  const std::string origin_trouble = TroubleWithOrigin(*request, setup_.site);
+  if (!origin_trouble.empty()) return ErrorReply(kForbidden, origin_trouble);
+  if (!request->body.empty() && !IsJson(*request)) {
+    return ErrorReply(kNotJson, "Send the parameters as Content-Type: application/json.");
+  }
+  if (path[0] == "login") return Login(*request);
+  if (path[0] == "logout") return Logout(request);
+  return CallApi(request, path);
+}
+
+Answer Service::RouteGet(HttpRequest* request, const Path& path) {
+  const std::string& first = path.empty() ? std::string() : path[0];
+  if (path.size() == 1) {
+    if (first == "health") return JsonReply(kOk, R"({"status":"ok"})");
+    if (first == "open") return OpenByToken(*request);
+    if (first == "api") return JsonReply(kOk, api_list_);
+    if (first == "metrics") {
+      if (!request->from_loopback) {
+        return ErrorReply(kForbidden, "Read the metrics on the machine itself.");
+      }
+      const ServerCounts counts = setup_.counts();
+      const size_t all = ChildrenOfThisProcess().size();
+      HttpReply reply =
+          JsonReply(kOk, metrics_.Text({counts.connections, counts.children,
+                                        all > counts.children ? all - counts.children : 0,
+                                        sessions_.Count(std::time(nullptr))}));
+      reply.fields[0].second = "text/plain; version=0.0.4; charset=utf-8";
+      return reply;
+    }
+  }
+  if (path.size() == 2 && first == "api" && path[1] == "openapi.json") {
+    return JsonReply(kOk, openapi_);
+  }
+  const bool is_private = (path.size() == 1 && (first == "session" || first == "shares")) ||
+                          (path.size() == 2 && first == "searches") ||
+                          (path.size() >= 2 && first == "files");
+  if (!is_private) return PageReply(setup_.web_dir, path);
+  Answer refusal;
+  if (!Authenticate(request, &refusal)) return refusal;
+  if (first == "session") {
+    return SessionReply(kOk, *sessions_.Find(Cookie(*request, setup_.cookie), std::time(nullptr)));
+  }
+  if (first == "shares") {
+    return Run(*request, "shares", [&] { return StartListShares(request->user); });
+  }
+  if (first == "searches") {
+    return Run(*request, "searches", [&] { return StartReadSearch(request->user, path[1]); });
+  }
+  return GetFile(request, path);
+}
+
+template <typename Start>
+Answer Service::Run(const HttpRequest& request, const std::string& method, Start start) {
+  const int limit = setup_.settings.max_calls;
+  int& of_user = running_[request.user];
+  // With logins nobody may take all of it, so that others get through.
+  const int user_limit = setup_.single_user.empty() ? (limit + 1) / 2 : limit;
+  if (setup_.counts().children >= static_cast<size_t>(limit) || of_user >= user_limit) {
+    return Busy(kUnavailable, "The server is busy; try again in a moment.", kRetrySeconds);
+  }
+  ChildAnswer answer;
+  answer.child = start();
+  if (answer.child.pid < 0) {
+    return Busy(kUnavailable, "The machine has no room for another request; try again.",
+                kRetrySeconds);
+  }
+  ++of_user;
+  answer.token = std::shared_ptr<void>(nullptr, [this, user = request.user](void*) {
+    if (--running_[user] == 0) running_.erase(user);
+  });
+  const auto begun = Clock::now();
+  answer.make_reply = [this, method, begun](const ChildHead* head) {
+    const std::chrono::duration<double> spent = Clock::now() - begun;
+    metrics_.CountCall(method, head == nullptr ? nas::kCodeUnknownFailure : head->code,
+                       spent.count());
+    return ChildsReply(head);
+  };
+  return answer;
+}
+
+Answer Service::OpenByToken(const HttpRequest& request) {
+  const auto given = QueryValue(request.query(), "token");
+  const bool good = !token_.empty() && given && SameText(*given, token_);
+  if (setup_.single_user.empty() || !good) {
+    return ErrorReply(kForbidden,
+                      "This address opens the page only once. Print a new one: send the server "
+                      "the signal HUP, or start it again.");
+  }
+  if (request.method != "GET") return NotAllowed("GET");
+  token_.clear();
+  const std::string id = sessions_.Begin(setup_.single_user, std::time(nullptr));
+  HttpReply reply;
+  reply.status = kSeeOther;
+  reply.fields = {{"Location", "/"},
+                  {"Set-Cookie", SessionCookie(id, setup_.settings.session_minutes * 60L)},
+                  {"Cache-Control", "no-store"}};
+  return reply;
+}
+
+Answer Service::Login(const HttpRequest& request) {
+  Json::Value params;
+  Answer refusal;
+  if (!ParseBody(request, &params, &refusal)) return refusal;
+  if (!setup_.single_user.empty()) {
+    return ErrorReply(kForbidden, "This server has one user; open the address it printed.");
+  }
+  const Json::Value& user = params["user"];
+  const Json::Value& password = params["password"];
+  if (!user.isString() || !password.isString() || user.asString().empty()) {
+    return ErrorReply(kBadRequest, R"(Send {"user": TEXT, "password": TEXT}.)");
+  }
+  Credentials credentials{user.asString(), password.asString()};
+  const bool absurd = credentials.user.size() > kMaxCredentialBytes ||
+                      credentials.password.size() > kMaxCredentialBytes ||
+                      credentials.user.find('\0') != std::string::npos ||
+                      credentials.password.find('\0') != std::string::npos;
+  if (absurd) return ErrorReply(kBadRequest, "The user or the password is too long or malformed.");
+  const int wait = login_limit_.Begin(request.peer, credentials.user, std::time(nullptr));
+  if (wait > 0) {
+    metrics_.CountRefusedLogin();
+    return Busy(kTooMany, "Too many refused logins; wait a minute and try again.",
+                std::to_string(wait));
+  }
+  const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
+  Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
+  if (auto* child = std::get_if<ChildAnswer>(&answer)) {
+    child->make_reply = [this, request, given = credentials.user,
+                         count = std::move(child->make_reply)](const ChildHead* head) {
+      count(head);
+      return LoginReply(request, given, head);
+    };
+  }
+  return answer;
+}
+
+HttpReply Service::LoginReply(const HttpRequest& request, const std::string& given_user,
+                              const ChildHead* head) {
+  if (head != nullptr && head->status == kOk) {
+    const auto named = SplitPath("/" + head->fields.at(0).second);
+    const std::string user = named && named->size() == 1 ? named->front() : given_user;
+    login_limit_.Succeeded(request.peer, given_user);
+    const std::time_t now = std::time(nullptr);
+    const std::string id = sessions_.Begin(user, now);
+    HttpReply reply = SessionReply(kOk, *sessions_.Find(id, now));
+    reply.fields.emplace_back("Set-Cookie",
+                              SessionCookie(id, setup_.settings.session_minutes * 60L));
+    return reply;
+  }
+  metrics_.CountRefusedLogin();
+  const bool refused = head != nullptr && head->status == kForbidden;
+  HttpReply reply =
+      refused
+          ? ErrorReply(kUnauthorized, "The user or the password is wrong; try again.")
+          : ErrorReply(kUnavailable, "Logins cannot be checked now; the server's log says why.");
+  reply.not_before = request.begun + kRefusalTime;
+  return reply;
+}
+
+Answer Service::Logout(HttpRequest* request) {
+  Json::Value params;
+  Answer answer;
+  if (!Authenticate(request, &answer) || !ParseBody(*request, &params, &answer)) return answer;
+  const Json::Value& stops = params["stop_searches"];
+  if (!stops.isNull() && !stops.isBool()) {
+    return ErrorReply(kBadRequest, R"(Send {"stop_searches": true} or false.)");
+  }
+  sessions_.End(Cookie(*request, setup_.cookie));
+  const std::string gone = SessionCookie("", 0);
+  const NUVA::APIMethod* stop = module_.Find(kSearchApi, 1, kStopMethod);
+  if (!stops.isBool() || !stops.asBool() || stop == nullptr) {
+    HttpReply reply = JsonReply(kOk, "{}");
+    reply.fields.emplace_back("Set-Cookie", gone);
+    return reply;
+  }
+  answer = Run(*request, "logout", [&] { return StartStopSearches(request->user, *stop); });
+  if (auto* busy = std::get_if<HttpReply>(&answer)) {
+    busy->fields.emplace_back("Set-Cookie", gone);
+    return answer;
+  }
+  auto& child = std::get<ChildAnswer>(answer);
+  child.make_reply = [make = std::move(child.make_reply), gone](const ChildHead* head) {
+    HttpReply reply = make(head);
+    reply.fields.emplace_back("Set-Cookie", gone);
+    return reply;
+  };
+  return answer;
+}
+
+Answer Service::CallApi(HttpRequest* request, const Path& path) {
+  Json::Value params;
+  Answer answer;
+  if (!Authenticate(request, &answer) || !ParseBody(*request, &params, &answer)) return answer;
+  int version = 0;
+  const std::string& text = path[2];
+  const auto parsed = std::from_chars(text.data(), text.data() + text.size(), version);
+  const bool is_number = parsed.ec == std::errc() && parsed.ptr == text.data() + text.size();
+  const NUVA::APIMethod* row = is_number ? module_.Find(path[1], version, path[3]) : nullptr;
+  if (row == nullptr) return NoSuchRow(path);
+  const std::string session = Cookie(*request, setup_.cookie);
+  answer = Run(*request, std::string(row->api) + "/" + row->method, [&] {
+    // The id is the key to the account, which no log line of the module needs to hold whole.
+    constexpr size_t kShown = 8;
+    return nas::StartCall(*row, {path[3], params, request->user, session.substr(0, kShown)},
+                          EncodeApiReply);
+  });
+  if (auto* child = std::get_if<ChildAnswer>(&answer)) {
+    child->make_reply = [make = std::move(child->make_reply)](const ChildHead* head) {
+      HttpReply reply = make(head);
+      if (head != nullptr) return reply;
+      return JsonReply(kOk, nas::EncodeJsonReply(nas::kCodeUnknownFailure, Json::Value()));
+    };
+  }
+  return answer;
+}
+
+HttpReply Service::NoSuchRow(const Path& path) const {
+  bool has_api = false;
+  bool has_version = false;
+  for (const NUVA::APIMethod* row = module_.table(); row->api != nullptr; ++row) {
+    if (row->api != path[1]) continue;
+    has_api = true;
+    has_version = has_version || std::to_string(row->version) == path[2];
+  }
+  const std::string hint = "; GET /api lists what there is.";
+  if (!has_api) return ErrorReply(kNotFound, kNoSuchApi, "There is no API " + path[1] + hint);
+  if (!has_version) {
+    return ErrorReply(kNotFound, kNoSuchVersion, path[1] + " has no version " + path[2] + hint);
+  }
+  return ErrorReply(kNotFound, kNoSuchMethod,
+                    path[1] + " " + path[2] + " has no method " + path[3] + hint);
+}
+
+Answer Service::GetFile(HttpRequest* request, const Path& path) {
+  if (path.size() < 3) return ErrorReply(kNotFound, "Name a file: /files/SHARE/PATH.");
+  FileRequest file;
+  file.user = request->user;
+  file.share = path[1];
+  file.path.assign(path.begin() + 2, path.end());
+  file.preview = QueryValue(request->query(), "preview").value_or("") == "1";
+  const std::string* range = request->Field("range");
+  if (range != nullptr) file.range = *range;
+  file.head_only = request->method == "HEAD";
+  return Run(*request, "files", [&] { return StartFile(file); });
+}
+
+HttpReply Service::SessionReply(int status, const Sessions::Session& session) const {
+  Json::Value body;
+  body["user"] = session.user;
+  body["mode"] = setup_.single_user.empty() ? "login" : "single";
+  body["expires"] = Json::Int64{session.expires};
+  body["version"] = ARBORY_VERSION;
+  return JsonReply(status, nas::JsonText(body, nas::JsonBytes::kClean));
+}
+
+std::string Service::SessionCookie(const std::string& id, long max_age) const {
+  return setup_.cookie + "=" + id +
+         "; Path=/; HttpOnly; SameSite=Strict; Max-Age=" + std::to_string(max_age) +
+         (setup_.site.behind_tls ? "; Secure" : "");
+}
+
+bool Service::Authenticate(HttpRequest* request, Answer* refusal) {
+  const std::string id = Cookie(*request, setup_.cookie);
+  const auto session = sessions_.Find(id, std::time(nullptr));
+  if (session) {
+    request->user = session->user;
+    return true;
+  }
+  *refusal = NotLoggedIn();
+  return false;
+}
+
+HttpReply Service::NotLoggedIn() const {
+  const bool single = !setup_.single_user.empty();
+  Json::Value body;
+  body["code"] = kUnauthorized;
+  body["error"] = single ? "Open the address that the server printed when it started; a used one "
+                           "is replaced when the server gets the signal HUP."
+                         : "Log in first.";
+  body["mode"] = single ? "single" : "login";
+  return JsonReply(kUnauthorized, nas::JsonText(body, nas::JsonBytes::kClean));
+}
+
+bool Service::ParseBody(const HttpRequest& request, Json::Value* params, Answer* refusal) {
+  *params = Json::Value(Json::objectValue);
+  if (request.body.empty()) return true;
+  if (nas::ParseJson(request.body, params) && params->isObject()) return true;
+  *refusal = ErrorReply(kBadRequest, "The body must be one JSON object.");
+  return false;
+}
+
+}  // namespace arbory
