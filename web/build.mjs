@@ -1,29 +1,30 @@
-// Bundles the page into dist/: index.html, app.js, app.css and the icon, and nothing that is fetched
-// from elsewhere. `node build.mjs --watch` rebuilds as files change.
-import { context } from 'esbuild';
-import { copyFile, mkdir, rm } from 'node:fs/promises';
+// Bundles the page into dist/: index.html, and beside it in assets/ the script, the style sheet and
+// the icon under names that tell their content, so that a browser may keep them for good. Nothing in
+// them is fetched from elsewhere.
+import { build } from 'esbuild';
+import { readFile, rm, writeFile } from 'node:fs/promises';
+import { basename } from 'node:path';
 
-const options = {
-  entryPoints: { app: 'src/main.tsx' },
-  outdir: 'dist',
+process.chdir(new URL('.', import.meta.url).pathname);
+await rm('dist', { recursive: true, force: true });
+const { metafile } = await build({
+  entryPoints: ['src/main.tsx', 'src/icon.svg'],
+  outdir: 'dist/assets',
+  entryNames: '[name]-[hash]',
+  loader: { '.svg': 'copy' },
   bundle: true,
   format: 'esm',
-  target: ['chrome111', 'firefox113', 'safari16.4'],
+  target: ['chrome123', 'firefox120', 'safari17.5'],
   jsx: 'automatic',
   jsxImportSource: 'preact',
   minify: true,
+  metafile: true,
   legalComments: 'none',
   logLevel: 'warning',
-};
-
-process.chdir(import.meta.dirname ?? new URL('.', import.meta.url).pathname);
-await rm('dist', { recursive: true, force: true });
-await mkdir('dist', { recursive: true });
-const bundle = await context(options);
-await bundle.rebuild();
-for (const name of ['index.html', 'icon.svg']) await copyFile(`src/${name}`, `dist/${name}`);
-if (process.argv.includes('--watch')) {
-  await bundle.watch();
-} else {
-  await bundle.dispose();
+});
+let html = await readFile('src/index.html', 'utf8');
+for (const path of Object.keys(metafile.outputs)) {
+  const [, name, ending] = /^(.*)-[A-Z0-9]+(\.\w+)$/.exec(basename(path));
+  html = html.replaceAll(`"${name}${ending}"`, `"assets/${basename(path)}"`);
 }
+await writeFile('dist/index.html', html);

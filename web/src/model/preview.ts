@@ -6,7 +6,9 @@ export type PreviewKind = 'image' | 'pdf' | 'text' | 'none';
 
 const words = (text: string) => new Set(text.split(' '));
 const IMAGES = words('png jpg jpeg gif webp avif');
-const TEXTS = words('txt text md log csv');
+const TEXTS = words(
+  'txt md log csv tsv json xml yaml yml ini conf cfg toml c h cpp hpp cc py js ts go rs java sh sql',
+);
 
 export function previewKind(name: string): PreviewKind {
   const extension = extensionOf(name);
@@ -57,7 +59,7 @@ export async function readStart(
 // Line breaks and tabs are shown as what they are here; other controls as signs.
 function textPieces(text: string, ranges: [number, number][]): Piece[] {
   return pieces(text, ranges).map((piece) => {
-    const plain = { '\u240a': '\n', '\u2409': '\t', '\u240d': '' }[piece.text];
+    const plain = { '\\n': '\n', '\\t': '\t', '\\r': '' }[piece.text];
     return piece.sign && plain !== undefined ? { ...piece, text: plain } : piece;
   });
 }

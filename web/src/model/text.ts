@@ -13,14 +13,12 @@ export type Range = [start: number, end: number];
 // scripts and emoji need them.
 const UNSEEN =
   /[\u0000-\u001f\u007f-\u009f\u00ad\u061c\u180e\u200b\u200e\u200f\u2028-\u202e\u2060-\u206f\ufeff\ufff9-\ufffb]/g;
-const CONTROL_PICTURES = 0x2400;
-const DELETE_PICTURE = '\u2421';
+const ESCAPES: Record<string, string> = { '\n': '\\n', '\r': '\\r', '\t': '\\t' };
 
 function signFor(character: string): string {
   const code = character.charCodeAt(0);
-  if (code < 0x20) return String.fromCharCode(CONTROL_PICTURES + code);
-  if (code === 0x7f) return DELETE_PICTURE;
-  return `U+${code.toString(16).toUpperCase().padStart(4, '0')}`;
+  const hex = code.toString(16).toUpperCase();
+  return ESCAPES[character] ?? (code < 0x80 ? `\\x${hex.padStart(2, '0')}` : `U+${hex.padStart(4, '0')}`);
 }
 
 // `ranges` are ordered and do not overlap.
@@ -65,9 +63,10 @@ export function plural(n: number, one: string, many = one + 's'): string {
   return `${count(n)} ${n === 1 ? one : many}`;
 }
 
-export function elapsed(milliseconds: number): string {
+// With `exact`, hundredths where they say something; a running clock shows none.
+export function elapsed(milliseconds: number, exact: boolean): string {
   const seconds = milliseconds / 1000;
-  if (seconds < 59.95) return `${seconds.toFixed(seconds < 9.995 ? 2 : 1)} s`;
+  if (seconds < 59.95) return `${seconds.toFixed(exact && seconds < 9.995 ? 2 : 1)} s`;
   const whole = Math.round(seconds);
   return `${Math.floor(whole / 60)} min ${whole % 60} s`;
 }

@@ -1,5 +1,6 @@
 // In place of the table: how to search, before the first search; what to try, when nothing is found.
 import { hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
+import { describe } from '../model/history.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';
@@ -48,7 +49,8 @@ export function Welcome({ app }: { app: App }) {
               <li key={one}>
                 <button type="button" class="example" onClick={() => app.submit(one.criteria)}>
                   <Name text={one.criteria.pattern} />
-                </button>
+                </button>{' '}
+                <span class="aside">{describe(one.criteria).join(' · ')}</span>
               </li>
             ))}
           </ul>

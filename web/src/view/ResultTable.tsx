@@ -21,6 +21,7 @@ export interface RowActions {
 }
 
 export function ResultTable({ app, search, actions }: { app: App; search: Search; actions: RowActions }) {
+  const root = useRef<HTMLDivElement>(null);
   const scroller = useRef<HTMLDivElement>(null);
   const model = useMemo(() => new ScrollModel(), [search]);
   const [, redraw] = useState(0);
@@ -91,6 +92,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Search
   const activeSeen = app.active >= first && app.active <= last;
   return (
     <div
+      ref={root}
       class="table"
       role="grid"
       tabIndex={0}
@@ -123,6 +125,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Search
               active={index === app.active}
               highlighter={highlighter}
               choose={(row) => {
+                root.current?.focus({ preventScroll: true });
                 goTo(index);
                 app.set({ detailed: row });
               }}

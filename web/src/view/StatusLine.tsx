@@ -46,7 +46,7 @@ function Elapsed({ search }: { search: Search }) {
     const timer = setInterval(() => tick((n) => n + 1), TICK_MS);
     return () => clearInterval(timer);
   }, [search, search.over]);
-  return <time class="elapsed">{elapsed(search.elapsed)}</time>;
+  return <time class="elapsed">{elapsed(search.elapsed, search.over)}</time>;
 }
 
 // The only part that is announced; it changes seldom enough to be listened to.
@@ -164,13 +164,14 @@ function Export({ app, search }: { app: App; search: Search }) {
   }
   return (
     <Popover
-      className="tool"
+      className="tool save"
       panelClass="menu right"
       panelLabel="Save the result"
+      title="Save result"
       label={
         <>
           <Icon name="download" size={14} />
-          Save result
+          <span class="long">Save result</span>
         </>
       }
     >

@@ -28,8 +28,8 @@ export type IconName = keyof typeof DRAWINGS;
 
 export function Icon({ name, size = 16 }: { name: IconName; size?: number }) {
   return (
-    <svg class="icon" viewBox="0 0 16 16" width={size} height={size} aria-hidden="true">
-      <path d={DRAWINGS[name]} />
+    <svg class="icon" stroke-width="1.4" viewBox="0 0 16 16" width={size} height={size} aria-hidden="true">
+      <path d={DRAWINGS[name]} stroke-width={name === 'more' ? 2.2 : undefined} />
     </svg>
   );
 }

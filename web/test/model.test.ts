@@ -1,0 +1,211 @@
+// The parts of the page that only compute: each table row is a case that once could go wrong.
+import assert from 'node:assert/strict';
+import { test } from 'node:test';
+import { fromHash, toHash, type Address } from '../src/model/address.ts';
+import { NO_CRITERIA, startParams, CriterionError } from '../src/model/criteria.ts';
+import { csvRow, jsonLine } from '../src/model/csv.ts';
+import { Highlighter } from '../src/model/highlight.ts';
+import { fromRecord } from '../src/model/history.ts';
+import { formatSize, parseSize } from '../src/model/size.ts';
+import { pieces, visible } from '../src/model/text.ts';
+import { customValue, timeBounds } from '../src/model/times.ts';
+import type { FileRow } from '../src/api/types.ts';
+
+test('highlighting marks what matched', () => {
+  const rows: [string, string, string, string][] = [
+    ['holi', 'My Holiday', 'My [Holi]day', 'case is ignored'],
+    ['a b', 'ba', '[ba]', 'touching places are one'],
+    ['a|b !c', 'xbca', 'x[b]c[a]', 'either, and never the excluded'],
+    ['"a b"', 'a b ab', '[a b] ab', 'a quoted term holds its space'],
+    ['"a*"', 'aa a*', 'aa [a*]', 'a quoted star is a star'],
+    ['!', 'wow!', 'wow[!]', 'an exclamation mark of its own'],
+    ['*.c', 'a.c.c', 'a.c[.c]', 'the last run of a glob stands at the end'],
+    ['img_*2?*.jpg', 'IMG_1202.jpg', '[IMG_]1[2]02[.jpg]', 'runs of a glob, not what a star took'],
+    ['[ab]x*', 'bxyz', 'b[x]yz', 'a set is no literal'],
+    ['[!a]x', 'bx', 'b[x]', 'a negated set'],
+    ['a[', 'za[', 'z[a[]', 'a bracket that nothing closes'],
+    ['ss', 'Straße', 'Stra[ß]e', 'a letter that folds to two'],
+    ['été', 'e\u0301te\u0301.txt', '[e\u0301te\u0301].txt', 'composed finds decomposed'],
+    ['e', 'e\u0301', 'e\u0301', 'a letter without its mark is another one'],
+    ['regex:^\\d+', '123 4', '[123] 4', 'a regular expression'],
+    ['x regex:b|c', 'xabc', '[x]a[bc]', 'a regular expression after a term'],
+    ['regex:(', 'a(', 'a(', 'a broken one marks nothing'],
+    ['regex:(a+)+$', 'aaa', 'aaa', 'one that may run away is not tried'],
+    ['', 'abc', 'abc', 'nothing'],
+  ];
+  for (const [pattern, name, wanted, why] of rows) {
+    const shown = pieces(name, new Highlighter(pattern).ranges(name));
+    const text = shown.map((piece) => (piece.marked ? `[${piece.text}]` : piece.text)).join('');
+    assert.equal(text.replaceAll('][', ''), wanted, `${pattern} in ${name}: ${why}`);
+  }
+});
+
+test('highlighting ends soon whatever the pattern', () => {
+  const name = 'a'.repeat(255);
+  for (const pattern of ['*a'.repeat(120) + 'b', 'a '.repeat(500), '*' + '?*'.repeat(400)]) {
+    const begun = performance.now();
+    new Highlighter(pattern).ranges(name);
+    assert.ok(performance.now() - begun < 500, pattern.slice(0, 20));
+  }
+});
+
+test('what cannot be seen is shown as a sign', () => {
+  const rows: [string, string][] = [
+    ['a\nb\tc\rd', 'a\\nb\\tc\\rd'],
+    ['\x1b[31mred\x7f', '\\x1B[31mred\\x7F'],
+    ['\u202egnp.exe', 'U+202Egnp.exe'],
+    ['zero\u200bwidth\ufeff', 'zeroU+200BwidthU+FEFF'],
+    ['👩\u200d👧 שלום é', '👩\u200d👧 שלום é'],
+    ['<b>&amp;"\'', '<b>&amp;"\''],
+  ];
+  for (const [name, shown] of rows) assert.equal(visible(name), shown);
+  assert.deepEqual(pieces('a\nb', [[0, 2]]), [
+    { text: 'a', marked: true, sign: false },
+    { text: '\\n', marked: true, sign: true },
+    { text: 'b', marked: false, sign: false },
+  ]);
+});
+
+test('an address repeats its search, whatever it holds', () => {
+  const address: Address = {
+    criteria: {
+      ...NO_CRITERIA,
+      pattern: 'a b&c=d#e "ü" 100%',
+      folders: ['/photos/2024 & more', '/Straße'],
+      kind: 'image',
+      extension: 'jpg, png',
+      sizeFrom: '1.5 MB',
+      modified: '2026-01-01..',
+      created: 'last-7-days',
+      owner: 'DOM\\ann',
+      contents: true,
+      subfolders: false,
+    },
+    sort: { column: 'mtime', descending: true },
+  };
+  assert.deepEqual(fromHash(toHash(address)), address);
+  assert.equal(fromHash(''), null);
+  assert.equal(fromHash('#sort=name'), null);
+  const hostile = fromHash('#q=x&in=javascript:1&in=//evil&type=exe&modified=ever&sort=-DROP');
+  assert.deepEqual(hostile, { criteria: { ...NO_CRITERIA, pattern: 'x' }, sort: null });
+});
+
+test('sizes', () => {
+  const rows: [string, number | undefined][] = [
+    ['0', 0],
+    ['500', 500],
+    ['500 B', 500],
+    ['20 KB', 20480],
+    ['1.5m', 1572864],
+    ['1,5 MiB', 1572864],
+    [' 2 GB ', 2147483648],
+    ['', undefined],
+    ['-1', undefined],
+    ['1 XB', undefined],
+    ['1e9', undefined],
+    ['99999999 PB', undefined],
+  ];
+  for (const [text, bytes] of rows) assert.equal(parseSize(text), bytes, text);
+  const shown: [number, string][] = [
+    [0, '0 B'],
+    [999, '999 B'],
+    [1000, '1.0 KB'],
+    [10188, '9.9 KB'],
+    [10189, '10 KB'],
+    [1023 * 1024, '1.0 MB'],
+    [2 ** 50 * 5000, '5000 PB'],
+  ];
+  for (const [bytes, text] of shown) assert.equal(formatSize(bytes), text, String(bytes));
+});
+
+// The tests run in the time zone of Berlin: clocks changed on 2026-03-29 and 2026-10-25.
+test('times', () => {
+  const now = new Date(2026, 2, 30, 15, 4, 5);
+  const at = (...parts: [number, number, number]) => new Date(...parts).getTime() / 1000;
+  const rows: [string, object | undefined][] = [
+    ['', {}],
+    ['today', { from: at(2026, 2, 30) }],
+    ['yesterday', { from: at(2026, 2, 29), to: at(2026, 2, 30) - 1 }],
+    ['last-7-days', { from: at(2026, 2, 24) }],
+    ['last-year', { from: at(2025, 0, 1), to: at(2026, 0, 1) - 1 }],
+    ['2026-03-29..2026-03-29', { from: at(2026, 2, 29), to: at(2026, 2, 29) + 23 * 3600 - 1 }],
+    ['2026-01-01..', { from: at(2026, 0, 1) }],
+    ['..1999-12-31', { to: at(2000, 0, 1) - 1 }],
+    ['..2100-01-01', { to: 2 ** 31 - 1 }],
+    ['0001-01-01..', { from: -(2 ** 31) }],
+    ['2026-02-30..', undefined],
+    ['last-3-days', undefined],
+    ['2026-01-01', undefined],
+  ];
+  for (const [value, bounds] of rows) assert.deepEqual(timeBounds(value, now), bounds, value);
+  const days = '2026-03-29..2026-10-25';
+  const { from, to } = timeBounds(days, now)!;
+  assert.equal(customValue(from, to), days);
+});
+
+test('what a search is started with', () => {
+  const now = new Date();
+  const plain = { ...NO_CRITERIA, pattern: 'x' };
+  assert.deepEqual(startParams(plain, ['/a', '/b'], now), {
+    folder_path: ['/a', '/b'],
+    pattern: 'x',
+    recursive: true,
+    search_content: false,
+    search_type: 'simple',
+  });
+  const full = { ...plain, folders: ['/c'], kind: 'image', sizeTo: '1 KB', subfolders: false };
+  assert.deepEqual(startParams(full, ['/a'], now), {
+    folder_path: ['/c'],
+    pattern: 'x',
+    filetype: 'image',
+    size_to: 1024,
+    recursive: false,
+    search_content: false,
+    search_type: 'advance',
+  });
+  const wrong: [object, string][] = [
+    [{ sizeFrom: 'much' }, 'sizeFrom'],
+    [{ sizeFrom: '2 KB', sizeTo: '1 KB' }, 'sizeTo'],
+    [{ modified: '2026-02-02..2026-02-01' }, 'modified'],
+    [{ contents: true, pattern: ' ' }, 'contents'],
+  ];
+  for (const [change, field] of wrong) {
+    assert.throws(
+      () => startParams({ ...plain, ...change }, ['/a'], now),
+      (error) => error instanceof CriterionError && error.field === field,
+      field,
+    );
+  }
+  assert.throws(() => startParams(plain, [], now), CriterionError);
+});
+
+test('the history gives back what was searched', () => {
+  const criteria = { ...NO_CRITERIA, pattern: 'x', kind: 'image', extension: 'jpg', sizeFrom: '1500', sizeTo: '2 GB', modified: '2026-01-01..2026-01-31', contents: true };
+  const record = startParams(criteria, ['/a', '/b'], new Date());
+  assert.deepEqual(fromRecord(record, ['/b', '/a']), criteria);
+  assert.deepEqual(fromRecord(record, ['/a'])?.folders, ['/a', '/b']);
+  assert.deepEqual(fromRecord({ pattern: 'x', folder_path: '/a,/c', recursive: false }, [])?.folders, ['/a', '/c']);
+  for (const broken of [{}, { pattern: '' }, { pattern: 3 }, { pattern: 'x', owner: '1026' }]) {
+    assert.equal(fromRecord(broken, []), null, JSON.stringify(broken));
+  }
+});
+
+test('exports are safe to open', () => {
+  const row: FileRow = { name: '=1+1', path: '/a/=1+1', is_dir: false, size: 0, time: { mtime: 1, atime: 0, ctime: 0, crtime: 0 } };
+  const name = (text: string) => csvRow({ ...row, name: text }).split(',').slice(1, -6).join(',');
+  const rows: [string, string][] = [
+    ['=1+1', "'=1+1"],
+    ['@x', "'@x"],
+    ['-1', "'-1"],
+    ['+1', "'+1"],
+    ['\t=1', "'\t=1"],
+    ['a"b,c', '"a""b,c"'],
+    ['a\nb', '"a\nb"'],
+    ['\n=1', '"\'\n=1"'],
+    ['plain', 'plain'],
+  ];
+  for (const [text, cell] of rows) assert.equal(name(text), cell, JSON.stringify(text));
+  assert.equal(csvRow(row), "/a/=1+1,'=1+1,file,0,1970-01-01T00:00:01Z,,,\r\n");
+  assert.deepEqual(JSON.parse(jsonLine({ ...row, name: 'a\nb' })).name, 'a\nb');
+  assert.equal(jsonLine({ ...row, name: 'a\nb' }).split('\n').length, 2);
+});
