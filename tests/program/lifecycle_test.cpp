@@ -41,8 +41,8 @@ class Lifecycle : public ProgramTest {
     return Eventually([&] {
       const Json::Value data = TaskProperty(id, "data");
       const Json::Value walk = TaskProperty(id, "walk");
-      if (stage == "started") return data.isMember("pid");
-      if (stage == "located") return data.isMember("sdbid");
+      if (stage == "started") return data.isObject() && data.isMember("pid");
+      if (stage == "located") return data.isObject() && data.isMember("sdbid");
       return walk.isObject() && walk["phase"].asString() == stage;
     });
   }

@@ -12,6 +12,7 @@
 #include <memory>
 #include <thread>
 
+#include "nas/system/file_io.h"
 #include "nas/system/json_text.h"
 #include "nas/system/user_state.h"
 #include "platform/task.h"
@@ -193,7 +194,9 @@ std::vector<std::string> ProgramTest::Remains(const std::string& user) {
   for (const std::string& folder :
        {dir_ + "/volume1" + results, state_ + "/volume0" + results, nas::TaskFolder(user)}) {
     for (const std::string& file : FilesIn(folder)) {
-      if (file != nas::TaskFolder(user) + "/lock") remains.push_back(file);
+      // The lock stays for the next task; a writer killed half-way leaves a file for the sweep.
+      const std::string name = fs::path(file).filename();
+      if (name != "lock" && !name.starts_with(nas::kTemporaryPrefix)) remains.push_back(file);
     }
   }
   return remains;
