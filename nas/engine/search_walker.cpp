@@ -57,7 +57,7 @@ void SetErrorFromException() {
 }
 
 // Results from this many on take noticeably long to sort for the first time.
-constexpr std::uint64_t kWorthSorting = 20'000;
+constexpr std::uint64_t kWorthSorting = 100'000;
 // A client that only wanted the rows, such as a terminal, has removed them by then.
 constexpr std::chrono::milliseconds kBeforeSorting(200);
 constexpr int kSortingNiceness = 10;
