@@ -9,6 +9,7 @@ process.chdir(new URL('.', import.meta.url).pathname);
 await rm('dist', { recursive: true, force: true });
 const { metafile } = await build({
   entryPoints: ['src/main.tsx', 'src/icon.svg'],
+  absWorkingDir: process.cwd(),
   outdir: 'dist/assets',
   entryNames: '[name]-[hash]',
   loader: { '.svg': 'copy' },

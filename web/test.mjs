@@ -1,4 +1,5 @@
-// Bundles the unit tests, since Node does not read TypeScript, and runs them with its own runner.
+// Bundles tests, since Node does not read TypeScript, and runs them: `node test.mjs [FOLDER [WORD]]`
+// takes the files FOLDER/*.WORD.ts. Node's own runner runs and counts them.
 import { build } from 'esbuild';
 import { spawnSync } from 'node:child_process';
 import { mkdtemp, readdir, rm } from 'node:fs/promises';
@@ -6,22 +7,25 @@ import { tmpdir } from 'node:os';
 import { join } from 'node:path';
 
 process.chdir(new URL('.', import.meta.url).pathname);
+const [folder = 'test', word = 'test'] = process.argv.slice(2);
 const out = await mkdtemp(join(tmpdir(), 'arbory-page-tests-'));
-const tests = (await readdir('test')).filter((name) => name.endsWith('.test.ts'));
+const tests = (await readdir(folder)).filter((name) => name.endsWith(`.${word}.ts`));
 await build({
-  entryPoints: tests.map((name) => `test/${name}`),
+  entryPoints: tests.map((name) => join(folder, name)),
+  absWorkingDir: process.cwd(),
   outdir: out,
-  outExtension: { '.js': '.mjs' },
+  outExtension: { '.js': '.cjs' },
   bundle: true,
   platform: 'node',
-  format: 'esm',
+  format: 'cjs',
+  external: ['playwright-core'],
   sourcemap: 'inline',
   logLevel: 'warning',
 });
-const files = tests.map((name) => join(out, name.replace(/\.ts$/, '.mjs')));
+const files = tests.map((name) => join(out, name.replace(/\.ts$/, '.cjs')));
 const run = spawnSync(process.execPath, ['--enable-source-maps', '--test', ...files], {
   stdio: 'inherit',
-  env: { ...process.env, TZ: 'Europe/Berlin' },
+  env: { ...process.env, TZ: 'Europe/Berlin', NODE_PATH: join(process.cwd(), 'node_modules') },
 });
 await rm(out, { recursive: true, force: true });
 process.exit(run.status ?? 1);

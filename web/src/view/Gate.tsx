@@ -16,7 +16,10 @@ export function Gate({ app }: { app: App }) {
             This page belongs to whoever started the server. Open the address that{' '}
             <code>arbory serve</code> printed when it started: it ends with a token that lets you in.
           </p>
-          <p>If it was used before, start the server again to get a new one.</p>
+          <p>
+            Each address works once. For another one, start the server again or send it the signal{' '}
+            <code>SIGHUP</code>.
+          </p>
         </>
       )}
       {app.gate === 'unreachable' && (

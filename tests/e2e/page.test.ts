@@ -1,0 +1,334 @@
+// What people do with the page, from the address that the server prints to leaving it.
+import assert from 'node:assert/strict';
+import * as fs from 'node:fs';
+import { after, before, test } from 'node:test';
+import type { Browser } from 'playwright-core';
+import { openBrowser, Tab } from './browser.ts';
+import { Place, Server } from './server.ts';
+import { HOSTILE, makeFiles, makeMany, MANY } from './tree.ts';
+
+let place: Place;
+let server: Server;
+let browser: Browser;
+let cookies: Awaited<ReturnType<ReturnType<Tab['page']['context']>['cookies']>>;
+
+before(async () => {
+  place = new Place();
+  const shares = { files: makeFiles(place), many: makeMany(place) };
+  for (const folder of Object.values(shares)) place.giveAway(folder);
+  server = await Server.start(place, { shares });
+  browser = await openBrowser();
+});
+after(async () => {
+  await browser?.close();
+  await server?.stop();
+  place?.remove();
+});
+
+// A tab with the session that the first test opened; `hash` is the search in its address.
+async function openTab(hash = '', options = {}): Promise<Tab> {
+  const tab = await Tab.open(browser, options);
+  await tab.page.context().addCookies(cookies);
+  await tab.page.goto(`${server.origin}/${hash}`);
+  await tab.page.waitForSelector('#pattern');
+  if (hash) await tab.over();
+  return tab;
+}
+
+test('without a session the page tells to open the printed address, which works', async () => {
+  const tab = await Tab.open(browser);
+  await tab.page.goto(server.origin);
+  await tab.page.getByRole('heading', { name: 'Open the printed address' }).waitFor();
+  await tab.page.goto(server.address + '#q=plan');
+  await tab.page.waitForSelector('#pattern:focus');
+  assert.equal(new URL(tab.page.url()).search, '', 'the token does not stay in the address');
+  cookies = await tab.page.context().cookies();
+  await tab.close();
+});
+
+test('a search shows what was found, marked, and how it went', async () => {
+  const tab = await openTab();
+  const { page } = tab;
+  await tab.search('PLAN !middle');
+  assert.equal(await tab.count(), '3 matches'); // the folder "plans" too
+  assert.deepEqual([...(await tab.names())].sort(), ['plan large.txt', 'plan small.txt', 'plans']);
+  assert.equal(await page.textContent('.row mark >> nth=0'), 'plan');
+  assert.match((await page.textContent('.elapsed'))!, /^\d\.\d\d s$/);
+  await page.click('text=1 folder could not be read');
+  await page.getByText('Ask the owner for permission').waitFor();
+  await tab.close();
+});
+
+test('columns sort, and back to the order found', async () => {
+  const tab = await openTab('#q=plan*.txt');
+  const { page } = tab;
+  const order = async (column: string) => {
+    await page.getByRole('columnheader', { name: column }).getByRole('button').click();
+    return page.waitForFunction(() => {
+      const sorted = document.querySelector('[aria-sort$=ing]');
+      return sorted ? `${sorted.textContent} ${sorted.getAttribute('aria-sort')}` : 'found';
+    });
+  };
+  const rows: [string, string][] = [
+    ['Size', 'large'],
+    ['Size', 'small'],
+    ['Modified', 'small'],
+    ['Modified', 'large'],
+    ['Name', 'large'],
+    ['Name', 'small'],
+  ];
+  for (const [column, first] of rows) {
+    await order(column);
+    await tab.firstIs(`plan ${first}.txt`);
+  }
+  assert.match(page.url(), /sort=-name/);
+  await order('Name');
+  await page.waitForURL((url) => !url.hash.includes('sort'));
+  await tab.close();
+});
+
+test('a table of many rows is scrolled to any of them, and fetches only what is seen', async () => {
+  const tab = await openTab('#q=item&in=/many&sort=name');
+  const { page } = tab;
+  let fetched = 0;
+  page.on('request', (request) => request.url().endsWith('/list') && ++fetched);
+  assert.equal(await tab.count(), `${MANY.toLocaleString('en')} matches`);
+  await page.focus('.table');
+  await page.keyboard.press('End');
+  const nameOf = (row: number) => `item ${String(row).padStart(6, '0')}.dat`;
+  await page.getByText(nameOf(MANY - 1)).waitFor();
+  await page.keyboard.press('ArrowUp');
+  await page.locator(`.row.active`, { hasText: nameOf(MANY - 2) }).waitFor();
+  // Dragging the bar over everything, then to the middle.
+  await page.locator('.scroller').evaluate(async (element) => {
+    for (const part of [1, 0.8, 0.6, 0.4, 0.2, 0, 0.25, 0.5]) {
+      element.scrollTop = part * (element.scrollHeight - element.clientHeight);
+      await new Promise((drawn) => requestAnimationFrame(() => requestAnimationFrame(drawn)));
+    }
+  });
+  await page.getByText(nameOf(MANY / 2)).waitFor();
+  await page.waitForFunction(() => !document.querySelector('.row.waiting'));
+  const before = await tab.names();
+  const box = (await page.locator('.scroller').boundingBox())!;
+  await page.mouse.move(box.x + 50, box.y + 50);
+  await page.mouse.wheel(0, 29 * 3);
+  await page.waitForFunction((old) => document.querySelector(`#row-${old}`) === null, Number(before[0]!.slice(5, 11)));
+  const now = await tab.names();
+  now.forEach((name, i) => i > 0 && assert.equal(Number(name.slice(5, 11)), Number(now[i - 1]!.slice(5, 11)) + 1));
+  assert.ok(fetched < 30, `${fetched} pages were fetched`);
+  assert.ok((await page.locator('.row').count()) < 60);
+  await tab.close();
+});
+
+test('a running search is stopped, and says so', async () => {
+  const tab = await openTab();
+  const { page } = tab;
+  await page.fill('#pattern', 'needle|slow');
+  await page.click('text=Criteria');
+  await page.check('text=Also look inside files');
+  await page.press('#pattern', 'Enter');
+  await page.waitForSelector('.stop');
+  await page.getByText('slow', { exact: true }).first().waitFor(); // by its name, while files are read
+  await page.click('.stop');
+  await page.locator('.figures', { hasText: 'stopped' }).waitFor();
+  assert.match(await tab.count(), /[1-9]/);
+  await tab.close();
+});
+
+test('reload and a shared link repeat the search; the way back leads to the one before', async () => {
+  const tab = await openTab();
+  const { page } = tab;
+  await page.click('text=Criteria');
+  await page.getByLabel('Size from').fill('1 KB');
+  await page.getByRole('radio', { name: 'Files' }).check({ force: true });
+  await tab.search('plan');
+  assert.deepEqual([...(await tab.names())].sort(), ['plan large.txt', 'plan middle.txt']);
+  const link = page.url();
+  await tab.search('notes');
+  await page.goBack();
+  await tab.over();
+  assert.equal(page.url(), link);
+  assert.equal(await page.inputValue('#pattern'), 'plan');
+  await page.reload();
+  await tab.over();
+  assert.equal(await tab.count(), '2 matches');
+  await page.getByRole('button', { name: 'Remove: at least 1 KB' }).click();
+  await page.locator('.figures strong', { hasText: '3 matches' }).waitFor();
+  await tab.close();
+});
+
+test('past searches are offered, repeated and cleared', async () => {
+  const tab = await openTab();
+  const { page } = tab;
+  await tab.search('notes');
+  await page.goto(server.origin + '/');
+  await page.reload();
+  await page.press('#pattern', 'ArrowDown');
+  await page.getByRole('option', { name: /^notes/ }).waitFor();
+  const advanced = page.getByRole('option', { name: /plan.*files.*at least 1 KB/ });
+  await advanced.click();
+  await tab.over();
+  assert.equal(await tab.count(), '2 matches');
+  await page.click('#pattern');
+  await page.click('text=Clear history');
+  await page.getByText('The history is cleared.').waitFor();
+  await page.fill('#pattern', '');
+  await page.press('#pattern', 'ArrowDown');
+  assert.equal(await page.getByRole('option').count(), 0);
+  await tab.close();
+});
+
+test('hostile names are shown as text, everywhere', async () => {
+  const tab = await openTab('#q=hostile+&sort=name');
+  const { page } = tab;
+  const names = await tab.names();
+  const visible: Record<string, string> = { '\n': '\\n', '\t': '\\t', '\u202e': 'U+202E', '\x1b': '\\x1B' };
+  for (const name of HOSTILE) {
+    const shown = 'hostile ' + name.replace(/[\n\t\u202e\x1b]/g, (c) => visible[c]!);
+    assert.ok(names.includes(shown), `${JSON.stringify(shown)} in ${names.join(' · ')}`);
+  }
+  assert.ok(names.some((name) => /^hostile broken \ufffd+\.txt$/.test(name)));
+  for (let row = 0; row < names.length; ++row) {
+    await page.click(`#row-${row}`);
+    await page.locator('.details h2', { hasText: names[row]! }).waitFor();
+  }
+  assert.equal(await page.locator('main script, main img[src=x]').count(), 0);
+  await page.locator('.row', { hasText: 'hostile broken' }).click();
+  await page.getByText('cannot be fetched from here').waitFor();
+  await tab.search('<img src=x onerror=alert(2)>');
+  assert.equal(await page.textContent('.row mark >> nth=0'), '<img');
+  assert.equal(await page.title(), '<img src=x onerror=alert(2)> · Arbory Search');
+  await page.goto(`${server.origin}/#q=${encodeURIComponent('"><script>alert(4)</script>')}`);
+  await page.reload();
+  await tab.over();
+  await page.getByText('Nothing found').waitFor();
+  await tab.close();
+});
+
+test('files are previewed, downloaded and their paths copied, by keyboard', async () => {
+  const tab = await openTab('#q=*&in=/files/docs&sort=name', { acceptDownloads: true });
+  const { page } = tab;
+  await page.context().grantPermissions(['clipboard-read', 'clipboard-write']);
+  await page.press('#pattern', 'ArrowDown');
+  const go = async (name: string) => {
+    const index = (await tab.names()).indexOf(name);
+    assert.ok(index >= 0, name);
+    await page.keyboard.press('Home');
+    for (let i = 0; i < index; ++i) await page.keyboard.press('ArrowDown');
+    await page.locator('.row.active', { hasText: name }).waitFor();
+  };
+  const downloaded = async () => {
+    const [download] = await Promise.all([page.waitForEvent('download'), page.keyboard.press('d')]);
+    return { name: download.suggestedFilename(), text: fs.readFileSync(await download.path(), 'utf8') };
+  };
+  await go('100% & "fine" #1.txt');
+  assert.equal((await downloaded()).text, 'content of the oddly named');
+  await page.keyboard.press('c');
+  await page.getByText('The path is copied.').waitFor();
+  assert.equal(await page.evaluate(() => navigator.clipboard.readText()), '/files/docs/100% & "fine" #1.txt');
+  await go('view.png');
+  await page.keyboard.press('Space');
+  await page.waitForFunction(() => document.querySelector<HTMLImageElement>('.details img')?.naturalWidth === 320);
+  await go('notes.txt'); // the details follow the keyboard
+  await page.locator('.details pre', { hasText: 'the needle is here' }).waitFor();
+  await page.keyboard.press('Escape');
+  await page.locator('.details').waitFor({ state: 'detached' });
+  await page.keyboard.press('/');
+  await page.waitForSelector('#pattern:focus');
+  await tab.close();
+});
+
+test('the whole result is saved, page by page', async () => {
+  const tab = await openTab('#q=item+00&in=/many&sort=name', { acceptDownloads: true });
+  const { page } = tab;
+  const saved = async (format: string) => {
+    await page.getByRole('button', { name: 'Save result' }).click();
+    const [download] = await Promise.all([
+      page.waitForEvent('download'),
+      page.getByRole('button', { name: format }).click(),
+    ]);
+    return fs.readFileSync(await download.path(), 'utf8');
+  };
+  const total = Number((await tab.count()).replace(/\D/g, ''));
+  assert.ok(total > 4000, 'more than one page');
+  const lines = (await saved('JSON lines')).trim().split('\n');
+  assert.equal(new Set(lines.map((line) => JSON.parse(line).path)).size, total);
+  const csv = (await saved('CSV')).split('\r\n');
+  assert.equal(csv.length, total + 2); // the heading, and nothing after the last line end
+  assert.match(csv[1]!, /^\/many\/f0\/item 000000\.dat,item 000000\.dat,file,0,20/);
+  await tab.close();
+});
+
+test('folders are chosen from a tree', async () => {
+  const tab = await openTab();
+  const { page } = tab;
+  await page.getByRole('button', { name: 'All folders' }).click();
+  await page.getByRole('button', { name: 'Folders in files' }).click();
+  await page.getByLabel('Straße').check();
+  await page.getByRole('dialog').getByRole('button', { name: 'Search', exact: true }).click();
+  await tab.over();
+  assert.deepEqual(await tab.names(), ['été']);
+  assert.match(decodeURIComponent(page.url()), /in=\/files\/Straße$/);
+  await tab.close();
+});
+
+test('failures are sentences that say what to do', async () => {
+  const rows: [string, string][] = [
+    ['#q=regex%3A(', 'Check the name pattern'],
+    ['#q=x&in=/nowhere', 'Choose others'],
+    ['#q=x&in=/files/locked', 'ask their owner for access'],
+  ];
+  for (const [hash, sentence] of rows) {
+    const tab = await openTab(hash);
+    await tab.page.getByText(sentence).waitFor();
+    await tab.close();
+  }
+  const tab = await openTab();
+  await tab.page.click('text=Criteria');
+  await tab.page.getByLabel('Size from').fill('huge');
+  await tab.page.press('#pattern', 'Enter');
+  await tab.page.getByText('Write a size as a number with a unit').waitFor();
+  await tab.close();
+});
+
+test('leaving the page cleans its searches; coming back repeats them', async () => {
+  const tab = await openTab('#q=plan');
+  const { page, tasks } = tab;
+  const known = async (task: string) => (await page.request.get(`${server.origin}/searches/${task}`)).status();
+  const gone = async (task: string) => {
+    for (let tries = 0; tries < 100 && (await known(task)) !== 404; ++tries) await page.waitForTimeout(100);
+    assert.equal(await known(task), 404);
+  };
+  assert.equal(await known(tasks[0]!), 200);
+  await tab.search('notes');
+  await gone(tasks[0]!);
+  assert.equal(await known(tasks[1]!), 200);
+  await page.goto('about:blank');
+  await gone(tasks[1]!);
+  await page.goBack();
+  await tab.over();
+  assert.equal(await tab.count(), '1 match');
+  await tab.close();
+});
+
+test('a lost session asks to sign in again', async () => {
+  const tab = await openTab('#q=plan');
+  await tab.page.context().clearCookies();
+  await tab.page.press('#pattern', 'Enter');
+  await tab.page.getByRole('heading', { name: 'Open the printed address' }).waitFor();
+  await tab.close();
+});
+
+test('it is usable on a phone', async () => {
+  const tab = await openTab('#q=plan', { viewport: { width: 390, height: 800 }, hasTouch: true, isMobile: true });
+  const { page } = tab;
+  assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 390);
+  await page.getByLabel('Sort by').selectOption('size');
+  await tab.firstIs('plan large.txt');
+  await page.tap('#row-0');
+  await page.getByRole('button', { name: 'Download' }).waitFor();
+  await page.getByRole('button', { name: 'Close' }).tap();
+  await page.tap('text=Criteria');
+  assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 390);
+  await tab.close();
+});

@@ -1,0 +1,91 @@
+// A real `arbory serve` in a folder of its own, as an ordinary user: when the tests run as root the
+// server is given away to nobody, so that permissions are what they are for people.
+import { spawn, type ChildProcess } from 'node:child_process';
+import * as fs from 'node:fs';
+import { tmpdir } from 'node:os';
+import { join } from 'node:path';
+
+const NOBODY = 65534;
+const START_MS = 20_000;
+
+export interface Options {
+  shares: Record<string, string>; // by name, folders as `Place.folder` gives them
+  logins?: boolean; // as root, with people logging in by PAM
+  settings?: string; // more lines of the [server] table
+}
+
+// A folder that the server may use, removed at the end.
+export class Place {
+  readonly root = fs.mkdtempSync(join(tmpdir(), 'arbory-e2e-'));
+
+  constructor() {
+    fs.chmodSync(this.root, 0o755);
+  }
+  folder(name: string): string {
+    const path = join(this.root, name);
+    fs.mkdirSync(path, { recursive: true });
+    return path;
+  }
+  // Everything made so far becomes the server user's.
+  giveAway(folder: string): void {
+    if (process.getuid?.() !== 0) return;
+    fs.chownSync(folder, NOBODY, NOBODY);
+    for (const entry of fs.readdirSync(folder, { withFileTypes: true, encoding: 'buffer' })) {
+      if (entry.isDirectory()) this.giveAway(join(folder, entry.name.toString()));
+    }
+  }
+  remove(): void {
+    fs.rmSync(this.root, { recursive: true, force: true });
+  }
+}
+
+export class Server {
+  private constructor(
+    private readonly child: ChildProcess,
+    readonly address: string, // what it printed: with the token, where there is one
+  ) {}
+
+  get origin(): string {
+    return new URL(this.address).origin;
+  }
+
+  static async start(place: Place, options: Options): Promise<Server> {
+    const state = place.folder(options.logins ? 'state-logins' : 'state');
+    place.giveAway(state);
+    const config = join(place.root, options.logins ? 'logins.toml' : 'arbory.toml');
+    const shares = Object.entries(options.shares).map(([name, dir]) => `"${name}" = "${dir}"`);
+    fs.writeFileSync(
+      config,
+      `state_dir = "${state}"\nvolumes = []\n[shares]\n${shares.join('\n')}\n[server]\n` +
+        `listen = "127.0.0.1:0"\nweb_dir = "${process.env.ARBORY_PAGE}"\n${options.settings ?? ''}`,
+    );
+    const drop = process.getuid?.() === 0 && !options.logins;
+    const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config], {
+      stdio: ['ignore', 'pipe', 'pipe'],
+      env: { PATH: process.env.PATH, HOME: state, TZ: process.env.TZ },
+      ...(drop ? { uid: NOBODY, gid: NOBODY } : {}),
+    });
+    return new Server(child, await printedAddress(child));
+  }
+
+  async stop(): Promise<void> {
+    const ended = new Promise((done) => this.child.once('exit', done));
+    this.child.kill('SIGTERM');
+    await ended;
+  }
+}
+
+function printedAddress(child: ChildProcess): Promise<string> {
+  return new Promise((found, failed) => {
+    let said = '';
+    const hear = (text: Buffer) => {
+      said += text;
+      const match = /Open (http:\S+)/.exec(said);
+      if (match) found(match[1]!);
+    };
+    child.stdout!.on('data', hear);
+    child.stderr!.on('data', hear);
+    child.once('exit', (code) => failed(new Error(`the server ended (${code}): ${said}`)));
+    setTimeout(() => failed(new Error(`the server said no address: ${said}`)), START_MS).unref();
+  });
+}
