@@ -63,34 +63,48 @@ std::uint64_t Step(std::string_view key, size_t at) {
   return step;
 }
 
+bool Less(const TextKeys& keys, size_t depth, std::uint32_t a, std::uint32_t b) {
+  const auto rest = [&keys, depth](std::uint32_t row) {
+    const std::string_view key = keys[row];
+    return key.substr(std::min(depth, key.size()));
+  };
+  const int order = rest(a).compare(rest(b));
+  return order != 0 ? order < 0 : a < b;
+}
+
+// The end of the run of rows from `begin` on that have the same step.
+size_t RunEnd(const KeyedRows& rows, size_t begin, size_t end) {
+  size_t at = begin + 1;
+  while (at < end && rows[at].key == rows[begin].key) ++at;
+  return at;
+}
+
 // Sorts the rows [begin, end), whose keys agree in their first `depth` bytes: eight bytes at a
-// time, and within each run of rows that agree in those, the next eight.
+// time, and within each run of rows that agree in those, the next eight. Where all rows agree it
+// goes on without a call: the common front of paths may be megabytes long.
 void SortByText(const TextKeys& keys, KeyedRows& rows, size_t begin, size_t end, size_t depth,
                 KeyedRows& spare) {
-  if (end - begin < kFewRows) {
-    std::sort(rows.begin() + static_cast<std::ptrdiff_t>(begin),
-              rows.begin() + static_cast<std::ptrdiff_t>(end),
-              [&keys, depth](const KeyedRow& a, const KeyedRow& b) {
-                const auto rest = [&keys, depth](std::uint32_t row) {
-                  const std::string_view key = keys[row];
-                  return key.substr(std::min(depth, key.size()));
-                };
-                const int order = rest(a.row).compare(rest(b.row));
-                return order != 0 ? order < 0 : a.row < b.row;
-              });
-    return;
+  for (;; depth += kStepBytes) {
+    if (end - begin < kFewRows) {
+      std::sort(rows.begin() + static_cast<std::ptrdiff_t>(begin),
+                rows.begin() + static_cast<std::ptrdiff_t>(end),
+                [&keys, depth](const KeyedRow& a, const KeyedRow& b) {
+                  return Less(keys, depth, a.row, b.row);
+                });
+      return;
+    }
+    bool longer = false;
+    for (size_t i = begin; i < end; ++i) {
+      const std::string_view key = keys[rows[i].row];
+      rows[i].key = Step(key, depth);
+      longer |= key.size() > depth;
+    }
+    if (!longer) return;  // all equal, and already in the order of their numbers
+    if (RunEnd(rows, begin, end) != end) break;
   }
-  bool longer = false;
-  for (size_t i = begin; i < end; ++i) {
-    const std::string_view key = keys[rows[i].row];
-    rows[i].key = Step(key, depth);
-    longer |= key.size() > depth;
-  }
-  if (!longer) return;  // all equal, and already in the order of their numbers
   RadixSort(rows, begin, end, spare);
   for (size_t run = begin; run < end;) {
-    size_t next = run + 1;
-    while (next < end && rows[next].key == rows[run].key) ++next;
+    const size_t next = RunEnd(rows, run, end);
     if (next - run > 1) SortByText(keys, rows, run, next, depth + kStepBytes, spare);
     run = next;
   }

@@ -155,6 +155,17 @@ TEST(Ordering, TextsAgainstPlainSort) {
   EXPECT_EQ(keys.Order(), expected);
 }
 
+// The folders of a deep tree share a path of any length.
+TEST(Ordering, LongCommonFronts) {
+  constexpr std::uint32_t kTexts = 210;
+  const std::string front(700'000, 'd');
+  TextKeys keys;
+  for (std::uint32_t i = kTexts; i-- > 0;) keys.AddNatural(front + std::to_string(i));
+  Ordering expected(kTexts);
+  std::iota(expected.rbegin(), expected.rend(), 0);
+  EXPECT_EQ(keys.Order(), expected);
+}
+
 TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
   constexpr std::uint32_t kRows = 2 * kOrderingPiece + 17;
   ResultWriter writer(path_);
