@@ -20,6 +20,14 @@ namespace {
 constexpr size_t kMostBlocks = 256;
 // Orderings of fewer rows are quicker made than kept.
 constexpr std::uint64_t kWorthKeeping = 10'000;
+// Orderings number rows in 32 bits.
+constexpr std::uint64_t kMostRows = std::uint64_t{1} << 32;
+
+// The file is its user's own to write to, while the process that reads it may be able to become
+// root: numbers in it are checked before anything is indexed by them.
+void Check(bool sound) {
+  if (!sound) throw std::runtime_error("a damaged result file");
+}
 
 constexpr struct {
   std::string_view word;
@@ -80,6 +88,7 @@ void ResultReader::Begin() {
   blocks_.clear();
   Statement last(db_, "SELECT first + count FROM names ORDER BY first DESC LIMIT 1");
   rows_ = last.Step() ? static_cast<std::uint64_t>(last.Integer(0)) : 0;
+  Check(rows_ < kMostRows);
   locations_.clear();
   Statement locations(db_, "SELECT id, share_name, share_root FROM location");
   while (locations.Step()) {
@@ -156,32 +165,41 @@ ResultRow ResultReader::Row(std::uint32_t number) {
           &attributes};
 }
 
-// Calls visit(first row, names side of the block) for every block, in order.
+// Calls visit(first row, names side of the block) for every block, in order. The blocks number the
+// rows without a gap.
 template <typename Visitor>
 void ResultReader::ForEachNames(Visitor visit) {
+  std::uint64_t next = 0;
   Statement blocks(db_, "SELECT first, folders, names FROM names ORDER BY first");
   Names names;
   while (blocks.Step()) {
     names.folders.clear();
     names.names.clear();
     TakeApart(blocks.Bytes(1), blocks.Bytes(2), names);
-    visit(static_cast<std::uint64_t>(blocks.Integer(0)), names);
+    Check(static_cast<std::uint64_t>(blocks.Integer(0)) == next &&
+          names.names.size() <= rows_ - next);
+    visit(next, names);
+    next += names.names.size();
   }
+  Check(next == rows_);
 }
 
-// Calls visit(row, attributes) for every row, in order.
+// Calls visit(row, attributes) for every row, in order and without a gap.
 template <typename Visitor>
 void ResultReader::ForEachAttributes(Visitor visit) {
   Statement blocks(db_, "SELECT first, data FROM attributes ORDER BY first");
   FileAttributes row;
+  std::uint64_t next = 0;
   while (blocks.Step()) {
-    auto number = static_cast<std::uint32_t>(blocks.Integer(0));
     const std::string_view data = blocks.Bytes(1);
+    Check(static_cast<std::uint64_t>(blocks.Integer(0)) == next &&
+          data.size() / sizeof(row) <= rows_ - next);
     for (size_t at = 0; at + sizeof(row) <= data.size(); at += sizeof(row)) {
       std::memcpy(&row, data.data() + at, sizeof(row));
-      visit(number++, row);
+      visit(static_cast<std::uint32_t>(next++), row);
     }
   }
+  Check(next == rows_);
 }
 
 ResultReader::Page ResultReader::Select(const Selection& selection, std::uint64_t offset,
@@ -258,6 +276,7 @@ bool ResultReader::ReadKept(SortColumn column, std::uint64_t offset, std::uint64
                 count * sizeof(std::uint32_t));
     skip = 0;
   }
+  Check(std::ranges::all_of(out, [this](std::uint32_t row) { return row < rows_; }));
   if (out.size() == limit && (limit > 0 || rows_ == 0)) return true;
   out.clear();
   return false;
