@@ -17,9 +17,9 @@ struct SiteRules {
 
 // Each gives a sentence for the client; empty when all is well.
 
-// One Host field. On a loopback address it must be a loopback name, with any port (tunnels change
-// it), or the host of a configured origin: a page of another site whose name was made to lead to
-// this machine would be believed to be of the same origin.
+// On a loopback address the Host (which must be there) must be a loopback name, with any port, as
+// tunnels change it, or the host of a configured origin: a page of another site whose name was made
+// to lead to this machine would be believed to be of the same origin.
 std::string TroubleWithHost(const HttpRequest& request, const SiteRules& rules);
 
 // Origin, which browsers send with every POST, must be this server's own or a configured one.

@@ -15,7 +15,6 @@ namespace {
 
 constexpr int kLetIn = 200;
 constexpr int kRefused = 403;
-constexpr int kNoAnswer = 503;
 
 // Answers what PAM asks: a hidden question is taken for the password, a shown one for the name.
 int Converse(int count, const pam_message** questions, pam_response** answers, void* data) {
@@ -72,34 +71,20 @@ class Pam {
   int status_ = PAM_ABORT;
 };
 
-int StatusOf(int pam_status) {
-  switch (pam_status) {
-    case PAM_SUCCESS:
-      return kLetIn;
-    case PAM_ABORT:
-    case PAM_BUF_ERR:
-    case PAM_SYSTEM_ERR:
-    case PAM_SERVICE_ERR:
-    case PAM_OPEN_ERR:
-    case PAM_SYMBOL_ERR:
-      return kNoAnswer;
-    default:
-      return kRefused;
-  }
-}
-
 ChildHead CheckLogin(const Credentials& credentials, const PamService& service) {
+  const ChildHead refused{kRefused, kRefused, {}};
   Pam pam(credentials, service);
   const int status = pam.Check();
-  ChildHead head{StatusOf(status), 0, {}};
-  if (head.status == kNoAnswer) {
-    syslog(LOG_ERR, "login service %s: %s", service.name.c_str(), pam_strerror(nullptr, status));
+  // Modules tell a wrong password by many codes, some of which are also those of their own trouble,
+  // so the client is told one thing and the administrator the other.
+  if (status != PAM_SUCCESS) {
+    syslog(LOG_NOTICE, "login refused by service %s: %s", service.name.c_str(),
+           pam_strerror(nullptr, status));
+    return refused;
   }
-  if (head.status != kLetIn) return head;
   const auto account = nas::FindAccount(pam.User());
-  if (!account) return {kRefused, 0, {}};
-  head.fields.emplace_back(kLoginUser, PercentEncoded(account->name));
-  return head;
+  if (!account) return refused;
+  return {kLetIn, 0, {{kLoginUser, PercentEncoded(account->name)}}};
 }
 
 }  // namespace

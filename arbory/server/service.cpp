@@ -108,6 +108,9 @@ void Service::Finished(const HttpRequest& request, int status, std::uint64_t byt
 }
 
 Answer Service::Handle(HttpRequest* request) {
+  if (request->CountOf("host") != 1) {
+    return ErrorReply(kBadRequest, "Send exactly one Host field.");
+  }
   const std::string host_trouble = TroubleWithHost(*request, setup_.site);
   if (!host_trouble.empty()) return ErrorReply(kForbidden, host_trouble);
   const auto path = SplitPath(request->path());

@@ -34,7 +34,6 @@ struct ServerSettings {
   int call_seconds = 120;      // for a child to begin or go on with its reply
   int logins_per_minute = 10;  // refused ones, by address and by user
   int session_minutes = 12 * 60;
-  int searches_per_user = 8;  // running at once
 };
 
 struct Config {
@@ -42,6 +41,9 @@ struct Config {
   std::vector<std::string> volumes = {"/volume*"};  // shell patterns of absolute directories
   std::string module;                               // path of the module; empty: beside the program
   std::vector<ShareSetting> shares;
+  // A user's searches at once: enough for several open windows, and a bound on what one user can
+  // take from the machine.
+  int searches_per_user = 8;
   ServerSettings server;
 };
 

@@ -84,6 +84,8 @@ class Reader {
         {"module", [&](const toml::node& node) { config->module = Path(node); }},
         {"volumes", [&](const toml::node& node) { config->volumes = Paths(node); }},
         {"shares", [&](const toml::node& node) { config->shares = Shares(node); }},
+        {"searches_per_user",
+         [&](const toml::node& node) { config->searches_per_user = Limit(node); }},
         {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
     };
     ReadTable(document, keys);
@@ -140,7 +142,6 @@ class Reader {
         {"call_seconds", &server->call_seconds},
         {"logins_per_minute", &server->logins_per_minute},
         {"session_minutes", &server->session_minutes},
-        {"searches_per_user", &server->searches_per_user},
     };
     for (const auto& [name, limit] : limits) {
       keys[name] = [this, limit = limit](const toml::node& value) { *limit = Limit(value); };

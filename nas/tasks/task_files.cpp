@@ -14,6 +14,7 @@
 #include <string_view>
 #include <vector>
 
+#include "nas/system/config.h"
 #include "nas/system/error.h"
 #include "nas/system/file_io.h"
 #include "nas/system/json_text.h"
@@ -94,7 +95,8 @@ std::string TaskFiles::Create(UniqueFd* life) const {
   const int flags = O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC;
   const UniqueFd guard(openat(folder_.get(), kFolderLock, flags, kPrivateMode));
   if (!guard || !TakeLock(guard.get(), kFolderByte)) Throw("the task folder is locked", errno);
-  if (CountRunningAndSweep() >= kMaxRunningTasks) Throw("too many running tasks", EAGAIN);
+  if (CountRunningAndSweep() >= CurrentConfig().searches_per_user)
+    Throw("too many running tasks", EAGAIN);
 
   std::string id = RandomName();
   UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), flags | O_EXCL, kPrivateMode));

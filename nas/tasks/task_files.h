@@ -39,7 +39,8 @@ class TaskFiles {
   explicit TaskFiles(const char* owner);
 
   // Makes a task with an empty record. `life` receives the descriptor that keeps it alive. Throws
-  // std::runtime_error when the owner has kMaxRunningTasks or it cannot be stored.
+  // std::runtime_error when the owner has as many running tasks as the
+  // configuration allows or it cannot be stored.
   std::string Create(UniqueFd* life) const;
 
   // Whether some process still works on the task.
@@ -61,9 +62,6 @@ class TaskFiles {
   UniqueFd folder_;
 };
 
-// A user's searches at once: enough for several open windows, and a bound on what one user can take
-// from the machine.
-inline constexpr int kMaxRunningTasks = 8;
 // Tasks of clients that never cleaned up go after this long.
 inline constexpr long kKeepSeconds = 24L * 60 * 60;
 

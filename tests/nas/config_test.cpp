@@ -52,6 +52,17 @@ TEST_F(ConfigTest, NamesTheLineOfTheTrouble) {
       {"[shares]\nb = \"/x/homes/y\"\n", ":2: share \"b\": its directory lies in"},
       {"state_dir = \"/s\"\nstate_dir = \"/t\"\n", ":2: "},
       {"[shares\n", ":1: "},
+      {"searches_per_user = 3\n[server]\nlisten = \"[::1]:1\"\nbehind_tls = true\n"
+       "origins = [\"https://nas\"]\nmax_calls = 1\nidle_seconds = 1000000000\n",
+       ""},
+      {"server = 1\n", ":1: a table"},
+      {"[server]\nmax_cals = 5\n", ":2: unknown key \"max_cals\""},
+      {"[server]\nmax_calls = 0\n", ":2: a number from 1"},
+      {"[server]\nmax_calls = 1000000001\n", ":2: a number from 1"},
+      {"[server]\nmax_calls = \"5\"\n", ":2: a number from 1"},
+      {"[server]\nbehind_tls = 1\n", ":2: true or false"},
+      {"[server]\norigins = \"https://nas\"\n", ":2: a list"},
+      {"[server]\nweb_dir = \"web\"\n", ":2: an absolute path"},
   };
   for (const auto& row : rows) {
     const std::string trouble = Trouble(row.content);

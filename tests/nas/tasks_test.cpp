@@ -229,7 +229,7 @@ TEST_F(TasksTest, AFailedWriteLeavesTheRecordWhole) {
 
 TEST_F(TasksTest, RunningTasksAreBoundedPerOwner) {
   std::vector<std::unique_ptr<Task>> running;
-  for (int at = 0; at < nas::kMaxRunningTasks; ++at) running.push_back(New());
+  for (int at = 0; at < nas::CurrentConfig().searches_per_user; ++at) running.push_back(New());
   EXPECT_THROW(New(), std::runtime_error);
   running[3]->finish(false);  // marked finished, though its process lives
   running[3] = New();

@@ -1,0 +1,230 @@
+// Downloads, previews and the page's own files.
+
+#include "arbory/server/files.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+
+#include "arbory/server/http_text.h"
+#include "tests/server/server_test.h"
+
+namespace server_test {
+namespace {
+
+using nas_test::ReadFile;
+using nas_test::WriteFile;
+
+class FilesTest : public ServerTest {};
+
+TEST_F(FilesTest, NothingButReadableFilesOfTheShareComesOut) {
+  WriteFile(dir_ + "/secret.txt", "secret");
+  std::filesystem::create_directories(share_ + "/folder/below");
+  WriteFile(share_ + "/folder/below/file.txt", "inside");
+  WriteFile(share_ + "/closed.txt", "closed");
+  chmod((share_ + "/closed.txt").c_str(), 0);
+  ASSERT_EQ(symlink("folder/below/file.txt", (share_ + "/near").c_str()), 0);
+  ASSERT_EQ(symlink("../secret.txt", (share_ + "/far").c_str()), 0);
+  ASSERT_EQ(symlink((dir_ + "/secret.txt").c_str(), (share_ + "/absolute").c_str()), 0);
+  ASSERT_EQ(symlink("..", (share_ + "/up").c_str()), 0);
+  ASSERT_EQ(symlink("loop", (share_ + "/loop").c_str()), 0);
+  ASSERT_EQ(symlink("/proc/self/root", (share_ + "/magic").c_str()), 0);
+  ASSERT_EQ(mkfifo((share_ + "/pipe").c_str(), 0666), 0);
+  WriteFile(share_ + "/%2e%2e", "literal");
+  Server server = Start();
+  server.Open();
+  const struct {
+    const char* path;
+    int status;
+    const char* body;  // null: not looked at
+  } rows[] = {
+      {"photo/folder/below/file.txt", 200, "inside"},
+      {"photo/near", 200, "inside"},
+      {"photo/%252e%252e", 200, "literal"},
+      {"photo/far", 404, nullptr},
+      {"photo/absolute", 404, nullptr},
+      {"photo/up/secret.txt", 404, nullptr},
+      {"photo/loop", 404, nullptr},
+      {"photo/magic/etc/passwd", 404, nullptr},
+      {"photo/pipe", 404, nullptr},
+      {"photo/folder", 404, nullptr},
+      {"photo/folder/", 404, nullptr},
+      {"photo", 404, nullptr},
+      {"photo/none", 404, nullptr},
+      {"photo/folder/below/file.txt/x", 404, nullptr},
+      {"none/x", 404, nullptr},
+      {"home/x", 404, nullptr},
+      {"photo/closed.txt", 403, nullptr},
+  };
+  for (const auto& row : rows) {
+    const Reply reply = server.Get(std::string("/files/") + row.path);
+    EXPECT_EQ(reply.status, row.status) << row.path << reply.body;
+    if (row.body != nullptr) {
+      EXPECT_EQ(reply.body, row.body) << row.path;
+    }
+    EXPECT_EQ(reply.body.find("secret"), std::string::npos) << row.path;
+    EXPECT_EQ(reply.body.find(dir_), std::string::npos) << row.path;
+  }
+}
+
+TEST_F(FilesTest, OnlySafeTypesAreShown) {
+  const struct {
+    const char* name;  // encoded
+    const char* type;  // null: an attachment
+  } rows[] = {
+      {"a.png", "image/png"},
+      {"a.JPG", "image/jpeg"},
+      {"a.txt", "text/plain; charset=utf-8"},
+      {"a.html.txt", "text/plain; charset=utf-8"},
+      {"a.pdf", "application/pdf"},
+      {"a.svg", nullptr},
+      {"a.html", nullptr},
+      {"a.xhtml", nullptr},
+      {"a.txt.html", nullptr},
+      {"a", nullptr},
+      {"png", nullptr},
+      {".png", "image/png"},
+  };
+  for (const auto& row : rows) WriteFile(share_ + "/" + row.name, "<script>alert(1)</script>");
+  Server server = Start();
+  server.Open();
+  for (const auto& row : rows) {
+    const std::string target = std::string("/files/photo/") + row.name;
+    for (const bool preview : {false, true}) {
+      const Reply reply = server.Get(target + (preview ? "?preview=1" : ""));
+      ASSERT_EQ(reply.status, 200) << row.name;
+      const bool shown = preview && row.type != nullptr;
+      EXPECT_EQ(reply.fields.at("content-type"), shown ? row.type : "application/octet-stream");
+      EXPECT_TRUE(reply.fields.at("content-disposition").starts_with(shown ? "inline;" : "attach"))
+          << row.name;
+      EXPECT_EQ(reply.fields.at("x-content-type-options"), "nosniff");
+      const std::string policy = reply.fields.at("content-security-policy");
+      EXPECT_TRUE(policy.starts_with("default-src 'none'")) << policy;
+      const bool pdf = shown && row.type == std::string("application/pdf");
+      EXPECT_EQ(policy.ends_with("sandbox"), !pdf) << row.name;
+    }
+  }
+}
+
+TEST_F(FilesTest, NamesAndRangesFollowTheirTables) {
+  const struct {
+    const char* name;
+    const char* header;
+  } names[] = {
+      {"a b.txt", "attachment; filename=\"a b.txt\"; filename*=UTF-8''a%20b.txt"},
+      {"\"q\"\\.txt", "attachment; filename=\"_q__.txt\"; filename*=UTF-8''%22q%22%5C.txt"},
+      {"\xC3\xA9%41", "attachment; filename=\"___41\"; filename*=UTF-8''%C3%A9%2541"},
+      {"a\r\nX: y", "attachment; filename=\"a__X: y\"; filename*=UTF-8''a%0D%0AX%3A%20y"},
+  };
+  for (const auto& row : names) {
+    EXPECT_EQ(arbory::ContentDisposition(false, row.name), row.header);
+  }
+  const struct {
+    const char* field;
+    std::uint64_t size, first, count;
+    bool partial, satisfiable;
+  } ranges[] = {
+      {"", 10, 0, 10, false, true},
+      {"bytes=0-0", 10, 0, 1, true, true},
+      {"bytes=9-", 10, 9, 1, true, true},
+      {"bytes=2-99", 10, 2, 8, true, true},
+      {"bytes=-3", 10, 7, 3, true, true},
+      {"bytes=-99", 10, 0, 10, true, true},
+      {"bytes=10-", 10, 0, 0, false, false},
+      {"bytes=-0", 10, 0, 0, false, false},
+      {"bytes=0-", 0, 0, 0, false, false},
+      {"bytes=5-2", 10, 0, 10, false, true},
+      {"bytes=a-b", 10, 0, 10, false, true},
+      {"bytes=0-1,3-4", 10, 0, 10, false, true},
+      {"lines=0-1", 10, 0, 10, false, true},
+      {"bytes=99999999999999999999-", 10, 0, 10, false, true},
+      {"bytes=-", 10, 0, 10, false, true},
+  };
+  for (const auto& row : ranges) {
+    const arbory::ByteRange range = arbory::ParseRange(row.field, row.size);
+    EXPECT_EQ(range.first, row.first) << row.field;
+    EXPECT_EQ(range.count, row.count) << row.field;
+    EXPECT_EQ(range.partial, row.partial) << row.field;
+    EXPECT_EQ(range.satisfiable, row.satisfiable) << row.field;
+  }
+}
+
+TEST_F(FilesTest, LargeFilesAndPartsOfThemArriveWhole) {
+  std::string content;
+  for (int at = 0; content.size() < 5'000'000; ++at) content += std::to_string(at) + " ";
+  WriteFile(share_ + "/large.bin", content);
+  WriteFile(share_ + "/empty.bin", "");
+  Server server = Start();
+  server.Open();
+  const Reply whole = server.Get("/files/photo/large.bin");
+  EXPECT_EQ(whole.status, 200);
+  EXPECT_TRUE(whole.body == content);
+  const Reply part =
+      server.Ask("GET", "/files/photo/large.bin", "", "Range: bytes=1000000-3999999\r\n");
+  EXPECT_EQ(part.status, 206);
+  EXPECT_EQ(part.fields.at("content-range"),
+            "bytes 1000000-3999999/" + std::to_string(content.size()));
+  EXPECT_TRUE(part.body == content.substr(1'000'000, 3'000'000));
+  EXPECT_EQ(server.Get("/files/photo/empty.bin").body, "");
+  const Reply none = server.Ask("GET", "/files/photo/empty.bin", "", "Range: bytes=0-\r\n");
+  EXPECT_EQ(none.status, 416);
+  EXPECT_EQ(none.fields.at("content-range"), "bytes */0");
+  const Reply head = server.Ask("HEAD", "/files/photo/large.bin");
+  EXPECT_EQ(head.fields.at("content-length"), std::to_string(content.size()));
+}
+
+TEST_F(FilesTest, ThePageComesWithItsPolicy) {
+  const std::string web = MakeFolder("web");
+  Server unbuilt = Start("web_dir = \"" + web + "\"\n");
+  EXPECT_NE(unbuilt.Get("/").body.find("npm run build"), std::string::npos);
+  WriteFile(web + "/index.html", "<!doctype html>");
+  WriteFile(MakeFolder("web/assets") + "/app-1.js", "1");
+  WriteFile(web + "/.hidden", "hidden");
+  const Reply page = unbuilt.Get("/?q=a");
+  EXPECT_EQ(page.body, "<!doctype html>");
+  const std::string policy = page.fields.at("content-security-policy");
+  for (const char* rule : {"default-src 'none'", "script-src 'self';", "frame-ancestors 'none'"}) {
+    EXPECT_NE(policy.find(rule), std::string::npos) << policy;
+  }
+  EXPECT_EQ(policy.find("unsafe"), std::string::npos) << policy;
+  const Reply script = unbuilt.Get("/assets/app-1.js");
+  EXPECT_EQ(script.fields.at("content-type"), "text/javascript; charset=utf-8");
+  EXPECT_NE(script.fields.at("cache-control").find("immutable"), std::string::npos);
+  for (const char* none : {"/.hidden", "/assets", "/assets/none.js", "/assets/a/b", "/none"}) {
+    EXPECT_EQ(unbuilt.Get(none).status, 404) << none;
+  }
+}
+
+// Runs what docs/http.md shows to do, as it stands, against the sample share.
+TEST_F(FilesTest, TheExamplesOfTheDocumentWork) {
+  const std::string document = ReadFile(ARBORY_SOURCE_DIR "/docs/http.md");
+  std::string script = "set -eu -o pipefail\n";
+  constexpr std::string_view kBegin = "\n```sh\n";
+  for (size_t at = 0; (at = document.find(kBegin, at)) != std::string::npos;) {
+    at += kBegin.size();
+    const size_t end = document.find("```", at);
+    script += document.substr(at, end - at) + "echo\n";
+    at = end;
+  }
+  WriteFile(dir_ + "/examples.sh", script);
+  share_lines_.clear();  // so that the sample is offered
+  const Server server = Start();
+  const std::string command = "ARBORY=http://" + server.Host() + " JAR=" + dir_ +
+                              "/jar ARBORY_OPEN=http://" + server.Host() + server.open_path +
+                              " bash " + dir_ + "/examples.sh > " + dir_ + "/said 2>&1";
+  const int status = std::system(command.c_str());
+  const std::string said = ReadFile(dir_ + "/said");
+  EXPECT_EQ(WEXITSTATUS(status), 0) << said;
+  for (const char* part :
+       {"\"mode\":\"single\"", "\"name\":\"sample\"", "\"total\":2", "\"phase\":\"done\"",
+        "# Report 2025", "This is", "arbory_calls_total{"}) {
+    EXPECT_NE(said.find(part), std::string::npos) << part << "\n" << said;
+  }
+}
+
+}  // namespace
+}  // namespace server_test

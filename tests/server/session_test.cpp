@@ -1,0 +1,214 @@
+// Who is let in, for how long, and as whom.
+
+#include "arbory/server/sessions.h"
+
+#include <grp.h>
+#include <pwd.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "tests/server/server_test.h"
+
+namespace server_test {
+namespace {
+
+using nas_test::WriteFile;
+using std::chrono::milliseconds;
+using std::chrono::seconds;
+using std::chrono::steady_clock;
+
+class SessionTest : public ServerTest {};
+
+TEST_F(SessionTest, ATokenOpensOneSessionOnce) {
+  Server server = Start();
+  EXPECT_EQ(server.Get("/session").status, 401);
+  EXPECT_EQ(server.Get("/session").json()["mode"], "single");
+  for (const char* bad :
+       {"/open", "/open?token=", "/open?token=00000000000000000000000000000000"}) {
+    EXPECT_EQ(server.Get(bad).status, 403) << bad;
+  }
+  EXPECT_EQ(server.Ask("HEAD", server.open_path).status, 405) << "looking does not use it up";
+  const Reply opened = server.Get(server.open_path);
+  EXPECT_EQ(opened.status, 303);
+  EXPECT_EQ(opened.fields.at("location"), "/");
+  const std::string cookie = opened.fields.at("set-cookie");
+  for (const char* part : {"; HttpOnly", "; SameSite=Strict", "; Path=/", "; Max-Age=43200"}) {
+    EXPECT_NE(cookie.find(part), std::string::npos) << cookie;
+  }
+  EXPECT_EQ(cookie.find("; Secure"), std::string::npos) << "no TLS here";
+  EXPECT_EQ(server.Get(server.open_path).status, 403) << "the second time";
+
+  server.cookie = cookie.substr(0, cookie.find(';'));
+  const Json::Value session = server.Get("/session").json();
+  EXPECT_EQ(session["user"], User());
+  EXPECT_EQ(session["mode"], "single");
+  EXPECT_NEAR(session["expires"].asDouble(), static_cast<double>(time(nullptr)) + 12 * 3600, 60);
+  EXPECT_EQ(server.Post("/login", R"({"user":"root","password":""})").status, 403);
+
+  const Server stranger = [&] {
+    Server other = server;
+    other.cookie = server.cookie.substr(0, server.cookie.size() - 1) + "x";
+    return other;
+  }();
+  for (const char* target : {"/session", "/shares", "/searches/x", "/files/photo/x"}) {
+    EXPECT_EQ(stranger.Get(target).status, 401) << target;
+  }
+  EXPECT_EQ(stranger.Call("list", "{}").status, 401);
+  EXPECT_EQ(stranger.Post("/logout", "{}").status, 401);
+
+  const Reply left = server.Post("/logout", "");
+  EXPECT_EQ(left.status, 200);
+  EXPECT_NE(left.fields.at("set-cookie").find("Max-Age=0"), std::string::npos);
+  EXPECT_EQ(server.Get("/session").status, 401) << "the cookie was kept";
+  EXPECT_EQ(Log().find(server.open_path.substr(12)), std::string::npos) << "the token was logged";
+}
+
+TEST_F(SessionTest, BehindTlsTheCookieIsBoundToTheHost) {
+  Server server = Start("behind_tls = true\nsession_minutes = 5\n");
+  const std::string cookie = server.Get(server.open_path).fields.at("set-cookie");
+  EXPECT_TRUE(cookie.starts_with("__Host-arbory=")) << cookie;
+  EXPECT_NE(cookie.find("; Max-Age=300; Secure"), std::string::npos) << cookie;
+}
+
+TEST(SessionsTest, EndWithTheirTime) {
+  arbory::Sessions sessions(seconds(100));
+  const std::string id = sessions.Begin("ann", 1000);
+  EXPECT_EQ(id.size(), 32U);
+  EXPECT_NE(sessions.Begin("ann", 1000), id);
+  EXPECT_EQ(sessions.Find(id, 1099)->user, "ann");
+  EXPECT_FALSE(sessions.Find(id, 1100)) << "its time has come";
+  EXPECT_FALSE(sessions.Find(id, 1050)) << "what ended stays ended";
+  EXPECT_FALSE(sessions.Find("", 1000));
+  const std::string oldest = sessions.Begin("bob", 1001);
+  for (int at = 1; at < arbory::Sessions::kMaxPerUser; ++at) sessions.Begin("bob", 1002);
+  EXPECT_TRUE(sessions.Find(oldest, 1003));
+  sessions.Begin("bob", 1003);
+  EXPECT_FALSE(sessions.Find(oldest, 1003)) << "one too many";
+  EXPECT_EQ(sessions.Count(1103), 0U);
+}
+
+TEST(LoginLimitTest, CountsRefusedOnesByAddressAndByUser) {
+  arbory::LoginLimit limit(2);
+  EXPECT_EQ(limit.Begin("1.1.1.1", "ann", 100), 0);
+  EXPECT_EQ(limit.Begin("1.1.1.1", "bob", 110), 0);
+  EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 120), 40) << "the address has had two";
+  EXPECT_EQ(limit.Begin("2.2.2.2", "ann", 120), 0);
+  EXPECT_EQ(limit.Begin("3.3.3.3", "ann", 120), 40) << "the user has had two";
+  EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 160), 0) << "the first is a minute old";
+  limit.Succeeded("1.1.1.1", "cid");
+  EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 160), 0) << "one that succeeded does not count";
+}
+
+// Logins against a private PAM service, whose password is "right" for everybody.
+class LoginTest : public ServerTest {
+ protected:
+  static constexpr char kAnn[] = "nobody";
+  static constexpr char kBob[] = "daemon";
+
+  Server StartWithLogins(const std::string& more = "") {
+    const std::string check = dir_ + "/check";
+    WriteFile(check, "#!/bin/sh\nread -r given || :\n[ \"$given\" = right ]\n");
+    chmod(check.c_str(), 0755);
+    WriteFile(MakeFolder("pam") + "/arbory", "auth required pam_exec.so quiet expose_authtok " +
+                                                 check + "\naccount required pam_permit.so\n");
+    WriteFile(dir_ + "/pam/closed", "auth required pam_permit.so\naccount required pam_deny.so\n");
+    return Start("pam_dir = \"" + dir_ + "/pam\"\n" + more, "", As::kRootWithLogins);
+  }
+
+  void GiveTo(const std::string& path, const char* user, mode_t mode) {
+    const passwd* account = getpwnam(user);
+    ASSERT_EQ(chown(path.c_str(), account->pw_uid, account->pw_gid), 0);
+    ASSERT_EQ(chmod(path.c_str(), mode), 0);
+  }
+};
+
+TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
+  SKIP_UNLESS_ROOT();
+  Server server = StartWithLogins("logins_per_minute = 4\n");
+  EXPECT_TRUE(server.open_path.empty());
+  EXPECT_EQ(server.Get("/session").json()["mode"], "login");
+  EXPECT_EQ(server.Get("/open?token=").status, 403);
+  EXPECT_TRUE(server.LogIn(kAnn, "right"));
+  EXPECT_EQ(server.Get("/session").json()["user"], kAnn);
+  EXPECT_EQ(server.Get("/session").json()["mode"], "login");
+
+  std::string body;
+  const struct {
+    const char* user;
+    const char* password;
+  } rows[] = {{kAnn, "wrong"}, {"no-such-user", "right"}, {"no-such-user", "wrong"}, {"../x", ""}};
+  for (const auto& row : rows) {
+    const auto begun = steady_clock::now();
+    const Reply reply = server.Post("/login", std::string("{\"user\":\"") + row.user +
+                                                  "\",\"password\":\"" + row.password + "\"}");
+    const auto spent = steady_clock::now() - begun;
+    EXPECT_EQ(reply.status, 401) << row.user;
+    EXPECT_TRUE(body.empty() || reply.body == body) << reply.body;
+    body = reply.body;
+    EXPECT_GE(spent, milliseconds(1990)) << row.user;
+    EXPECT_LT(spent, milliseconds(3500)) << row.user;
+  }
+  const Reply limited = server.Post("/login", R"({"user":"nobody","password":"right"})");
+  EXPECT_EQ(limited.status, 429) << "even the right one, after four refusals";
+  EXPECT_GT(std::stoi(limited.fields.at("retry-after")), 0);
+  for (const char* bad : {"{}", R"({"user":7,"password":"a"})", R"({"user":"a"})",
+                          R"({"user":"","password":""})", R"({"user":"a\u0000b","password":""})"}) {
+    EXPECT_EQ(server.Post("/login", bad).status, 400) << bad;
+  }
+  EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 5\n"),
+            std::string::npos);
+  EXPECT_EQ(Log().find("right"), std::string::npos) << "a password was logged";
+}
+
+TEST_F(LoginTest, AClosedAccountIsRefused) {
+  SKIP_UNLESS_ROOT();
+  Server server = StartWithLogins("pam_service = \"closed\"\n");
+  EXPECT_FALSE(server.LogIn(kAnn, "right"));
+  Server missing = StartWithLogins("pam_service = \"missing\"\n");
+  EXPECT_FALSE(missing.LogIn(kAnn, "right")) << "no service file: nobody is let in";
+}
+
+TEST_F(LoginTest, EachUserSeesTheirOwn) {
+  SKIP_UNLESS_ROOT();
+  WriteFile(share_ + "/ann.txt", "ann's");
+  GiveTo(share_ + "/ann.txt", kAnn, 0600);
+  WriteFile(share_ + "/all.txt", "all's");
+  GiveTo(MakeFolder("volume1/bobs"), kBob, 0700);
+  WriteFile(MakeFolder("volume1/homes/nobody") + "/diary.txt", "secret");
+  GiveTo(dir_ + "/volume1/homes/nobody", kAnn, 0700);
+  chmod((dir_ + "/volume1/homes").c_str(), 0711);
+  Server ann = StartWithLogins();
+  Server bob = ann;
+  ASSERT_TRUE(ann.LogIn(kAnn, "right"));
+  ASSERT_TRUE(bob.LogIn(kBob, "right"));
+
+  const auto names = [](const Json::Value& shares) {
+    std::string text;
+    for (const Json::Value& share : shares["shares"]) text += share["name"].asString() + " ";
+    return text + (shares["homes"].asBool() ? "+home" : "");
+  };
+  EXPECT_EQ(names(ann.Get("/shares").json()), "photo +home");
+  EXPECT_EQ(names(bob.Get("/shares").json()), "bobs photo ");
+
+  EXPECT_EQ(ann.Get("/files/photo/ann.txt").body, "ann's");
+  EXPECT_EQ(bob.Get("/files/photo/ann.txt").status, 403);
+  EXPECT_EQ(bob.Get("/files/photo/all.txt").body, "all's");
+  EXPECT_EQ(ann.Get("/files/home/diary.txt").body, "secret");
+  EXPECT_EQ(bob.Get("/files/home/diary.txt").status, 404);
+  EXPECT_EQ(bob.Get("/files/homes/nobody/diary.txt").status, 403);
+
+  const Reply started = ann.Call("start", R"({"folder_path":"/photo","pattern":"ann"})");
+  const std::string task = started.json()["data"]["taskid"].asString();
+  EXPECT_TRUE(Eventually([&] { return ann.Get("/searches/" + task).json()["finished"] == true; }));
+  EXPECT_EQ(bob.Get("/searches/" + task).status, 404);
+  const std::string list = "{\"taskid\":\"" + task + "\"}";
+  EXPECT_EQ(ann.Call("list", list).json()["data"]["total"], 1);
+  EXPECT_FALSE(bob.Call("list", list).json()["data"].isMember("total"));
+  bob.Call("clean", list);
+  EXPECT_EQ(ann.Call("list", list).json()["data"]["total"], 1) << "bob cleaned ann's search";
+  EXPECT_EQ(Stop(ann), 0);
+}
+
+}  // namespace
+}  // namespace server_test
