@@ -51,7 +51,8 @@ export class Server {
 
   static async start(place: Place, options: Options): Promise<Server> {
     const state = place.folder(options.logins ? 'state-logins' : 'state');
-    place.giveAway(state);
+    const drop = process.getuid?.() === 0 && !options.logins;
+    if (drop) place.giveAway(state);
     const config = join(place.root, options.logins ? 'logins.toml' : 'arbory.toml');
     const shares = Object.entries(options.shares).map(([name, dir]) => `"${name}" = "${dir}"`);
     fs.writeFileSync(
@@ -59,7 +60,6 @@ export class Server {
       `state_dir = "${state}"\nvolumes = []\n[shares]\n${shares.join('\n')}\n[server]\n` +
         `listen = "127.0.0.1:0"\nweb_dir = "${process.env.ARBORY_PAGE}"\n${options.settings ?? ''}`,
     );
-    const drop = process.getuid?.() === 0 && !options.logins;
     const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config], {
       stdio: ['ignore', 'pipe', 'pipe'],
       env: { PATH: process.env.PATH, HOME: state, TZ: process.env.TZ },

@@ -4,11 +4,12 @@ import { join } from 'node:path';
 import { deflateSync } from 'node:zlib';
 import type { Place } from './server.ts';
 
-export const MANY = 300_000; // rows of the table's height exceed what a browser can lay out
+export const MANY = 20_000;
 const PER_FOLDER = 1000;
 
 export const HOSTILE = [
-  '<script>alert(1)</script>',
+  '<script>alert(1)',
+  '<svg onload=alert(1)>',
   '<img src=x onerror=alert(2)>.txt',
   '"quoted" \'name\' & more.txt',
   'line\nbreak.txt',
@@ -50,13 +51,15 @@ export function makeFiles(place: Place): string {
   return top;
 }
 
+export const itemName = (i: number) => `item ${String(i).padStart(6, '0')}.dat`;
+
 export function makeMany(place: Place): string {
   const top = place.folder('many');
   for (let first = 0; first < MANY; first += PER_FOLDER) {
     const folder = join(top, `f${first / PER_FOLDER}`);
     fs.mkdirSync(folder);
     for (let i = first; i < first + PER_FOLDER; ++i) {
-      fs.closeSync(fs.openSync(`${folder}/item ${String(i).padStart(6, '0')}.dat`, 'w'));
+      fs.closeSync(fs.openSync(`${folder}/${itemName(i)}`, 'w'));
     }
   }
   return top;

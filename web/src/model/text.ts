@@ -49,9 +49,16 @@ export function visible(text: string): string {
   return text.replace(UNSEEN, signFor);
 }
 
-// A name that the server could not tell as text: its real bytes are not known here.
-export function hasLostBytes(text: string): boolean {
-  return text.includes('\ufffd');
+// Why the file of a path cannot be asked for, as a sentence; empty when it can. Where the server
+// could not tell a name as text its real bytes are not known here, and it takes no control
+// characters in an address.
+export function whyNotFetched(path: string): string {
+  const held = path.includes('\ufffd')
+    ? 'bytes that are not text'
+    : /[\u0000-\u001f\u007f]/.test(path)
+      ? 'control characters'
+      : '';
+  return held && `This path holds ${held}, so it cannot be fetched from here. Rename it to reach it.`;
 }
 
 const counts = new Intl.NumberFormat('en');

@@ -6,7 +6,7 @@ import type { FileRow } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
 import { previewKind, readStart, type TextStart } from '../model/preview.ts';
 import { formatSize } from '../model/size.ts';
-import { count, folderOf, hasLostBytes, visible } from '../model/text.ts';
+import { count, folderOf, visible, whyNotFetched } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
 import type { App } from '../state/app.ts';
 import { Icon } from './icons.tsx';
@@ -22,7 +22,7 @@ interface Props {
 
 export function Details({ app, row, pattern, actions }: Props) {
   const close = () => app.set({ detailed: null });
-  const lost = hasLostBytes(row.path);
+  const barred = row.is_dir ? '' : whyNotFetched(row.path);
   const searchIn = (folder: string) => app.submit({ folders: [folder] });
   return (
     <aside class="details" aria-label={`About ${visible(row.name)}`} onKeyDown={(event) => event.key === 'Escape' && close()}>
@@ -34,14 +34,14 @@ export function Details({ app, row, pattern, actions }: Props) {
           <Icon name="close" size={15} />
         </button>
       </header>
-      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} lost={lost} />}
+      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} barred={barred !== ''} />}
       <div class="actions">
-        {!row.is_dir && !lost && (
+        {!row.is_dir && !barred && (
           <button type="button" class="tool" onClick={() => actions.download(row)}>
             <Icon name="download" size={14} /> Download
           </button>
         )}
-        {!row.is_dir && !lost && previewKind(row.name) !== 'none' && (
+        {!row.is_dir && !barred && previewKind(row.name) !== 'none' && (
           <a class="tool" href={fileAddress(row.path, true)} target="_blank" rel="noopener">
             <Icon name="open" size={14} /> Open
           </a>
@@ -53,12 +53,7 @@ export function Details({ app, row, pattern, actions }: Props) {
           <Icon name="search" size={14} /> Search {row.is_dir ? 'in it' : 'its folder'}
         </button>
       </div>
-      {lost && (
-        <p class="hint">
-          This path holds bytes that are not text, so it cannot be fetched from here. Rename it on the
-          server to reach it.
-        </p>
-      )}
+      {barred && <p class="hint">{barred}</p>}
       <Facts row={row} />
     </aside>
   );
@@ -98,9 +93,9 @@ function sizeFact(size: number): string {
   return size < 1000 ? `${size} bytes` : `${formatSize(size)} (${count(size)} bytes)`;
 }
 
-function Preview({ row, pattern, lost }: { row: FileRow; pattern: string; lost: boolean }) {
+function Preview({ row, pattern, barred }: { row: FileRow; pattern: string; barred: boolean }) {
   const [failed, setFailed] = useState(false);
-  const kind = lost ? 'none' : previewKind(row.name);
+  const kind = barred ? 'none' : previewKind(row.name);
   if (kind === 'none' || row.size === 0) {
     return <p class="nopreview">{row.size === 0 ? 'Empty file' : 'No preview'}</p>;
   }

@@ -3,7 +3,7 @@ import { useEffect, useMemo, useState } from 'preact/hooks';
 import { fileAddress } from '../api/client.ts';
 import type { FileRow } from '../api/types.ts';
 import { previewKind } from '../model/preview.ts';
-import { hasLostBytes, visible } from '../model/text.ts';
+import { visible, whyNotFetched } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import { copyText, follow } from '../state/save.ts';
 import { nextTheme, themeName } from '../state/theme.ts';
@@ -164,19 +164,17 @@ function pageKey(app: App, event: KeyboardEvent, help: () => void): void {
   event.preventDefault();
 }
 
-const LOST = 'This name holds bytes that are not text, so it cannot be fetched from here.';
-
 function rowActions(app: App): RowActions {
   const download = (row: FileRow) => {
     if (row.is_dir) app.tell('A folder cannot be downloaded. Search in it, and download its files.');
-    else if (hasLostBytes(row.path)) app.tell(LOST);
+    else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
     else follow(fileAddress(row.path), row.name);
   };
   return {
     download,
     open: (row) => {
       if (row.is_dir) app.submit({ folders: [row.path] });
-      else if (hasLostBytes(row.path)) app.tell(LOST);
+      else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
       else if (previewKind(row.name) === 'none') download(row);
       else window.open(fileAddress(row.path, true), '_blank', 'noopener');
     },
