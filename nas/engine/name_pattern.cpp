@@ -6,6 +6,9 @@ namespace nas {
 namespace {
 
 constexpr std::string_view kRegexPrefix = "regex:";
+// Far more than anyone types, and names have 255 bytes. Composing a text of nothing but combining
+// marks takes time by the square of its length: three seconds for one of this length.
+constexpr size_t kMostPatternBytes = size_t{64} << 10;
 
 // Cuts a pattern into alternatives. Knows quoting and operators, nothing of matching.
 class Scanner {
@@ -71,6 +74,10 @@ class Scanner {
 std::optional<NamePattern> NamePattern::Parse(std::string_view text, std::string& error) {
   if (text.find('\0') != std::string_view::npos) {
     error = "a name cannot hold a NUL";
+    return std::nullopt;
+  }
+  if (text.size() > kMostPatternBytes) {
+    error = "the pattern is longer than 64 KiB";
     return std::nullopt;
   }
   NamePattern pattern;
