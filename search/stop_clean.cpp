@@ -55,7 +55,10 @@ Json::Value WaitForData(OKT::Task* task, const char* member, int not_ready_line,
 }
 
 void StopWorker(const OKT::Task& task, const Json::Value& data) {
-  if (!task.isFinished()) KillSearchWorker(data[task_record::kPid].asInt());
+  if (task.isFinished()) return;
+  // A record that was tampered with must not keep the others from being stopped or cleaned.
+  const Json::Value& pid = data[task_record::kPid];
+  KillSearchWorker(pid.isInt() ? pid.asInt() : 0);
 }
 
 // Opens the search's task and database into the globals, as far as there are any.

@@ -113,6 +113,8 @@ TEST(Clean, RemovesTheDatabaseBeforeTheTask) {
       {"no data", R"("t1")", "child, no data",
        join({open, {"log S:687 Failed to get json data"}, task})},
       {"no volume", R"("t1")", "child, no volume", join({open, {"kill(77,15)"}, task})},
+      {"a process id that is none", R"("t1")", "child, spoil pid",
+       join({open, {"log S:580 invalid process id"}, database, task})},
       {"no database", R"("t1")", "child, fail getDBTask",
        join({open, {"kill(77,15)", database[0]}, task})},
       {"no child: the request process does the work and ends", R"("t1")", "fail NLIBCProcFork",
