@@ -73,6 +73,7 @@ SearchJob::SearchJob(const std::vector<Location>& locations,
                      const int& stop_flag, Settings settings)
     : settings_(std::move(settings)), shared_(locations, comps, writer, stop_flag) {
   shared_.recursive = settings_.recursive;
+  for (const int error_number : settings_.unopened) shared_.progress.AddSkipped(error_number);
   if (settings_.search_content && shared_.criteria.pattern != nullptr) {
     shared_.content = ContentQuery::From(shared_.criteria.pattern->pattern());
   }

@@ -22,6 +22,7 @@ class SearchJob {
     bool recursive = true;
     bool search_content = false;
     std::string temporary_folder;  // for the list of files to read
+    std::vector<int> unopened;     // errno of each location asked for that is not searched
     // Called by the thread that runs the job, every few hundredths of a second, after the rows
     // found so far have been made visible.
     std::function<void(const WalkProgress&)> report;

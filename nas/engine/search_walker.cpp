@@ -31,13 +31,19 @@ constexpr std::chrono::milliseconds kReportInterval(200);
 // Rows name their location in 16 bits.
 constexpr size_t kMostLocations = 65'535;
 
-// Each level of a tree that is being read holds a descriptor, so the usual soft bound of 1,024
-// would end at a chain of some hundred folders.
+// Each location and each level of a tree that is being read holds a descriptor, so the usual soft
+// bound of 1,024 would end at some hundred folders.
 void RaiseDescriptorLimit() {
   rlimit limit;
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
   limit.rlim_cur = limit.rlim_max;
   setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+// The kind of trouble, as the walk counts what it skips.
+int ErrnoOf(nas::PlatformError error) {
+  if (error == nas::kErrorPermission) return EACCES;
+  return error == nas::kErrorNoSuchFolder ? ENOENT : EINVAL;
 }
 
 // Turns what a job threw into the last error. To be called in a catch block.
@@ -102,6 +108,7 @@ class WfmSearchWalker::Impl {
   const int& stop_flag_;
   std::vector<FindComp*> comps_;
   std::vector<nas::Location> locations_;
+  std::vector<int> unopened_;  // why each of the other locations is not searched
   std::string volume_;
   std::string folder_;
   std::string id_;
@@ -115,16 +122,18 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
                                  const std::vector<FindComp*>& comps) try {
   comps_ = comps;
   nas::PlatformError first_error = nas::kErrorNoSuchFolder;
-  bool failed = false;
+  RaiseDescriptorLimit();
   for (const std::string& text : texts) {
-    if (locations_.size() == kMostLocations) break;
-    std::optional<nas::Location> location = nas::OpenLocation(text);
+    std::optional<nas::Location> location;
+    nas::SetLastError(nas::kErrorOther);
+    if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
     if (location) {
       locations_.push_back(std::move(*location));
-    } else if (!failed) {
-      failed = true;
-      first_error = static_cast<nas::PlatformError>(NLIBCErrGet());
+      continue;
     }
+    const auto error = static_cast<nas::PlatformError>(NLIBCErrGet());
+    if (unopened_.empty()) first_error = error;
+    unopened_.push_back(ErrnoOf(error));
   }
   if (locations_.empty()) {
     nas::SetLastError(first_error);
@@ -136,11 +145,20 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
   if (folder_.empty()) return false;
   nas::SweepResultFolder(folder_);
   id_ = nas::NewResultId();
-  writer_ = std::make_unique<nas::ResultWriter>(nas::ResultPath(folder_, id_));
+  // Where the file cannot be made whole nobody will ever know its name.
+  struct Cleanup {
+    const std::string path;
+    bool keep = false;
+    ~Cleanup() {
+      if (!keep) nas::RemoveResultFile(path);
+    }
+  } file{nas::ResultPath(folder_, id_)};
+  writer_ = std::make_unique<nas::ResultWriter>(file.path);
   for (size_t i = 0; i < locations_.size(); ++i) {
     writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
                          locations_[i].share.root);
   }
+  file.keep = true;
   return true;
 } catch (...) {
   SetErrorFromException();
@@ -148,12 +166,12 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
 }
 
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
-  RaiseDescriptorLimit();
   nas::SearchJob job(
       locations_, comps_, *writer_, stop_flag_,
       {.recursive = !current_only_,
        .search_content = options.get("search_content", false).asBool(),
        .temporary_folder = folder_,
+       .unopened = unopened_,
        .report = [this](const nas::WalkProgress& progress) { Report(progress, false); }});
   const bool completed = job.Run();
   writer_->Complete();

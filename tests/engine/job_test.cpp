@@ -71,6 +71,7 @@ class Job : public testing::Test {
                     {.recursive = true,
                      .search_content = content,
                      .temporary_folder = base_ + "/results",
+                     .unopened = {EACCES},
                      .report = [this](const WalkProgress&) { ++reports_; }});
       completed_ = job.Run();
       progress_ = job.progress().ToJson();
@@ -129,6 +130,7 @@ TEST_F(Job, HugeFolderAndManyFolders) {
   EXPECT_EQ(progress_["entries"].asInt(), kFiles + 2 * kFolders);
   EXPECT_EQ(progress_["matches"].asInt(), kFiles + kFolders);
   EXPECT_EQ(progress_["phase"], "done");
+  EXPECT_EQ(progress_["skipped"]["permission"].asInt(), 1) << "the location not opened";
 }
 
 TEST_F(Job, LocationsInsideOneAnotherAreWalkedOnce) {
