@@ -18,6 +18,8 @@ using std::chrono::milliseconds;
 // first time comes sooner, so that a first page can be asked for at once.
 constexpr milliseconds kTick(25);
 constexpr milliseconds kFirstTick(5);
+// What threads get to notice the stop flag; with a tick before it, a tenth of a second in all.
+constexpr milliseconds kStopPatience(75);
 // Rows wait at most this long before listings can see them, the first ones the first tick. A long
 // search writes ever less often, so that its rows do not end up in very many small blocks.
 constexpr milliseconds kFlushInterval(50);
@@ -183,12 +185,22 @@ void SearchJob::Tend(Work work) {
         flushed = now;
       }
       settings_.report(shared_.progress);
+      LookForStuckThreads(now);
       if (disk.Waiting() && handles_.size() < kMostThreads) StartThread(work);
     } catch (...) {
       Fail(std::current_exception());
     }
     lock.lock();
   }
+}
+
+void SearchJob::LookForStuckThreads(Clock::time_point now) {
+  if (__atomic_load_n(&shared_.stop_flag, __ATOMIC_RELAXED) == 0 || told_stuck_) return;
+  if (!stop_seen_) stop_seen_ = now;
+  if (now - *stop_seen_ < kStopPatience) return;
+  told_stuck_ = true;
+  Flush();
+  if (settings_.stuck) settings_.stuck();
 }
 
 void SearchJob::Flush() {

@@ -4,10 +4,12 @@
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <condition_variable>
 #include <exception>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -26,6 +28,11 @@ class SearchJob {
     // Called by the thread that runs the job, every few hundredths of a second, after the rows
     // found so far have been made visible.
     std::function<void(const WalkProgress&)> report;
+    // Called once, on the same thread, when threads are still at work some time after the stop
+    // flag: inside an expression that finds no end, or waiting for a file server that does not
+    // answer. All rows are visible then. Run cannot return before those threads do, but a process
+    // may choose to end.
+    std::function<void()> stuck;
   };
 
   SearchJob(const std::vector<Location>& locations, const std::vector<FileSearch::FindComp*>& comps,
@@ -43,12 +50,15 @@ class SearchJob {
   void RunPhase(Work work);
   void StartThread(Work work);
   void Tend(Work work);
+  void LookForStuckThreads(std::chrono::steady_clock::time_point now);
   void Flush();
   void Fail(std::exception_ptr failure);
 
   const Settings settings_;
   SharedWalk shared_;
   std::vector<std::unique_ptr<WalkThread>> threads_;
+  std::optional<std::chrono::steady_clock::time_point> stop_seen_;
+  bool told_stuck_ = false;
 
   std::mutex mutex_;  // guards running_ and failure_
   std::condition_variable ended_;

@@ -102,6 +102,7 @@ class WfmSearchWalker::Impl {
 
  private:
   void Report(const nas::WalkProgress& progress, bool last);
+  [[noreturn]] void EndWorker();
 
   const std::string user_;
   OKT::Task* const task_;
@@ -172,7 +173,8 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
        .search_content = options.get("search_content", false).asBool(),
        .temporary_folder = folder_,
        .unopened = unopened_,
-       .report = [this](const nas::WalkProgress& progress) { Report(progress, false); }});
+       .report = [this](const nas::WalkProgress& progress) { Report(progress, false); },
+       .stuck = [this] { EndWorker(); }});
   const bool completed = job.Run();
   writer_->Complete();
   Report(job.progress(), true);
@@ -184,6 +186,13 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
 } catch (...) {
   SetErrorFromException();
   return false;
+}
+
+// A thread cannot be ended, but a process can: this is how a stopped search's worker ends, only
+// without waiting for the walk to return.
+void WfmSearchWalker::Impl::EndWorker() {
+  task_->finish(false);
+  _exit(0);
 }
 
 void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {

@@ -72,7 +72,8 @@ class Job : public testing::Test {
                      .search_content = content,
                      .temporary_folder = base_ + "/results",
                      .unopened = {EACCES},
-                     .report = [this](const WalkProgress&) { ++reports_; }});
+                     .report = [this](const WalkProgress&) { ++reports_; },
+                     .stuck = [this] { ++stuck_; }});
       completed_ = job.Run();
       progress_ = job.progress().ToJson();
     }
@@ -93,6 +94,7 @@ class Job : public testing::Test {
   const std::string tree_ = base_ + "/tree";
   int stop_ = 0;
   std::atomic<int> reports_ = 0;
+  int stuck_ = 0;
   bool completed_ = false;
   Json::Value progress_;
   size_t descriptors_ = 0;
@@ -204,6 +206,20 @@ TEST_F(Job, TheStopFlagEndsIt) {
   EXPECT_TRUE(Find("needle", {"/tree"}, true).empty());
   EXPECT_FALSE(completed_);
   EXPECT_NE(progress_["phase"], "done");
+  EXPECT_EQ(stuck_, 0);
+}
+
+// An expression that needs some seconds for the file, however often it is told to stop.
+TEST_F(Job, TellsOfThreadsThatDoNotStop) {
+  std::string lines;
+  while (lines.size() < 20'000) lines += std::string(26, 'a') + "b\n";
+  Touch("bomb", lines + "c");
+  std::jthread stopper([this] {
+    while (reports_ < 4) std::this_thread::yield();
+    __atomic_store_n(&stop_, 1, __ATOMIC_RELAXED);
+  });
+  EXPECT_TRUE(Find("regex:(a|aa)+$c", {"/tree"}, true).empty());
+  EXPECT_EQ(stuck_, 1);
 }
 
 TEST_F(Job, LocationErrors) {
