@@ -1,10 +1,13 @@
 #include "arbory/server/connection.h"
 
+#include <syslog.h>
 #include <algorithm>
+
 #include <boost/asio/buffer.hpp>
 #include <boost/beast/http/error.hpp>
 #include <boost/beast/http/read.hpp>
 #include <ctime>
+#include <exception>
 
 #include "arbory/server/http_text.h"
 
@@ -31,6 +34,7 @@ constexpr int kBadRequest = 400;
 constexpr int kTimeout = 408;
 constexpr int kTooLarge = 413;
 constexpr int kHeaderTooLarge = 431;
+constexpr int kFailed = 503;
 constexpr unsigned kHttp11 = 11;
 
 constexpr char kEveryReply[] =
@@ -179,9 +183,19 @@ void Connection::Refuse(int status, const char* sentence) {
 void Connection::Dispatch() {
   keep_alive_ = parser_->keep_alive() && !host_->stopping();
   request_.body = std::move(parser_->get().body());
-  Answer answer = host_->service().Handle(&request_);
+  Answer answer = HandleSafely();
   if (auto* reply = std::get_if<HttpReply>(&answer)) return Send(std::move(*reply));
   AwaitChild(std::move(std::get<ChildAnswer>(answer)));
+}
+
+// One request's trouble, such as no memory for its answer, is not the others'.
+Answer Connection::HandleSafely() {
+  try {
+    return host_->service().Handle(&request_);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "%s %s: %s", request_.method.c_str(), request_.target.c_str(), error.what());
+    return ErrorReply(kFailed, "The server failed here; try again.");
+  }
 }
 
 void Connection::AwaitChild(ChildAnswer answer) {

@@ -54,6 +54,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void ReadBody();
   void OnReadError(Error error);
   void Dispatch();
+  Answer HandleSafely();
   void Refuse(int status, const char* sentence);
 
   void Send(HttpReply reply);

@@ -207,6 +207,11 @@ class HttpServer::Loop : public ConnectionHost {
     for (const auto& [pid, child] : children_) child->Kill();
     ForEachConnection(&Connection::Abort);
     ended_ = true;
+    // A child that even this does not end waits for a device, and would do so for ever.
+    stop_timer_.expires_after(kStopTime);
+    stop_timer_.async_wait([this](Error error) {
+      if (!error) loop_.stop();
+    });
     EndWhenIdle();
   }
 

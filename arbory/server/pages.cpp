@@ -70,7 +70,7 @@ HttpReply PageReply(const std::string& folder, const std::vector<std::string>& p
   if (!known ||
       !nas::ReadWholeFile(AT_FDCWD, (folder + "/" + file).c_str(), kMaxFileBytes, &reply.body)) {
     if (!path.empty()) return ErrorReply(kNotFound, "There is nothing here; open / for the page.");
-    reply.body = "The page has not been built. Build it with: cd web && npm ci && npm run build\n";
+    reply.body = "The page has not been built. Build it with scripts/build-page, then reload.\n";
     reply.status = kNotFound;
     reply.fields = {{"Content-Type", "text/plain; charset=utf-8"}, {"Cache-Control", "no-store"}};
     return reply;

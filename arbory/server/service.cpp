@@ -258,21 +258,20 @@ Answer Service::Login(const HttpRequest& request) {
   const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
   Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
-    child->make_reply = [this, request, given = credentials.user,
+    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, request.begun},
                          count = std::move(child->make_reply)](const ChildHead* head) {
       count(head);
-      return LoginReply(request, given, head);
+      return LoginReply(attempt, head);
     };
   }
   return answer;
 }
 
-HttpReply Service::LoginReply(const HttpRequest& request, const std::string& given_user,
-                              const ChildHead* head) {
+HttpReply Service::LoginReply(const Attempt& attempt, const ChildHead* head) {
   if (head != nullptr && head->status == kOk) {
     const auto named = SplitPath("/" + head->fields.at(0).second);
-    const std::string user = named && named->size() == 1 ? named->front() : given_user;
-    login_limit_.Succeeded(request.peer, given_user);
+    const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
+    login_limit_.Succeeded(attempt.peer, attempt.user);
     const std::time_t now = std::time(nullptr);
     const std::string id = sessions_.Begin(user, now);
     HttpReply reply = SessionReply(kOk, *sessions_.Find(id, now));
@@ -286,7 +285,7 @@ HttpReply Service::LoginReply(const HttpRequest& request, const std::string& giv
       refused
           ? ErrorReply(kUnauthorized, "The user or the password is wrong; try again.")
           : ErrorReply(kUnavailable, "Logins cannot be checked now; the server's log says why.");
-  reply.not_before = request.begun + kRefusalTime;
+  reply.not_before = attempt.begun + kRefusalTime;
   return reply;
 }
 

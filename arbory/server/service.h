@@ -43,8 +43,11 @@ class Service : public HttpService {
 
   Answer OpenByToken(const HttpRequest& request);
   Answer Login(const HttpRequest& request);
-  HttpReply LoginReply(const HttpRequest& request, const std::string& given_user,
-                       const ChildHead* head);
+  struct Attempt {
+    std::string peer, user;
+    Clock::time_point begun;
+  };
+  HttpReply LoginReply(const Attempt& attempt, const ChildHead* head);
   Answer Logout(HttpRequest* request);
   Answer CallApi(HttpRequest* request, const Path& path);
   HttpReply NoSuchRow(const Path& path) const;

@@ -180,7 +180,7 @@ TEST_F(FilesTest, LargeFilesAndPartsOfThemArriveWhole) {
 TEST_F(FilesTest, ThePageComesWithItsPolicy) {
   const std::string web = MakeFolder("web");
   Server unbuilt = Start("web_dir = \"" + web + "\"\n");
-  EXPECT_NE(unbuilt.Get("/").body.find("npm run build"), std::string::npos);
+  EXPECT_NE(unbuilt.Get("/").body.find("build-page"), std::string::npos);
   WriteFile(web + "/index.html", "<!doctype html>");
   WriteFile(MakeFolder("web/assets") + "/app-1.js", "1");
   WriteFile(web + "/.hidden", "hidden");

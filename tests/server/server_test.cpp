@@ -192,10 +192,9 @@ void ServerTest::SetUp() {
 }
 
 void ServerTest::TearDown() {
-  for (const pid_t pid : servers_) {
-    kill(pid, SIGKILL);
-    waitpid(pid, nullptr, 0);
-  }
+  while (!servers_.empty()) EXPECT_EQ(Stop({servers_.front(), 0, "", ""}), 0) << Log();
+  EXPECT_EQ(Log().find("Sanitizer"), std::string::npos) << Log();
+  EXPECT_EQ(Log().find("runtime error"), std::string::npos) << Log();
   PlatformTest::TearDown();
 }
 
@@ -239,9 +238,14 @@ Server ServerTest::StartMisbehaving(const std::string& server_lines) {
 }
 
 int ServerTest::Stop(const Server& server) {
-  kill(server.pid, SIGTERM);
   int status = -1;
-  EXPECT_TRUE(Eventually([&] { return waitpid(server.pid, &status, WNOHANG) == server.pid; }));
+  const auto ended = [&] { return waitpid(server.pid, &status, WNOHANG) == server.pid; };
+  kill(server.pid, SIGTERM);
+  if (!Eventually(ended)) {
+    ADD_FAILURE() << "the server does not stop";
+    kill(server.pid, SIGKILL);
+    waitpid(server.pid, &status, 0);
+  }
   std::erase(servers_, server.pid);
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
