@@ -115,7 +115,7 @@ Json::Value RenderFiles(const std::list<DIRENTRY_INFO>& files, int additional) {
     Json::Value object;
     object.clear();
     DumpFileInfo(additional, file, object, 0, 0);
-    rendered.append(object);
+    rendered.append(std::move(object));
   }
   return rendered;
 }

@@ -63,29 +63,32 @@ int ModeAsDecimal(std::uint32_t mode) {
   return decimal;
 }
 
+// Keys that are neither copied into each object nor with it: a page may hold very many files.
+using Key = Json::StaticString;
+
 Json::Value OwnerOf(const DIRENTRY_INFO& entry) {
   Json::Value owner(Json::objectValue);
-  owner["user"] = entry.user;
-  owner["group"] = entry.group;
-  owner["uid"] = entry.uid;
-  owner["gid"] = entry.gid;
+  owner[Key("user")] = entry.user;
+  owner[Key("group")] = entry.group;
+  owner[Key("uid")] = entry.uid;
+  owner[Key("gid")] = entry.gid;
   return owner;
 }
 
 Json::Value TimesOf(const DIRENTRY_INFO& entry) {
   Json::Value times(Json::objectValue);
-  times["atime"] = entry.atime;
-  times["mtime"] = entry.mtime;
-  times["ctime"] = entry.ctime;
-  times["crtime"] = entry.crtime;
+  times[Key("atime")] = entry.atime;
+  times[Key("mtime")] = entry.mtime;
+  times[Key("ctime")] = entry.ctime;
+  times[Key("crtime")] = entry.crtime;
   return times;
 }
 
 Json::Value PermissionsOf(const DIRENTRY_INFO& entry) {
   Json::Value permissions(Json::objectValue);
-  permissions["mode"] = ModeAsDecimal(entry.mode);
-  permissions["privilege"] = entry.acl_privilege;
-  permissions["acl_mode"] = entry.acl_mode;
+  permissions[Key("mode")] = ModeAsDecimal(entry.mode);
+  permissions[Key("privilege")] = entry.acl_privilege;
+  permissions[Key("acl_mode")] = entry.acl_mode;
   return permissions;
 }
 
@@ -118,13 +121,13 @@ void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, 
   using namespace nas;
   enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
   out = Json::Value(Json::objectValue);
-  out["name"] = entry.name;
-  out["path"] = entry.path;
-  out["is_dir"] = entry.is_dir;
-  if (additional & kRealPath) out["real_path"] = entry.real_path;
-  if (additional & kSize) out["size"] = static_cast<Json::UInt64>(entry.size);
-  if (additional & kOwner) out["owner"] = OwnerOf(entry);
-  if (additional & kTime) out["time"] = TimesOf(entry);
-  if (additional & kPerm) out["perm"] = PermissionsOf(entry);
-  if (additional & kType) out["type"] = entry.type;
+  out[Key("name")] = entry.name;
+  out[Key("path")] = entry.path;
+  out[Key("is_dir")] = entry.is_dir;
+  if (additional & kRealPath) out[Key("real_path")] = entry.real_path;
+  if (additional & kSize) out[Key("size")] = static_cast<Json::UInt64>(entry.size);
+  if (additional & kOwner) out[Key("owner")] = OwnerOf(entry);
+  if (additional & kTime) out[Key("time")] = TimesOf(entry);
+  if (additional & kPerm) out[Key("perm")] = PermissionsOf(entry);
+  if (additional & kType) out[Key("type")] = entry.type;
 }
