@@ -33,6 +33,7 @@ using Clock = std::chrono::steady_clock;
 
 constexpr int kRounds = 5;
 constexpr int kPageRows = 100;
+constexpr unsigned kLargePageRows = 10'000;
 
 double Milliseconds(Clock::duration d) {
   return std::chrono::duration<double, std::milli>(d).count();
@@ -159,6 +160,13 @@ void MeasureRunning(Client& client) {
 
 void MeasureSorted(Client& client) {
   const unsigned total = client.List(0, 1).total;
+  std::vector<double> large;
+  for (unsigned offset = 0; offset < std::min(total, 10 * kLargePageRows);
+       offset += kLargePageRows) {
+    large.push_back(client.List(offset, kLargePageRows).milliseconds);
+  }
+  std::ranges::sort(large);
+  Print("page of 10,000 rows, median", large[large.size() / 2], "ms");
   const std::array<std::uint64_t, 3> offsets = {0, total / 2, total - std::min(total, 100U)};
   for (const char* column : {"", "name", "path", "size", "type", "user", "group", "mode", "atime",
                              "mtime", "ctime", "crtime"}) {
