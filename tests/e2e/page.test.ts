@@ -299,7 +299,7 @@ test('folders are chosen from a tree', async () => {
 
 test('failures are sentences that say what to do', async () => {
   const rows: [string, string][] = [
-    ['#q=regex%3A(', 'Check the name pattern'],
+    ['#q=regex%3A(', 'Check its brackets'],
     ['#q=x&in=/nowhere', 'Choose others'],
     ['#q=x&in=/files/locked', 'ask their owner for access'],
   ];

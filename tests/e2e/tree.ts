@@ -70,10 +70,15 @@ export function picture(width = 320, height = 200): Buffer {
   for (let y = 0; y < height; ++y) {
     for (let x = 0; x < width; ++x) {
       const at = y * (1 + width * 3) + 1 + x * 3;
-      // An evening sky over hills.
-      const hill = height * (0.72 + 0.1 * Math.sin(x / 41) + 0.05 * Math.sin(x / 17));
-      const sky = [250 - y * 0.5, 190 - y * 0.55, 150 + y * 0.3];
-      const shade = y > hill ? [38, 62 + (y - hill) * 0.4, 52] : sky;
+      // An evening sky over hills and a lake, in parts of the whole.
+      const [across, down] = [x / width, y / height];
+      const far = 0.5 + 0.06 * Math.sin(across * 9) + 0.02 * Math.sin(across * 31);
+      const near = 0.62 + 0.05 * Math.sin(across * 5 + 2) + 0.015 * Math.sin(across * 23);
+      const sun = Math.max(0, 1 - 6 * Math.hypot(across - 0.68, (down - 0.42) * 0.7));
+      let shade = [226 - 30 * down + 60 * sun, 178 + 40 * down + 50 * sun, 160 + 30 * down];
+      if (down > far) shade = [104, 122, 134];
+      if (down > near) shade = [52, 82, 74];
+      if (down > 0.74) shade = [150 - 50 * down + 40 * sun, 160 - 40 * down, 168 - 30 * down];
       shade.forEach((value, i) => (rows[at + i] = Math.max(0, Math.min(255, value))));
     }
   }

@@ -26,10 +26,15 @@ const WALK_FAILURES: Record<number, string> = {
   405: 'There is no such owner or group. Check the spelling of the account name.',
   407: 'You may not read these folders. Choose others, or ask their owner for access.',
   408: 'These folders are no longer there. Choose others.',
-  418: 'The search could not be understood. Check the name pattern (a regex: must be complete) and that the folders begin with the name of a share.',
+  418: 'The folders or a criterion could not be understood. A folder begins with the name of a share: /photos/2026.',
 };
 
-export function walkFailure(code: number): string {
+const BAD_REGEX =
+  'What follows regex: is not a complete regular expression. Check its brackets and repetitions.';
+const CRITERION = 418;
+
+export function walkFailure(code: number, pattern: string): string {
+  if (code === CRITERION && pattern.includes('regex:')) return BAD_REGEX;
   return WALK_FAILURES[code] ?? `The search failed on the server (error ${code}). Try again.`;
 }
 

@@ -36,7 +36,7 @@ export function toHash({ criteria, sort }: Address): string {
   for (const [key, field] of TEXTS) if (criteria[field]) query.set(key, criteria[field]);
   if (criteria.contents) query.set('contents', '1');
   if (!criteria.subfolders) query.set('subfolders', '0');
-  if (sort) query.set('sort', (sort.descending ? '-' : '') + sort.column);
+  if (sort) query.set('sort', sortText(sort));
   return '#' + query.toString();
 }
 
@@ -58,7 +58,11 @@ export function fromHash(hash: string): Address | null {
   return { criteria, sort: parseSort(query.get('sort')) };
 }
 
-function parseSort(text: string | null): Sort | null {
+export function sortText(sort: Sort | null): string {
+  return sort ? (sort.descending ? '-' : '') + sort.column : '';
+}
+
+export function parseSort(text: string | null): Sort | null {
   const descending = text?.startsWith('-') ?? false;
   const column = SORT_COLUMNS.find((name) => name === text?.replace(/^-/, ''));
   return column ? { column, descending } : null;

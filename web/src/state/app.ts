@@ -3,15 +3,17 @@
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow, Session, Share } from '../api/types.ts';
-import { fromHash, toHash, type Sort } from '../model/address.ts';
+import { fromHash, parseSort, sortText, toHash, type Sort } from '../model/address.ts';
 import {
   CriterionError,
   hasCriteria,
   NO_CRITERIA,
+  sameCriteria,
   startParams,
   type Criteria,
 } from '../model/criteria.ts';
 import { fromRecord } from '../model/history.ts';
+import { recall, remember } from './memory.ts';
 import { Search } from './search.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
@@ -118,11 +120,13 @@ export class App {
     this.changed();
   }
 
-  // Searches for what is typed, and puts it into the address bar.
+  // Searches for what is typed, and puts it into the address bar. The order is that of the search
+  // before, in this tab or the last one.
   submit(change: Partial<Criteria> = {}): void {
     this.edit(change);
-    const hash = toHash({ criteria: this.draft, sort: this.search?.sort ?? null });
-    if (!this.start(this.draft, this.search?.sort ?? null)) return;
+    const sort = this.search ? this.search.sort : parseSort(recall('sort'));
+    const hash = toHash({ criteria: this.draft, sort });
+    if (!this.start(this.draft, sort)) return;
     if (hash === location.hash) history.replaceState(null, '', hash);
     else history.pushState(null, '', hash);
   }
@@ -174,6 +178,7 @@ export class App {
     if (!this.search) return;
     this.active = -1;
     this.search.setSort(sort);
+    remember('sort', sortText(sort));
     history.replaceState(null, '', toHash({ criteria: this.search.criteria, sort }));
     this.changed();
   }
@@ -184,11 +189,15 @@ export class App {
         client.getHistory('simple'),
         client.getHistory('advance'),
       ]);
-      const turned = [...simple.history, ...advanced.history].flatMap((record) => {
-        const criteria = fromRecord(record, this.everywhere);
-        return criteria ? [{ criteria, advanced: hasCriteria(criteria) }] : [];
+      const past = [...simple.history, ...advanced.history]
+        .map((record) => fromRecord(record, this.everywhere))
+        .filter((criteria) => criteria !== null);
+      const differs = (one: Criteria, at: number) =>
+        past.findIndex((other) => sameCriteria(one, other)) === at;
+      const history = past.filter(differs);
+      this.set({
+        history: history.map((criteria) => ({ criteria, advanced: hasCriteria(criteria) })),
       });
-      this.set({ history: turned });
     } catch {
       // Suggestions are a convenience; their absence is no reason to speak.
     }

@@ -9,11 +9,11 @@ import { Pages } from './pages.ts';
 
 export type Status = 'starting' | 'running' | 'done' | 'stopped' | 'failed';
 
-// How often a running search is asked: often at first, when most searches end.
-const QUICK_MS = 120;
+// How often a running search is asked: soon at first, as most end within moments, then ever less.
+const SOONEST_MS = 30;
+const PART_OF_ELAPSED = 4;
 const STEADY_MS = 400;
 const HIDDEN_MS = 2000;
-const QUICK_FOR_MS = 1500;
 // So many unanswered questions in a row, and the search is given up.
 const MISSES = 5;
 
@@ -92,8 +92,8 @@ export class Search {
         const final = error instanceof ApiError && (error.signedOut || error.gone);
         if (final || ++misses >= MISSES) return this.fail(error);
       }
-      const quick = this.elapsed < QUICK_FOR_MS;
-      await wait(document.hidden ? HIDDEN_MS : quick ? QUICK_MS : STEADY_MS);
+      const pause = Math.max(SOONEST_MS, this.elapsed / PART_OF_ELAPSED);
+      await wait(document.hidden ? HIDDEN_MS : Math.min(pause, STEADY_MS));
     }
   }
 
@@ -110,7 +110,7 @@ export class Search {
     this.endedAt = performance.now();
     if (progress.progress === -1) {
       this.status = 'failed';
-      this.error = walkFailure(progress.errno ?? 0);
+      this.error = walkFailure(progress.errno ?? 0, this.criteria.pattern);
     } else if (progress.progress === 1) {
       this.status = 'done';
     } else {

@@ -1,14 +1,12 @@
-// Light, dark, or as the system says. Kept in the browser, and set before the first drawing.
-const KEY = 'arbory.theme';
+// Light, dark, or as the system says. Set before the first drawing.
+import { recall, remember } from './memory.ts';
+
 const THEMES = ['system', 'light', 'dark'] as const;
 type Theme = (typeof THEMES)[number];
 
 export function themeName(): Theme {
-  try {
-    return THEMES.find((theme) => theme === localStorage.getItem(KEY)) ?? 'system';
-  } catch {
-    return 'system'; // storage may be closed to the page
-  }
+  const set = document.documentElement.dataset.theme ?? recall('theme');
+  return THEMES.find((theme) => theme === set) ?? 'system';
 }
 
 export function applyTheme(theme: Theme = themeName()): void {
@@ -17,11 +15,7 @@ export function applyTheme(theme: Theme = themeName()): void {
 
 export function nextTheme(): Theme {
   const next = THEMES[(THEMES.indexOf(themeName()) + 1) % THEMES.length]!;
-  try {
-    localStorage.setItem(KEY, next);
-  } catch {
-    // Then it lasts as long as the page.
-  }
+  remember('theme', next);
   applyTheme(next);
   return next;
 }

@@ -21,7 +21,10 @@ interface Props {
 }
 
 export function Details({ app, row, pattern, actions }: Props) {
-  const close = () => app.set({ detailed: null });
+  const close = () => {
+    app.set({ detailed: null });
+    document.querySelector<HTMLElement>('.table')?.focus();
+  };
   const barred = row.is_dir ? '' : whyNotFetched(row.path);
   const searchIn = (folder: string) => app.submit({ folders: [folder] });
   return (
