@@ -38,7 +38,11 @@ export function Welcome({ app }: { app: App }) {
           </tbody>
         </table>
         <p class="hint">
-          Upper and lower case are the same. Press <kbd>?</kbd> for the keyboard.
+          Upper and lower case are the same.
+          <span class="keyed">
+            {' '}
+            Press <kbd>?</kbd> for the keyboard.
+          </span>
         </p>
       </section>
       {recent.length > 0 && (
