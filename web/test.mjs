@@ -18,7 +18,7 @@ await build({
   bundle: true,
   platform: 'node',
   format: 'cjs',
-  external: ['playwright-core'],
+  external: ['playwright-core', 'axe-core'],
   sourcemap: 'inline',
   logLevel: 'warning',
 });

@@ -357,3 +357,37 @@ test('it is usable on a phone', async () => {
   assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 390);
   await tab.close();
 });
+
+test('screen readers find names, roles and contrast in order, light and dark', async () => {
+  const states: [string, string, string?][] = [
+    ['the start', ''],
+    ['results', '#q=plan'],
+    ['details', '#q=plan', '#row-0'],
+    ['criteria', '#q=plan&type=file', 'text=Criteria'],
+    ['the folders', '#q=plan', '.folders'],
+    ['nothing found', '#q=nowhere+to+be+found'],
+  ];
+  const axe = fs.readFileSync(require.resolve('axe-core/axe.min.js'), 'utf8');
+  for (const colorScheme of ['light', 'dark'] as const) {
+    for (const [state, hash, click] of states) {
+      const tab = await openTab(hash, { colorScheme });
+      if (click) await tab.page.click(click);
+      await tab.page.evaluate(axe);
+      const found = await tab.page.evaluate(async () => {
+        // The table scrolls by the keys of the grid around it, which has the focus.
+        const rules = { 'scrollable-region-focusable': { enabled: false } };
+        const { violations } = await (window as unknown as { axe: Axe }).axe.run(document, { rules });
+        return violations.map(({ id, nodes }) => `${id}: ${nodes[0]!.html}`);
+      });
+      assert.deepEqual(found, [], `${state}, ${colorScheme}`);
+      await tab.close();
+    }
+  }
+});
+
+interface Axe {
+  run(
+    root: Document,
+    options: object,
+  ): Promise<{ violations: { id: string; nodes: { html: string }[] }[] }>;
+}

@@ -31,22 +31,24 @@ export function Page({ app }: { app: App }) {
   return (
     <>
       <header class="top">
-        <a
-          class="home"
-          href="#"
-          aria-label="Arbory Search, start"
-          onClick={(event) => {
-            event.preventDefault();
-            history.pushState(null, '', location.pathname);
-            app.reset();
-          }}
-        >
-          <Wordmark />
-        </a>
+        <h1>
+          <a
+            class="home"
+            href="#"
+            aria-label="Arbory Search, start"
+            onClick={(event) => {
+              event.preventDefault();
+              history.pushState(null, '', location.pathname);
+              app.reset();
+            }}
+          >
+            <Wordmark />
+          </a>
+        </h1>
         <SearchBar app={app} />
         <Menu app={app} help={() => setHelp(true)} />
       </header>
-      <div class="toolbar">
+      <section class="toolbar" aria-label="Folders and criteria">
         <FolderPicker app={app} />
         <button
           type="button"
@@ -60,7 +62,7 @@ export function Page({ app }: { app: App }) {
           <Icon name={app.unfolded ? 'up' : 'down'} size={11} />
         </button>
         <CriteriaTags app={app} />
-      </div>
+      </section>
       {app.unfolded && <CriteriaPanel app={app} />}
       {!app.unfolded && app.draftError && (
         <p class="wrong band" role="alert">
