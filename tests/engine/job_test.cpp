@@ -10,6 +10,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <set>
@@ -176,6 +177,28 @@ TEST_F(Job, PseudoFileSystemsAreNotEntered) {
   EXPECT_EQ(Find("status"), (std::set<std::string>{"tmpfs/status"}));
   umount((tree_ + "/proc").c_str());
   umount((tree_ + "/tmpfs").c_str());
+}
+
+TEST_F(Job, FileSystemThatTellsNoTypes) {
+  const std::string image = base_ + "/image";
+  const std::string make = "truncate -s 8M " + image + " && mkfs.ext2 -q -O ^filetype " + image +
+                           " && mount -o loop " + image + " " + tree_ + " 2>/dev/null";
+  if (std::system(make.c_str()) != 0) GTEST_SKIP() << "mounting needs root and a loop device";
+  std::filesystem::create_directories(tree_ + "/a/b");
+  Touch("a/x1", "needle");
+  Touch("a/b/x2");
+  std::filesystem::create_symlink("b", tree_ + "/a/x3");
+  ASSERT_EQ(mkfifo((tree_ + "/a/pipe").c_str(), 0644), 0);
+  const int fd = open((tree_ + "/a").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  DirectoryReader reader;
+  DirectoryReader::Entry entry;
+  reader.Start(fd);
+  ASSERT_TRUE(reader.Next(entry));
+  EXPECT_EQ(entry.type, DT_UNKNOWN) << "or this tests nothing";
+  close(fd);
+  EXPECT_EQ(Find("x"), (std::set<std::string>{"a/x1", "a/b/x2", "a/x3"}));
+  EXPECT_EQ(Find("needle", {"/tree"}, true), (std::set<std::string>{"a/x1"}));
+  EXPECT_EQ(umount(tree_.c_str()), 0);
 }
 
 TEST_F(Job, FoldersVanishingDuringTheWalk) {
