@@ -100,8 +100,8 @@ TEST_F(Contents, NothingIsLostWherePiecesMeet) {
   }
   EXPECT_TRUE(Finds("regex:^end$", std::string(3 * kPiece, '-') + "\nend\n"));
   EXPECT_FALSE(Finds("regex:^-+x", std::string(3 * kPiece, '-') + "\nx\n"));
-  const std::string huge(kPiece, 'q');
-  EXPECT_TRUE(Finds(huge, "x" + huge)) << "a text as long as a piece";
+  const std::string huge(size_t{64} << 10, 'q');
+  EXPECT_TRUE(Finds(huge, std::string(kPiece - 1, '-') + huge)) << "as long as a pattern may be";
 }
 
 TEST_F(Contents, LiteralAgainstPlainSearch) {
