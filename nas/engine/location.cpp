@@ -11,6 +11,8 @@
 #include <climits>
 
 #include "nas/system/error.h"
+#include "nas/system/real_path.h"
+#include "nas/system/volumes.h"
 
 namespace nas {
 namespace {
@@ -61,6 +63,18 @@ PlatformError LocationError(int error_number) {
   }
 }
 
+// Whether the folder is the temporary folder of a volume, or lies in one.
+bool IsTemporary(int folder) {
+  const auto path = RealPath("/proc/self/fd/" + std::to_string(folder));
+  if (!path) return false;
+  std::vector<std::string> volumes = ListVolumes();
+  volumes.push_back(ScratchVolume());
+  return std::ranges::any_of(volumes, [&path](const std::string& volume) {
+    const auto temporary = RealPath(volume + "/" + kTemporaryFolder);
+    return temporary && (*path + "/").starts_with(*temporary + "/");
+  });
+}
+
 std::optional<Location> Fail(PlatformError error) {
   SetLastError(error);
   return std::nullopt;
@@ -86,6 +100,7 @@ std::optional<Location> OpenLocation(const std::string& text) {
   const UniqueFd readable(openat(location.fd.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   struct stat status;
   if (!readable || fstat(readable.get(), &status) != 0) return Fail(LocationError(errno));
+  if (IsTemporary(readable.get())) return Fail(kErrorIllegal);
   location.device = status.st_dev;
   location.inode = status.st_ino;
   return location;

@@ -21,8 +21,8 @@ struct Location {
   ino_t inode = 0;
 };
 
-// Nothing, with the last error set: an illegal location, no such share or folder, a file, or a
-// folder that may not be entered.
+// Nothing, with the last error set: an illegal location, no such share or folder, a file, a folder
+// that may not be entered, or one in a volume's temporary folder.
 std::optional<Location> OpenLocation(const std::string& text);
 
 // Opens `name` in the folder `dir`; EXDEV where it is a mount point.

@@ -164,6 +164,9 @@ TEST_F(Job, LinksLoopsPipesAndTemporaryFolders) {
   config.shares = {{"all", base_}};
   Configure(config);
   EXPECT_EQ(Find("y", {"/all"}), (std::set<std::string>{"volume1/docs/@tmp/y2"}));
+  EXPECT_TRUE(OpenLocation("/all/volume1/docs/@tmp"));
+  EXPECT_FALSE(OpenLocation("/all/volume1/@tmp"));
+  EXPECT_FALSE(OpenLocation("/all/volume1/@tmp/webfm"));
 }
 
 TEST_F(Job, PseudoFileSystemsAreNotEntered) {
