@@ -67,11 +67,15 @@ void SweepResultFolder(const std::string& folder) {
   if (!dir) return;
   const time_t oldest_kept = time(nullptr) - kKeepSeconds;
   while (const dirent* entry = readdir(dir.get())) {
-    const std::string_view name = entry->d_name;
+    std::string_view name = entry->d_name;
+    // A companion can be all that is left: a reader makes one anew while the file is deleted.
+    for (const std::string_view companion : kCompanions) {
+      if (name.ends_with(companion)) name.remove_suffix(companion.size());
+    }
     if (!name.ends_with(kSuffix) || !IsResultId(name.substr(0, name.size() - kSuffix.size()))) {
       continue;
     }
-    const std::string path = folder + "/" + entry->d_name;
+    const std::string path = folder + "/" + std::string(name);
     if (LastWritten(path) < oldest_kept) stale.push_back(path);
   }
   for (const std::string& path : stale) RemoveResultFile(path);

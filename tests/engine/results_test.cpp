@@ -299,12 +299,15 @@ TEST_F(Results, SweepKeepsWhatIsInUse) {
   const auto long_ago = std::filesystem::file_time_type::clock::now() - std::chrono::hours(25);
   for (const std::string& path : {fresh, stale, written, foreign}) std::ofstream(path) << "x";
   std::ofstream(written + "-wal") << "x";
-  for (const std::string& path : {stale, written, foreign}) {
+  const std::string orphan = ResultPath(folder_, NewResultId()) + "-wal";
+  std::ofstream(orphan) << "x";
+  for (const std::string& path : {stale, written, foreign, orphan}) {
     std::filesystem::last_write_time(path, long_ago);
   }
   SweepResultFolder(folder_);
   EXPECT_TRUE(std::filesystem::exists(fresh));
   EXPECT_FALSE(std::filesystem::exists(stale));
+  EXPECT_FALSE(std::filesystem::exists(orphan));
   EXPECT_TRUE(std::filesystem::exists(written)) << "its log is new";
   EXPECT_TRUE(std::filesystem::exists(foreign)) << "not one of ours";
 }
