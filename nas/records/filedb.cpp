@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <functional>
 
@@ -116,7 +117,7 @@ class FileDB::Store {
   bool Select(const Condition& condition, std::vector<Json::Value>& out) {
     std::vector<Json::Value> found;
     const bool done = Use([&] {
-      int skip = condition.offset;
+      int skip = std::max(condition.offset, 0);
       ForEachNewestFirst([&](std::int64_t, Json::Value& record) {
         if (!Matches(record, condition) || skip-- > 0) return true;
         found.push_back(std::move(record));
