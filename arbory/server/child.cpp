@@ -19,8 +19,6 @@ namespace {
 constexpr size_t kLengthBytes = sizeof(std::uint64_t);
 // Far above what a head holds: a file's name in two encodings and a few short fields.
 constexpr size_t kMaxHeadBytes = size_t{16} << 10;
-constexpr int kOk = 200;
-constexpr int kUnavailable = 503;
 
 std::string HeadText(const ChildHead& head) {
   std::string text = std::to_string(head.status) + " " + std::to_string(head.code) + "\n";

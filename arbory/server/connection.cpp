@@ -30,11 +30,6 @@ constexpr size_t kWriteBytes = size_t{256} << 10;
 // reset.
 constexpr int kLingerSeconds = 1;
 
-constexpr int kBadRequest = 400;
-constexpr int kTimeout = 408;
-constexpr int kTooLarge = 413;
-constexpr int kHeaderTooLarge = 431;
-constexpr int kFailed = 503;
 constexpr unsigned kHttp11 = 11;
 
 constexpr char kEveryReply[] =
@@ -194,7 +189,7 @@ Answer Connection::HandleSafely() {
     return host_->service().Handle(&request_);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s %s: %s", request_.method.c_str(), request_.target.c_str(), error.what());
-    return ErrorReply(kFailed, "The server failed here; try again.");
+    return ErrorReply(kUnavailable, "The server failed here; try again.");
   }
 }
 

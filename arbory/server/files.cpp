@@ -21,12 +21,6 @@
 namespace arbory {
 namespace {
 
-constexpr int kOk = 200;
-constexpr int kPartial = 206;
-constexpr int kForbidden = 403;
-constexpr int kNotFound = 404;
-constexpr int kNotSatisfiable = 416;
-constexpr int kUnavailable = 503;
 constexpr char kHome[] = "home";
 constexpr size_t kReadBytes = size_t{256} << 10;
 

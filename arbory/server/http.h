@@ -22,6 +22,24 @@
 
 namespace arbory {
 
+enum HttpStatus : int {
+  kOk = 200,
+  kPartial = 206,
+  kSeeOther = 303,
+  kBadRequest = 400,
+  kUnauthorized = 401,
+  kForbidden = 403,
+  kNotFound = 404,
+  kNotAllowed = 405,
+  kTimeout = 408,
+  kTooLarge = 413,
+  kNotJson = 415,
+  kNotSatisfiable = 416,
+  kTooMany = 429,
+  kHeaderTooLarge = 431,
+  kUnavailable = 503,
+};
+
 using Clock = std::chrono::steady_clock;
 using Fields = std::vector<std::pair<std::string, std::string>>;
 
@@ -46,7 +64,7 @@ struct HttpRequest {
 };
 
 struct HttpReply {
-  int status = 200;
+  int status = kOk;
   Fields fields;  // beside those every reply has
   std::string body;
   bool child_follows = false;  // the body is what the child sends after its head

@@ -140,24 +140,21 @@ std::string ContentDisposition(bool inline_shown, const std::string& name) {
 
 std::string_view ReasonPhrase(int status) {
   static constexpr std::pair<int, std::string_view> kPhrases[] = {
-      {100, "Continue"},
-      {200, "OK"},
-      {204, "No Content"},
-      {206, "Partial Content"},
-      {303, "See Other"},
-      {304, "Not Modified"},
-      {400, "Bad Request"},
-      {401, "Unauthorized"},
-      {403, "Forbidden"},
-      {404, "Not Found"},
-      {405, "Method Not Allowed"},
-      {408, "Request Timeout"},
-      {413, "Content Too Large"},
-      {415, "Unsupported Media Type"},
-      {416, "Range Not Satisfiable"},
-      {429, "Too Many Requests"},
-      {431, "Request Header Fields Too Large"},
-      {503, "Service Unavailable"},
+      {kOk, "OK"},
+      {kPartial, "Partial Content"},
+      {kSeeOther, "See Other"},
+      {kBadRequest, "Bad Request"},
+      {kUnauthorized, "Unauthorized"},
+      {kForbidden, "Forbidden"},
+      {kNotFound, "Not Found"},
+      {kNotAllowed, "Method Not Allowed"},
+      {kTimeout, "Request Timeout"},
+      {kTooLarge, "Content Too Large"},
+      {kNotJson, "Unsupported Media Type"},
+      {kNotSatisfiable, "Range Not Satisfiable"},
+      {kTooMany, "Too Many Requests"},
+      {kHeaderTooLarge, "Request Header Fields Too Large"},
+      {kUnavailable, "Service Unavailable"},
   };
   for (const auto& [number, phrase] : kPhrases) {
     if (number == status) return phrase;
@@ -188,6 +185,18 @@ HttpReply ErrorReply(int status, int code, std::string_view sentence) {
 
 HttpReply ErrorReply(int status, std::string_view sentence) {
   return ErrorReply(status, status, sentence);
+}
+
+HttpReply NotAllowedReply(const std::string& allowed_methods) {
+  HttpReply reply = ErrorReply(kNotAllowed, "Use " + allowed_methods + " here.");
+  reply.fields.emplace_back("Allow", allowed_methods);
+  return reply;
+}
+
+HttpReply BusyReply(int status, std::string_view sentence, const std::string& retry_seconds) {
+  HttpReply reply = ErrorReply(status, sentence);
+  reply.fields.emplace_back("Retry-After", retry_seconds);
+  return reply;
 }
 
 }  // namespace arbory

@@ -33,5 +33,7 @@ HttpReply JsonReply(int status, std::string body);
 // {"code":STATUS,"error":SENTENCE}, or with a code of its own.
 HttpReply ErrorReply(int status, std::string_view sentence);
 HttpReply ErrorReply(int status, int code, std::string_view sentence);
+HttpReply NotAllowedReply(const std::string& allowed_methods);
+HttpReply BusyReply(int status, std::string_view sentence, const std::string& retry_seconds);
 
 }  // namespace arbory

@@ -13,9 +13,6 @@
 namespace arbory {
 namespace {
 
-constexpr int kLetIn = 200;
-constexpr int kRefused = 403;
-
 // Answers what PAM asks: a hidden question is taken for the password, a shown one for the name.
 int Converse(int count, const pam_message** questions, pam_response** answers, void* data) {
   const auto* credentials = static_cast<const Credentials*>(data);
@@ -72,7 +69,7 @@ class Pam {
 };
 
 ChildHead CheckLogin(const Credentials& credentials, const PamService& service) {
-  const ChildHead refused{kRefused, kRefused, {}};
+  const ChildHead refused{kForbidden, kForbidden, {}};
   Pam pam(credentials, service);
   const int status = pam.Check();
   // Modules tell a wrong password by many codes, some of which are also those of their own trouble,
@@ -84,7 +81,7 @@ ChildHead CheckLogin(const Credentials& credentials, const PamService& service) 
   }
   const auto account = nas::FindAccount(pam.User());
   if (!account) return refused;
-  return {kLetIn, 0, {{kLoginUser, PercentEncoded(account->name)}}};
+  return {kOk, 0, {{kLoginUser, PercentEncoded(account->name)}}};
 }
 
 }  // namespace

@@ -12,8 +12,6 @@
 namespace arbory {
 namespace {
 
-constexpr int kOk = 200;
-constexpr int kNotFound = 404;
 constexpr size_t kMaxFileBytes = size_t{16} << 20;
 constexpr char kIndex[] = "index.html";
 constexpr char kAssets[] = "assets";  // files whose names tell their content

@@ -8,7 +8,6 @@
 #include "arbory/server/child.h"
 #include "arbory/server/files.h"
 #include "arbory/server/http_text.h"
-#include "arbory/server/login.h"
 #include "arbory/server/openapi.h"
 #include "arbory/server/pages.h"
 #include "arbory/server/processes.h"
@@ -19,52 +18,13 @@
 namespace arbory {
 namespace {
 
-constexpr int kOk = 200;
-constexpr int kSeeOther = 303;
-constexpr int kBadRequest = 400;
-constexpr int kUnauthorized = 401;
-constexpr int kForbidden = 403;
-constexpr int kNotFound = 404;
-constexpr int kNotAllowed = 405;
-constexpr int kNotJson = 415;
-constexpr int kTooMany = 429;
-constexpr int kUnavailable = 503;
-
 // What callers of the API are told when no row of the table serves them.
 constexpr int kNoSuchApi = 102;
 constexpr int kNoSuchMethod = 103;
 constexpr int kNoSuchVersion = 104;
 
 constexpr std::chrono::seconds kMinute{60};
-// Every refused login takes this long, so that its time tells nothing of the user; far longer than
-// hashing a password, and what PAM's own modules let a wrong one wait.
-constexpr std::chrono::seconds kRefusalTime{2};
 constexpr char kRetrySeconds[] = "1";
-// Names and passwords longer than this are not looked at.
-constexpr size_t kMaxCredentialBytes = 1024;
-constexpr char kSearchApi[] = "NUVA.Arbory.Search";
-constexpr char kStopMethod[] = "stop";
-
-bool SameText(const std::string& a, const std::string& b) {
-  unsigned char difference = a.size() == b.size() ? 0 : 1;
-  for (size_t at = 0; at < std::min(a.size(), b.size()); ++at) {
-    difference |= static_cast<unsigned char>(a[at] ^ b[at]);
-  }
-  return difference == 0;
-}
-
-HttpReply NotAllowed(const char* allowed) {
-  HttpReply reply = ErrorReply(kNotAllowed, std::string("Use ") + allowed + " here.");
-  reply.fields.emplace_back("Allow", allowed);
-  return reply;
-}
-
-HttpReply Busy(int status, const char* sentence, const std::string& seconds) {
-  HttpReply reply = ErrorReply(status, sentence);
-  reply.fields.emplace_back("Retry-After", seconds);
-  return reply;
-}
-
 // The reply as the child says it.
 HttpReply ChildsReply(const ChildHead* head) {
   if (head == nullptr) return ErrorReply(kUnavailable, "The server failed here; try again.");
@@ -124,10 +84,10 @@ Answer Service::Route(HttpRequest* request, const Path& path) {
   const bool posts = (path.size() == 1 && (path[0] == "login" || path[0] == "logout")) ||
                      (path.size() == 4 && path[0] == "api");
   if (posts) {
-    if (request->method != "POST") return NotAllowed("POST");
+    if (request->method != "POST") return NotAllowedReply("POST");
     return RoutePost(request, path);
   }
-  if (request->method != "GET" && request->method != "HEAD") return NotAllowed("GET, HEAD");
+  if (request->method != "GET" && request->method != "HEAD") return NotAllowedReply("GET, HEAD");
   return RouteGet(request, path);
 }
 
@@ -183,20 +143,20 @@ Answer Service::RouteGet(HttpRequest* request, const Path& path) {
   return GetFile(request, path);
 }
 
-template <typename Start>
-Answer Service::Run(const HttpRequest& request, const std::string& method, Start start) {
+Answer Service::Run(const HttpRequest& request, const std::string& method,
+                    const std::function<nas::RunningCall()>& start) {
   const int limit = setup_.settings.max_calls;
   int& of_user = running_[request.user];
   // With logins nobody may take all of it, so that others get through.
   const int user_limit = setup_.single_user.empty() ? (limit + 1) / 2 : limit;
   if (setup_.counts().children >= static_cast<size_t>(limit) || of_user >= user_limit) {
-    return Busy(kUnavailable, "The server is busy; try again in a moment.", kRetrySeconds);
+    return BusyReply(kUnavailable, "The server is busy; try again in a moment.", kRetrySeconds);
   }
   ChildAnswer answer;
   answer.child = start();
   if (answer.child.pid < 0) {
-    return Busy(kUnavailable, "The machine has no room for another request; try again.",
-                kRetrySeconds);
+    return BusyReply(kUnavailable, "The machine has no room for another request; try again.",
+                     kRetrySeconds);
   }
   ++of_user;
   answer.token = std::shared_ptr<void>(nullptr, [this, user = request.user](void*) {
@@ -208,113 +168,6 @@ Answer Service::Run(const HttpRequest& request, const std::string& method, Start
     metrics_.CountCall(method, head == nullptr ? nas::kCodeUnknownFailure : head->code,
                        spent.count());
     return ChildsReply(head);
-  };
-  return answer;
-}
-
-Answer Service::OpenByToken(const HttpRequest& request) {
-  const auto given = QueryValue(request.query(), "token");
-  const bool good = !token_.empty() && given && SameText(*given, token_);
-  if (setup_.single_user.empty() || !good) {
-    return ErrorReply(kForbidden,
-                      "This address opens the page only once. Print a new one: send the server "
-                      "the signal HUP, or start it again.");
-  }
-  if (request.method != "GET") return NotAllowed("GET");
-  token_.clear();
-  const std::string id = sessions_.Begin(setup_.single_user, std::time(nullptr));
-  HttpReply reply;
-  reply.status = kSeeOther;
-  reply.fields = {{"Location", "/"},
-                  {"Set-Cookie", SessionCookie(id, setup_.settings.session_minutes * 60L)},
-                  {"Cache-Control", "no-store"}};
-  return reply;
-}
-
-Answer Service::Login(const HttpRequest& request) {
-  Json::Value params;
-  Answer refusal;
-  if (!ParseBody(request, &params, &refusal)) return refusal;
-  if (!setup_.single_user.empty()) {
-    return ErrorReply(kForbidden, "This server has one user; open the address it printed.");
-  }
-  const Json::Value& user = params["user"];
-  const Json::Value& password = params["password"];
-  if (!user.isString() || !password.isString() || user.asString().empty()) {
-    return ErrorReply(kBadRequest, R"(Send {"user": TEXT, "password": TEXT}.)");
-  }
-  Credentials credentials{user.asString(), password.asString()};
-  const bool absurd = credentials.user.size() > kMaxCredentialBytes ||
-                      credentials.password.size() > kMaxCredentialBytes ||
-                      credentials.user.find('\0') != std::string::npos ||
-                      credentials.password.find('\0') != std::string::npos;
-  if (absurd) return ErrorReply(kBadRequest, "The user or the password is too long or malformed.");
-  const int wait = login_limit_.Begin(request.peer, credentials.user, std::time(nullptr));
-  if (wait > 0) {
-    metrics_.CountRefusedLogin();
-    return Busy(kTooMany, "Too many refused logins; wait a minute and try again.",
-                std::to_string(wait));
-  }
-  const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
-  Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
-  if (auto* child = std::get_if<ChildAnswer>(&answer)) {
-    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, request.begun},
-                         count = std::move(child->make_reply)](const ChildHead* head) {
-      count(head);
-      return LoginReply(attempt, head);
-    };
-  }
-  return answer;
-}
-
-HttpReply Service::LoginReply(const Attempt& attempt, const ChildHead* head) {
-  if (head != nullptr && head->status == kOk) {
-    const auto named = SplitPath("/" + head->fields.at(0).second);
-    const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
-    login_limit_.Succeeded(attempt.peer, attempt.user);
-    const std::time_t now = std::time(nullptr);
-    const std::string id = sessions_.Begin(user, now);
-    HttpReply reply = SessionReply(kOk, *sessions_.Find(id, now));
-    reply.fields.emplace_back("Set-Cookie",
-                              SessionCookie(id, setup_.settings.session_minutes * 60L));
-    return reply;
-  }
-  metrics_.CountRefusedLogin();
-  const bool refused = head != nullptr && head->status == kForbidden;
-  HttpReply reply =
-      refused
-          ? ErrorReply(kUnauthorized, "The user or the password is wrong; try again.")
-          : ErrorReply(kUnavailable, "Logins cannot be checked now; the server's log says why.");
-  reply.not_before = attempt.begun + kRefusalTime;
-  return reply;
-}
-
-Answer Service::Logout(HttpRequest* request) {
-  Json::Value params;
-  Answer answer;
-  if (!Authenticate(request, &answer) || !ParseBody(*request, &params, &answer)) return answer;
-  const Json::Value& stops = params["stop_searches"];
-  if (!stops.isNull() && !stops.isBool()) {
-    return ErrorReply(kBadRequest, R"(Send {"stop_searches": true} or false.)");
-  }
-  sessions_.End(Cookie(*request, setup_.cookie));
-  const std::string gone = SessionCookie("", 0);
-  const NUVA::APIMethod* stop = module_.Find(kSearchApi, 1, kStopMethod);
-  if (!stops.isBool() || !stops.asBool() || stop == nullptr) {
-    HttpReply reply = JsonReply(kOk, "{}");
-    reply.fields.emplace_back("Set-Cookie", gone);
-    return reply;
-  }
-  answer = Run(*request, "logout", [&] { return StartStopSearches(request->user, *stop); });
-  if (auto* busy = std::get_if<HttpReply>(&answer)) {
-    busy->fields.emplace_back("Set-Cookie", gone);
-    return answer;
-  }
-  auto& child = std::get<ChildAnswer>(answer);
-  child.make_reply = [make = std::move(child.make_reply), gone](const ChildHead* head) {
-    HttpReply reply = make(head);
-    reply.fields.emplace_back("Set-Cookie", gone);
-    return reply;
   };
   return answer;
 }
@@ -374,43 +227,6 @@ Answer Service::GetFile(HttpRequest* request, const Path& path) {
   if (range != nullptr) file.range = *range;
   file.head_only = request->method == "HEAD";
   return Run(*request, "files", [&] { return StartFile(file); });
-}
-
-HttpReply Service::SessionReply(int status, const Sessions::Session& session) const {
-  Json::Value body;
-  body["user"] = session.user;
-  body["mode"] = setup_.single_user.empty() ? "login" : "single";
-  body["expires"] = Json::Int64{session.expires};
-  body["version"] = ARBORY_VERSION;
-  return JsonReply(status, nas::JsonText(body, nas::JsonBytes::kClean));
-}
-
-std::string Service::SessionCookie(const std::string& id, long max_age) const {
-  return setup_.cookie + "=" + id +
-         "; Path=/; HttpOnly; SameSite=Strict; Max-Age=" + std::to_string(max_age) +
-         (setup_.site.behind_tls ? "; Secure" : "");
-}
-
-bool Service::Authenticate(HttpRequest* request, Answer* refusal) {
-  const std::string id = Cookie(*request, setup_.cookie);
-  const auto session = sessions_.Find(id, std::time(nullptr));
-  if (session) {
-    request->user = session->user;
-    return true;
-  }
-  *refusal = NotLoggedIn();
-  return false;
-}
-
-HttpReply Service::NotLoggedIn() const {
-  const bool single = !setup_.single_user.empty();
-  Json::Value body;
-  body["code"] = kUnauthorized;
-  body["error"] = single ? "Open the address that the server printed when it started; a used one "
-                           "is replaced when the server gets the signal HUP."
-                         : "Log in first.";
-  body["mode"] = single ? "single" : "login";
-  return JsonReply(kUnauthorized, nas::JsonText(body, nas::JsonBytes::kClean));
 }
 
 bool Service::ParseBody(const HttpRequest& request, Json::Value* params, Answer* refusal) {

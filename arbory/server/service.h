@@ -62,8 +62,8 @@ class Service : public HttpService {
   HttpReply NotLoggedIn() const;
 
   // Starts a child for the user unless too many run. `method` is for the counts.
-  template <typename Start>
-  Answer Run(const HttpRequest& request, const std::string& method, Start start);
+  Answer Run(const HttpRequest& request, const std::string& method,
+             const std::function<nas::RunningCall()>& start);
 
   const Setup setup_;
   const nas::Module& module_;

@@ -20,9 +20,6 @@
 namespace arbory {
 namespace {
 
-constexpr int kOk = 200;
-constexpr int kNotFound = 404;
-constexpr int kUnavailable = 503;
 constexpr char kTaskId[] = "taskid";
 
 Json::Value Error(int status, const char* sentence) {
