@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 
 #include "nas/system/json_text.h"
 #include "platform/filedb.h"
@@ -58,8 +59,13 @@ TEST_F(FileDBTest, KeepsTheNewestOfEachKey) {
     int offset;
     int limit;
     const char* patterns;
-  } rows[] = {{0, 0, "r q p5 p11 "}, {1, 2, "q p5 "}, {-1, -1, "r q p5 p11 "},
-              {3, 0, "p11 "},        {4, 1, ""},      {0, 99, "r q p5 p11 "}};
+  } rows[] = {{0, 0, "r q p5 p11 "},
+              {1, 2, "q p5 "},
+              {-1, -1, "r q p5 p11 "},
+              {3, 0, "p11 "},
+              {4, 1, ""},
+              {0, 99, "r q p5 p11 "},
+              {INT_MIN, 0, "r q p5 p11 "}};
   for (const auto& row : rows) {
     FileDB::Condition condition;
     condition.offset = row.offset;
