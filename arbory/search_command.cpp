@@ -200,7 +200,7 @@ class Search {
     }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
     ComplainOfSkipped(state.unreadable, "permission denied");
-    ComplainOfSkipped(state.troubled, "see the system log");
+    ComplainOfSkipped(state.troubled, "errors other than missing permission");
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
 
