@@ -35,6 +35,9 @@ constexpr int kRecordVersion = 1;
 constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
 // A record holds a request's parameters and little more.
 constexpr size_t kMaxRecordBytes = size_t{16} << 20;
+// Kept in the lock file for the day the disk is full: a search that ends for want of space must
+// still be able to say so. Two blocks, as a directory may need one besides the record.
+constexpr off_t kReserveBytes = 8 * 1024;
 // A lock is held for the time of one small write; a holder that is stopped must not stop others.
 constexpr int kLockTenths = 50;
 
@@ -106,6 +109,8 @@ std::string TaskFiles::Create(UniqueFd* life) const {
     unlinkat(folder_.get(), LockName(id).c_str(), 0);
     Throw("a task cannot be stored", cause);
   }
+  // Without it the task is no worse than with it used up.
+  if (fallocate(fd.get(), 0, 0, kReserveBytes) != 0) errno = 0;
   *life = std::move(fd);
   return id;
 }
@@ -147,7 +152,17 @@ bool TaskFiles::Store(const std::string& id, const TaskState& state) const {
     errno = EFBIG;
     return false;
   }
-  return ReplaceFile(folder_.get(), RecordName(id).c_str(), text, kPrivateMode, /*durable=*/false);
+  const auto replace = [&] {
+    return ReplaceFile(folder_.get(), RecordName(id).c_str(), text, kPrivateMode,
+                       /*durable=*/false);
+  };
+  if (replace()) return true;
+  return (errno == ENOSPC || errno == EDQUOT) && FreeReserve(id) && replace();
+}
+
+bool TaskFiles::FreeReserve(const std::string& id) const {
+  const UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
+  return fd && ftruncate(fd.get(), 0) == 0;
 }
 
 // The record goes first: a writer that gets the lock of a file already gone finds no record.

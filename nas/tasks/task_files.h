@@ -5,7 +5,9 @@
 // digits:
 //
 //   ID.json   {"version":1,"finished":BOOL,"properties":{...}}, replaced as a whole by rename
-//   ID.lock   empty, only for locks on two of its bytes:
+//   ID.lock   for locks on two of its bytes, and as a reserve of space that is given up when the
+//   disk
+//             is full:
 //             byte 0, life: held by the process that made the task and by what it forked, as they
 //                     share one open file description. Nobody holds it: nobody works on the task.
 //             byte 1, write: held for each read-merge-write of ID.json
@@ -52,6 +54,8 @@ class TaskFiles {
   UniqueFd LockForWriting(const std::string& id) const;
   // To be called with the write lock held. False with errno set; the old record is then whole.
   bool Store(const std::string& id, const TaskState& state) const;
+  // Gives the task's reserve of space back to the disk.
+  bool FreeReserve(const std::string& id) const;
   // Takes the write lock itself. False when there was no task or it could not be deleted.
   bool Remove(const std::string& id) const;
 

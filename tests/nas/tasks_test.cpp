@@ -1,6 +1,7 @@
 // Task records: what several processes do to one record, and what any death leaves behind.
 
 #include <fcntl.h>
+#include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -225,6 +226,25 @@ TEST_F(TasksTest, AFailedWriteLeavesTheRecordWhole) {
   ASSERT_TRUE(task->reload());
   EXPECT_EQ(task->getProperty("a"), 1);
   EXPECT_FALSE(task->isFinished());
+}
+
+TEST_F(TasksTest, AFullDiskCanStillBeToldOf) {
+  const std::string folder = nas::TaskFolder(me_);
+  if (mount("tmpfs", folder.c_str(), "tmpfs", 0, "size=256k,mode=0700") != 0) {
+    GTEST_SKIP() << "mounting needs root";
+  }
+  {
+    const auto task = New();
+    const int fd = open((folder + "/filler").c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600);
+    const std::string block(4096, 'x');
+    while (write(fd, block.data(), block.size()) > 0) {
+    }
+    close(fd);
+    EXPECT_TRUE(task->setProperty("progress", -1));
+    EXPECT_TRUE(task->finish(false));
+    EXPECT_EQ(Open(task->getTaskId())->getProperty("progress"), -1);
+  }
+  EXPECT_EQ(umount(folder.c_str()), 0);
 }
 
 TEST_F(TasksTest, RunningTasksAreBoundedPerOwner) {
