@@ -259,7 +259,11 @@ TEST_F(CallTest, StoppingLeavesSearchesWhole) {
   }
   // A server that ends stops its searches too.
   const std::string last = server.Call("start", start).json()["data"]["taskid"].asString();
+  EXPECT_TRUE(Eventually(
+      [&] { return server.Get("/searches/" + last).json()["walk"]["phase"] == "contents"; }));
+  const auto begun = steady_clock::now();
   EXPECT_EQ(Stop(server), 0);
+  EXPECT_LT(steady_clock::now() - begun, seconds(4)) << "its search was killed, not told";
   server = Start();
   server.Open();
   EXPECT_TRUE(server.Get("/searches/" + last).json()["finished"].asBool());

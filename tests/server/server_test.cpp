@@ -232,7 +232,7 @@ Server ServerTest::Start(const std::string& server_lines, const std::string& top
 }
 
 Server ServerTest::StartMisbehaving(const std::string& server_lines) {
-  Server server = Start(server_lines, "module = \"" ARBORY_BIN_DIR "/misbehaving.so\"\n");
+  Server server = Start(server_lines, kMisbehaving);
   server.Open();
   return server;
 }

@@ -22,6 +22,9 @@ inline constexpr std::chrono::seconds kSoon{20};
 bool Eventually(const std::function<bool()>& holds);
 Json::Value Parsed(const std::string& text);
 
+// Of the configuration: the module whose methods are slow, large and deadly.
+inline constexpr char kMisbehaving[] = "module = \"" ARBORY_BIN_DIR "/misbehaving.so\"\n";
+
 struct Reply {
   int status = 0;                             // 0: the connection ended without a whole reply
   std::map<std::string, std::string> fields;  // names in lower case

@@ -106,14 +106,14 @@ class LoginTest : public ServerTest {
   static constexpr char kAnn[] = "nobody";
   static constexpr char kBob[] = "daemon";
 
-  Server StartWithLogins(const std::string& more = "") {
+  Server StartWithLogins(const std::string& more = "", const std::string& top_lines = "") {
     const std::string check = dir_ + "/check";
     WriteFile(check, "#!/bin/sh\nread -r given || :\n[ \"$given\" = right ]\n");
     chmod(check.c_str(), 0755);
     WriteFile(MakeFolder("pam") + "/arbory", "auth required pam_exec.so quiet expose_authtok " +
                                                  check + "\naccount required pam_permit.so\n");
     WriteFile(dir_ + "/pam/closed", "auth required pam_permit.so\naccount required pam_deny.so\n");
-    return Start("pam_dir = \"" + dir_ + "/pam\"\n" + more, "", As::kRootWithLogins);
+    return Start("pam_dir = \"" + dir_ + "/pam\"\n" + more, top_lines, As::kRootWithLogins);
   }
 
   void GiveTo(const std::string& path, const char* user, mode_t mode) {
@@ -167,6 +167,33 @@ TEST_F(LoginTest, AClosedAccountIsRefused) {
   EXPECT_FALSE(server.LogIn(kAnn, "right"));
   Server missing = StartWithLogins("pam_service = \"missing\"\n");
   EXPECT_FALSE(missing.LogIn(kAnn, "right")) << "no service file: nobody is let in";
+}
+
+TEST_F(LoginTest, NobodyTakesAllCallsFromTheOthers) {
+  SKIP_UNLESS_ROOT();
+  Server ann = StartWithLogins("max_calls = 3\n", kMisbehaving);
+  Server bob = ann;
+  ASSERT_TRUE(ann.LogIn(kAnn, "right"));
+  ASSERT_TRUE(bob.LogIn(kBob, "right"));
+  const auto sleep = [](const Server& user) {
+    auto client = std::make_unique<Client>(user.port);
+    client->Send(user.RequestText("POST", "/api/Test/1/sleep", R"({"ms":4000})",
+                                  "Content-Type: application/json\r\n"));
+    return client;
+  };
+  const auto running = [&](int count) {
+    const std::string line = "\narbory_running_calls " + std::to_string(count) + "\n";
+    return Eventually([&] { return ann.Get("/metrics").body.find(line) != std::string::npos; });
+  };
+  const auto first = sleep(ann);
+  const auto second = sleep(ann);
+  ASSERT_TRUE(running(2));
+  EXPECT_EQ(ann.Get("/shares").status, 503) << "ann has her half";
+  EXPECT_EQ(bob.Get("/shares").status, 200);
+  ASSERT_TRUE(running(2));
+  const auto third = sleep(bob);
+  ASSERT_TRUE(running(3));
+  EXPECT_EQ(bob.Get("/shares").status, 503) << "bob has less than his, but that is all there is";
 }
 
 TEST_F(LoginTest, EachUserSeesTheirOwn) {
