@@ -7,6 +7,7 @@
 #include <poll.h>
 #include <pwd.h>
 #include <signal.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -52,6 +53,7 @@ void GiveTo(const std::string& path, const std::string& user) {
       (setgroups(0, nullptr) != 0 || setgid(other->pw_gid) != 0 || setuid(other->pw_uid) != 0)) {
     _exit(99);
   }
+  prctl(PR_SET_PDEATHSIG, SIGTERM);  // a test that crashes leaves no server behind
   execl(ARBORY_BIN_DIR "/arbory", "arbory", "serve", "--config", config.c_str(), nullptr);
   _exit(98);
 }
