@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <string>
+#include <utility>
 
 #include "api/log.h"
 #include "platform/webfm.h"
@@ -38,6 +39,11 @@ void FileWebAPI::OutputResponse() { response_->SetError(error_, data_); }
 
 void FileWebAPI::SetResponse(Json::Value& result) {
   data_ = result;
+  error_ = 0;
+}
+
+void FileWebAPI::SetResponse(Json::Value&& result) {
+  data_ = std::move(result);
   error_ = 0;
 }
 

@@ -25,6 +25,8 @@ class FileWebAPI {
 
   void OutputResponse();
   void SetResponse(Json::Value& result);
+  // The same for a result that the caller has no more use for: a page may be too large to copy.
+  void SetResponse(Json::Value&& result);
   void SetError(int code, Json::Value& detail);
   void SetError(int code);
   // 0 as long as no error has been set.

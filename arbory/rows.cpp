@@ -123,6 +123,8 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
     const bool finished = listed && data["finished"].asBool();
     std::string payload =
         std::to_string(code) + (finished ? " 1 " : " 0 ") + std::to_string(files.size()) + "\n";
+    constexpr size_t kUsualRowBytes = 128;
+    payload.reserve(payload.size() + files.size() * kUsualRowBytes);
     for (const Json::Value& file : files) AppendRow(file, format, &payload);
     return payload;
   };

@@ -35,6 +35,11 @@ constexpr std::uint64_t kPageRows = 10000;
 constexpr std::chrono::milliseconds kLeastPause{3};
 constexpr std::chrono::milliseconds kMostPause{100};
 constexpr int kPauseShare = 4;
+// A search that lately brought this many rows in one page is asked more often: what has been found
+// and not yet printed when it ends is what its user waits for.
+constexpr std::uint64_t kManyRows = 500;
+constexpr std::chrono::milliseconds kLately{300};
+constexpr std::chrono::milliseconds kBusyPause{10};
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -142,6 +147,7 @@ class Search {
       if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
       if (page.rows() < wanted) {
         if (page.finished()) return Ending::kComplete;
+        if (page.rows() >= kManyRows) busy_ = Clock::now();
         Wait();
       }
     }
@@ -175,8 +181,10 @@ class Search {
 
   void Wait() {
     ShowProgress();
-    const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
-    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, kMostPause).count()),
+    const Clock::time_point now = Clock::now();
+    const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(now - started_);
+    const auto most = now - busy_ < kLately ? kBusyPause : kMostPause;
+    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, most).count()),
           worker_.get());
   }
 
@@ -237,7 +245,8 @@ class Search {
   RowFormat format_;
   ProgressLine progress_;
   std::string task_id_;
-  nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
+  nas::UniqueFd worker_;      // its pidfd, invalid where that cannot be had
+  Clock::time_point busy_{};  // when a page last held many rows
   std::uint64_t printed_ = 0;
   int failure_ = 0;  // the code of kFailed, errno of kUnwritable
   bool running_ = true;

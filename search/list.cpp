@@ -4,6 +4,8 @@
 #include <strings.h>
 #include <syslog.h>
 
+#include <utility>
+
 #include "api/codes.h"
 #include "api/log.h"
 #include "search/find_handler.h"
@@ -91,7 +93,7 @@ bool ArboryFindHandler::AnswerPage(int additional, const std::string& task_id) {
     }
   }
   response["finished"] = pTask->isFinished();
-  SetResponse(response);
+  SetResponse(std::move(response));
   return true;
 }
 

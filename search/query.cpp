@@ -109,12 +109,13 @@ void FillAttributes(const FileSearch::__tag_FILE_INFO_DATA& row, int additional,
   }
 }
 
-Json::Value RenderFiles(const std::list<DIRENTRY_INFO>& files, int additional) {
+// Empties the list on the way, so that a large page is not held twice.
+Json::Value RenderFiles(std::list<DIRENTRY_INFO>& files, int additional) {
   Json::Value rendered(Json::arrayValue);
-  for (const DIRENTRY_INFO& file : files) {
+  for (; !files.empty(); files.pop_front()) {
     Json::Value object;
     object.clear();
-    DumpFileInfo(additional, file, object, 0, 0);
+    DumpFileInfo(additional, files.front(), object, 0, 0);
     rendered.append(std::move(object));
   }
   return rendered;

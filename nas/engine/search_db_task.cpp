@@ -34,27 +34,54 @@ bool HasVanished(const std::string& path) {
   return lstat(path.c_str(), &info) != 0 && (errno == ENOENT || errno == ENOTDIR);
 }
 
-// Lends one row to a callback in the platform's form.
-BOOL Lend(nas::ResultReader& reader, const nas::ResultRow& row, SelectCallback callback,
-          void* context) {
-  std::string share_root(row.share_root);
-  std::string share_name(row.share_name);
-  std::string name(row.name);
-  std::string relative_path = RelativePath(row);
-  std::string extension(nas::ExtensionOf(row.name));
-  std::string owner = reader.UserName(row.attributes->uid);
-  std::string group = reader.GroupName(row.attributes->gid);
-  const nas::FileAttributes& file = *row.attributes;
-  const auto known = [](std::int64_t time) {
-    return time == nas::FileAttributes::kNoTime ? 0 : time;
-  };
-  __tag_FILE_INFO_DATA data{
-      share_root.data(), share_name.data(), name.data(),        relative_path.data(),
-      extension.data(),  file.mode,         owner.data(),       group.data(),
-      file.uid,          file.gid,          S_ISDIR(file.mode), file.size,
-      file.atime,        file.mtime,        file.ctime,         known(file.crtime)};
-  return callback(&data, context);
-}
+// Lends rows to a callback in the platform's form, row after row from the same memory.
+class Lender {
+ public:
+  Lender(nas::ResultReader& reader, SelectCallback callback, void* context)
+      : reader_(reader), callback_(callback), context_(context) {}
+
+  BOOL Lend(const nas::ResultRow& row) {
+    const nas::FileAttributes& file = *row.attributes;
+    relative_path_.assign(row.folder);
+    if (!relative_path_.empty()) relative_path_.push_back('/');
+    relative_path_.append(row.name);
+    __tag_FILE_INFO_DATA data{};
+    data.share_root = Keep(share_root_, row.share_root);
+    data.share_name = Keep(share_name_, row.share_name);
+    data.name = Keep(name_, row.name);
+    data.relative_path = relative_path_.data();
+    data.extension = Keep(extension_, nas::ExtensionOf(row.name));
+    data.mode = file.mode;
+    data.owner_name = Keep(owner_, reader_.UserName(file.uid));
+    data.group_name = Keep(group_, reader_.GroupName(file.gid));
+    data.uid = file.uid;
+    data.gid = file.gid;
+    data.is_dir = S_ISDIR(file.mode);
+    data.size = file.size;
+    data.atime = file.atime;
+    data.mtime = file.mtime;
+    data.ctime = file.ctime;
+    data.crtime = file.crtime == nas::FileAttributes::kNoTime ? 0 : file.crtime;
+    return callback_(&data, context_);
+  }
+
+ private:
+  static char* Keep(std::string& kept, std::string_view text) {
+    kept.assign(text);
+    return kept.data();
+  }
+
+  nas::ResultReader& reader_;
+  const SelectCallback callback_;
+  void* const context_;
+  std::string share_root_;
+  std::string share_name_;
+  std::string name_;
+  std::string relative_path_;
+  std::string extension_;
+  std::string owner_;
+  std::string group_;
+};
 
 }  // namespace
 
@@ -86,9 +113,10 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
   reader_.Begin();
   const nas::ResultReader::Page page = reader_.Select(selection, offset, limit);
   *total = page.total;
+  Lender lender(reader_, callback, context);
   for (const std::uint32_t number : page.numbers) {
     current_ = number;
-    if (Lend(reader_, reader_.Row(number), callback, context) == 0) break;
+    if (lender.Lend(reader_.Row(number)) == 0) break;
   }
   current_.reset();
   reader_.End();

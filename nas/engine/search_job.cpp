@@ -22,7 +22,7 @@ constexpr milliseconds kFirstTick(5);
 constexpr milliseconds kStopPatience(75);
 // Rows wait at most this long before listings can see them, the first ones the first tick. A long
 // search writes ever less often, so that its rows do not end up in very many small blocks.
-constexpr milliseconds kFlushInterval(50);
+constexpr milliseconds kFlushInterval(25);
 constexpr milliseconds kSlowestFlush(1000);
 constexpr int kFlushShare = 200;  // one part of the elapsed time
 
