@@ -6,6 +6,8 @@
 #include <array>
 #include <new>
 
+#include "nas/engine/folded_name.h"
+
 namespace nas {
 namespace {
 
@@ -59,14 +61,24 @@ std::uint32_t CompileOptions(Regex::Kind kind) {
   return kCommon;
 }
 
+// Null, with the number and place of the error, for a broken expression.
+pcre2_code* CompileFor(std::string_view pattern, std::uint32_t options, int& number,
+                       PCRE2_SIZE& where) {
+  pcre2_code* code = pcre2_compile(reinterpret_cast<PCRE2_SPTR>(pattern.data()), pattern.size(),
+                                   options, &number, &where, nullptr);
+  // Where no machine code can be made the expression is interpreted: slower, never wrong.
+  if (code != nullptr) pcre2_jit_compile(code, PCRE2_JIT_COMPLETE);
+  return code;
+}
+
 }  // namespace
 
 std::shared_ptr<const Regex> Regex::Compile(std::string_view pattern, Kind kind,
                                             std::string& error) {
   int number = 0;
   PCRE2_SIZE where = 0;
-  pcre2_code* code = pcre2_compile(reinterpret_cast<PCRE2_SPTR>(pattern.data()), pattern.size(),
-                                   CompileOptions(kind), &number, &where, nullptr);
+  const std::uint32_t options = CompileOptions(kind);
+  pcre2_code* code = CompileFor(pattern, options, number, where);
   if (code == nullptr) {
     std::array<PCRE2_UCHAR, 256> text{};
     pcre2_get_error_message(number, text.data(), text.size());
@@ -74,17 +86,23 @@ std::shared_ptr<const Regex> Regex::Compile(std::string_view pattern, Kind kind,
             std::to_string(where);
     return nullptr;
   }
-  // Where no machine code can be made the expression is interpreted: slower, never wrong.
-  pcre2_jit_compile(code, PCRE2_JIT_COMPLETE);
-  return std::shared_ptr<const Regex>(new Regex(code));
+  constexpr std::uint32_t kUnicode = PCRE2_UTF | PCRE2_UCP | PCRE2_MATCH_INVALID_UTF;
+  pcre2_code* ascii_code =
+      IsAscii(pattern) ? CompileFor(pattern, options & ~kUnicode, number, where) : nullptr;
+  return std::shared_ptr<const Regex>(new Regex(code, ascii_code));
 }
 
-Regex::~Regex() { pcre2_code_free(static_cast<pcre2_code*>(code_)); }
+Regex::~Regex() {
+  pcre2_code_free(static_cast<pcre2_code*>(code_));
+  pcre2_code_free(static_cast<pcre2_code*>(ascii_code_));
+}
 
 bool Regex::Finds(std::string_view text) const {
   thread_local Scratch scratch;
-  return pcre2_match(static_cast<pcre2_code*>(code_), reinterpret_cast<PCRE2_SPTR>(text.data()),
-                     text.size(), 0, 0, scratch.match(), scratch.context()) >= 0;
+  const void* code = ascii_code_ != nullptr && IsAscii(text) ? ascii_code_ : code_;
+  return pcre2_match(static_cast<const pcre2_code*>(code),
+                     reinterpret_cast<PCRE2_SPTR>(text.data()), text.size(), 0, 0, scratch.match(),
+                     scratch.context()) >= 0;
 }
 
 }  // namespace nas

@@ -28,8 +28,11 @@ class Regex {
   bool Finds(std::string_view text) const;
 
  private:
-  explicit Regex(void* code) : code_(code) {}
+  Regex(void* code, void* ascii_code) : code_(code), ascii_code_(ascii_code) {}
   void* code_;  // pcre2_code_8, kept out of this header
+  // The same expression for texts that are ASCII, where it means the same and need not look out for
+  // longer characters; null where there is none.
+  void* ascii_code_;
 };
 
 }  // namespace nas

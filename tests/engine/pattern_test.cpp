@@ -107,6 +107,7 @@ TEST(NamePattern, Table) {
        "\xff"
        "x",
        true, "broken UTF-8 around"},
+      {"regex:k", "\u212a", true, "and fold beyond ASCII"},
       {"regex:", "anything", true, "an empty expression is no term"},
   };
   for (const Row& row : rows) {
