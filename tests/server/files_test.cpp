@@ -199,9 +199,12 @@ TEST_F(FilesTest, ThePageComesWithItsPolicy) {
   }
 }
 
-// Runs what docs/http.md shows to do, as it stands, against the sample share.
-TEST_F(FilesTest, TheExamplesOfTheDocumentWork) {
-  const std::string document = ReadFile(ARBORY_SOURCE_DIR "/docs/http.md");
+// Runs what the documents show to do, as it stands, against the sample share.
+TEST_F(FilesTest, TheExamplesOfTheDocumentsWork) {
+  std::string document = ReadFile(ARBORY_SOURCE_DIR "/docs/http.md");
+  // Its first example logs in and its last one logs out; those of the API stand between.
+  document.insert(document.find("\n## What can be searched"),
+                  ReadFile(ARBORY_SOURCE_DIR "/docs/api.md"));
   std::string script = "set -eu -o pipefail\n";
   constexpr std::string_view kBegin = "\n```sh\n";
   for (size_t at = 0; (at = document.find(kBegin, at)) != std::string::npos;) {
@@ -221,7 +224,7 @@ TEST_F(FilesTest, TheExamplesOfTheDocumentWork) {
   EXPECT_EQ(WEXITSTATUS(status), 0) << said;
   for (const char* part :
        {"\"mode\":\"single\"", "\"name\":\"sample\"", "\"total\":2", "\"phase\":\"done\"",
-        "# Report 2025", "This is", "arbory_calls_total{"}) {
+        "# Report 2025", "This is", "arbory_calls_total{", "\"pattern\":\"report\""}) {
     EXPECT_NE(said.find(part), std::string::npos) << part << "\n" << said;
   }
 }
