@@ -1,5 +1,5 @@
-// A real `arbory serve` in a folder of its own, as an ordinary user: when the tests run as root the
-// server is given away to nobody, so that permissions are what they are for people.
+// A real `arbory serve` in a folder of its own, for an ordinary user: when the tests run as root it
+// serves nobody, so that permissions are what they are for people.
 import { spawn, type ChildProcess } from 'node:child_process';
 import * as fs from 'node:fs';
 import { tmpdir } from 'node:os';
@@ -51,8 +51,6 @@ export class Server {
 
   static async start(place: Place, options: Options): Promise<Server> {
     const state = place.folder(options.logins ? 'state-logins' : 'state');
-    const drop = process.getuid?.() === 0 && !options.logins;
-    if (drop) place.giveAway(state);
     const config = join(place.root, options.logins ? 'logins.toml' : 'arbory.toml');
     const shares = Object.entries(options.shares).map(([name, dir]) => `"${name}" = "${dir}"`);
     fs.writeFileSync(
@@ -60,10 +58,11 @@ export class Server {
       `state_dir = "${state}"\nvolumes = []\n[shares]\n${shares.join('\n')}\n[server]\n` +
         `listen = "127.0.0.1:0"\nweb_dir = "${process.env.ARBORY_PAGE}"\n${options.settings ?? ''}`,
     );
-    const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config], {
+    const drop = process.getuid?.() === 0 && !options.logins;
+    const user = drop ? ['--user', 'nobody'] : [];
+    const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config, ...user], {
       stdio: ['ignore', 'pipe', 'pipe'],
       env: { PATH: process.env.PATH, HOME: state, TZ: process.env.TZ },
-      ...(drop ? { uid: NOBODY, gid: NOBODY } : {}),
     });
     return new Server(child, await printedAddress(child));
   }
@@ -85,6 +84,7 @@ function printedAddress(child: ChildProcess): Promise<string> {
     };
     child.stdout!.on('data', hear);
     child.stderr!.on('data', hear);
+    child.once('error', failed);
     child.once('exit', (code) => failed(new Error(`the server ended (${code}): ${said}`)));
     setTimeout(() => failed(new Error(`the server said no address: ${said}`)), START_MS).unref();
   });
