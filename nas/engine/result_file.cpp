@@ -1,7 +1,6 @@
 #include "nas/engine/result_file.h"
 
 #include <dirent.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -10,13 +9,14 @@
 #include <cerrno>
 #include <ctime>
 #include <memory>
-#include <system_error>
 #include <vector>
+
+#include "nas/system/file_io.h"
 
 namespace nas {
 namespace {
 
-constexpr size_t kIdBytes = 16;
+constexpr size_t kIdDigits = 32;
 constexpr std::string_view kSuffix = ".db";
 constexpr std::array<const char*, 3> kCompanions = {"", "-wal", "-shm"};
 constexpr time_t kKeepSeconds = 24 * 60 * 60;
@@ -33,21 +33,10 @@ time_t LastWritten(const std::string& path) {
 
 }  // namespace
 
-std::string NewResultId() {
-  std::array<unsigned char, kIdBytes> bytes;
-  if (getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) {
-    throw std::system_error(errno, std::generic_category(), "getrandom");
-  }
-  std::string id;
-  for (const unsigned char byte : bytes) {
-    id += "0123456789abcdef"[byte >> 4];
-    id += "0123456789abcdef"[byte & 15];
-  }
-  return id;
-}
+std::string NewResultId() { return RandomName(); }
 
 bool IsResultId(std::string_view id) {
-  return id.size() == 2 * kIdBytes &&
+  return id.size() == kIdDigits &&
          id.find_first_not_of("0123456789abcdef") == std::string_view::npos;
 }
 
