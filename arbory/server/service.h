@@ -45,7 +45,7 @@ class Service : public HttpService {
   Answer Login(const HttpRequest& request);
   struct Attempt {
     std::string peer, user;
-    Clock::time_point begun;
+    Clock::time_point begun;  // the check, as a client may draw its request out as it likes
   };
   HttpReply LoginReply(const Attempt& attempt, const ChildHead* head);
   Answer Logout(HttpRequest* request);

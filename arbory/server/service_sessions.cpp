@@ -81,7 +81,7 @@ Answer Service::Login(const HttpRequest& request) {
   const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
   Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
-    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, request.begun},
+    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, Clock::now()},
                          count = std::move(child->make_reply)](const ChildHead* head) {
       count(head);
       return LoginReply(attempt, head);

@@ -8,6 +8,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <thread>
+
 #include "tests/server/server_test.h"
 
 namespace server_test {
@@ -125,7 +127,7 @@ class LoginTest : public ServerTest {
 
 TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
   SKIP_UNLESS_ROOT();
-  Server server = StartWithLogins("logins_per_minute = 4\n");
+  Server server = StartWithLogins("logins_per_minute = 5\n");
   EXPECT_TRUE(server.open_path.empty());
   EXPECT_EQ(server.Get("/session").json()["mode"], "login");
   EXPECT_EQ(server.Get("/open?token=").status, 403);
@@ -149,14 +151,24 @@ TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
     EXPECT_GE(spent, milliseconds(1990)) << row.user;
     EXPECT_LT(spent, milliseconds(3500)) << row.user;
   }
+  // A body that is held back must not use the time up before the password is looked at.
+  const std::string slow = server.RequestText("POST", "/login", R"({"user":"x","password":""})",
+                                              "Content-Type: application/json\r\n");
+  Client client(server.port);
+  client.Send(slow.substr(0, slow.size() - 1));
+  std::this_thread::sleep_for(milliseconds(2100));
+  const auto begun = steady_clock::now();
+  client.Send(slow.substr(slow.size() - 1));
+  EXPECT_EQ(client.Read().status, 401);
+  EXPECT_GE(steady_clock::now() - begun, milliseconds(1990));
   const Reply limited = server.Post("/login", R"({"user":"nobody","password":"right"})");
-  EXPECT_EQ(limited.status, 429) << "even the right one, after four refusals";
+  EXPECT_EQ(limited.status, 429) << "even the right one, after five refusals";
   EXPECT_GT(std::stoi(limited.fields.at("retry-after")), 0);
   for (const char* bad : {"{}", R"({"user":7,"password":"a"})", R"({"user":"a"})",
                           R"({"user":"","password":""})", R"({"user":"a\u0000b","password":""})"}) {
     EXPECT_EQ(server.Post("/login", bad).status, 400) << bad;
   }
-  EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 5\n"),
+  EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 6\n"),
             std::string::npos);
   EXPECT_EQ(Log().find("right"), std::string::npos) << "a password was logged";
 }
