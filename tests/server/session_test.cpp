@@ -168,6 +168,8 @@ TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
                           R"({"user":"","password":""})", R"({"user":"a\u0000b","password":""})"}) {
     EXPECT_EQ(server.Post("/login", bad).status, 400) << bad;
   }
+  const std::string large = "{\"user\":[" + std::string(100'000, ' ') + "]}";
+  EXPECT_EQ(server.Post("/login", large).status, 413) << "not even read as JSON";
   EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 6\n"),
             std::string::npos);
   EXPECT_EQ(Log().find("right"), std::string::npos) << "a password was logged";
