@@ -52,6 +52,14 @@ std::string DateNow() {
   return text;
 }
 
+// The parser takes a body in any other transfer encoding for none, or for one of Content-Length
+// bytes; a proxy that takes it otherwise would see other requests than this server.
+bool EndsClearly(const HttpRequest& request) {
+  constexpr char kField[] = "transfer-encoding";
+  const std::string* encoding = request.Field(kField);
+  return encoding == nullptr || (request.CountOf(kField) == 1 && LowerCase(*encoding) == "chunked");
+}
+
 }  // namespace
 
 Connection::Connection(ConnectionHost* host, asio::ip::tcp::socket socket)
@@ -140,6 +148,7 @@ void Connection::OnHeader(Error error) {
     }
   }
   if (error) return OnReadError(error);
+  if (!EndsClearly(request_)) return OnReadError(http::error::bad_transfer_encoding);
   const std::string* expect = request_.Field("expect");
   if (expect == nullptr) return ReadBody();
   out_ = "HTTP/1.1 100 Continue\r\n\r\n";

@@ -96,6 +96,11 @@ TEST_F(ProtocolTest, MalformedRequestsAreRefused) {
       {"POST /login HTTP/1.1\r\n" + host +
            "Content-Length: 2\r\nTransfer-Encoding: chunked\r\n\r\n0\r\n\r\n",
        400},
+      {"POST /login HTTP/1.1\r\n" + host + "Transfer-Encoding: xchunked\r\n\r\n0\r\n\r\n", 400},
+      {"GET /health HTTP/1.1\r\n" + host + "Transfer-Encoding: chunked, identity\r\n\r\n", 400},
+      {"GET /health HTTP/1.1\r\n" + host +
+           "Transfer-Encoding: identity\r\nContent-Length: 2\r\n\r\n{}",
+       400},
       {"POST /login HTTP/1.1\r\n" + host + "Content-Length: -2\r\n\r\n{}", 400},
       {"POST /login HTTP/1.1\r\n" + host + "Transfer-Encoding: chunked\r\n\r\nzz\r\n", 400},
       {"POST /login HTTP/1.1\r\n" + host + "Content-Length: 99999999999999999999\r\n\r\n", 400},
