@@ -76,7 +76,8 @@ std::string_view HttpRequest::query() const {
 std::optional<std::vector<std::string>> SplitPath(std::string_view path) {
   std::vector<std::string> segments;
   if (!path.starts_with('/')) return std::nullopt;
-  while (path.size() > 1) {
+  if (path == "/") return segments;
+  while (!path.empty()) {
     path.remove_prefix(1);
     const std::string_view encoded = path.substr(0, path.find('/'));
     path.remove_prefix(encoded.size());

@@ -52,7 +52,7 @@ TEST_F(FilesTest, NothingButReadableFilesOfTheShareComesOut) {
       {"photo/magic/etc/passwd", 404, nullptr},
       {"photo/pipe", 404, nullptr},
       {"photo/folder", 404, nullptr},
-      {"photo/folder/", 404, nullptr},
+      {"photo/folder/", 400, nullptr},
       {"photo", 404, nullptr},
       {"photo/none", 404, nullptr},
       {"photo/folder/below/file.txt/x", 404, nullptr},
