@@ -3,6 +3,7 @@
 #include <cmath>
 #include <ctime>
 
+#include "arbory/server/http_text.h"
 #include "nas/system/json_text.h"
 
 namespace arbory {
@@ -13,6 +14,19 @@ std::string Number(double value) {
   char text[kRoom];
   snprintf(text, sizeof text, "%.6g", value);
   return text;
+}
+
+// Well-behaved clients encode such bytes; as they are, U+009B and its like would be commands to the
+// terminal that shows the log.
+std::string Visible(std::string_view path) {
+  constexpr char kFirst = '!';
+  constexpr char kLast = '~';
+  std::string out;
+  for (const char byte : path) {
+    const bool plain = byte >= kFirst && byte <= kLast;
+    out += plain ? std::string(1, byte) : PercentEncoded({&byte, 1});
+  }
+  return out;
 }
 
 class PrometheusText {
@@ -88,6 +102,7 @@ std::string AccessLine(const HttpRequest& request, int status, std::uint64_t byt
   constexpr size_t kRoom = 32;
   constexpr double kTenths = 10;
   constexpr size_t kMaxPath = 1024;  // a longer one is cut: a line must fit a log's line
+  constexpr size_t kMaxMethod = 32;  // clients may make one up
   char time[kRoom];
   const std::time_t now = std::time(nullptr);
   std::tm parts;
@@ -97,8 +112,8 @@ std::string AccessLine(const HttpRequest& request, int status, std::uint64_t byt
   Json::Value line;
   line["time"] = time;
   line["peer"] = request.peer;
-  line["method"] = request.method;
-  line["path"] = std::string(request.path().substr(0, kMaxPath));
+  line["method"] = request.method.substr(0, kMaxMethod);
+  line["path"] = Visible(request.path().substr(0, kMaxPath));
   line["status"] = status;
   line["user"] = request.user;
   line["ms"] = std::round(spent.count() * kTenths) / kTenths;

@@ -67,6 +67,11 @@ TEST_F(ProtocolTest, HostileTargetsAreRefusedOnEveryRoute) {
   }
   // Double encoding is decoded once: a name that holds a percent sign, and nothing else.
   EXPECT_EQ(server.Get("/files/photo/%252e%252e%252fsecret").status, 404);
+  // What a log's reader sees is text: no commands to a terminal, and no line of any length.
+  EXPECT_EQ(server.Get("/log\xC2\x9B[2J").status, 404);
+  EXPECT_EQ(server.Ask(std::string(20'000, 'M'), "/log").status, 405);
+  EXPECT_NE(Log().find("/log%C2%9B[2J"), std::string::npos) << Log();
+  EXPECT_EQ(Log().find(std::string(100, 'M')), std::string::npos);
   EXPECT_EQ(Stop(server), 0);
 }
 
