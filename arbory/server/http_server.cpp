@@ -78,6 +78,9 @@ class HttpServer::Loop : public ConnectionHost {
     signal(SIGPIPE, SIG_IGN);
     // Search workers outlive the child that started them; as this process's own they are reaped.
     prctl(PR_SET_CHILD_SUBREAPER, 1);
+    // Where nothing else is done at a hang-up, it must not end the server without its workers.
+    Error ignored;
+    if (!on_hangup_) stop_signals_.add(SIGHUP, ignored);
     stop_signals_.async_wait([this](Error error, int) {
       if (!error) BeginStop();
     });
