@@ -48,13 +48,12 @@ void GiveTo(const std::string& path, const std::string& user) {
   dup2(null, STDIN_FILENO);
   dup2(out, STDOUT_FILENO);
   dup2(err, STDERR_FILENO);
-  const passwd* other = getpwnam(nas_test::kOtherUser);
-  if (step_down &&
-      (setgroups(0, nullptr) != 0 || setgid(other->pw_gid) != 0 || setuid(other->pw_uid) != 0)) {
-    _exit(99);
-  }
   prctl(PR_SET_PDEATHSIG, SIGTERM);  // a test that crashes leaves no server behind
-  execl(ARBORY_BIN_DIR "/arbory", "arbory", "serve", "--config", config.c_str(), nullptr);
+  // Root serves the other user without becoming it first: that user may not be able to enter the
+  // tree.
+  const char* user = step_down ? "--user" : nullptr;
+  execl(ARBORY_BIN_DIR "/arbory", "arbory", "serve", "--config", config.c_str(), user,
+        nas_test::kOtherUser, nullptr);
   _exit(98);
 }
 
@@ -186,11 +185,8 @@ void ServerTest::SetUp() {
   PlatformTest::SetUp();
   share_ = MakeFolder("photo");
   share_lines_ = "[shares]\nphoto = \"" + share_ + "\"\n";
-  const std::string state = MakeFolder("state");
-  if (AmRoot()) {
-    GiveTo(share_, User());
-    GiveTo(state, User());
-  }
+  MakeFolder("state");
+  if (AmRoot()) GiveTo(share_, User());
 }
 
 void ServerTest::TearDown() {
