@@ -75,6 +75,12 @@ export class Tab {
   async over(): Promise<void> {
     await this.page.waitForSelector('.searchbar .primary:not(.stop)');
     await this.page.waitForSelector('.table[aria-busy=false], .blank:not(.welcome)');
+    await this.fetched();
+  }
+
+  // Until no row that can be seen still waits for its page of the result.
+  private async fetched(): Promise<void> {
+    await this.page.waitForFunction(() => !document.querySelector('.row.waiting'));
   }
 
   async count(): Promise<string> {
@@ -83,7 +89,8 @@ export class Tab {
 
   // The names that can be seen, in their order on the screen.
   async names(): Promise<string[]> {
-    const rows = this.page.locator('.row:not(.waiting)');
+    await this.fetched();
+    const rows = this.page.locator('.row');
     const found = await rows.evaluateAll((elements) =>
       elements.map((row) => ({
         index: Number(row.id.slice('row-'.length)),

@@ -133,7 +133,6 @@ async function walkTable(tab: Tab, rows: number): Promise<void> {
     }
   });
   await page.getByText(itemName(rows / 2)).waitFor();
-  await page.waitForFunction(() => !document.querySelector('.row.waiting'));
   const [first] = await tab.names();
   await page.hover('.scroller');
   await page.mouse.wheel(0, 300);

@@ -5,7 +5,7 @@ import { NO_CRITERIA } from '../src/model/criteria.ts';
 import { Search } from '../src/state/search.ts';
 
 type Reply = { status?: number; body: object };
-type Script = Record<string, (times: number) => Reply | 'broken'>; // by the end of the address
+type Script = Record<string, (times: number) => Reply | Promise<Reply> | 'broken'>; // by the end of the address
 
 let asked: string[] = [];
 let search: Search;
@@ -32,7 +32,7 @@ function begin(change: Script): void {
   globalThis.fetch = (async (path: string) => {
     const key = Object.keys(script).find((end) => path.endsWith(end))!;
     asked.push(key);
-    const reply = script[key]!(asked.filter((one) => one === key).length);
+    const reply = await script[key]!(asked.filter((one) => one === key).length);
     if (reply === 'broken') throw new TypeError('no network');
     const headers = { 'Content-Type': 'application/json', 'Retry-After': '0.01' };
     return new Response(JSON.stringify(reply.body), { status: reply.status ?? 200, headers });
@@ -97,6 +97,23 @@ test('growth shows before the end', async () => {
   end = true;
   await over;
   assert.equal(search.status, 'done');
+});
+
+test('growth shows though the page that is under way was written before it', async () => {
+  let end = false;
+  begin({
+    'searches/t': () => progress(end, end ? 1 : 0, 2),
+    list: async (n) => {
+      const reply = n === 1 ? listing(0, false) : listing(2, end);
+      await settle();
+      return reply;
+    },
+  });
+  const over = search.run();
+  for (let i = 0; i < 20 && !search.pages.row(1); ++i) await settle();
+  assert.ok(search.pages.row(1), 'the rows are shown');
+  end = true;
+  await over;
 });
 
 test('a search that is left leaves nothing behind, whenever that is', async () => {

@@ -19,7 +19,8 @@ export class Pages {
   total = 0;
   private kept = new Map<number, Kept>(); // least recently wanted first
   private before = new Map<number, Kept>(); // of the order before; shown until the first new page
-  private flying = new Set<number>();
+  private flying = new Map<number, { outgrown: boolean }>();
+  private foundOrder = true;
   private first = 0;
   private last = 0;
   private abort = new AbortController();
@@ -46,10 +47,15 @@ export class Pages {
   // More has been found. In found order full pages never change; in any other, all may.
   grown(total: number, foundOrder: boolean): void {
     this.total = Math.max(total, this.total);
-    for (const page of this.kept.values()) {
-      if (!foundOrder || page.rows.length < PAGE_ROWS) page.stale = true;
-    }
+    this.foundOrder = foundOrder;
+    for (const page of this.kept.values()) page.stale ||= this.canGrow(page.rows);
+    // Their replies may have been written before.
+    for (const request of this.flying.values()) request.outgrown = true;
     this.pump();
+  }
+
+  private canGrow(rows: FileRow[]): boolean {
+    return !this.foundOrder || rows.length < PAGE_ROWS;
   }
 
   // Everything is fetched anew, in a new order or for the last time; the old is shown meanwhile.
@@ -90,11 +96,12 @@ export class Pages {
 
   private async fetch(number: number): Promise<void> {
     const { signal } = this.abort;
-    this.flying.add(number);
+    const request = { outgrown: false };
+    this.flying.set(number, request);
     try {
       const page = await this.fetchPage(number * PAGE_ROWS, PAGE_ROWS, signal);
       if (signal.aborted) return;
-      this.keep(number, page);
+      this.keep(number, page, request.outgrown);
       this.flying.delete(number);
       this.changed();
       this.pump();
@@ -105,9 +112,9 @@ export class Pages {
     }
   }
 
-  private keep(number: number, page: Page): void {
+  private keep(number: number, page: Page, outgrown: boolean): void {
     this.kept.delete(number);
-    this.kept.set(number, { rows: page.files, stale: false });
+    this.kept.set(number, { rows: page.files, stale: outgrown && this.canGrow(page.files) });
     this.before.clear();
     // While a search runs a page may have been counted before the newest matches were.
     this.total = page.finished ? page.total : Math.max(this.total, page.total);
