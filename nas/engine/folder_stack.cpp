@@ -1,41 +1,64 @@
 #include "nas/engine/folder_stack.h"
 
+#include <algorithm>
+
 namespace nas {
 
-void FolderStack::Push(std::shared_ptr<FolderBatch> batch) {
-  const std::lock_guard lock(mutex_);
-  waiting_.push_back({std::move(batch), 0});
-  changed_.notify_all();
+void FolderStack::Push(size_t thread, std::shared_ptr<FolderBatch> batch) {
+  const auto folders = static_cast<size_t>(std::ranges::count(batch->names, '\0'));
+  unfinished_ += folders;
+  Own& own = own_[thread];
+  bool enough_for_others = folders > 1;
+  {
+    const std::lock_guard lock(own.mutex);
+    own.waiting.push_back({std::move(batch), 0});
+    enough_for_others |= own.waiting.size() > 1;
+  }
+  // A single folder is taken next by this thread itself.
+  if (enough_for_others) WakeAll();
 }
 
-bool FolderStack::Take(Item& item) {
-  std::unique_lock lock(mutex_);
+bool FolderStack::Take(size_t thread, Item& item) {
   if (item.batch) {
-    --busy_;
-    // The descriptor of an exhausted batch is closed outside the lock, by whoever lets go last.
-    const std::shared_ptr<FolderBatch> done = std::move(item.batch);
-    lock.unlock();
     item = {};
-    lock.lock();
+    if (--unfinished_ == 0) WakeAll();
   }
-  changed_.wait(lock, [this] { return aborted_ || !waiting_.empty() || busy_ == 0; });
-  if (aborted_ || waiting_.empty()) {
-    changed_.notify_all();
-    return false;
+  while (true) {
+    const int seen = changes_;
+    if (aborted_) return false;
+    if (TakeFrom(own_[thread], End::kNewest, item)) return true;
+    for (size_t step = 1; step < kMostThreads; ++step) {
+      if (TakeFrom(own_[(thread + step) % kMostThreads], End::kOldest, item)) return true;
+    }
+    if (unfinished_ == 0) return false;
+    changes_.wait(seen);
   }
-  Waiting& top = waiting_.back();
-  item.batch = top.batch;
-  item.name = item.batch->names.c_str() + top.next;
-  top.next += item.name.size() + 1;
-  if (top.next >= item.batch->names.size()) waiting_.pop_back();
-  ++busy_;
+}
+
+bool FolderStack::TakeFrom(Own& own, End end, Item& item) {
+  const std::lock_guard lock(own.mutex);
+  if (own.waiting.empty()) return false;
+  Waiting& chosen = end == End::kNewest ? own.waiting.back() : own.waiting.front();
+  item.batch = chosen.batch;
+  item.name = item.batch->names.c_str() + chosen.next;
+  chosen.next += item.name.size() + 1;
+  if (chosen.next < item.batch->names.size()) return true;
+  if (end == End::kNewest) {
+    own.waiting.pop_back();
+  } else {
+    own.waiting.pop_front();
+  }
   return true;
 }
 
 void FolderStack::Abort() {
-  const std::lock_guard lock(mutex_);
   aborted_ = true;
-  changed_.notify_all();
+  WakeAll();
+}
+
+void FolderStack::WakeAll() {
+  ++changes_;
+  changes_.notify_all();
 }
 
 }  // namespace nas

@@ -32,7 +32,7 @@ constexpr int kFlushShare = 200;  // one part of the elapsed time
 // half a megabyte.
 constexpr unsigned kFewestThreads = 2;
 constexpr unsigned kMostAtFirst = 8;
-constexpr unsigned kMostThreads = 16;
+constexpr size_t kMostThreads = FolderStack::kMostThreads;
 // A search that got less than this part of its cores, and read from a disk, waits for the disk.
 constexpr double kBusyShare = 0.7;
 
@@ -126,7 +126,7 @@ void SearchJob::PushLocations() {
     batch->location = static_cast<std::uint16_t>(i);
     batch->parent_path = location.path;
     batch->names.assign(".\0", 2);
-    shared_.stack.Push(std::move(batch));
+    shared_.stack.Push(0, std::move(batch));
   }
 }
 
@@ -139,8 +139,9 @@ void SearchJob::RunPhase(Work work) {
 
 // Starts one more thread. Where the machine gives none, the search goes on with those it has.
 void SearchJob::StartThread(Work work) {
-  if (handles_.size() == threads_.size()) threads_.push_back(std::make_unique<WalkThread>(shared_));
-  WalkThread* thread = threads_[handles_.size()].get();
+  const size_t number = handles_.size();
+  if (number == threads_.size()) threads_.push_back(std::make_unique<WalkThread>(shared_, number));
+  WalkThread* thread = threads_[number].get();
   {
     const std::lock_guard lock(mutex_);
     ++running_;

@@ -63,7 +63,7 @@ Criteria::Criteria(const std::vector<FileSearch::FindComp*>& comps) {
   }
 }
 
-WalkThread::WalkThread(SharedWalk& shared) : shared_(shared) {
+WalkThread::WalkThread(SharedWalk& shared, size_t number) : shared_(shared), number_(number) {
   if (shared.content) scanner_.emplace(*shared.content, shared.stop_flag);
 }
 
@@ -74,7 +74,7 @@ void WalkThread::Flush() {
 
 void WalkThread::WalkNames() {
   FolderStack::Item item;
-  while (shared_.stack.Take(item)) {
+  while (shared_.stack.Take(number_, item)) {
     UniqueFd fd = OpenFolder(item);
     if (fd) ReadFolder(item, std::move(fd));
     if (shared_.stopping()) shared_.stack.Abort();
@@ -139,7 +139,7 @@ void WalkThread::ReadFolder(const FolderStack::Item& item, UniqueFd fd) {
   below->location = folder_.location;
   below->parent_path = folder_.path;
   below->parent = std::move(fd);
-  shared_.stack.Push(std::move(below));
+  shared_.stack.Push(number_, std::move(below));
 }
 
 // Asks for the type that the directory did not tell.

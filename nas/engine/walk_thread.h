@@ -71,7 +71,8 @@ struct SharedWalk {
 // One thread of a search: its buffers, and the rows it has found and not yet handed over.
 class WalkThread {
  public:
-  explicit WalkThread(SharedWalk& shared);
+  // `number`: which of the walk's threads it is, from 0.
+  WalkThread(SharedWalk& shared, size_t number);
 
   // Reads folders until none is left.
   void WalkNames();
@@ -102,6 +103,7 @@ class WalkThread {
   void ScanFile(const char* name);
 
   SharedWalk& shared_;
+  const size_t number_;
   DirectoryReader reader_;
   FoldedName folded_;
   FileSearch::WalkEntry entry_;
