@@ -29,9 +29,9 @@ void WatchForInterrupt() {
 
 bool Interrupted() { return interrupted != 0; }
 
-void Pause(int milliseconds, int pidfd) {
+bool Pause(int milliseconds, int pidfd) {
   pollfd ended = {pidfd, POLLIN, 0};
-  if (!Interrupted()) poll(&ended, 1, milliseconds);
+  return !Interrupted() && poll(&ended, 1, milliseconds) == 0;
 }
 
 }  // namespace arbory

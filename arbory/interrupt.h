@@ -10,7 +10,7 @@ void WatchForInterrupt();
 bool Interrupted();
 
 // Waits; an interrupt ends the wait early, and so does the end of the process that `pidfd` stands
-// for (-1: none).
-void Pause(int milliseconds, int pidfd);
+// for (-1: none). Returns whether the wait lasted to its end.
+bool Pause(int milliseconds, int pidfd);
 
 }  // namespace arbory

@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
+#include <optional>
 #include <string>
 
 #include "arbory/folders.h"
@@ -19,6 +20,8 @@
 #include "arbory/search_task.h"
 #include "arbory/session.h"
 #include "arbory/terminal.h"
+#include "nas/engine/result_file.h"
+#include "nas/system/accounts.h"
 #include "nas/system/shares.h"
 #include "nas/system/unique_fd.h"
 
@@ -30,8 +33,8 @@ constexpr int kApiVersion = 2;
 // call (about 2 ms) disappear.
 constexpr std::uint64_t kPageRows = 10000;
 // Between two looks at a search that had nothing more to show: a part of the time it has run, so
-// that first results are seen at once and the asking slows nothing down. The end of the search ends
-// the pause as well.
+// that first results are seen at once and the asking slows nothing down. It is asked for rows only
+// when a look shows that some may have come. The end of the search ends the pause as well.
 constexpr std::chrono::milliseconds kLeastPause{3};
 constexpr std::chrono::milliseconds kMostPause{100};
 constexpr int kPauseShare = 4;
@@ -39,7 +42,7 @@ constexpr int kPauseShare = 4;
 // and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
-constexpr std::chrono::milliseconds kBusyPause{10};
+constexpr std::chrono::milliseconds kBusyPause{20};
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -136,6 +139,7 @@ class Search {
     while (true) {
       const std::uint64_t wanted = Wanted();
       if (wanted == 0) return Ending::kEnough;
+      WatchResults();
       const Page page = List(options_.offset + printed_, wanted);
       if (Interrupted()) return Ending::kInterrupted;
       if (page.code() != 0) {
@@ -184,8 +188,19 @@ class Search {
     const Clock::time_point now = Clock::now();
     const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(now - started_);
     const auto most = now - busy_ < kLately ? kBusyPause : kMostPause;
-    Pause(static_cast<int>(std::clamp(ran / kPauseShare, kLeastPause, most).count()),
-          worker_.get());
+    const auto pause = std::clamp(ran / kPauseShare, kLeastPause, most);
+    while (Pause(static_cast<int>(pause.count()), worker_.get())) {
+      // Without the worker's descriptor only asking tells its end.
+      if (!worker_ || !watch_ || watch_->Changed()) break;
+      ShowProgress();
+    }
+  }
+
+  // Rows that come after this are noticed, however early the search is.
+  void WatchResults() {
+    if (watch_) return;
+    const std::string path = ReadSearch(session_.user(), task_id_).results;
+    if (!path.empty()) watch_.emplace(path);
   }
 
   void ShowProgress() {
@@ -245,7 +260,8 @@ class Search {
   RowFormat format_;
   ProgressLine progress_;
   std::string task_id_;
-  nas::UniqueFd worker_;      // its pidfd, invalid where that cannot be had
+  nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
+  std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows
   std::uint64_t printed_ = 0;
   int failure_ = 0;  // the code of kFailed, errno of kUnwritable
@@ -257,6 +273,7 @@ class Search {
 int RunSearchCommand(const SearchOptions& options) {
   WatchForInterrupt();
   Session session(options.common);
+  nas::LoadNameService();
   const Locations locations = LocateFolders(options.folders, nas::ListShares(), options.recursive);
   session.AddShares(locations.added);
   const Json::Value params = SearchRequest(options, locations.paths, std::time(nullptr));

@@ -3,6 +3,8 @@
 #include <exception>
 #include <memory>
 
+#include "nas/engine/result_file.h"
+#include "nas/system/volumes.h"
 #include "platform/task.h"
 #include "platform/webfm.h"
 
@@ -22,6 +24,13 @@ std::string Grouped(std::uint64_t number) {
   std::string text = std::to_string(number);
   for (int at = static_cast<int>(text.size()) - kGroup; at > 0; at -= kGroup) text.insert(at, ",");
   return text;
+}
+
+std::string ResultsOf(const std::string& user, const Json::Value& data) {
+  const Json::Value& volume = Member(data, "sdbvol");
+  const Json::Value& id = Member(data, "sdbid");
+  if (!volume.isString() || !id.isString() || !nas::IsResultId(id.asString())) return {};
+  return nas::ResultPath(nas::ResultFolderPath(volume.asString(), user), id.asString());
 }
 
 // A table row of the program's own: makes a task as the user and removes it again, because the
@@ -50,6 +59,7 @@ SearchState ReadSearch(const std::string& user, const std::string& task_id) {
     const Json::Value data = task->getProperty("data");
     state.error = IntOf(Member(data, "errno"));
     state.pid = IntOf(Member(data, "pid"));
+    state.results = ResultsOf(user, data);
     const Json::Value walk = task->getProperty("walk");
     if (Member(walk, "phase").isString()) state.phase = walk["phase"].asString();
     state.folders = CountOf(Member(walk, "folders"));

@@ -12,10 +12,11 @@ namespace arbory {
 struct SearchState {
   bool exists = false;
   bool finished = false;
-  int progress = 0;   // 1: complete, -1: failed with `error`, 0: running, or ended before its end
-  int error = 0;      // web API code
-  int pid = 0;        // of the worker, which may have ended
-  std::string phase;  // empty until the walk has begun
+  int progress = 0;     // 1: complete, -1: failed with `error`, 0: running, or ended before its end
+  int error = 0;        // web API code
+  int pid = 0;          // of the worker, which may have ended
+  std::string results;  // path of the result file, empty until there is one
+  std::string phase;    // empty until the walk has begun
   std::uint64_t folders = 0;
   std::uint64_t entries = 0;
   std::uint64_t matches = 0;

@@ -1,7 +1,5 @@
 #include "arbory/serve_command.h"
 
-#include <grp.h>
-#include <pwd.h>
 #include <unistd.h>
 
 #include <string>
@@ -12,6 +10,7 @@
 #include "arbory/server/service.h"
 #include "arbory/session.h"
 #include "arbory/terminal.h"
+#include "nas/system/accounts.h"
 #include "nas/system/shares.h"
 
 namespace arbory {
@@ -54,15 +53,6 @@ Service::Setup SetupOf(const ServeOptions& options, const nas::ServerSettings& s
   return setup;
 }
 
-// Children would each load the libraries of the name service anew, which is a third of what a short
-// call takes; what this process has loaded they inherit.
-void LoadNameService() {
-  constexpr char kRoot[] = "root";
-  int count = 0;
-  getpwnam(kRoot);
-  getgrouplist(kRoot, 0, nullptr, &count);
-}
-
 void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& settings,
                      const HttpServer& server) {
   if (!server.on_loopback() && !settings.behind_tls) {
@@ -88,7 +78,7 @@ int RunServeCommand(const ServeOptions& options) {
   HttpServer server(settings);
   Service service(SetupOf(options, settings, session, server), session.module());
   WarnOfOpenDoors(options, settings, server);
-  LoadNameService();
+  nas::LoadNameService();
   const std::string base = "http://" + server.address() + "/";
   if (HasLogins(options)) {
     Say("Open " + base);

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <ctime>
 #include <memory>
+#include <utility>
 #include <vector>
 
 #include "nas/system/file_io.h"
@@ -18,7 +19,8 @@ namespace {
 
 constexpr size_t kIdDigits = 32;
 constexpr std::string_view kSuffix = ".db";
-constexpr std::array<const char*, 3> kCompanions = {"", "-wal", "-shm"};
+constexpr char kLogSuffix[] = "-wal";
+constexpr std::array<const char*, 3> kCompanions = {"", kLogSuffix, "-shm"};
 constexpr time_t kKeepSeconds = 24 * 60 * 60;
 
 // When the result file or its log was last written; 0 when neither is there.
@@ -32,6 +34,19 @@ time_t LastWritten(const std::string& path) {
 }
 
 }  // namespace
+
+ResultWatch::ResultWatch(const std::string& path) : log_(path + kLogSuffix), seen_(Look()) {}
+
+ResultWatch::Stamp ResultWatch::Look() const {
+  struct stat status = {};
+  if (stat(log_.c_str(), &status) != 0) return {};
+  return {status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
+}
+
+bool ResultWatch::Changed() {
+  const Stamp before = std::exchange(seen_, Look());
+  return before != seen_;
+}
 
 std::string NewResultId() { return RandomName(); }
 

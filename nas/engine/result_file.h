@@ -41,6 +41,28 @@ constexpr std::uint64_t kOrderingPiece = 16 * 1024;
 // How long a writer waits for another: longer than any listing holds its short write transaction.
 constexpr int kResultBusyMilliseconds = 10'000;
 
+// Tells a follower of a running search for some microseconds whether asking for rows is worth a
+// listing's milliseconds.
+class ResultWatch {
+ public:
+  // `path` as of ResultPath; the file need not be there yet.
+  explicit ResultWatch(const std::string& path);
+  // Whether rows may have been appended since the call before, or since construction.
+  bool Changed();
+
+ private:
+  struct Stamp {
+    std::int64_t bytes = 0;
+    std::int64_t seconds = 0;
+    std::int64_t nanoseconds = 0;
+    bool operator==(const Stamp&) const = default;
+  };
+  Stamp Look() const;
+
+  std::string log_;  // writers append to it alone
+  Stamp seen_;
+};
+
 // Random, 32 hexadecimal digits.
 std::string NewResultId();
 bool IsResultId(std::string_view id);

@@ -81,6 +81,14 @@ std::optional<Account> FindAccount(uid_t uid) {
   });
 }
 
+void LoadNameService() {
+  constexpr char kRoot[] = "root";
+  if (geteuid() != 0) return;  // only root's calls look up groups, to become their user
+  int count = 0;
+  getpwnam(kRoot);
+  getgrouplist(kRoot, 0, nullptr, &count);
+}
+
 }  // namespace nas
 
 int NUVAUserGet(const char* name, NUVAUSER** out) {

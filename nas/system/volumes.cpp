@@ -114,6 +114,12 @@ std::map<std::string, std::string> NamesInSandbox(const std::vector<std::string>
   return names;
 }
 
+std::string ResultFolderPath(const std::string& volume, const std::string& user) {
+  std::string path = volume;
+  for (const Step& step : kResultRoad) path += std::string("/") + step.name;
+  return path + "/" + user;
+}
+
 std::string ResultFolder(const std::string& volume, const std::string& user) {
   const auto account = FindAccount(user);
   if (!account) return {};
@@ -131,9 +137,7 @@ std::string ResultFolder(const std::string& volume, const std::string& user) {
   // Something else in its place was put there by somebody: not a missing folder.
   if (!folder) return Fail(errno == ENOTDIR ? EPERM : errno);
   if (!IsPrivateTo(folder.get(), geteuid())) return Fail(errno);
-  std::string path = volume;
-  for (const Step& step : kResultRoad) path += std::string("/") + step.name;
-  return path + "/" + user;
+  return ResultFolderPath(volume, user);
 }
 
 std::string ResultVolume(const Share& share, const std::string& user) {

@@ -11,6 +11,9 @@ namespace nas {
 // Below a volume: @tmp/webfm/FBSearch/USER.
 inline constexpr char kTemporaryFolder[] = "@tmp";
 
+// Where ResultFolder (shares.h) is or would be; nothing is looked at or made.
+std::string ResultFolderPath(const std::string& volume, const std::string& user);
+
 // The path under which each volume, the scratch volume among them, appears to a confined command:
 // its own where the pattern /volume* matches it, otherwise an unused /volumeN; the scratch volume
 // is /volume0 unless a volume is.

@@ -21,6 +21,7 @@ namespace {
 
 constexpr size_t kHeaderBytes = sizeof(std::uint64_t);
 constexpr size_t kReadBytes = size_t{256} << 10;
+constexpr int kPipeBytes = 1 << 20;
 // No reply is that large: such a length comes from a child gone wrong, and is never met.
 constexpr std::uint64_t kMaxPayload = std::uint64_t{16} << 30;
 // Room taken at once on the word of a length; more only as bytes come.
@@ -96,6 +97,9 @@ RunningCall StartCall(const NUVA::APIMethod& row, const ApiCall& call, const Rep
     SetLastError(kErrorOther);
     return running;
   }
+  // A large reply is then written in a few steps, mostly without waiting for its reader. An
+  // unprivileged process may have used up its share of such room; then it takes a little longer.
+  fcntl(ends[1], F_SETPIPE_SZ, kPipeBytes);
   running.fd = UniqueFd(ends[0]);
   const UniqueFd writable(ends[1]);
   running.pid = fork();
