@@ -5,8 +5,6 @@
 #include <cstring>
 #include <utility>
 
-#include "nas/engine/folded_name.h"
-
 namespace nas {
 namespace {
 
@@ -112,19 +110,15 @@ void SortByText(const TextKeys& keys, KeyedRows& rows, size_t begin, size_t end,
 
 bool IsDigit(char c) { return c >= '0' && c <= '9'; }
 
-}  // namespace
-
-void AppendNaturalKey(std::string_view text, std::string& key) {
-  const std::string folded = FoldText(text);
-  // A number becomes "0", the count of its digits without leading zeros, and these digits: "0"
-  // keeps numbers where digits stand among other characters, and the count orders them by
-  // magnitude.
+// A number becomes "0", the count of its digits without leading zeros, and these digits: "0" keeps
+// numbers where digits stand among other characters, and the count orders them by magnitude.
+void AppendNatural(std::string_view folded, std::string& key) {
   constexpr size_t kMostDigits = 255;
   for (size_t i = 0; i < folded.size();) {
-    if (!IsDigit(folded[i])) {
-      key.push_back(folded[i++]);
-      continue;
-    }
+    const size_t text = i;
+    while (i < folded.size() && !IsDigit(folded[i])) ++i;
+    key.append(folded, text, i - text);
+    if (i == folded.size()) return;
     while (i < folded.size() && folded[i] == '0') ++i;
     size_t end = i;
     while (end < folded.size() && IsDigit(folded[end]) && end - i < kMostDigits) ++end;
@@ -134,6 +128,8 @@ void AppendNaturalKey(std::string_view text, std::string& key) {
     i = end;
   }
 }
+
+}  // namespace
 
 Ordering OrderByNumber(const std::vector<std::uint64_t>& keys) {
   if (keys.empty()) return {};
@@ -145,7 +141,8 @@ Ordering OrderByNumber(const std::vector<std::uint64_t>& keys) {
 }
 
 void TextKeys::AddNatural(std::string_view text) {
-  AppendNaturalKey(text, bytes_);
+  folded_.Set(text);
+  AppendNatural(folded_.folded(), bytes_);
   ends_.push_back(bytes_.size());
 }
 

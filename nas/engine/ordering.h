@@ -7,13 +7,11 @@
 #include <string_view>
 #include <vector>
 
+#include "nas/engine/folded_name.h"
+
 namespace nas {
 
 using Ordering = std::vector<std::uint32_t>;
-
-// Appends to `key` the form of `text` whose byte order is natural order ignoring case: numbers by
-// their value (IMG2 before IMG10), letters folded.
-void AppendNaturalKey(std::string_view text, std::string& key);
 
 // Orders rows by their numbers `keys`.
 Ordering OrderByNumber(const std::vector<std::uint64_t>& keys);
@@ -25,7 +23,8 @@ inline std::uint64_t UnsignedKey(std::int64_t value) {
 // Byte strings without NUL, one for each row, kept end to end.
 class TextKeys {
  public:
-  // Appends the natural key of `text` as the next row's.
+  // Appends the natural key of `text` as the next row's: its byte order is natural order ignoring
+  // case, with numbers by their value (IMG2 before IMG10) and letters folded.
   void AddNatural(std::string_view text);
   size_t size() const { return ends_.size(); }
   std::string_view operator[](size_t row) const {
@@ -35,6 +34,7 @@ class TextKeys {
   Ordering Order() const;
 
  private:
+  FoldedName folded_;
   std::string bytes_;
   std::vector<std::uint64_t> ends_;
 };

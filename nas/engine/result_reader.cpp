@@ -33,8 +33,9 @@ constexpr struct {
   std::string_view word;
   SortColumn column;
 } kSortColumns[] = {
-    {"name", SortColumn::kName},   {"path", SortColumn::kPath},     {"size", SortColumn::kSize},
-    {"type", SortColumn::kType},   {"user", SortColumn::kUser},     {"group", SortColumn::kGroup},
+    // In this order they are kept: first those that take long to make.
+    {"name", SortColumn::kName},   {"path", SortColumn::kPath},     {"type", SortColumn::kType},
+    {"size", SortColumn::kSize},   {"user", SortColumn::kUser},     {"group", SortColumn::kGroup},
     {"mode", SortColumn::kMode},   {"atime", SortColumn::kAtime},   {"mtime", SortColumn::kMtime},
     {"ctime", SortColumn::kCtime}, {"crtime", SortColumn::kCrtime},
 };
@@ -416,6 +417,7 @@ void ResultReader::KeepAllOrderings() {
     OrderingOf(known.column);
     End();
   }
+  EmptyLog(db_);
 }
 
 void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {

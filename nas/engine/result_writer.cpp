@@ -6,9 +6,9 @@ namespace {
 // Large pages, because a block's columns are some tens of kilobytes each. The log is emptied into
 // the file now and then, so that it does not grow as large as the results.
 constexpr char kMakeFile[] =
+    "PRAGMA synchronous=OFF;"
     "PRAGMA page_size=16384;"
     "PRAGMA journal_mode=WAL;"
-    "PRAGMA synchronous=OFF;"
     "PRAGMA wal_autocheckpoint=1024;"
     "BEGIN;"
     "CREATE TABLE location(id INTEGER PRIMARY KEY, share_name BLOB, share_root BLOB);"
@@ -64,6 +64,7 @@ void ResultWriter::Append(RowBlock& block) {
 void ResultWriter::Complete() {
   const std::lock_guard lock(mutex_);
   Statement(db_, "INSERT INTO complete VALUES(?)").Bind(1, static_cast<std::int64_t>(rows_)).Run();
+  EmptyLog(db_);
 }
 
 std::uint64_t ResultWriter::rows() {

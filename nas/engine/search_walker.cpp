@@ -1,15 +1,17 @@
 // The walker that a search worker runs: opens the locations, makes the result database, runs the
 // job and tells the task how it goes.
 
+#include <poll.h>
 #include <signal.h>
 #include <sys/resource.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
 #include <system_error>
-#include <thread>
 
 #include "nas/engine/location.h"
 #include "nas/engine/result_file.h"
@@ -18,6 +20,7 @@
 #include "nas/engine/search_job.h"
 #include "nas/system/error.h"
 #include "nas/system/shares.h"
+#include "nas/system/unique_fd.h"
 #include "platform/filesearch.h"
 #include "platform/system.h"
 
@@ -64,24 +67,25 @@ void SetErrorFromException() {
 
 // Results from this many on take noticeably long to sort for the first time.
 constexpr std::uint64_t kWorthSorting = 100'000;
-// A client that only wanted the rows, such as a terminal, has removed them by then.
-constexpr std::chrono::milliseconds kBeforeSorting(200);
+// A million rows take three quarters of it. Sorting goes on after that, but the search has
+// finished.
+constexpr std::chrono::milliseconds kSortingPatience(1000);
+constexpr std::chrono::milliseconds kStopTick(25);
 constexpr int kSortingNiceness = 10;
 
-// Sorts a finished search's results by every column, so that no listing has to wait for it. Done in
-// a process of its own, which lives a second or two, because the search counts as finished only
-// when the worker has gone. It gives up every descriptor first: one of them says that the search's
-// worker is alive. No SQLite handle may be open in this process.
-void SortInBackground(const std::string& path) {
+// Sorts a search's results by every column, so that no listing of a finished search has to wait for
+// it. Done in a process of its own, because it takes some 100 bytes of memory a row, more than a
+// worker shall have, and because the worker may go before it. It gives up every descriptor first:
+// one of them says that the search's worker is alive. No SQLite handle may be open in this process.
+pid_t StartSorting(const std::string& path) {
   const pid_t child = fork();
-  if (child != 0) return;  // where no process can be had, listings sort for themselves
+  if (child != 0) return child;  // where no process can be had, listings sort for themselves
   signal(SIGTERM, SIG_DFL);
   closelog();
   close_range(0, ~0U, 0);
   if (nice(kSortingNiceness) == -1) errno = 0;
-  std::this_thread::sleep_for(kBeforeSorting);
   try {
-    if (access(path.c_str(), F_OK) == 0) nas::ResultReader(path).KeepAllOrderings();
+    nas::ResultReader(path).KeepAllOrderings();
   } catch (const std::exception&) {
   }
   _exit(0);
@@ -102,6 +106,7 @@ class WfmSearchWalker::Impl {
 
  private:
   void Report(const nas::WalkProgress& progress, bool last);
+  void WaitForSorting(pid_t child) const;
   [[noreturn]] void EndWorker();
 
   const std::string user_;
@@ -180,12 +185,23 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
   Report(job.progress(), true);
   if (writer_->rows() >= kWorthSorting) {
     writer_.reset();
-    SortInBackground(nas::ResultPath(folder_, id_));
+    WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
   }
   return completed;
 } catch (...) {
   SetErrorFromException();
   return false;
+}
+
+void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
+  if (child < 0) return;
+  const Clock::time_point end = Clock::now() + kSortingPatience;
+  const nas::UniqueFd sorting(static_cast<int>(syscall(SYS_pidfd_open, child, 0)));
+  pollfd ended{sorting.get(), POLLIN, 0};
+  while (sorting && __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) == 0 && Clock::now() < end) {
+    if (poll(&ended, 1, static_cast<int>(kStopTick.count())) > 0) break;
+  }
+  waitpid(child, nullptr, WNOHANG);
 }
 
 // A thread cannot be ended, but a process can: this is how a stopped search's worker ends, only
