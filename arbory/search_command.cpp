@@ -38,11 +38,10 @@ constexpr std::uint64_t kPageRows = 10000;
 constexpr std::chrono::milliseconds kLeastPause{3};
 constexpr std::chrono::milliseconds kMostPause{100};
 constexpr int kPauseShare = 4;
-// A search that lately brought this many rows in one page is asked more often: what has been found
-// and not yet printed when it ends is what its user waits for.
+// A search that lately brought this many rows in one page is looked at all the time: what has been
+// found and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
-constexpr std::chrono::milliseconds kBusyPause{20};
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -187,7 +186,7 @@ class Search {
     ShowProgress();
     const Clock::time_point now = Clock::now();
     const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(now - started_);
-    const auto most = now - busy_ < kLately ? kBusyPause : kMostPause;
+    const auto most = now - busy_ < kLately ? kLeastPause : kMostPause;
     const auto pause = std::clamp(ran / kPauseShare, kLeastPause, most);
     while (Pause(static_cast<int>(pause.count()), worker_.get())) {
       // Without the worker's descriptor only asking tells its end.

@@ -66,6 +66,22 @@ int ModeAsDecimal(std::uint32_t mode) {
 // Keys that are neither copied into each object nor with it: a page may hold very many files.
 using Key = Json::StaticString;
 
+// A file's object with the members that most have, to be copied and filled in their order: finding
+// each by its name takes longer than all else about a row.
+const Json::Value& FileObject(bool with_real_path) {
+  static const Json::Value kObject = [] {
+    Json::Value object(Json::objectValue);
+    for (const char* name : {"is_dir", "name", "path"}) object[Key(name)];
+    return object;
+  }();
+  static const Json::Value kWithRealPath = [] {
+    Json::Value object = kObject;
+    object[Key("real_path")];
+    return object;
+  }();
+  return with_real_path ? kWithRealPath : kObject;
+}
+
 Json::Value OwnerOf(const DIRENTRY_INFO& entry) {
   Json::Value owner(Json::objectValue);
   owner[Key("user")] = entry.user;
@@ -120,11 +136,12 @@ void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, 
                   int /*reserved2*/) {
   using namespace nas;
   enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
-  out = Json::Value(Json::objectValue);
-  out[Key("name")] = entry.name;
-  out[Key("path")] = entry.path;
-  out[Key("is_dir")] = entry.is_dir;
-  if (additional & kRealPath) out[Key("real_path")] = entry.real_path;
+  out = FileObject((additional & kRealPath) != 0);
+  auto member = out.begin();
+  *member = entry.is_dir;
+  *++member = entry.name;
+  *++member = entry.path;
+  if (additional & kRealPath) *++member = entry.real_path;
   if (additional & kSize) out[Key("size")] = static_cast<Json::UInt64>(entry.size);
   if (additional & kOwner) out[Key("owner")] = OwnerOf(entry);
   if (additional & kTime) out[Key("time")] = TimesOf(entry);

@@ -20,7 +20,7 @@ namespace nas {
 namespace {
 
 constexpr size_t kHeaderBytes = sizeof(std::uint64_t);
-constexpr size_t kReadBytes = size_t{256} << 10;
+constexpr size_t kReadBytes = size_t{64} << 10;
 constexpr int kPipeBytes = 1 << 20;
 // No reply is that large: such a length comes from a child gone wrong, and is never met.
 constexpr std::uint64_t kMaxPayload = std::uint64_t{16} << 30;
@@ -125,7 +125,7 @@ std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const Reply
     }
   }
   if (!waited) return {};
-  return frame.whole() ? frame.payload() : encode(kCodeUnknownFailure, Json::Value());
+  return frame.whole() ? frame.TakePayload() : encode(kCodeUnknownFailure, Json::Value());
 }
 
 }  // namespace nas

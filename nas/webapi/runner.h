@@ -17,6 +17,7 @@
 
 #include <functional>
 #include <string>
+#include <utility>
 
 #include "nas/system/unique_fd.h"
 #include "platform/webapi.h"
@@ -71,7 +72,8 @@ class FrameReader {
   // Takes bytes as they come. True once the frame is whole; later bytes are ignored.
   bool Feed(const char* bytes, size_t count);
   bool whole() const { return whole_; }
-  const std::string& payload() const { return payload_; }
+  // Of a whole frame; once.
+  std::string TakePayload() { return std::move(payload_); }
 
  private:
   std::string header_;

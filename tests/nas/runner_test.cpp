@@ -231,11 +231,11 @@ TEST_F(RunnerTest, FramesAreTakenInAnyPieces) {
       const size_t count = std::min(piece, bytes.size() - at);
       EXPECT_EQ(reader.Feed(bytes.data() + at, count), at + count >= frame.size());
     }
-    EXPECT_EQ(reader.payload(), "hello") << piece;
+    EXPECT_EQ(reader.TakePayload(), "hello") << piece;
   }
   nas::FrameReader absurd;
   EXPECT_FALSE(absurd.Feed(std::string(100, '\xFF').data(), 100));
-  EXPECT_TRUE(absurd.payload().empty());
+  EXPECT_TRUE(absurd.TakePayload().empty());
 }
 
 TEST_F(RunnerTest, WhatIsNotAModuleIsRefused) {
