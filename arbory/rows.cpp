@@ -121,8 +121,10 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
     const bool listed = data.isObject();
     const Json::Value& files = listed ? data["files"] : Json::Value::nullSingleton();
     const bool finished = listed && data["finished"].asBool();
-    std::string payload =
-        std::to_string(code) + (finished ? " 1 " : " 0 ") + std::to_string(files.size()) + "\n";
+    const Json::Value& total = listed ? data["total"] : Json::Value::nullSingleton();
+    std::string payload = std::to_string(code) + (finished ? " 1 " : " 0 ") +
+                          std::to_string(files.size()) + " " + std::to_string(total.asUInt()) +
+                          "\n";
     constexpr size_t kUsualRowBytes = 128;
     payload.reserve(payload.size() + files.size() * kUsualRowBytes);
     for (const Json::Value& file : files) AppendRow(file, format, &payload);
@@ -133,14 +135,17 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
 Page::Page(std::string payload) : payload_(std::move(payload)) {
   int finished = 0;
   unsigned long long rows = 0;
+  unsigned long long total = 0;
   int used = 0;
-  const int fields = std::sscanf(payload_.c_str(), "%d %d %llu%n", &code_, &finished, &rows, &used);
-  if (fields != 3) {
+  const int fields =
+      std::sscanf(payload_.c_str(), "%d %d %llu %llu%n", &code_, &finished, &rows, &total, &used);
+  if (fields != 4) {
     code_ = nas::kCodeUnknownFailure;
     return;
   }
   finished_ = finished != 0;
   rows_ = rows;
+  total_ = total;
   text_at_ = static_cast<size_t>(used) + 1;
 }
 

@@ -15,6 +15,7 @@
 
 #include "arbory/folders.h"
 #include "arbory/interrupt.h"
+#include "arbory/page_reader.h"
 #include "arbory/rows.h"
 #include "arbory/search_request.h"
 #include "arbory/search_task.h"
@@ -28,10 +29,6 @@
 namespace arbory {
 namespace {
 
-constexpr int kApiVersion = 2;
-// Rows of one page: few enough to be printed while the search goes on, enough to make the cost of a
-// call (about 2 ms) disappear.
-constexpr std::uint64_t kPageRows = 10000;
 // Between two looks at a search that had nothing more to show: a part of the time it has run, so
 // that first results are seen at once and the asking slows nothing down. It is asked for rows only
 // when a look shows that some may have come. The end of the search ends the pause as well.
@@ -94,11 +91,8 @@ class Search {
  private:
   using Clock = std::chrono::steady_clock;
 
-  std::string Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode,
-                   const std::function<bool()>& go_on = {}) {
-    const NUVA::APIMethod* row = session_.module().Find(kSearchApi, kApiVersion, method);
-    if (row == nullptr) throw std::runtime_error(std::string("the module has no ") + method);
-    return session_.Call(*row, method, params, encode, go_on);
+  std::string Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode) {
+    return session_.Call(session_.Method(method), method, params, encode);
   }
 
   void Start(const Json::Value& params) {
@@ -119,27 +113,15 @@ class Search {
                              (why.empty() ? "code" + reply : why));
   }
 
-  Page List(std::uint64_t offset, std::uint64_t limit) {
-    Json::Value params(Json::objectValue);
-    params["taskid"] = task_id_;
-    params["offset"] = Json::UInt64{offset};
-    params["limit"] = Json::UInt64{limit};
-    params["additional"] = format_.Additional();
-    if (!options_.sort_by.empty()) params["sort_by"] = options_.sort_by;
-    if (options_.descending) params["sort_direction"] = "DESC";
-    return Page(Call("list", params, PageEncoder(format_), [this] {
-      ShowProgress();
-      return !Interrupted();
-    }));
-  }
-
   // Prints rows in the order they are found.
   Ending Stream() {
-    while (true) {
-      const std::uint64_t wanted = Wanted();
-      if (wanted == 0) return Ending::kEnough;
+    PageReader pages(&session_, options_, format_, task_id_);
+    while (!pages.AtEnd()) {
       WatchResults();
-      const Page page = List(options_.offset + printed_, wanted);
+      const Page page = pages.Next([this] {
+        ShowProgress();
+        return !Interrupted();
+      });
       if (Interrupted()) return Ending::kInterrupted;
       if (page.code() != 0) {
         // No results to be had: because the search failed, or because it has not come so far yet.
@@ -148,12 +130,12 @@ class Search {
         if (state.finished || !state.exists) return Ending::kFailed;
       }
       if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
-      if (page.rows() < wanted) {
-        if (page.finished()) return Ending::kComplete;
-        if (page.rows() >= kManyRows) busy_ = Clock::now();
-        Wait();
-      }
+      if (!pages.caught_up()) continue;
+      if (page.finished()) return Ending::kComplete;
+      if (page.rows() >= kManyRows) busy_ = Clock::now();
+      Wait();
     }
+    return Ending::kEnough;
   }
 
   // Prints the rows of the finished search.
@@ -165,11 +147,6 @@ class Search {
       if (state.finished) break;
     }
     return Stream();
-  }
-
-  std::uint64_t Wanted() const {
-    if (options_.limit == 0) return kPageRows;
-    return std::min(kPageRows, options_.limit - printed_);
   }
 
   // False when standard output does not take it.

@@ -41,11 +41,21 @@ const nas::Module& Session::module() {
   return *module_;
 }
 
+const NUVA::APIMethod& Session::Method(const char* method) {
+  const NUVA::APIMethod* row = module().Find(kSearchApi, kSearchVersion, method);
+  if (row == nullptr) throw std::runtime_error(std::string("the module has no ") + method);
+  return *row;
+}
+
 std::string Session::Call(const NUVA::APIMethod& row, const std::string& method,
-                          const Json::Value& params, const nas::ReplyEncoder& encode,
-                          const std::function<bool()>& go_on) const {
+                          const Json::Value& params, const nas::ReplyEncoder& encode) const {
+  return nas::FinishCall(Begin(row, method, params, encode), encode);
+}
+
+nas::RunningCall Session::Begin(const NUVA::APIMethod& row, const std::string& method,
+                                const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
-  return nas::RunCall(row, {method, params, user_, "terminal"}, encode, go_on);
+  return nas::StartCall(row, {method, params, user_, "terminal"}, encode);
 }
 
 }  // namespace arbory

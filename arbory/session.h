@@ -14,6 +14,7 @@
 namespace arbory {
 
 inline constexpr char kSearchApi[] = "NUVA.Arbory.Search";
+inline constexpr int kSearchVersion = 2;
 
 class Session {
  public:
@@ -28,9 +29,15 @@ class Session {
   // Loads the module when first asked for. Throws std::runtime_error.
   const nas::Module& module();
 
+  // The search API's row for `method`. Throws std::runtime_error when the module has none.
+  const NUVA::APIMethod& Method(const char* method);
+
   // Makes one call as this user; see nas::RunCall.
   std::string Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
-                   const nas::ReplyEncoder& encode, const std::function<bool()>& go_on = {}) const;
+                   const nas::ReplyEncoder& encode) const;
+  // Begins one; see nas::StartCall.
+  nas::RunningCall Begin(const NUVA::APIMethod& row, const std::string& method,
+                         const Json::Value& params, const nas::ReplyEncoder& encode) const;
 
  private:
   nas::Config config_;

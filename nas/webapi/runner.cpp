@@ -62,6 +62,11 @@ bool Collect(const RunningCall& running, int process_fd, const std::function<boo
   return true;
 }
 
+void Reap(pid_t child) {
+  while (waitpid(child, nullptr, 0) < 0 && errno == EINTR) {
+  }
+}
+
 }  // namespace
 
 std::string EncodeJsonReply(int code, const Json::Value& data) {
@@ -111,21 +116,30 @@ RunningCall StartCall(const NUVA::APIMethod& row, const ApiCall& call, const Rep
   return running;
 }
 
-std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
-                    const std::function<bool()>& go_on) {
-  RunningCall running = StartCall(row, call, encode);
+std::string FinishCall(RunningCall running, const ReplyEncoder& encode,
+                       const std::function<bool()>& go_on) {
   FrameReader frame;
-  bool waited = true;
   if (running.pid > 0) {
     const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, running.pid, 0)));
-    waited = Collect(running, process.get(), go_on, &frame);
-    running.fd.Reset();
-    if (!waited) kill(running.pid, SIGKILL);
-    while (waitpid(running.pid, nullptr, 0) < 0 && errno == EINTR) {
+    if (!Collect(running, process.get(), go_on, &frame)) {
+      AbandonCall(std::move(running));
+      return {};
     }
+    running.fd.Reset();
+    Reap(running.pid);
   }
-  if (!waited) return {};
   return frame.whole() ? frame.TakePayload() : encode(kCodeUnknownFailure, Json::Value());
+}
+
+void AbandonCall(RunningCall running) {
+  if (running.pid <= 0) return;
+  kill(running.pid, SIGKILL);
+  Reap(running.pid);
+}
+
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
+                    const std::function<bool()>& go_on) {
+  return FinishCall(StartCall(row, call, encode), encode, go_on);
 }
 
 }  // namespace nas

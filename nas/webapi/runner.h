@@ -90,5 +90,10 @@ class FrameReader {
 constexpr int kAskMilliseconds = 50;  // soon enough for a person's interrupt
 std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
                     const std::function<bool()>& go_on = {});
+// The second half of RunCall, for a call begun with StartCall.
+std::string FinishCall(RunningCall running, const ReplyEncoder& encode,
+                       const std::function<bool()>& go_on = {});
+// Ends a call that nobody waits for any more.
+void AbandonCall(RunningCall running);
 
 }  // namespace nas
