@@ -14,7 +14,7 @@ namespace {
 Json::Value ParseParams(const std::string& text) {
   Json::Value params(Json::objectValue);
   if (text.empty()) return params;
-  if (!nas::ParseJson(text, &params))
+  if (!nas::ParseJson(text, &params, nas::kRequestMaxDepth))
     throw UsageError("the parameters are not valid JSON: " + text);
   if (!params.isObject()) throw UsageError("the parameters must be a JSON object: " + text);
   return params;

@@ -232,7 +232,9 @@ Answer Service::GetFile(HttpRequest* request, const Path& path) {
 bool Service::ParseBody(const HttpRequest& request, Json::Value* params, Answer* refusal) {
   *params = Json::Value(Json::objectValue);
   if (request.body.empty()) return true;
-  if (nas::ParseJson(request.body, params) && params->isObject()) return true;
+  if (nas::ParseJson(request.body, params, nas::kRequestMaxDepth) && params->isObject()) {
+    return true;
+  }
   *refusal = ErrorReply(kBadRequest, "The body must be one JSON object.");
   return false;
 }

@@ -171,7 +171,7 @@ std::string JsonText(const Json::Value& value, JsonBytes bytes) {
   return text;
 }
 
-bool ParseJson(std::string_view text, Json::Value* out) {
+bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
   if (HasComment(text)) return false;
   Json::CharReaderBuilder settings;
   settings["collectComments"] = false;
@@ -180,7 +180,7 @@ bool ParseJson(std::string_view text, Json::Value* out) {
   settings["strictRoot"] = false;
   settings["failIfExtra"] = true;
   settings["rejectDupKeys"] = false;
-  settings["stackLimit"] = kJsonMaxDepth;
+  settings["stackLimit"] = max_depth;
   const std::unique_ptr<Json::CharReader> reader(settings.newCharReader());
   // The reader throws when a document is too deep, and may leave a half-read value behind.
   try {

@@ -19,11 +19,13 @@ enum class JsonBytes {
 void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out);
 std::string JsonText(const Json::Value& value, JsonBytes bytes);
 
-// Reads one JSON document of any type: no comments, nothing after it, at most kJsonMaxDepth levels
-// deep. False, with `out` untouched, for anything else. Strings may hold bytes that are not UTF-8.
-bool ParseJson(std::string_view text, Json::Value* out);
-
 // Far above any request or record, and low enough for the recursion to fit every stack.
 inline constexpr int kJsonMaxDepth = 200;
+// Of a request, so that a record that holds parts of it can be read again.
+inline constexpr int kRequestMaxDepth = 100;
+
+// Reads one JSON document of any type: no comments, nothing after it, at most `max_depth` levels
+// deep. False, with `out` untouched, for anything else. Strings may hold bytes that are not UTF-8.
+bool ParseJson(std::string_view text, Json::Value* out, int max_depth = kJsonMaxDepth);
 
 }  // namespace nas

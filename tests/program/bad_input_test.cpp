@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "nas/system/json_text.h"
 #include "tests/program/program_test.h"
 
 namespace program_test {
@@ -124,6 +125,9 @@ TEST_F(BadInput, LaterCalls) {
 // The command line: what is wrong is said in one line, nothing is printed and nothing stays.
 TEST_F(BadInput, CommandLine) {
   WriteFile(share_ + "/file.txt", "x");
+  // A record that kept it could not be read again.
+  const std::string deep = "{\"folder_path\":" + std::string(nas::kRequestMaxDepth, '[') +
+                           std::string(nas::kRequestMaxDepth, ']') + "}";
   const struct {
     std::vector<std::string> words;
     const char* said;  // part of the message
@@ -153,6 +157,7 @@ TEST_F(BadInput, CommandLine) {
       {{"call", "NUVA.Arbory.Search", "3", "start"}, "no method"},
       {{"call", "NUVA.Arbory.Search", "2", "start", "[]"}, "object"},
       {{"call", "NUVA.Arbory.Search", "2", "start", "{"}, "not valid JSON"},
+      {{"call", "NUVA.Arbory.Search", "2", "start", deep}, "not valid JSON"},
       {{"call", "NUVA.Arbory.Search", "x", "start"}, "VERSION"},
   };
   for (const auto& row : rows) {
