@@ -9,7 +9,9 @@
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
+#include <chrono>
 #include <climits>
+#include <thread>
 
 #include "arbory/server/child.h"
 #include "arbory/server/http_text.h"
@@ -23,6 +25,7 @@ namespace {
 
 constexpr char kHome[] = "home";
 constexpr size_t kReadBytes = size_t{256} << 10;
+constexpr std::chrono::milliseconds kRetryPause(5);
 
 // The browser draws what it shows of a preview with scripts, forms, and everything from elsewhere
 // off. A PDF's own viewer does not start in a sandbox; it runs no scripts of the page.
@@ -66,11 +69,15 @@ nas::UniqueFd OpenBeneath(int root, const std::vector<std::string>& path) {
   // Without O_NONBLOCK a pipe would be waited for; a terminal must not become this process's.
   how.flags = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
   how.resolve = RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS;
-  int fd;
-  do {
-    fd = static_cast<int>(syscall(SYS_openat2, root, below.c_str(), &how, sizeof how));
-  } while (fd < 0 && (errno == EINTR || errno == EAGAIN));
-  return nas::UniqueFd(fd);
+  while (true) {
+    nas::UniqueFd fd(static_cast<int>(syscall(SYS_openat2, root, below.c_str(), &how, sizeof how)));
+    // A folder moved on the way, or somebody holds a lease on the file and has been told to let go.
+    if (!fd && errno == EAGAIN) {
+      std::this_thread::sleep_for(kRetryPause);
+    } else if (fd || errno != EINTR) {
+      return fd;
+    }
+  }
 }
 
 void SendError(int pipe, int status, const char* sentence) {
