@@ -35,6 +35,8 @@ namespace {
 constexpr std::chrono::milliseconds kLeastPause{3};
 constexpr std::chrono::milliseconds kMostPause{100};
 constexpr int kPauseShare = 4;
+// Asked for this often whatever the looks show: a file system's clock may be too coarse for them.
+constexpr std::chrono::milliseconds kMostUnasked{1000};
 // A search that lately brought this many rows in one page is looked at all the time: what has been
 // found and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
@@ -167,7 +169,7 @@ class Search {
     const auto pause = std::clamp(ran / kPauseShare, kLeastPause, most);
     while (Pause(static_cast<int>(pause.count()), worker_.get())) {
       // Without the worker's descriptor only asking tells its end.
-      if (!worker_ || !watch_ || watch_->Changed()) break;
+      if (!worker_ || !watch_ || watch_->Changed() || Clock::now() - now >= kMostUnasked) break;
       ShowProgress();
     }
   }

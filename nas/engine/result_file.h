@@ -48,7 +48,9 @@ class ResultWatch {
  public:
   // `path` as of ResultPath; the file need not be there yet.
   explicit ResultWatch(const std::string& path);
-  // Whether rows may have been appended since the call before, or since construction.
+  // Whether rows seem to have been appended since the call before, or since construction. A log of
+  // full length is written anew from its front: of two writes between which the file system's clock
+  // has not moved, the second then goes unnoticed.
   bool Changed();
 
  private:
