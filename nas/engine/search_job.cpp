@@ -6,7 +6,7 @@
 
 #include <algorithm>
 #include <chrono>
-#include <system_error>
+#include <exception>
 
 namespace nas {
 namespace {
@@ -159,7 +159,7 @@ void SearchJob::StartThread(Work work) {
       }
       ended();
     });
-  } catch (const std::system_error&) {
+  } catch (const std::exception&) {  // no thread, or no memory for one
     ended();
     if (handles_.empty()) throw;
   }
