@@ -119,7 +119,7 @@ class Search {
   Ending Stream() {
     PageReader pages(&session_, options_, format_, task_id_);
     while (!pages.AtEnd()) {
-      WatchResults();
+      const bool walked = HasWalked();
       const Page page = pages.Next([this] {
         ShowProgress();
         return !Interrupted();
@@ -133,7 +133,7 @@ class Search {
       }
       if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
       if (!pages.caught_up()) continue;
-      if (page.finished()) return Ending::kComplete;
+      if (page.finished() || walked) return Ending::kComplete;
       if (page.rows() >= kManyRows) busy_ = Clock::now();
       Wait();
     }
@@ -174,11 +174,12 @@ class Search {
     }
   }
 
-  // Rows that come after this are noticed, however early the search is.
-  void WatchResults() {
-    if (watch_) return;
-    const std::string path = ReadSearch(session_.user(), task_id_).results;
-    if (!path.empty()) watch_.emplace(path);
+  // Whether no more rows will come, though the worker may still be sorting what it has found. Rows
+  // that do come after this are noticed, however early the search is.
+  bool HasWalked() {
+    const SearchState state = ReadSearch(session_.user(), task_id_);
+    if (!watch_ && !state.results.empty()) watch_.emplace(state.results);
+    return state.phase == "done";
   }
 
   void ShowProgress() {

@@ -51,7 +51,7 @@ class FolderStack {
     std::shared_ptr<FolderBatch> batch;
     size_t next = 0;
   };
-  constexpr static size_t kCacheLine = 64;
+  static constexpr size_t kCacheLine = 64;
   struct alignas(kCacheLine) Own {
     std::mutex mutex;  // guards waiting
     std::deque<Waiting> waiting;

@@ -194,13 +194,17 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
 }
 
 void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
-  if (child < 0) return;
+  const auto stopped = [this] { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; };
+  // What a stopped search has found is sorted without anybody waiting for it.
+  if (child < 0 || stopped()) return;
   const Clock::time_point end = Clock::now() + kSortingPatience;
   const nas::UniqueFd sorting(static_cast<int>(syscall(SYS_pidfd_open, child, 0)));
   pollfd ended{sorting.get(), POLLIN, 0};
-  while (sorting && __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) == 0 && Clock::now() < end) {
+  while (sorting && !stopped() && Clock::now() < end) {
     if (poll(&ended, 1, static_cast<int>(kStopTick.count())) > 0) break;
   }
+  // Who stops a search that has found everything has no more use for it.
+  if (stopped()) kill(child, SIGKILL);
   waitpid(child, nullptr, WNOHANG);
 }
 
