@@ -62,7 +62,7 @@ Page PageReader::Take(const std::function<bool()>& go_on) {
   return Page(nas::FinishCall(std::move(call), encode_, go_on));
 }
 
-Page PageReader::Next(const std::function<bool()>& go_on) {
+Page PageReader::Next(bool all_found, const std::function<bool()>& go_on) {
   const bool ahead = !asked_.empty();
   Page page = Take(go_on);
   if (ahead && page.total() != total_) {
@@ -73,7 +73,7 @@ Page PageReader::Next(const std::function<bool()>& go_on) {
   at_ += page.rows();
   total_ = page.total();
   caught_up_ = page.rows() < wanted_;
-  if (caught_up_ || !page.finished()) {
+  if (caught_up_ || !(all_found || page.finished())) {
     Forget();
   } else {
     while (asked_.size() < PagesAhead() && next_ < std::min(end_, total_)) Ask();

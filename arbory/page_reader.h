@@ -1,6 +1,6 @@
 #pragma once
-// Reads a search's rows page by page. Those of a finished search are asked for ahead, a page for
-// each core, because making a page takes longer than printing it.
+// Reads a search's rows page by page. Once all are found they are asked for ahead, a page for each
+// core, because making a page takes longer than printing it.
 
 #include <cstdint>
 #include <deque>
@@ -26,7 +26,8 @@ class PageReader {
   bool AtEnd() const { return at_ == end_; }
   // The next page; one that holds less than it could is followed by what is found later. `go_on` is
   // asked now and then while it is waited for; when it answers false the page is an error.
-  Page Next(const std::function<bool()>& go_on);
+  // `all_found`: no more rows will come.
+  Page Next(bool all_found, const std::function<bool()>& go_on);
   // Whether the last page held all the rows there were.
   bool caught_up() const { return caught_up_; }
 

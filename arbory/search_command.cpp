@@ -120,7 +120,7 @@ class Search {
     PageReader pages(&session_, options_, format_, task_id_);
     while (!pages.AtEnd()) {
       const bool walked = HasWalked();
-      const Page page = pages.Next([this] {
+      const Page page = pages.Next(walked, [this] {
         ShowProgress();
         return !Interrupted();
       });
