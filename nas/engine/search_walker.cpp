@@ -1,6 +1,7 @@
 // The walker that a search worker runs: opens the locations, makes the result database, runs the
 // job and tells the task how it goes.
 
+#include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
 #include <sys/resource.h>
@@ -19,6 +20,7 @@
 #include "nas/engine/result_writer.h"
 #include "nas/engine/search_job.h"
 #include "nas/system/error.h"
+#include "nas/system/file_io.h"
 #include "nas/system/shares.h"
 #include "nas/system/unique_fd.h"
 #include "platform/filesearch.h"
@@ -84,6 +86,10 @@ pid_t StartSorting(const std::string& path) {
   closelog();
   close_range(0, ~0U, 0);
   if (nice(kSortingNiceness) == -1) errno = 0;
+  // Where memory runs out, this is what the machine can best do without.
+  if (const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC)); score) {
+    nas::WriteAll(score.get(), "1000");
+  }
   try {
     nas::ResultReader(path).KeepAllOrderings();
   } catch (const std::exception&) {
