@@ -11,10 +11,7 @@
 #include <cctype>
 #include <cstdint>
 #include <cstring>
-#include <initializer_list>
 #include <memory>
-#include <string_view>
-#include <utility>
 
 #include "api/codes.h"
 #include "api/log.h"
@@ -37,22 +34,14 @@ std::string CutPath(std::string path) {
   return path;
 }
 
-std::string Joined(std::initializer_list<std::string_view> parts) {
-  size_t size = 0;
-  for (const std::string_view part : parts) size += part.size();
-  std::string text;
-  text.reserve(size);
-  for (const std::string_view part : parts) text += part;
-  return text;
-}
-
 // A row of a user's own home root already names the user's folder in its relative path, so such
 // roots are taken as the "homes" share itself.
 std::string RealPath(const FileSearch::__tag_FILE_INFO_DATA& row) {
-  std::string_view root = row.share_root;
-  const size_t homes = root.find(kHomesFolder);
-  if (homes != std::string_view::npos) root = root.substr(0, homes + strlen("/homes"));
-  return CutPath(Joined({root, "/", row.relative_path}));
+  const std::string tail = std::string("/") + row.relative_path;
+  const char* homes = strstr(row.share_root, kHomesFolder);
+  if (homes == nullptr) return CutPath(row.share_root + tail);
+  const size_t length = static_cast<size_t>(homes - row.share_root) + strlen("/homes");
+  return CutPath(std::string(row.share_root, length) + tail);
 }
 
 void PurgeIfVanished(const FileSearch::__tag_FILE_INFO_DATA& row, const std::string& real_path,
@@ -137,13 +126,13 @@ Json::Value RenderFiles(std::list<DIRENTRY_INFO>& files, int additional) {
 BOOL SelectFileInfoCB(FileSearch::__tag_FILE_INFO_DATA* row, void* context) {
   auto& page = *static_cast<_tag_SELECTCBDATA_*>(context);
   DIRENTRY_INFO file;
-  std::string real_path = RealPath(*row);
+  const std::string real_path = RealPath(*row);
+  if ((page.additional & kRealPath) != 0) file.real_path = real_path;
   PurgeIfVanished(*row, real_path, page);
-  if ((page.additional & kRealPath) != 0) file.real_path = std::move(real_path);
 
   file.name = row->name;
   file.is_dir = row->is_dir;
-  file.path = CutPath(Joined({"/", row->share_name, "/", row->relative_path}));
+  file.path = CutPath(std::string("/") + row->share_name + "/" + row->relative_path);
   if (page.home_enabled && strcasecmp(row->share_name, kHomesShare) == 0) {
     std::string folder;
     if (!HomeFolder(page, folder)) return 0;

@@ -1,8 +1,8 @@
 #include "arbory/server/connection.h"
 
 #include <syslog.h>
-#include <algorithm>
 
+#include <algorithm>
 #include <boost/asio/buffer.hpp>
 #include <boost/beast/http/error.hpp>
 #include <boost/beast/http/read.hpp>

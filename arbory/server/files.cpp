@@ -3,15 +3,12 @@
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
-#include <chrono>
 #include <climits>
-#include <thread>
 
 #include "arbory/server/child.h"
 #include "arbory/server/http_text.h"
@@ -25,7 +22,6 @@ namespace {
 
 constexpr char kHome[] = "home";
 constexpr size_t kReadBytes = size_t{256} << 10;
-constexpr std::chrono::milliseconds kRetryPause(5);
 
 // The browser draws what it shows of a preview with scripts, forms, and everything from elsewhere
 // off. A PDF's own viewer does not start in a sandbox; it runs no scripts of the page.
@@ -65,19 +61,9 @@ nas::UniqueFd OpenRoot(const FileRequest& request) {
 nas::UniqueFd OpenBeneath(int root, const std::vector<std::string>& path) {
   std::string below;
   for (const std::string& segment : path) below += (below.empty() ? "" : "/") + segment;
-  open_how how{};
   // Without O_NONBLOCK a pipe would be waited for; a terminal must not become this process's.
-  how.flags = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
-  how.resolve = RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS;
-  while (true) {
-    nas::UniqueFd fd(static_cast<int>(syscall(SYS_openat2, root, below.c_str(), &how, sizeof how)));
-    // A folder moved on the way, or somebody holds a lease on the file and has been told to let go.
-    if (!fd && errno == EAGAIN) {
-      std::this_thread::sleep_for(kRetryPause);
-    } else if (fd || errno != EINTR) {
-      return fd;
-    }
-  }
+  return nas::OpenAt2(root, below.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY,
+                      RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
 }
 
 void SendError(int pipe, int status, const char* sentence) {

@@ -7,6 +7,7 @@
 #include "arbory/server/login.h"
 #include "arbory/server/service.h"
 #include "arbory/server/user_calls.h"
+#include "arbory/session.h"
 #include "nas/system/json_text.h"
 
 namespace arbory {
@@ -21,7 +22,6 @@ constexpr size_t kMaxCredentialBytes = 1024;
 // Both, each byte escaped, and some room. Reading a megabyte of JSON takes the loop a fifth of a
 // second, which nobody may ask for who is not logged in.
 constexpr size_t kMaxLoginBytes = size_t{16} << 10;
-constexpr char kSearchApi[] = "NUVA.Arbory.Search";
 constexpr char kStopMethod[] = "stop";
 
 // Takes as long wherever the texts differ.

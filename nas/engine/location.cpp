@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -16,17 +15,6 @@
 
 namespace nas {
 namespace {
-
-UniqueFd OpenAt2(int dir, const char* path, int flags, unsigned long long resolve) {
-  open_how how{};
-  how.flags = static_cast<unsigned long long>(flags | O_CLOEXEC);
-  how.resolve = resolve;
-  int fd;
-  do {
-    fd = static_cast<int>(syscall(SYS_openat2, dir, path, &how, sizeof(how)));
-  } while (fd < 0 && (errno == EINTR || errno == EAGAIN));
-  return UniqueFd(fd);
-}
 
 // Cuts "/SHARE/below" into its share and a path without empty and "." components. False for a
 // text that is no location.

@@ -48,14 +48,6 @@ bool ResultWatch::Changed() {
   return before != seen_;
 }
 
-void EmptyLog(Database& db) {
-  try {
-    Statement(db, "PRAGMA wal_checkpoint(PASSIVE)").Step();
-  } catch (const SqliteError&) {
-    // A full disk: the rows are as readable in the log.
-  }
-}
-
 std::string NewResultId() { return RandomName(); }
 
 bool IsResultId(std::string_view id) {

@@ -30,7 +30,6 @@
 #include <string_view>
 
 #include "nas/engine/walk_entry.h"
-#include "nas/system/sqlite.h"
 
 namespace nas {
 
@@ -65,10 +64,6 @@ class ResultWatch {
   std::string log_;  // writers append to it alone
   Stamp seen_;
 };
-
-// To be called by whoever has written much and is about to close the file: closing would empty the
-// log as well, but keep everybody else from opening the file meanwhile.
-void EmptyLog(Database& db);
 
 // Random, 32 hexadecimal digits.
 std::string NewResultId();

@@ -417,7 +417,7 @@ void ResultReader::KeepAllOrderings() {
     OrderingOf(known.column);
     End();
   }
-  EmptyLog(db_);
+  db_.EmptyLog();
 }
 
 void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {

@@ -64,7 +64,7 @@ void ResultWriter::Append(RowBlock& block) {
 void ResultWriter::Complete() {
   const std::lock_guard lock(mutex_);
   Statement(db_, "INSERT INTO complete VALUES(?)").Bind(1, static_cast<std::int64_t>(rows_)).Run();
-  EmptyLog(db_);
+  db_.EmptyLog();
 }
 
 std::uint64_t ResultWriter::rows() {

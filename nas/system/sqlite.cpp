@@ -24,6 +24,10 @@ void Database::Execute(const char* sql) {
   if (sqlite3_exec(db_, sql, nullptr, nullptr, nullptr) != SQLITE_OK) throw SqliteError(db_, sql);
 }
 
+void Database::EmptyLog() {
+  sqlite3_wal_checkpoint_v2(db_, nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
+}
+
 Statement::Statement(const Database& db, const char* sql) : db_(db.handle()) {
   if (sqlite3_prepare_v2(db_, sql, -1, &statement_, nullptr) != SQLITE_OK) {
     throw SqliteError(db_, sql);

@@ -35,6 +35,10 @@ class Database {
 
   // Runs statements that yield no rows and take no values. Throws SqliteError.
   void Execute(const char* sql);
+  // Of a file in WAL mode, for whoever has written much and is about to close it: closing would
+  // empty the log as well, but keep everybody else from opening the file meanwhile. What cannot be
+  // moved now, such as on a full disk, stays in the log, where it is as readable.
+  void EmptyLog();
   sqlite3* handle() const { return db_; }
 
  private:

@@ -1,5 +1,5 @@
 #pragma once
-// Owner of one file descriptor.
+// Owner of one file descriptor, and opening below a folder.
 
 #include <unistd.h>
 
@@ -27,5 +27,11 @@ class UniqueFd {
  private:
   int fd_ = -1;
 };
+
+// openat2 with O_CLOEXEC; `resolve` is of the RESOLVE_* flags of <linux/openat2.h>. Tried again
+// after a pause where a folder was moved on the way, or where somebody who holds a lease on the
+// file has been told to let go, which the kernel enforces after a minute at most. Invalid with
+// errno set.
+UniqueFd OpenAt2(int dir_fd, const char* path, int flags, unsigned long long resolve);
 
 }  // namespace nas

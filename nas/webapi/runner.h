@@ -84,13 +84,12 @@ class FrameReader {
 
 // Makes the call and waits for its reply and for the end of the request child. A call that cannot
 // be made or answers nothing yields encode(kCodeUnknownFailure, null).
-//
-// `go_on`, where given, is asked every kAskMilliseconds while the call is waited for; when it
-// answers false the request child is killed and the result is empty.
+std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
+
+// The second half of RunCall, for a call begun with StartCall. `go_on`, where given, is asked every
+// kAskMilliseconds while the call is waited for; when it answers false the request child is killed
+// and the result is empty.
 constexpr int kAskMilliseconds = 50;  // soon enough for a person's interrupt
-std::string RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode,
-                    const std::function<bool()>& go_on = {});
-// The second half of RunCall, for a call begun with StartCall.
 std::string FinishCall(RunningCall running, const ReplyEncoder& encode,
                        const std::function<bool()>& go_on = {});
 // Ends a call that nobody waits for any more.

@@ -19,8 +19,8 @@ expect_none "other libraries" "$(echo "$needed" |
 
 for file in "$(dirname "$1")"/arbory "$(dirname "$1")"/*.so; do
   path=$(readelf -d "$file" | sed -n 's/.*R.*PATH.*\[\(.*\)\]/\1/p')
-  [ -z "$path" ] || expect_none "relative library path of $file" "$(echo "$path" | tr : '\n' | grep -v '^[/$]' |
-    sed 's/^/entry: /')"
+  [ -z "$path" ] || expect_none "relative library path of $file" "$(echo "$path" | tr : '\n' |
+    grep -v '^[/$]' | sed 's/^/entry: /')"
 done
 
 cd "$2"
