@@ -30,8 +30,7 @@ class UniqueFd {
 
 // openat2 with O_CLOEXEC; `resolve` is of the RESOLVE_* flags of <linux/openat2.h>. Tried again
 // after a pause where a folder was moved on the way, or where somebody who holds a lease on the
-// file has been told to let go, which the kernel enforces after a minute at most. Invalid with
-// errno set.
+// file has been told to let go, which the kernel enforces in the end. Invalid with errno set.
 UniqueFd OpenAt2(int dir_fd, const char* path, int flags, unsigned long long resolve);
 
 }  // namespace nas
