@@ -6,7 +6,7 @@
 
 #include "arbory/session.h"
 #include "arbory/terminal.h"
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 
 namespace arbory {
 namespace {

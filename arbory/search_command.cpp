@@ -21,10 +21,10 @@
 #include "arbory/search_task.h"
 #include "arbory/session.h"
 #include "arbory/terminal.h"
-#include "nas/engine/result_file.h"
+#include "nas/base/unique_fd.h"
+#include "nas/results/result_file.h"
 #include "nas/system/accounts.h"
 #include "nas/system/shares.h"
-#include "nas/system/unique_fd.h"
 
 namespace arbory {
 namespace {

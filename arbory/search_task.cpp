@@ -3,7 +3,7 @@
 #include <exception>
 #include <memory>
 
-#include "nas/engine/result_file.h"
+#include "nas/results/result_file.h"
 #include "nas/system/volumes.h"
 #include "platform/task.h"
 #include "platform/webfm.h"

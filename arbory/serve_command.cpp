@@ -4,10 +4,10 @@
 
 #include <string>
 
-#include "arbory/server/http_server.h"
-#include "arbory/server/pages.h"
-#include "arbory/server/sample_share.h"
-#include "arbory/server/service.h"
+#include "arbory/server/service/pages.h"
+#include "arbory/server/service/sample_share.h"
+#include "arbory/server/service/service.h"
+#include "arbory/server/transport/http_server.h"
 #include "arbory/session.h"
 #include "arbory/terminal.h"
 #include "nas/system/accounts.h"

@@ -6,7 +6,7 @@
 #include <cerrno>
 
 #include "arbory/interrupt.h"
-#include "nas/system/utf8.h"
+#include "nas/base/utf8.h"
 
 namespace arbory {
 namespace {

@@ -6,9 +6,9 @@
 #include <random>
 #include <string>
 
-#include "nas/engine/literal_finder.h"
-#include "nas/engine/name_pattern.h"
-#include "nas/engine/ordering.h"
+#include "nas/match/literal_finder.h"
+#include "nas/match/name_pattern.h"
+#include "nas/results/ordering.h"
 
 namespace {
 

@@ -1,5 +1,5 @@
 # The `arbory` program. All but its main function is a target of its own, so that tests can link it.
-file(GLOB PROGRAM_SOURCES CONFIGURE_DEPENDS arbory/*.cpp arbory/server/*.cpp)
+file(GLOB PROGRAM_SOURCES CONFIGURE_DEPENDS arbory/*.cpp arbory/server/*/*.cpp)
 list(FILTER PROGRAM_SOURCES EXCLUDE REGEX "/main\\.cpp$")
 add_library(program_objects OBJECT ${PROGRAM_SOURCES})
 target_link_libraries(program_objects PUBLIC arbory_nas PkgConfig::JSONCPP PkgConfig::PAM
@@ -8,8 +8,8 @@ target_compile_definitions(program_objects PRIVATE ARBORY_VERSION="${PROJECT_VER
                            ARBORY_WEB_DIR="${CMAKE_SOURCE_DIR}/web/dist")
 # Half of the time these take to compile is the optimiser's, which gains nothing there: they wait
 # for clients.
-set_source_files_properties(arbory/server/connection.cpp arbory/server/http_server.cpp
-                            arbory/server/child_pipe.cpp PROPERTIES COMPILE_OPTIONS "-O1")
+set_source_files_properties(arbory/server/transport/connection.cpp arbory/server/transport/http_server.cpp
+                            arbory/server/transport/child_pipe.cpp PROPERTIES COMPILE_OPTIONS "-O1")
 
 add_executable(arbory arbory/main.cpp)
 target_compile_definitions(arbory PRIVATE ARBORY_VERSION="${PROJECT_VERSION}")

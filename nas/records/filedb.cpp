@@ -7,10 +7,10 @@
 #include <cerrno>
 #include <functional>
 
-#include "nas/system/error.h"
-#include "nas/system/json_text.h"
-#include "nas/system/sqlite.h"
-#include "nas/system/unique_fd.h"
+#include "nas/base/error.h"
+#include "nas/base/json_text.h"
+#include "nas/base/sqlite.h"
+#include "nas/base/unique_fd.h"
 
 namespace NUVA::WEBFM {
 namespace {

@@ -9,7 +9,7 @@
 #include <cstring>
 #include <vector>
 
-#include "nas/system/error.h"
+#include "nas/base/error.h"
 #include "nas/system/user_state.h"
 #include "platform/system.h"
 

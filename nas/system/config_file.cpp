@@ -20,9 +20,9 @@
 #include <functional>
 #include <map>
 
+#include "nas/base/file_io.h"
 #include "nas/system/accounts.h"
 #include "nas/system/config.h"
-#include "nas/system/file_io.h"
 
 namespace nas {
 namespace {

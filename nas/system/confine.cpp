@@ -18,10 +18,10 @@
 #include <string>
 #include <vector>
 
-#include "nas/system/error.h"
-#include "nas/system/json_text.h"
+#include "nas/base/error.h"
+#include "nas/base/json_text.h"
+#include "nas/base/unique_fd.h"
 #include "nas/system/shares.h"
-#include "nas/system/unique_fd.h"
 #include "nas/system/volumes.h"
 #include "platform/system.h"
 

@@ -6,7 +6,7 @@
 
 #include <string>
 
-#include "nas/system/unique_fd.h"
+#include "nas/base/unique_fd.h"
 
 namespace nas {
 

@@ -5,7 +5,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "nas/system/error.h"
+#include "nas/base/error.h"
 #include "nas/system/share_names.h"
 #include "nas/system/shares.h"
 #include "nas/system/user_state.h"

@@ -9,8 +9,8 @@
 #include <cerrno>
 #include <cstdlib>
 
+#include "nas/base/error.h"
 #include "nas/system/accounts.h"
-#include "nas/system/error.h"
 #include "platform/webfm.h"
 
 namespace nas {

@@ -5,7 +5,7 @@
 #include <cstring>
 #include <string>
 
-#include "nas/system/error.h"
+#include "nas/base/error.h"
 #include "platform/system.h"
 
 pid_t NLIBCProcFork() {

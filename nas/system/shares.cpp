@@ -7,8 +7,8 @@
 #include <memory>
 #include <set>
 
+#include "nas/base/real_path.h"
 #include "nas/system/config.h"
-#include "nas/system/real_path.h"
 #include "nas/system/share_names.h"
 #include "nas/system/volumes.h"
 

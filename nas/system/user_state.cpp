@@ -7,10 +7,10 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "nas/base/error.h"
+#include "nas/base/file_io.h"
 #include "nas/system/accounts.h"
 #include "nas/system/config.h"
-#include "nas/system/error.h"
-#include "nas/system/file_io.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"
 

@@ -11,9 +11,9 @@
 #include <string>
 #include <vector>
 
+#include "nas/base/error.h"
 #include "nas/system/accounts.h"
 #include "nas/system/config.h"
-#include "nas/system/error.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"
 #include "nas/system/shares.h"

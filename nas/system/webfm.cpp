@@ -6,7 +6,7 @@
 
 #include <string_view>
 
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 
 namespace nas {
 namespace {

@@ -4,7 +4,7 @@
 #include <mutex>
 #include <stdexcept>
 
-#include "nas/tasks/pause.h"
+#include "nas/base/pause.h"
 #include "nas/tasks/task_files.h"
 
 namespace OKT {

@@ -14,12 +14,12 @@
 #include <string_view>
 #include <vector>
 
+#include "nas/base/error.h"
+#include "nas/base/file_io.h"
+#include "nas/base/json_text.h"
+#include "nas/base/pause.h"
 #include "nas/system/config.h"
-#include "nas/system/error.h"
-#include "nas/system/file_io.h"
-#include "nas/system/json_text.h"
 #include "nas/system/user_state.h"
-#include "nas/tasks/pause.h"
 
 namespace nas {
 namespace {

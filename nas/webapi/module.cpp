@@ -6,8 +6,8 @@
 
 #include <stdexcept>
 
+#include "nas/base/real_path.h"
 #include "nas/system/config.h"
-#include "nas/system/real_path.h"
 #include "nas/webapi/runner.h"
 
 namespace nas {

@@ -12,7 +12,7 @@
 #include <exception>
 #include <optional>
 
-#include "nas/system/file_io.h"
+#include "nas/base/file_io.h"
 #include "nas/system/user_state.h"
 #include "platform/webfm.h"
 

@@ -12,8 +12,8 @@
 #include <cstdint>
 #include <cstring>
 
-#include "nas/system/error.h"
-#include "nas/system/json_text.h"
+#include "nas/base/error.h"
+#include "nas/base/json_text.h"
 #include "nas/webapi/request_child.h"
 
 namespace nas {

@@ -19,7 +19,7 @@
 #include <string>
 #include <utility>
 
-#include "nas/system/unique_fd.h"
+#include "nas/base/unique_fd.h"
 #include "platform/webapi.h"
 
 namespace nas {

@@ -7,8 +7,8 @@
 #include <fstream>
 #include <random>
 
-#include "nas/engine/candidate_list.h"
-#include "nas/engine/content_query.h"
+#include "nas/match/content_query.h"
+#include "nas/search/candidate_list.h"
 
 namespace nas {
 namespace {

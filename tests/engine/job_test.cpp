@@ -16,8 +16,8 @@
 #include <set>
 #include <thread>
 
-#include "nas/engine/result_reader.h"
-#include "nas/engine/search_job.h"
+#include "nas/results/result_reader.h"
+#include "nas/search/search_job.h"
 #include "nas/system/config.h"
 #include "platform/system.h"
 

@@ -7,11 +7,11 @@
 #include <memory>
 #include <string>
 
-#include "nas/engine/criteria.h"
-#include "nas/engine/folded_name.h"
-#include "nas/engine/glob.h"
-#include "nas/engine/name_pattern.h"
-#include "nas/engine/walk_entry.h"
+#include "nas/match/folded_name.h"
+#include "nas/match/glob.h"
+#include "nas/match/name_pattern.h"
+#include "nas/search/criteria.h"
+#include "nas/search/walk_entry.h"
 
 namespace nas {
 namespace {

@@ -11,8 +11,8 @@
 #include <set>
 #include <thread>
 
-#include "nas/engine/result_reader.h"
-#include "nas/engine/result_writer.h"
+#include "nas/results/result_reader.h"
+#include "nas/results/result_writer.h"
 
 namespace nas {
 namespace {

@@ -24,8 +24,8 @@ for file in "$(dirname "$1")"/arbory "$(dirname "$1")"/*.so; do
 done
 
 cd "$2"
-expect_none "other includes" "$(grep -En '^#include "' api/* search/* history/* |
-  grep -Ev '"(platform|api|search|history)/' || true)"
+expect_none "other includes" "$(grep -En '^#include "' module/*.h module/*.cpp api/* search/* history/* |
+  grep -Ev '"(platform|api|search|history|module)/' || true)"
 expect_none "the platform's own libraries" "$(grep -EHn '#include <(sqlite3|utf8proc|pcre2|boost)' \
-  api/* search/* history/* || true)"
+  module/*.h module/*.cpp api/* search/* history/* || true)"
 exit $failed

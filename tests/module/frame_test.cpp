@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "api/table.h"
 #include "api/webfm_webapi.h"
+#include "module/table.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
 #include "tests/module/scripted_platform.h"

@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "api/table.h"
 #include "history/history_store.h"
+#include "module/table.h"
 #include "search/find_handler.h"
 #include "tests/module/scripted_platform.h"
 

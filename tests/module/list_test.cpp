@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "api/table.h"
+#include "module/table.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
 #include "tests/module/scripted_platform.h"

@@ -5,7 +5,7 @@
 
 #include <cerrno>
 
-#include "api/table.h"
+#include "module/table.h"
 #include "search/stop_clean.h"
 #include "tests/module/scripted_platform.h"
 

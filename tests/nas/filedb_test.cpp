@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <climits>
 
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 #include "platform/filedb.h"
 #include "tests/nas/fixture.h"
 

@@ -12,7 +12,7 @@
 #include <filesystem>
 #include <stdexcept>
 
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 #include "nas/system/user_state.h"
 #include "nas/webapi/runner.h"
 #include "platform/system.h"

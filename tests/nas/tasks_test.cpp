@@ -13,7 +13,7 @@
 #include <memory>
 #include <thread>
 
-#include "nas/system/file_io.h"
+#include "nas/base/file_io.h"
 #include "nas/system/user_state.h"
 #include "nas/tasks/task_files.h"
 #include "platform/task.h"

@@ -9,8 +9,8 @@
 #include <cstdio>
 #include <limits>
 
-#include "nas/system/json_text.h"
-#include "nas/system/utf8.h"
+#include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 #include "platform/json_file.h"
 #include "platform/system.h"
 #include "platform/webfm.h"

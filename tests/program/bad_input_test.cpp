@@ -3,7 +3,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 #include "tests/program/program_test.h"
 
 namespace program_test {

@@ -12,8 +12,8 @@
 #include <memory>
 #include <thread>
 
-#include "nas/system/file_io.h"
-#include "nas/system/json_text.h"
+#include "nas/base/file_io.h"
+#include "nas/base/json_text.h"
 #include "nas/system/user_state.h"
 #include "platform/task.h"
 

@@ -1,6 +1,6 @@
 // Downloads, previews and the page's own files.
 
-#include "arbory/server/files.h"
+#include "arbory/server/service/files.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -10,7 +10,7 @@
 #include <cstdlib>
 #include <filesystem>
 
-#include "arbory/server/http_text.h"
+#include "arbory/server/transport/http_text.h"
 #include "tests/server/server_test.h"
 
 namespace server_test {

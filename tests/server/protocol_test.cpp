@@ -5,8 +5,8 @@
 
 #include <thread>
 
-#include "arbory/server/guard.h"
-#include "arbory/server/http_text.h"
+#include "arbory/server/service/guard.h"
+#include "arbory/server/transport/http_text.h"
 #include "tests/server/server_test.h"
 
 namespace server_test {

@@ -16,7 +16,7 @@
 #include <filesystem>
 #include <thread>
 
-#include "nas/system/json_text.h"
+#include "nas/base/json_text.h"
 
 namespace server_test {
 

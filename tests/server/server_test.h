@@ -11,7 +11,7 @@
 #include <string>
 #include <vector>
 
-#include "nas/system/unique_fd.h"
+#include "nas/base/unique_fd.h"
 #include "tests/nas/fixture.h"
 
 namespace server_test {

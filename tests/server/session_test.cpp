@@ -1,6 +1,6 @@
 // Who is let in, for how long, and as whom.
 
-#include "arbory/server/sessions.h"
+#include "arbory/server/service/sessions.h"
 
 #include <grp.h>
 #include <pwd.h>

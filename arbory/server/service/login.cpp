@@ -1,0 +1,93 @@
+#include "arbory/server/service/login.h"
+
+#include <security/pam_appl.h>
+#include <syslog.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include "arbory/server/transport/child.h"
+#include "arbory/server/transport/http_text.h"
+#include "nas/system/accounts.h"
+
+namespace arbory {
+namespace {
+
+// Answers what PAM asks: a hidden question is taken for the password, a shown one for the name.
+int Converse(int count, const pam_message** questions, pam_response** answers, void* data) {
+  const auto* credentials = static_cast<const Credentials*>(data);
+  if (count <= 0 || count > PAM_MAX_NUM_MSG) return PAM_CONV_ERR;
+  // PAM frees it with the texts in it.
+  auto* given = static_cast<pam_response*>(std::calloc(count, sizeof(pam_response)));
+  if (given == nullptr) return PAM_BUF_ERR;
+  for (int at = 0; at < count; ++at) {
+    const int style = questions[at]->msg_style;
+    if (style == PAM_PROMPT_ECHO_OFF) given[at].resp = strdup(credentials->password.c_str());
+    if (style == PAM_PROMPT_ECHO_ON) given[at].resp = strdup(credentials->user.c_str());
+  }
+  *answers = given;
+  return PAM_SUCCESS;
+}
+
+// The server itself delays every refusal alike.
+void NoDelay(int /*status*/, unsigned /*microseconds*/, void* /*data*/) {}
+
+class Pam {
+ public:
+  Pam(const Credentials& credentials, const PamService& service) {
+    conversation_ = {Converse, const_cast<Credentials*>(&credentials)};
+    status_ =
+        pam_start_confdir(service.name.c_str(), credentials.user.c_str(), &conversation_,
+                          service.folder.empty() ? nullptr : service.folder.c_str(), &handle_);
+    if (status_ == PAM_SUCCESS) {
+      pam_set_item(handle_, PAM_FAIL_DELAY, reinterpret_cast<const void*>(&NoDelay));
+    }
+  }
+  ~Pam() {
+    if (handle_ != nullptr) pam_end(handle_, status_);
+  }
+  Pam(const Pam&) = delete;
+  Pam& operator=(const Pam&) = delete;
+
+  int Check() {
+    if (status_ == PAM_SUCCESS) status_ = pam_authenticate(handle_, PAM_DISALLOW_NULL_AUTHTOK);
+    if (status_ == PAM_SUCCESS) status_ = pam_acct_mgmt(handle_, PAM_DISALLOW_NULL_AUTHTOK);
+    return status_;
+  }
+
+  // Modules may map the name given to another one.
+  std::string User() const {
+    const void* name = nullptr;
+    if (pam_get_item(handle_, PAM_USER, &name) != PAM_SUCCESS || name == nullptr) return {};
+    return static_cast<const char*>(name);
+  }
+
+ private:
+  pam_conv conversation_;
+  pam_handle_t* handle_ = nullptr;
+  int status_ = PAM_ABORT;
+};
+
+ChildHead CheckLogin(const Credentials& credentials, const PamService& service) {
+  const ChildHead refused{kForbidden, kForbidden, {}};
+  Pam pam(credentials, service);
+  const int status = pam.Check();
+  // Modules tell a wrong password by many codes, some of which are also those of their own trouble,
+  // so the client is told one thing and the administrator the other.
+  if (status != PAM_SUCCESS) {
+    syslog(LOG_NOTICE, "login refused by service %s: %s", service.name.c_str(),
+           pam_strerror(nullptr, status));
+    return refused;
+  }
+  const auto account = nas::FindAccount(pam.User());
+  if (!account) return refused;
+  return {kOk, 0, {{kLoginUser, PercentEncoded(account->name)}}};
+}
+
+}  // namespace
+
+nas::RunningCall StartLogin(const Credentials& credentials, const PamService& service) {
+  return StartChild([&](int pipe) { SendReply(pipe, CheckLogin(credentials, service), ""); });
+}
+
+}  // namespace arbory

@@ -1,0 +1,188 @@
+// The service's routes that begin and end sessions.
+
+#include <algorithm>
+#include <ctime>
+
+#include "arbory/server/service/login.h"
+#include "arbory/server/service/service.h"
+#include "arbory/server/service/user_calls.h"
+#include "arbory/server/transport/http_text.h"
+#include "arbory/session.h"
+#include "nas/base/json_text.h"
+
+namespace arbory {
+namespace {
+
+constexpr long kMinuteSeconds = 60;
+// Every refused login takes this long, so that its time tells nothing of the user; far longer than
+// hashing a password, and what PAM's own modules let a wrong one wait.
+constexpr std::chrono::seconds kRefusalTime{2};
+// Names and passwords longer than this are not looked at.
+constexpr size_t kMaxCredentialBytes = 1024;
+// Both, each byte escaped, and some room. Reading a megabyte of JSON takes the loop a fifth of a
+// second, which nobody may ask for who is not logged in.
+constexpr size_t kMaxLoginBytes = size_t{16} << 10;
+constexpr char kStopMethod[] = "stop";
+
+// Takes as long wherever the texts differ.
+bool SameText(const std::string& a, const std::string& b) {
+  unsigned char difference = a.size() == b.size() ? 0 : 1;
+  for (size_t at = 0; at < std::min(a.size(), b.size()); ++at) {
+    difference |= static_cast<unsigned char>(a[at] ^ b[at]);
+  }
+  return difference == 0;
+}
+
+bool IsAbsurd(const std::string& text) {
+  return text.size() > kMaxCredentialBytes || text.find('\0') != std::string::npos;
+}
+
+}  // namespace
+
+Answer Service::OpenByToken(const HttpRequest& request) {
+  const auto given = QueryValue(request.query(), "token");
+  const bool good = !token_.empty() && given && SameText(*given, token_);
+  if (setup_.single_user.empty() || !good) {
+    return ErrorReply(kForbidden,
+                      "This address opens the page only once. Print a new one: send the server "
+                      "the signal HUP, or start it again.");
+  }
+  if (request.method != "GET") return NotAllowedReply("GET");
+  token_.clear();
+  const std::string id = sessions_.Begin(setup_.single_user, std::time(nullptr));
+  HttpReply reply;
+  reply.status = kSeeOther;
+  reply.fields = {
+      {"Location", "/"},
+      {"Set-Cookie", SessionCookie(id, setup_.settings.session_minutes * kMinuteSeconds)},
+      {"Cache-Control", "no-store"}};
+  return reply;
+}
+
+Answer Service::Login(const HttpRequest& request) {
+  if (!setup_.single_user.empty()) {
+    return ErrorReply(kForbidden, "This server has one user; open the address it printed.");
+  }
+  if (request.body.size() > kMaxLoginBytes) {
+    return ErrorReply(kTooLarge, "The user or the password is too long.");
+  }
+  Json::Value params;
+  Answer refusal;
+  if (!ParseBody(request, &params, &refusal)) return refusal;
+  const Json::Value& user = params["user"];
+  const Json::Value& password = params["password"];
+  if (!user.isString() || !password.isString() || user.asString().empty()) {
+    return ErrorReply(kBadRequest, R"(Send {"user": TEXT, "password": TEXT}.)");
+  }
+  Credentials credentials{user.asString(), password.asString()};
+  if (IsAbsurd(credentials.user) || IsAbsurd(credentials.password)) {
+    return ErrorReply(kBadRequest, "The user or the password is too long or malformed.");
+  }
+  const int wait = login_limit_.Begin(request.peer, credentials.user, std::time(nullptr));
+  if (wait > 0) {
+    metrics_.CountRefusedLogin();
+    return BusyReply(kTooMany, "Too many refused logins; wait a minute and try again.",
+                     std::to_string(wait));
+  }
+  const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
+  Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
+  if (auto* child = std::get_if<ChildAnswer>(&answer)) {
+    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, Clock::now()},
+                         count = std::move(child->make_reply)](const ChildHead* head) {
+      count(head);
+      return LoginReply(attempt, head);
+    };
+  }
+  return answer;
+}
+
+HttpReply Service::LoginReply(const Attempt& attempt, const ChildHead* head) {
+  if (head != nullptr && head->status == kOk) {
+    const auto named = SplitPath("/" + head->fields.at(0).second);
+    const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
+    login_limit_.Succeeded(attempt.peer, attempt.user);
+    const std::time_t now = std::time(nullptr);
+    const std::string id = sessions_.Begin(user, now);
+    HttpReply reply = SessionReply(kOk, *sessions_.Find(id, now));
+    reply.fields.emplace_back("Set-Cookie",
+                              SessionCookie(id, setup_.settings.session_minutes * kMinuteSeconds));
+    return reply;
+  }
+  metrics_.CountRefusedLogin();
+  const bool refused = head != nullptr && head->status == kForbidden;
+  HttpReply reply =
+      refused
+          ? ErrorReply(kUnauthorized, "The user or the password is wrong; try again.")
+          : ErrorReply(kUnavailable, "Logins cannot be checked now; the server's log says why.");
+  reply.not_before = attempt.begun + kRefusalTime;
+  return reply;
+}
+
+Answer Service::Logout(HttpRequest* request) {
+  Json::Value params;
+  Answer answer;
+  if (!Authenticate(request, &answer) || !ParseBody(*request, &params, &answer)) return answer;
+  const Json::Value& stops = params["stop_searches"];
+  if (!stops.isNull() && !stops.isBool()) {
+    return ErrorReply(kBadRequest, R"(Send {"stop_searches": true} or false.)");
+  }
+  sessions_.End(Cookie(*request, setup_.cookie));
+  const std::string gone = SessionCookie("", 0);
+  const NUVA::APIMethod* stop = module_.Find(kSearchApi, 1, kStopMethod);
+  if (!stops.isBool() || !stops.asBool() || stop == nullptr) {
+    HttpReply reply = JsonReply(kOk, "{}");
+    reply.fields.emplace_back("Set-Cookie", gone);
+    return reply;
+  }
+  answer = Run(*request, "logout", [&] { return StartStopSearches(request->user, *stop); });
+  if (auto* busy = std::get_if<HttpReply>(&answer)) {
+    busy->fields.emplace_back("Set-Cookie", gone);
+    return answer;
+  }
+  auto& child = std::get<ChildAnswer>(answer);
+  child.make_reply = [make = std::move(child.make_reply), gone](const ChildHead* head) {
+    HttpReply reply = make(head);
+    reply.fields.emplace_back("Set-Cookie", gone);
+    return reply;
+  };
+  return answer;
+}
+
+HttpReply Service::SessionReply(int status, const Sessions::Session& session) const {
+  Json::Value body;
+  body["user"] = session.user;
+  body["mode"] = setup_.single_user.empty() ? "login" : "single";
+  body["expires"] = Json::Int64{session.expires};
+  body["version"] = ARBORY_VERSION;
+  return JsonReply(status, nas::JsonText(body, nas::JsonBytes::kClean));
+}
+
+std::string Service::SessionCookie(const std::string& id, long max_age) const {
+  return setup_.cookie + "=" + id +
+         "; Path=/; HttpOnly; SameSite=Strict; Max-Age=" + std::to_string(max_age) +
+         (setup_.site.behind_tls ? "; Secure" : "");
+}
+
+bool Service::Authenticate(HttpRequest* request, Answer* refusal) {
+  const std::string id = Cookie(*request, setup_.cookie);
+  const auto session = sessions_.Find(id, std::time(nullptr));
+  if (session) {
+    request->user = session->user;
+    return true;
+  }
+  *refusal = NotLoggedIn();
+  return false;
+}
+
+HttpReply Service::NotLoggedIn() const {
+  const bool single = !setup_.single_user.empty();
+  Json::Value body;
+  body["code"] = kUnauthorized;
+  body["error"] = single ? "Open the address that the server printed when it started; a used one "
+                           "is replaced when the server gets the signal HUP."
+                         : "Log in first.";
+  body["mode"] = single ? "single" : "login";
+  return JsonReply(kUnauthorized, nas::JsonText(body, nas::JsonBytes::kClean));
+}
+
+}  // namespace arbory

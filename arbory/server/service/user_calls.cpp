@@ -1,0 +1,171 @@
+#include "arbory/server/service/user_calls.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <climits>
+#include <exception>
+#include <memory>
+#include <vector>
+
+#include "arbory/server/transport/child.h"
+#include "nas/system/shares.h"
+#include "nas/system/user_state.h"
+#include "nas/tasks/task_files.h"
+#include "platform/system.h"
+#include "platform/task.h"
+#include "platform/webfm.h"
+
+namespace arbory {
+namespace {
+
+constexpr char kTaskId[] = "taskid";
+
+Json::Value Error(int status, const char* sentence) {
+  Json::Value body;
+  body["code"] = status;
+  body["error"] = sentence;
+  return body;
+}
+
+// Steps down to the user; answers itself when that fails.
+bool Become(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) >= 0) return true;
+  response->SetError(kUnavailable, Error(kUnavailable, "The server cannot act as this user."));
+  return false;
+}
+
+bool CanList(const std::string& folder) {
+  return faccessat(AT_FDCWD, folder.empty() ? "/" : folder.c_str(), R_OK | X_OK, AT_EACCESS) == 0;
+}
+
+void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (!Become(request, response)) return;
+  Json::Value body;
+  body["shares"] = Json::Value(Json::arrayValue);
+  for (const nas::Share& share : nas::ListShares()) {
+    if (!CanList(share.root)) continue;
+    Json::Value entry;
+    entry["name"] = share.name;
+    entry["indexed"] = FILEIDXIsShareIndexed(share.name.c_str()) != 0;
+    body["shares"].append(entry);
+  }
+  char home[PATH_MAX];
+  const std::string user = request->GetLoginUserName();
+  body["homes"] = NUVAServiceHomePathGet(user.c_str(), home, sizeof home) == 0 && CanList(home);
+  response->SetError(kOk, body);
+}
+
+std::unique_ptr<OKT::Task> OpenTask(const std::string& user, const std::string& id) {
+  try {
+    return std::unique_ptr<OKT::Task>(OKT::TaskMgr(user.c_str()).getTaskWithThrow(id.c_str()));
+  } catch (const std::exception&) {
+    return nullptr;
+  }
+}
+
+void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (!Become(request, response)) return;
+  const std::string id = request->GetParam(kTaskId, "").asString();
+  const auto task = OpenTask(request->GetLoginUserName(), id);
+  if (!task) {
+    response->SetError(kNotFound, Error(kNotFound, "There is no such search; start a new one."));
+    return;
+  }
+  const Json::Value data = task->getProperty("data");
+  Json::Value body;
+  body[kTaskId] = id;
+  body["finished"] = task->isFinished();
+  body["progress"] = task->getProperty("progress");
+  if (data.isObject()) {
+    if (data.isMember("errno")) body["errno"] = data["errno"];
+    body["location"] = data["location"];
+  }
+  body["walk"] = task->getProperty("walk");
+  response->SetError(kOk, body);
+}
+
+std::vector<std::string> RunningTasks(const std::string& user) {
+  std::vector<std::string> ids;
+  constexpr std::string_view kRecord = ".json";
+  const std::unique_ptr<DIR, int (*)(DIR*)> folder(opendir(nas::TaskFolder(user).c_str()),
+                                                   closedir);
+  if (!folder) return ids;
+  while (const dirent* entry = readdir(folder.get())) {
+    std::string name = entry->d_name;
+    if (!name.ends_with(kRecord)) continue;
+    name.resize(name.size() - kRecord.size());
+    const auto task = nas::IsTaskId(name) ? OpenTask(user, name) : nullptr;
+    if (task && !task->isFinished()) ids.push_back(name);
+  }
+  return ids;
+}
+
+// The same request as one for the method "stop" of these searches.
+class StopRequest : public NUVA::APIRequest {
+ public:
+  StopRequest(const NUVA::APIRequest& outer, const NUVA::APIMethod& row, Json::Value ids)
+      : outer_(outer), row_(row), ids_(std::move(ids)) {}
+  std::string GetLoginUserName() const override { return outer_.GetLoginUserName(); }
+  std::string GetSessionID() const override { return outer_.GetSessionID(); }
+  std::string GetPreferenceDir() const override { return outer_.GetPreferenceDir(); }
+  std::string GetAPIMethod() const override { return row_.method; }
+  int GetAPIVersion() const override { return row_.version; }
+  bool HasParam(const std::string& name) const override { return name == kTaskId; }
+  Json::Value GetParam(const std::string& name, const Json::Value& fallback) const override {
+    return HasParam(name) ? ids_ : fallback;
+  }
+
+ private:
+  const NUVA::APIRequest& outer_;
+  const NUVA::APIMethod& row_;
+  const Json::Value ids_;
+};
+
+class NoResponse : public NUVA::APIResponse {
+ public:
+  void SetError(int /*code*/, const Json::Value& /*data*/) override {}
+};
+
+// Table rows carry plain functions, so what the stopping needs waits here for the child, which is
+// forked at once.
+const NUVA::APIMethod* g_stop = nullptr;
+
+void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (!Become(request, response)) return;
+  Json::Value ids(Json::arrayValue);
+  for (const std::string& id : RunningTasks(request->GetLoginUserName())) ids.append(id);
+  Json::Value body;
+  body["stopped"] = ids.size();
+  if (!ids.empty()) {
+    StopRequest stop(*request, *g_stop, ids);
+    NoResponse unheard;
+    g_stop->entry(&stop, &unheard);
+  }
+  response->SetError(kOk, body);
+}
+
+nas::RunningCall Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
+  const NUVA::APIMethod row = {"arbory", 1, "", entry};
+  return nas::StartCall(row, {"", params, user, "server"}, EncodeOwnReply);
+}
+
+}  // namespace
+
+nas::RunningCall StartListShares(const std::string& user) {
+  return Start(ListSharesEntry, user, Json::Value());
+}
+
+nas::RunningCall StartReadSearch(const std::string& user, const std::string& task_id) {
+  Json::Value params;
+  params[kTaskId] = task_id;
+  return Start(ReadSearchEntry, user, params);
+}
+
+nas::RunningCall StartStopSearches(const std::string& user, const NUVA::APIMethod& stop) {
+  g_stop = &stop;
+  return Start(StopSearchesEntry, user, Json::Value());
+}
+
+}  // namespace arbory

@@ -1,0 +1,88 @@
+#include "arbory/server/transport/child_pipe.h"
+
+#include <signal.h>
+#include <unistd.h>
+
+#include <boost/asio/post.hpp>
+#include <cerrno>
+
+namespace arbory {
+namespace {
+
+// What a pipe holds; more would never come at once.
+constexpr size_t kReadBytes = size_t{64} << 10;
+
+}  // namespace
+
+ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::RunningCall child,
+                     std::shared_ptr<void> token, std::chrono::seconds patience)
+    : pipe_(loop),
+      timer_(loop),
+      pid_(child.pid),
+      token_(std::move(token)),
+      patience_(patience),
+      buffer_(kReadBytes) {
+  pipe_.assign(child.fd.Release());
+  pipe_.native_non_blocking(true);
+}
+
+void ChildPipe::Read(Reader reader) {
+  reader_ = std::move(reader);
+  Watch();
+  Wait();
+}
+
+void ChildPipe::Wait() {
+  if (exited_) {
+    boost::asio::post(pipe_.get_executor(),
+                      [self = shared_from_this()] { self->Deliver(/*may_wait=*/false); });
+    return;
+  }
+  pipe_.async_wait(boost::asio::posix::stream_descriptor::wait_read,
+                   [self = shared_from_this()](boost::system::error_code) {
+                     self->Deliver(/*may_wait=*/!self->exited_);
+                   });
+}
+
+void ChildPipe::Deliver(bool may_wait) {
+  if (!reader_ || !pipe_.is_open()) return;
+  ssize_t count;
+  do {
+    count = read(pipe_.native_handle(), buffer_.data(), buffer_.size());
+  } while (count < 0 && errno == EINTR);
+  if (count < 0 && errno == EAGAIN && may_wait) return Wait();
+  timer_.cancel();  // from here on it is the client who is waited for
+  const Reader reader = std::move(reader_);
+  reader_ = nullptr;
+  reader(std::string_view(buffer_.data(), count > 0 ? static_cast<size_t>(count) : 0));
+}
+
+void ChildPipe::Watch() {
+  timer_.cancel();
+  if (exited_) return;
+  timer_.expires_after(patience_);
+  timer_.async_wait([self = shared_from_this()](boost::system::error_code error) {
+    if (!error) self->Kill();
+  });
+}
+
+void ChildPipe::Close() {
+  reader_ = nullptr;
+  boost::system::error_code ignored;
+  pipe_.close(ignored);
+  Watch();
+}
+
+void ChildPipe::OnExit() {
+  exited_ = true;
+  token_.reset();
+  timer_.cancel();
+  boost::system::error_code ignored;
+  if (pipe_.is_open()) pipe_.cancel(ignored);  // a waiting reader looks once more
+}
+
+void ChildPipe::Kill() {
+  if (!exited_) kill(pid_, SIGKILL);
+}
+
+}  // namespace arbory

@@ -1,0 +1,97 @@
+#pragma once
+// One client's connection: reads a request, has it answered, writes the reply, and so on. Included
+// only where the network library is.
+
+#include <boost/asio/io_context.hpp>
+#include <boost/asio/ip/tcp.hpp>
+#include <boost/asio/steady_timer.hpp>
+#include <boost/beast/core/flat_buffer.hpp>
+#include <boost/beast/http/parser.hpp>
+#include <boost/beast/http/string_body.hpp>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "arbory/server/transport/child.h"
+#include "arbory/server/transport/child_pipe.h"
+#include "arbory/server/transport/http.h"
+#include "nas/system/config.h"
+
+namespace arbory {
+
+class Connection;
+
+// What connections need of the server they belong to.
+class ConnectionHost {
+ public:
+  virtual ~ConnectionHost() = default;
+  virtual boost::asio::io_context& loop() = 0;
+  virtual const nas::ServerSettings& settings() const = 0;
+  virtual HttpService& service() = 0;
+  virtual bool stopping() const = 0;
+  virtual std::shared_ptr<ChildPipe> Adopt(ChildAnswer* answer) = 0;
+  virtual void Closed(Connection* connection) = 0;
+};
+
+class Connection : public std::enable_shared_from_this<Connection> {
+ public:
+  Connection(ConnectionHost* host, boost::asio::ip::tcp::socket socket);
+  ~Connection();
+  void Start();
+  // Ends it now when it is between requests; otherwise after the reply.
+  void Stop();
+  void Abort();
+
+ private:
+  using Parser = boost::beast::http::request_parser<boost::beast::http::string_body>;
+  using Error = boost::system::error_code;
+
+  // What the socket does is cancelled, and timed_out_ set, after this long.
+  void Arm(int seconds);
+  void AwaitRequest();
+  void ReadHeader();
+  void OnHeader(Error error);
+  void ReadBody();
+  void OnReadError(Error error);
+  void Dispatch();
+  Answer HandleSafely();
+  void Refuse(int status, const char* sentence);
+
+  void Send(HttpReply reply);
+  void SendNow(HttpReply reply);
+  void AwaitChild(ChildAnswer answer);
+  void OnChildBytes(std::string_view bytes);
+  void OnChildHead(const ChildHead* head);
+  void Relay();
+  std::string HeadText(const HttpReply& reply, std::uint64_t length) const;
+
+  // Writes `out_`, then calls `then`.
+  void Write(void (Connection::*then)());
+  void OnSent();
+  void FinishRequest();
+  void Linger();
+  void Drop();
+
+  ConnectionHost* host_;
+  boost::asio::ip::tcp::socket socket_;
+  boost::asio::steady_timer deadline_;  // for what the socket is doing
+  bool timed_out_ = false;
+  boost::asio::steady_timer delay_;  // of a reply that must not show how long it took
+  boost::beast::flat_buffer in_;
+  std::optional<Parser> parser_;
+  HttpRequest request_;
+  bool between_requests_ = true;
+  bool keep_alive_ = false;
+
+  std::shared_ptr<ChildPipe> child_;
+  std::function<HttpReply(const ChildHead*)> make_reply_;
+  std::optional<HeadReader> head_reader_;
+  std::uint64_t body_left_ = 0;  // of what the child still has to send
+
+  int status_ = 0;
+  std::string out_;
+  size_t out_at_ = 0;
+  std::uint64_t sent_ = 0;
+};
+
+}  // namespace arbory

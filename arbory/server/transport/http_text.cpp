@@ -1,0 +1,203 @@
+#include "arbory/server/transport/http_text.h"
+
+#include <algorithm>
+
+#include "nas/base/json_text.h"
+
+namespace arbory {
+namespace {
+
+constexpr unsigned char kFirstPrintable = 0x20;
+constexpr unsigned char kDelete = 0x7F;
+constexpr char kHexDigits[] = "0123456789ABCDEF";
+constexpr int kBitsPerDigit = 4;
+constexpr int kDigitMask = 0xF;
+
+bool IsControl(unsigned char byte) { return byte < kFirstPrintable || byte == kDelete; }
+
+bool IsUnreserved(char byte) {
+  return (byte >= 'a' && byte <= 'z') || (byte >= 'A' && byte <= 'Z') ||
+         (byte >= '0' && byte <= '9') || byte == '-' || byte == '.' || byte == '_' || byte == '~';
+}
+
+int HexDigit(char digit) {
+  constexpr int kTen = 10;
+  if (digit >= '0' && digit <= '9') return digit - '0';
+  if (digit >= 'a' && digit <= 'f') return digit - 'a' + kTen;
+  if (digit >= 'A' && digit <= 'F') return digit - 'A' + kTen;
+  return -1;
+}
+
+std::optional<std::string> Decoded(std::string_view text) {
+  std::string out;
+  while (!text.empty()) {
+    if (text[0] != '%') {
+      out += text[0];
+      text.remove_prefix(1);
+      continue;
+    }
+    const int high = text.size() > 1 ? HexDigit(text[1]) : -1;
+    const int low = text.size() > 2 ? HexDigit(text[2]) : -1;
+    if (high < 0 || low < 0) return std::nullopt;
+    out += static_cast<char>((high << kBitsPerDigit) | low);
+    text.remove_prefix(3);
+  }
+  return out;
+}
+
+bool IsPlainSegment(const std::string& segment) {
+  return !segment.empty() && segment != "." && segment != ".." &&
+         std::none_of(segment.begin(), segment.end(),
+                      [](char byte) { return byte == '/' || IsControl(byte); });
+}
+
+}  // namespace
+
+const std::string* HttpRequest::Field(std::string_view name) const {
+  const auto found =
+      std::find_if(fields.begin(), fields.end(), [&](const auto& f) { return f.first == name; });
+  return found == fields.end() ? nullptr : &found->second;
+}
+
+size_t HttpRequest::CountOf(std::string_view name) const {
+  return std::count_if(fields.begin(), fields.end(),
+                       [&](const auto& f) { return f.first == name; });
+}
+
+std::string_view HttpRequest::path() const {
+  return std::string_view(target).substr(0, target.find('?'));
+}
+
+std::string_view HttpRequest::query() const {
+  const size_t mark = target.find('?');
+  return mark == std::string::npos ? std::string_view() : std::string_view(target).substr(mark + 1);
+}
+
+std::optional<std::vector<std::string>> SplitPath(std::string_view path) {
+  std::vector<std::string> segments;
+  if (!path.starts_with('/')) return std::nullopt;
+  if (path == "/") return segments;
+  while (!path.empty()) {
+    path.remove_prefix(1);
+    const std::string_view encoded = path.substr(0, path.find('/'));
+    path.remove_prefix(encoded.size());
+    auto segment = Decoded(encoded);
+    if (!segment || !IsPlainSegment(*segment)) return std::nullopt;
+    segments.push_back(std::move(*segment));
+  }
+  return segments;
+}
+
+std::optional<std::string> QueryValue(std::string_view query, std::string_view name) {
+  while (!query.empty()) {
+    const std::string_view pair = query.substr(0, query.find('&'));
+    query.remove_prefix(std::min(query.size(), pair.size() + 1));
+    const size_t equals = pair.find('=');
+    if (pair.substr(0, equals) != name) continue;
+    return Decoded(equals == std::string_view::npos ? "" : pair.substr(equals + 1));
+  }
+  return std::nullopt;
+}
+
+std::string PercentEncoded(std::string_view text) {
+  std::string out;
+  for (const char byte : text) {
+    if (IsUnreserved(byte)) {
+      out += byte;
+    } else {
+      const auto value = static_cast<unsigned char>(byte);
+      out += {'%', kHexDigits[value >> kBitsPerDigit], kHexDigits[value & kDigitMask]};
+    }
+  }
+  return out;
+}
+
+std::string Cookie(const HttpRequest& request, std::string_view name) {
+  for (const auto& [field, value] : request.fields) {
+    if (field != "cookie") continue;
+    std::string_view rest = value;
+    while (!rest.empty()) {
+      std::string_view pair = rest.substr(0, rest.find(';'));
+      rest.remove_prefix(std::min(rest.size(), pair.size() + 1));
+      while (pair.starts_with(' ')) pair.remove_prefix(1);
+      const size_t equals = pair.find('=');
+      if (equals != std::string_view::npos && pair.substr(0, equals) == name) {
+        return std::string(pair.substr(equals + 1));
+      }
+    }
+  }
+  return {};
+}
+
+std::string ContentDisposition(bool inline_shown, const std::string& name) {
+  std::string plain = name;
+  for (char& byte : plain) {
+    const bool safe = byte >= ' ' && byte < kDelete && byte != '"' && byte != '\\' && byte != '%';
+    if (!safe) byte = '_';
+  }
+  return std::string(inline_shown ? "inline" : "attachment") + "; filename=\"" + plain +
+         "\"; filename*=UTF-8''" + PercentEncoded(name);
+}
+
+std::string_view ReasonPhrase(int status) {
+  static constexpr std::pair<int, std::string_view> kPhrases[] = {
+      {kOk, "OK"},
+      {kPartial, "Partial Content"},
+      {kSeeOther, "See Other"},
+      {kBadRequest, "Bad Request"},
+      {kUnauthorized, "Unauthorized"},
+      {kForbidden, "Forbidden"},
+      {kNotFound, "Not Found"},
+      {kNotAllowed, "Method Not Allowed"},
+      {kTimeout, "Request Timeout"},
+      {kTooLarge, "Content Too Large"},
+      {kNotJson, "Unsupported Media Type"},
+      {kNotSatisfiable, "Range Not Satisfiable"},
+      {kTooMany, "Too Many Requests"},
+      {kHeaderTooLarge, "Request Header Fields Too Large"},
+      {kUnavailable, "Service Unavailable"},
+  };
+  for (const auto& [number, phrase] : kPhrases) {
+    if (number == status) return phrase;
+  }
+  return "Unknown";
+}
+
+std::string LowerCase(std::string_view text) {
+  std::string lower(text);
+  for (char& byte : lower) {
+    if (byte >= 'A' && byte <= 'Z') byte = static_cast<char>(byte - 'A' + 'a');
+  }
+  return lower;
+}
+
+HttpReply JsonReply(int status, std::string body) {
+  return {status,
+          {{"Content-Type", "application/json"}, {"Cache-Control", "no-store"}},
+          std::move(body)};
+}
+
+HttpReply ErrorReply(int status, int code, std::string_view sentence) {
+  Json::Value body;
+  body["code"] = code;
+  body["error"] = std::string(sentence);
+  return JsonReply(status, nas::JsonText(body, nas::JsonBytes::kClean));
+}
+
+HttpReply ErrorReply(int status, std::string_view sentence) {
+  return ErrorReply(status, status, sentence);
+}
+
+HttpReply NotAllowedReply(const std::string& allowed_methods) {
+  HttpReply reply = ErrorReply(kNotAllowed, "Use " + allowed_methods + " here.");
+  reply.fields.emplace_back("Allow", allowed_methods);
+  return reply;
+}
+
+HttpReply BusyReply(int status, std::string_view sentence, const std::string& retry_seconds) {
+  HttpReply reply = ErrorReply(status, sentence);
+  reply.fields.emplace_back("Retry-After", retry_seconds);
+  return reply;
+}
+
+}  // namespace arbory

@@ -1,0 +1,39 @@
+#pragma once
+// The texts of HTTP: targets, cookies, headers and error bodies.
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "arbory/server/transport/http.h"
+
+namespace arbory {
+
+// The segments of a path, decoded once; none for "/". Nothing when it does not begin with "/", or a
+// segment is empty, even a final one, "." or "..", or holds after decoding a "/", a control
+// character or an incomplete escape: none may mean another place than it seems to, and a proxy's
+// rule for "/metrics" must not be passed by as "/metrics/".
+std::optional<std::vector<std::string>> SplitPath(std::string_view path);
+// The value of a parameter in a query; nothing when it is not there or badly encoded.
+std::optional<std::string> QueryValue(std::string_view query, std::string_view name);
+// Encodes all but letters, digits and "-._~".
+std::string PercentEncoded(std::string_view text);
+
+// The value of a cookie in the request; empty when it is not there.
+std::string Cookie(const HttpRequest& request, std::string_view name);
+
+// An attachment or inline header with the name in both forms, the plain one for old clients.
+std::string ContentDisposition(bool inline_shown, const std::string& name);
+
+std::string_view ReasonPhrase(int status);
+std::string LowerCase(std::string_view text);
+
+HttpReply JsonReply(int status, std::string body);
+// {"code":STATUS,"error":SENTENCE}, or with a code of its own.
+HttpReply ErrorReply(int status, std::string_view sentence);
+HttpReply ErrorReply(int status, int code, std::string_view sentence);
+HttpReply NotAllowedReply(const std::string& allowed_methods);
+HttpReply BusyReply(int status, std::string_view sentence, const std::string& retry_seconds);
+
+}  // namespace arbory

@@ -1,0 +1,70 @@
+// The last platform error number, and its translation into web API codes. Nothing here touches
+// errno: callers log it with %m afterwards.
+
+#include "nas/base/error.h"
+
+#include <atomic>
+#include <cerrno>
+
+#include "platform/system.h"
+#include "platform/webfm.h"
+
+namespace nas {
+namespace {
+
+std::atomic<int> g_last_error{kErrorNone};
+
+}  // namespace
+
+void SetLastError(PlatformError error) { g_last_error.store(error, std::memory_order_relaxed); }
+
+PlatformError ErrorFromErrno(int error_number) {
+  switch (error_number) {
+    case EACCES:
+    case EPERM:
+    case EROFS:
+      return kErrorPermission;
+    case ENOENT:
+    case ENOTDIR:
+      return kErrorNoSuchFolder;
+    case ENOSPC:
+    case EDQUOT:
+      return kErrorNoSpace;
+    case EXDEV:  // what openat2 says of a path that leaves its share
+    case ELOOP:
+    case ENAMETOOLONG:
+    case EINVAL:
+      return kErrorIllegal;
+    case EIO:
+      return kErrorIo;
+    default:
+      return kErrorOther;
+  }
+}
+
+}  // namespace nas
+
+int NLIBCErrGet() { return nas::g_last_error.load(std::memory_order_relaxed); }
+
+int WfmLibGetErr() { return WfmParseErrnoToError(NLIBCErrGet(), nullptr, nullptr); }
+
+int WfmParseErrnoToError(int error, const char* /*path*/, const char* /*other_path*/) {
+  constexpr int kCodePermission = 407;
+  constexpr int kCodeNoSuchFolder = 408;
+  constexpr int kCodeNoSuchAccount = 405;
+  constexpr int kCodeIllegal = 418;
+  constexpr int kCodeFailed = 401;
+  switch (error) {
+    case nas::kErrorPermission:
+      return kCodePermission;
+    case nas::kErrorNoSuchFolder:
+      return kCodeNoSuchFolder;
+    case nas::kErrorUnknownUser:
+    case nas::kErrorUnknownGroup:
+      return kCodeNoSuchAccount;
+    case nas::kErrorIllegal:
+      return kCodeIllegal;
+    default:
+      return kCodeFailed;
+  }
+}

@@ -1,0 +1,197 @@
+#include "nas/base/json_text.h"
+
+#include <json/reader.h>
+
+#include <array>
+#include <charconv>
+#include <cmath>
+#include <memory>
+
+#include "nas/base/utf8.h"
+
+namespace nas {
+namespace {
+
+constexpr unsigned char kFirstPrintable = 0x20;
+constexpr unsigned char kFirstNonAscii = 0x80;
+constexpr size_t kNumberBytes = 32;  // longest 64-bit integer or shortest exact double
+
+void AppendEscaped(unsigned char byte, std::string* out) {
+  switch (byte) {
+    case '"':
+      *out += "\\\"";
+      return;
+    case '\\':
+      *out += "\\\\";
+      return;
+    case '\b':
+      *out += "\\b";
+      return;
+    case '\f':
+      *out += "\\f";
+      return;
+    case '\n':
+      *out += "\\n";
+      return;
+    case '\r':
+      *out += "\\r";
+      return;
+    case '\t':
+      *out += "\\t";
+      return;
+    default: {
+      constexpr char kDigits[] = "0123456789abcdef";
+      *out += "\\u00";
+      *out += kDigits[byte >> 4];
+      *out += kDigits[byte & 0xF];
+    }
+  }
+}
+
+bool NeedsCare(unsigned char byte, JsonBytes bytes) {
+  return byte < kFirstPrintable || byte == '"' || byte == '\\' ||
+         (byte >= kFirstNonAscii && bytes == JsonBytes::kClean);
+}
+
+void AppendString(std::string_view text, JsonBytes bytes, std::string* out) {
+  *out += '"';
+  while (!text.empty()) {
+    size_t plain = 0;
+    while (plain < text.size() && !NeedsCare(static_cast<unsigned char>(text[plain]), bytes)) {
+      ++plain;
+    }
+    out->append(text.substr(0, plain));
+    text.remove_prefix(plain);
+    if (text.empty()) break;
+    const auto byte = static_cast<unsigned char>(text[0]);
+    if (byte < kFirstNonAscii) {
+      AppendEscaped(byte, out);
+      text.remove_prefix(1);
+      continue;
+    }
+    const Utf8Step step = NextUtf8(text);
+    out->append(step.valid ? text.substr(0, step.length) : kReplacementCharacter);
+    text.remove_prefix(step.length);
+  }
+  *out += '"';
+}
+
+template <typename Number>
+void AppendNumber(Number number, std::string* out) {
+  std::array<char, kNumberBytes> text;
+  const auto end = std::to_chars(text.data(), text.data() + text.size(), number).ptr;
+  out->append(text.data(), end);
+}
+
+void AppendReal(double number, std::string* out) {
+  if (!std::isfinite(number)) {
+    *out += "null";
+    return;
+  }
+  const size_t start = out->size();
+  AppendNumber(number, out);
+  // Keeps a real a real when it is read again.
+  if (out->find_first_of(".e", start) == std::string::npos) *out += ".0";
+}
+
+std::string_view StringOf(const Json::Value& value) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (!value.getString(&begin, &end)) return {};
+  return {begin, static_cast<size_t>(end - begin)};
+}
+
+void AppendArray(const Json::Value& value, JsonBytes bytes, std::string* out) {
+  *out += '[';
+  bool first = true;
+  for (const Json::Value& item : value) {
+    if (!first) *out += ',';
+    first = false;
+    AppendJson(item, bytes, out);
+  }
+  *out += ']';
+}
+
+void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
+  *out += '{';
+  bool first = true;
+  for (auto member = value.begin(); member != value.end(); ++member) {
+    if (!first) *out += ',';
+    first = false;
+    const char* end = nullptr;
+    const char* begin = member.memberName(&end);
+    AppendString({begin, static_cast<size_t>(end - begin)}, bytes, out);
+    *out += ':';
+    AppendJson(*member, bytes, out);
+  }
+  *out += '}';
+}
+
+// JsonCpp's reader passes over comments inside arrays and objects even when told not to allow them.
+bool HasComment(std::string_view text) {
+  bool in_string = false;
+  for (size_t at = 0; at < text.size(); ++at) {
+    if (text[at] == '/' && !in_string) return true;
+    if (text[at] == '\\')
+      ++at;
+    else if (text[at] == '"')
+      in_string = !in_string;
+  }
+  return false;
+}
+
+}  // namespace
+
+void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out) {
+  switch (value.type()) {
+    case Json::nullValue:
+      *out += "null";
+      return;
+    case Json::intValue:
+      return AppendNumber(value.asLargestInt(), out);
+    case Json::uintValue:
+      return AppendNumber(value.asLargestUInt(), out);
+    case Json::realValue:
+      return AppendReal(value.asDouble(), out);
+    case Json::stringValue:
+      return AppendString(StringOf(value), bytes, out);
+    case Json::booleanValue:
+      *out += value.asBool() ? "true" : "false";
+      return;
+    case Json::arrayValue:
+      return AppendArray(value, bytes, out);
+    case Json::objectValue:
+      return AppendObject(value, bytes, out);
+  }
+}
+
+std::string JsonText(const Json::Value& value, JsonBytes bytes) {
+  std::string text;
+  AppendJson(value, bytes, &text);
+  return text;
+}
+
+bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
+  if (HasComment(text)) return false;
+  Json::CharReaderBuilder settings;
+  settings["collectComments"] = false;
+  settings["allowComments"] = false;
+  settings["allowTrailingCommas"] = false;
+  settings["strictRoot"] = false;
+  settings["failIfExtra"] = true;
+  settings["rejectDupKeys"] = false;
+  settings["stackLimit"] = max_depth;
+  const std::unique_ptr<Json::CharReader> reader(settings.newCharReader());
+  // The reader throws when a document is too deep, and may leave a half-read value behind.
+  try {
+    Json::Value value;
+    Json::String trouble;
+    if (!reader->parse(text.data(), text.data() + text.size(), &value, &trouble)) return false;
+    *out = std::move(value);
+    return true;
+  } catch (const Json::Exception&) {
+    return false;
+  }
+}
+
+}  // namespace nas

@@ -1,0 +1,38 @@
+#include "nas/base/pause.h"
+
+#include <algorithm>
+#include <cerrno>
+
+namespace nas {
+namespace {
+
+constexpr long long kNanosecondsPerSecond = 1'000'000'000;
+constexpr long long kNanosecondsPerTenth = kNanosecondsPerSecond / 10;
+// The first is about what a write takes; the last is below what a person notices.
+constexpr long long kFirstPause = 500'000;
+constexpr long long kLongestPause = 20'000'000;
+
+long long Now() {
+  timespec now;
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  return now.tv_sec * kNanosecondsPerSecond + now.tv_nsec;
+}
+
+}  // namespace
+
+GrowingPause::GrowingPause(int tenths)
+    : deadline_(Now() + std::max(tenths, 0) * kNanosecondsPerTenth), pause_(kFirstPause) {}
+
+bool GrowingPause::Wait() {
+  const long long left = deadline_ - Now();
+  if (left <= 0) return false;
+  const long long pause = std::min(pause_, left);
+  const timespec length = {static_cast<time_t>(pause / kNanosecondsPerSecond),
+                           static_cast<long>(pause % kNanosecondsPerSecond)};
+  // A signal may end it early: the caller then looks once more than needed.
+  nanosleep(&length, nullptr);
+  pause_ = std::min(pause_ * 2, kLongestPause);
+  return true;
+}
+
+}  // namespace nas

@@ -1,0 +1,92 @@
+#include "nas/base/sqlite.h"
+
+#include <cerrno>
+
+namespace nas {
+
+SqliteError::SqliteError(sqlite3* db, const std::string& what)
+    : std::runtime_error(what + ": " + (db != nullptr ? sqlite3_errmsg(db) : "out of memory")),
+      code_(db != nullptr ? sqlite3_errcode(db) & 0xff : SQLITE_NOMEM),
+      system_errno_(db != nullptr ? sqlite3_system_errno(db) : ENOMEM) {}
+
+Database::Database(const std::string& path, int flags, int busy_milliseconds) {
+  if (sqlite3_open_v2(path.c_str(), &db_, flags | SQLITE_OPEN_NOMUTEX, nullptr) != SQLITE_OK) {
+    SqliteError error(db_, path);
+    sqlite3_close(db_);
+    throw error;
+  }
+  sqlite3_busy_timeout(db_, busy_milliseconds);
+}
+
+Database::~Database() { sqlite3_close(db_); }
+
+void Database::Execute(const char* sql) {
+  if (sqlite3_exec(db_, sql, nullptr, nullptr, nullptr) != SQLITE_OK) throw SqliteError(db_, sql);
+}
+
+void Database::EmptyLog() {
+  sqlite3_wal_checkpoint_v2(db_, nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
+}
+
+Statement::Statement(const Database& db, const char* sql) : db_(db.handle()) {
+  if (sqlite3_prepare_v2(db_, sql, -1, &statement_, nullptr) != SQLITE_OK) {
+    throw SqliteError(db_, sql);
+  }
+}
+
+Statement& Statement::Bind(int index, std::int64_t value) {
+  sqlite3_bind_int64(statement_, index, value);
+  return *this;
+}
+
+Statement& Statement::BindBlob(int index, std::string_view bytes) {
+  sqlite3_bind_blob64(statement_, index, bytes.data(), bytes.size(), SQLITE_STATIC);
+  return *this;
+}
+
+Statement& Statement::BindText(int index, std::string_view text) {
+  sqlite3_bind_text64(statement_, index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
+  return *this;
+}
+
+bool Statement::Step() {
+  const int result = sqlite3_step(statement_);
+  if (result == SQLITE_ROW) return true;
+  if (result == SQLITE_DONE) return false;
+  const SqliteError error(db_, sqlite3_sql(statement_));
+  Reset();
+  throw error;
+}
+
+void Statement::Run() {
+  while (Step()) {
+  }
+  Reset();
+}
+
+void Statement::Reset() {
+  sqlite3_reset(statement_);
+  sqlite3_clear_bindings(statement_);
+}
+
+std::string_view Statement::Bytes(int column) const {
+  // The order matters: asking for the blob first settles its form, so the count is of that form.
+  const void* bytes = sqlite3_column_blob(statement_, column);
+  const int count = sqlite3_column_bytes(statement_, column);
+  return {static_cast<const char*>(bytes), static_cast<size_t>(count)};
+}
+
+Transaction::Transaction(Database& db, Kind kind) : db_(db) {
+  db_.Execute(kind == Kind::kWrite ? "BEGIN IMMEDIATE" : "BEGIN");
+}
+
+Transaction::~Transaction() {
+  if (open_) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);
+}
+
+void Transaction::Commit() {
+  db_.Execute("COMMIT");
+  open_ = false;
+}
+
+}  // namespace nas

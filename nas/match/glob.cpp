@@ -1,0 +1,149 @@
+#include "nas/match/glob.h"
+
+#include <algorithm>
+
+namespace nas {
+namespace {
+
+constexpr size_t kNone = std::string_view::npos;
+// Bytes that are no UTF-8 become characters of their own, beyond all of Unicode.
+constexpr char32_t kStrayByte = 0x110000;
+
+// Reads the character at `at` and moves behind it.
+char32_t NextCharacter(std::string_view text, size_t& at) {
+  const auto lead = static_cast<unsigned char>(text[at++]);
+  if (lead < 0x80) return lead;
+  const size_t more = lead >= 0xf0 ? 3 : lead >= 0xe0 ? 2 : lead >= 0xc2 ? 1 : 0;
+  if (more == 0 || lead > 0xf4 || text.size() - at < more) return kStrayByte + lead;
+  char32_t c = lead & (0x3fU >> more);
+  for (size_t i = 0; i < more; ++i) {
+    const auto next = static_cast<unsigned char>(text[at + i]);
+    if ((next & 0xc0) != 0x80) return kStrayByte + lead;
+    c = (c << 6) | (next & 0x3fU);
+  }
+  at += more;
+  return c;
+}
+
+// Position of the "]" that closes the "[" at `open`, or npos. A "]" that comes first in the set
+// stands for itself.
+size_t SetEnd(std::string_view pattern, size_t open) {
+  size_t first = open + 1;
+  if (first < pattern.size() && (pattern[first] == '!' || pattern[first] == '^')) ++first;
+  return first < pattern.size() ? pattern.find(']', first + 1) : kNone;
+}
+
+}  // namespace
+
+bool Glob::HasWildcard(std::string_view text) {
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] == '*' || text[i] == '?') return true;
+    if (text[i] == '[' && SetEnd(text, i) != kNone) return true;
+  }
+  return false;
+}
+
+Glob::Glob(std::string_view pattern) {
+  size_t from = 0;
+  for (size_t i = 0; i < pattern.size(); ++i) {
+    if (pattern[i] == '[') {
+      const size_t end = SetEnd(pattern, i);
+      if (end != kNone) i = end;
+    } else if (pattern[i] == '*') {
+      segments_.push_back(ParseSegment(pattern.substr(from, i - from)));
+      from = i + 1;
+    }
+  }
+  segments_.push_back(ParseSegment(pattern.substr(from)));
+}
+
+Glob::Segment Glob::ParseSegment(std::string_view pattern) {
+  Segment segment;
+  if (!HasWildcard(pattern)) {
+    segment.literal = pattern;
+    return segment;
+  }
+  for (size_t i = 0; i < pattern.size();) {
+    Unit unit;
+    const size_t end = pattern[i] == '[' ? SetEnd(pattern, i) : kNone;
+    if (pattern[i] == '?') {
+      unit.any = true;
+      ++i;
+    } else if (end != kNone) {
+      ++i;
+      if (pattern[i] == '!' || pattern[i] == '^') {
+        unit.negated = true;
+        ++i;
+      }
+      while (i < end) {
+        const char32_t low = NextCharacter(pattern, i);
+        char32_t high = low;
+        if (i + 1 < end && pattern[i] == '-') {
+          ++i;
+          high = NextCharacter(pattern, i);
+        }
+        unit.ranges.emplace_back(low, high);
+      }
+      i = end + 1;
+    } else {
+      const char32_t c = NextCharacter(pattern, i);
+      unit.ranges.emplace_back(c, c);
+    }
+    segment.units.push_back(std::move(unit));
+  }
+  return segment;
+}
+
+std::string_view Glob::LongestLiteral() const {
+  return std::ranges::max_element(segments_, {}, [](const Segment& s) { return s.literal.size(); })
+      ->literal;
+}
+
+bool Glob::Unit::Accepts(char32_t c) const {
+  if (any) return true;
+  const bool in = std::any_of(ranges.begin(), ranges.end(),
+                              [c](const auto& r) { return r.first <= c && c <= r.second; });
+  return in != negated;
+}
+
+size_t Glob::Segment::MatchAt(std::string_view text, size_t at) const {
+  if (units.empty()) return text.substr(at).starts_with(literal) ? at + literal.size() : kNone;
+  for (const Unit& unit : units) {
+    if (at == text.size() || !unit.Accepts(NextCharacter(text, at))) return kNone;
+  }
+  return at;
+}
+
+size_t Glob::Segment::FindFrom(std::string_view text, size_t from) const {
+  if (units.empty()) {
+    const size_t at = text.find(literal, from);
+    return at == kNone ? kNone : at + literal.size();
+  }
+  for (size_t at = from; at < text.size(); NextCharacter(text, at)) {
+    const size_t end = MatchAt(text, at);
+    if (end != kNone) return end;
+  }
+  return kNone;
+}
+
+bool Glob::Segment::MatchesEnd(std::string_view text, size_t from) const {
+  if (units.empty()) return text.substr(from).ends_with(literal);
+  for (size_t at = from; at < text.size(); NextCharacter(text, at)) {
+    if (MatchAt(text, at) == text.size()) return true;
+  }
+  return false;
+}
+
+bool Glob::Matches(std::string_view text) const {
+  size_t at = segments_.front().MatchAt(text, 0);
+  if (at == kNone) return false;
+  if (segments_.size() == 1) return at == text.size();
+  // Taking the first place where each middle segment fits leaves the most for those behind it.
+  for (size_t i = 1; i + 1 < segments_.size(); ++i) {
+    at = segments_[i].FindFrom(text, at);
+    if (at == kNone) return false;
+  }
+  return segments_.back().MatchesEnd(text, at);
+}
+
+}  // namespace nas

@@ -1,0 +1,108 @@
+#include "nas/match/regex.h"
+
+#define PCRE2_CODE_UNIT_WIDTH 8
+#include <pcre2.h>
+
+#include <array>
+#include <new>
+
+#include "nas/match/folded_name.h"
+
+namespace nas {
+namespace {
+
+// Backtracking steps in one search of one text: a second or so at worst for the most hostile
+// expression, far above what honest ones need.
+constexpr std::uint32_t kMatchLimit = 2'000'000;
+// Machine stack for compiled code, grown on demand; the built-in 32 KiB is too little for
+// expressions with many alternatives.
+constexpr size_t kJitStackStart = 32 * 1024;
+constexpr size_t kJitStackMost = 1024 * 1024;
+
+// What matching needs besides the expression, one for each thread.
+class Scratch {
+ public:
+  Scratch()
+      : match_(pcre2_match_data_create(1, nullptr)),
+        context_(pcre2_match_context_create(nullptr)),
+        stack_(pcre2_jit_stack_create(kJitStackStart, kJitStackMost, nullptr)) {
+    if (match_ == nullptr || context_ == nullptr) throw std::bad_alloc();
+    pcre2_set_match_limit(context_, kMatchLimit);
+    if (stack_ != nullptr) pcre2_jit_stack_assign(context_, nullptr, stack_);
+  }
+  ~Scratch() {
+    pcre2_jit_stack_free(stack_);
+    pcre2_match_context_free(context_);
+    pcre2_match_data_free(match_);
+  }
+  Scratch(const Scratch&) = delete;
+  Scratch& operator=(const Scratch&) = delete;
+
+  pcre2_match_data* match() const { return match_; }
+  pcre2_match_context* context() const { return context_; }
+
+ private:
+  pcre2_match_data* match_;
+  pcre2_match_context* context_;
+  pcre2_jit_stack* stack_;
+};
+
+std::uint32_t CompileOptions(Regex::Kind kind) {
+  constexpr std::uint32_t kCommon =
+      PCRE2_UTF | PCRE2_UCP | PCRE2_CASELESS | PCRE2_MATCH_INVALID_UTF | PCRE2_NEVER_BACKSLASH_C;
+  switch (kind) {
+    case Regex::Kind::kName:
+      return kCommon | PCRE2_DOTALL | PCRE2_DOLLAR_ENDONLY;
+    case Regex::Kind::kContent:
+      return kCommon | PCRE2_MULTILINE;
+    case Regex::Kind::kLiteral:
+      return PCRE2_UTF | PCRE2_CASELESS | PCRE2_MATCH_INVALID_UTF | PCRE2_LITERAL;
+  }
+  return kCommon;
+}
+
+// Null, with the number and place of the error, for a broken expression.
+pcre2_code* CompileFor(std::string_view pattern, std::uint32_t options, int& number,
+                       PCRE2_SIZE& where) {
+  pcre2_code* code = pcre2_compile(reinterpret_cast<PCRE2_SPTR>(pattern.data()), pattern.size(),
+                                   options, &number, &where, nullptr);
+  // Where no machine code can be made the expression is interpreted: slower, never wrong.
+  if (code != nullptr) pcre2_jit_compile(code, PCRE2_JIT_COMPLETE);
+  return code;
+}
+
+}  // namespace
+
+std::shared_ptr<const Regex> Regex::Compile(std::string_view pattern, Kind kind,
+                                            std::string& error) {
+  int number = 0;
+  PCRE2_SIZE where = 0;
+  const std::uint32_t options = CompileOptions(kind);
+  pcre2_code* code = CompileFor(pattern, options, number, where);
+  if (code == nullptr) {
+    std::array<PCRE2_UCHAR, 256> text{};
+    pcre2_get_error_message(number, text.data(), text.size());
+    error = std::string(reinterpret_cast<const char*>(text.data())) + " at character " +
+            std::to_string(where);
+    return nullptr;
+  }
+  constexpr std::uint32_t kUnicode = PCRE2_UTF | PCRE2_UCP | PCRE2_MATCH_INVALID_UTF;
+  pcre2_code* ascii_code =
+      IsAscii(pattern) ? CompileFor(pattern, options & ~kUnicode, number, where) : nullptr;
+  return std::shared_ptr<const Regex>(new Regex(code, ascii_code));
+}
+
+Regex::~Regex() {
+  pcre2_code_free(static_cast<pcre2_code*>(code_));
+  pcre2_code_free(static_cast<pcre2_code*>(ascii_code_));
+}
+
+bool Regex::Finds(std::string_view text) const {
+  thread_local Scratch scratch;
+  const void* code = ascii_code_ != nullptr && IsAscii(text) ? ascii_code_ : code_;
+  return pcre2_match(static_cast<const pcre2_code*>(code),
+                     reinterpret_cast<PCRE2_SPTR>(text.data()), text.size(), 0, 0, scratch.match(),
+                     scratch.context()) >= 0;
+}
+
+}  // namespace nas

@@ -1,0 +1,88 @@
+#include "nas/results/result_file.h"
+
+#include <dirent.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <ctime>
+#include <memory>
+#include <utility>
+#include <vector>
+
+#include "nas/base/file_io.h"
+
+namespace nas {
+namespace {
+
+constexpr size_t kIdDigits = 32;
+constexpr std::string_view kSuffix = ".db";
+constexpr char kLogSuffix[] = "-wal";
+constexpr std::array<const char*, 3> kCompanions = {"", kLogSuffix, "-shm"};
+constexpr time_t kKeepSeconds = 24 * 60 * 60;
+
+// When the result file or its log was last written; 0 when neither is there.
+time_t LastWritten(const std::string& path) {
+  time_t newest = 0;
+  for (const char* companion : kCompanions) {
+    struct stat status;
+    if (stat((path + companion).c_str(), &status) == 0) newest = std::max(newest, status.st_mtime);
+  }
+  return newest;
+}
+
+}  // namespace
+
+ResultWatch::ResultWatch(const std::string& path) : log_(path + kLogSuffix), seen_(Look()) {}
+
+ResultWatch::Stamp ResultWatch::Look() const {
+  struct stat status = {};
+  if (stat(log_.c_str(), &status) != 0) return {};
+  return {status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
+}
+
+bool ResultWatch::Changed() {
+  const Stamp before = std::exchange(seen_, Look());
+  return before != seen_;
+}
+
+std::string NewResultId() { return RandomName(); }
+
+bool IsResultId(std::string_view id) {
+  return id.size() == kIdDigits &&
+         id.find_first_not_of("0123456789abcdef") == std::string_view::npos;
+}
+
+std::string ResultPath(const std::string& folder, const std::string& id) {
+  return folder + "/" + id + std::string(kSuffix);
+}
+
+bool RemoveResultFile(const std::string& path) {
+  const bool removed = unlink(path.c_str()) == 0;
+  for (const char* companion : kCompanions) unlink((path + companion).c_str());
+  return removed;
+}
+
+void SweepResultFolder(const std::string& folder) {
+  std::vector<std::string> stale;
+  const std::unique_ptr<DIR, int (*)(DIR*)> dir(opendir(folder.c_str()), closedir);
+  if (!dir) return;
+  const time_t oldest_kept = time(nullptr) - kKeepSeconds;
+  while (const dirent* entry = readdir(dir.get())) {
+    std::string_view name = entry->d_name;
+    // A companion can be all that is left: a reader makes one anew while the file is deleted.
+    for (const std::string_view companion : kCompanions) {
+      if (name.ends_with(companion)) name.remove_suffix(companion.size());
+    }
+    if (!name.ends_with(kSuffix) || !IsResultId(name.substr(0, name.size() - kSuffix.size()))) {
+      continue;
+    }
+    const std::string path = folder + "/" + std::string(name);
+    if (LastWritten(path) < oldest_kept) stale.push_back(path);
+  }
+  for (const std::string& path : stale) RemoveResultFile(path);
+}
+
+}  // namespace nas

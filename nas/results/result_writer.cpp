@@ -1,0 +1,75 @@
+#include "nas/results/result_writer.h"
+
+namespace nas {
+namespace {
+
+// Large pages, because a block's columns are some tens of kilobytes each. The log is emptied into
+// the file now and then, so that it does not grow as large as the results.
+constexpr char kMakeFile[] =
+    "PRAGMA synchronous=OFF;"
+    "PRAGMA page_size=16384;"
+    "PRAGMA journal_mode=WAL;"
+    "PRAGMA wal_autocheckpoint=1024;"
+    "BEGIN;"
+    "CREATE TABLE location(id INTEGER PRIMARY KEY, share_name BLOB, share_root BLOB);"
+    "CREATE TABLE names(first INTEGER PRIMARY KEY, count INTEGER, folders BLOB, names BLOB);"
+    "CREATE TABLE attributes(first INTEGER PRIMARY KEY, data BLOB);"
+    "CREATE TABLE purged(row INTEGER PRIMARY KEY);"
+    "CREATE TABLE complete(rows INTEGER);"
+    "CREATE TABLE ordering(id INTEGER PRIMARY KEY, data BLOB);"
+    "PRAGMA user_version=1;"
+    "COMMIT;";
+static_assert(kResultVersion == 1, "the version is written above");
+
+Database MakeResultFile(const std::string& path) {
+  Database db(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_EXRESCODE,
+              kResultBusyMilliseconds);
+  db.Execute(kMakeFile);
+  return db;
+}
+
+}  // namespace
+
+ResultWriter::ResultWriter(const std::string& path)
+    : db_(MakeResultFile(path)),
+      insert_names_(db_, "INSERT INTO names VALUES(?,?,?,?)"),
+      insert_attributes_(db_, "INSERT INTO attributes VALUES(?,?)") {}
+
+void ResultWriter::AddLocation(std::uint16_t id, const std::string& share_name,
+                               const std::string& share_root) {
+  const std::lock_guard lock(mutex_);
+  Statement(db_, "INSERT INTO location VALUES(?,?,?)")
+      .Bind(1, id)
+      .BindBlob(2, share_name)
+      .BindBlob(3, share_root)
+      .Run();
+}
+
+void ResultWriter::Append(RowBlock& block) {
+  if (block.size() == 0) return;
+  const std::lock_guard lock(mutex_);
+  const auto first = static_cast<std::int64_t>(rows_);
+  Transaction transaction(db_, Transaction::Kind::kWrite);
+  insert_names_.Bind(1, first)
+      .Bind(2, static_cast<std::int64_t>(block.size()))
+      .BindBlob(3, block.folders())
+      .BindBlob(4, block.names())
+      .Run();
+  insert_attributes_.Bind(1, first).BindBlob(2, block.attributes()).Run();
+  transaction.Commit();
+  rows_ += block.size();
+  block.Clear();
+}
+
+void ResultWriter::Complete() {
+  const std::lock_guard lock(mutex_);
+  Statement(db_, "INSERT INTO complete VALUES(?)").Bind(1, static_cast<std::int64_t>(rows_)).Run();
+  db_.EmptyLog();
+}
+
+std::uint64_t ResultWriter::rows() {
+  const std::lock_guard lock(mutex_);
+  return rows_;
+}
+
+}  // namespace nas

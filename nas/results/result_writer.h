@@ -1,0 +1,35 @@
+#pragma once
+// The writing end of a result database: made by the worker, fed with blocks by its threads.
+
+#include <cstdint>
+#include <mutex>
+#include <string>
+
+#include "nas/base/sqlite.h"
+#include "nas/results/row_block.h"
+
+namespace nas {
+
+class ResultWriter {
+ public:
+  // Makes the file, which must not exist. Throws SqliteError.
+  explicit ResultWriter(const std::string& path);
+
+  // Registers where rows lie; to be called before any block that names it. Throws SqliteError.
+  void AddLocation(std::uint16_t id, const std::string& share_name, const std::string& share_root);
+  // Appends the block's rows and empties it; they are visible to listings at once. Callable from
+  // any thread. Throws SqliteError; the block then keeps its rows.
+  void Append(RowBlock& block);
+  // Says that no rows will follow, so that orderings are worth keeping. Throws SqliteError.
+  void Complete();
+  std::uint64_t rows();
+
+ private:
+  std::mutex mutex_;  // guards everything below
+  Database db_;
+  Statement insert_names_;
+  Statement insert_attributes_;
+  std::uint64_t rows_ = 0;
+};
+
+}  // namespace nas

@@ -1,0 +1,45 @@
+#pragma once
+// A block of result rows on its way into a result database.
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "nas/results/result_file.h"
+
+namespace nas {
+
+class RowBlock {
+ public:
+  // Rows in a block at most: some 150 KB, small enough to read for one row of a page, large enough
+  // that storing a block costs little beside finding its rows.
+  static constexpr size_t kMostRows = 2048;
+
+  // Says where the rows that follow lie: `path` below the share's root of location `location`.
+  void SetFolder(std::uint16_t location, std::string_view path);
+  void Add(std::string_view name, const FileAttributes& attributes);
+
+  size_t size() const { return attributes_.size(); }
+  bool full() const { return size() >= kMostRows; }
+  void Clear();
+
+  std::string_view folders() const { return folders_; }
+  std::string_view names() const { return names_; }
+  std::string_view attributes() const {
+    return {reinterpret_cast<const char*>(attributes_.data()),
+            attributes_.size() * sizeof(FileAttributes)};
+  }
+
+ private:
+  std::vector<FileAttributes> attributes_;
+  std::string names_;
+  std::string folders_;
+  std::uint32_t folder_count_ = 0;
+  // The folder set last, kept over Clear and written to `folders_` with its first row.
+  std::uint16_t location_ = 0;
+  std::string path_;
+  bool folder_written_ = false;
+};
+
+}  // namespace nas

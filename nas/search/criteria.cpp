@@ -1,0 +1,173 @@
+#include "nas/search/criteria.h"
+
+#include <syslog.h>
+
+#include <algorithm>
+#include <cstring>
+
+#include "nas/base/error.h"
+#include "nas/search/walk_entry.h"
+#include "platform/system.h"
+
+namespace nas {
+
+bool PatternComp::match(const FileSearch::WalkEntry& entry) const {
+  return pattern_.Matches(*entry.name);
+}
+
+ExtensionComp::ExtensionComp(std::string_view list) {
+  constexpr std::string_view kSeparators = ",; ";
+  size_t at = 0;
+  while ((at = list.find_first_not_of(kSeparators, at)) != std::string_view::npos) {
+    const size_t end = std::min(list.find_first_of(kSeparators, at), list.size());
+    std::string_view extension = list.substr(at, end - at);
+    at = end;
+    if (extension.starts_with("*.")) extension.remove_prefix(1);
+    if (extension.starts_with(".")) extension.remove_prefix(1);
+    if (!extension.empty()) suffixes_.push_back("." + FoldText(extension));
+  }
+}
+
+bool ExtensionComp::match(const FileSearch::WalkEntry& entry) const {
+  if (suffixes_.empty()) return true;
+  const std::string_view name = entry.name->folded();
+  return std::ranges::any_of(suffixes_, [name](const std::string& suffix) {
+    return name.size() > suffix.size() && name.ends_with(suffix);
+  });
+}
+
+std::unique_ptr<KindComp> KindComp::Parse(std::string_view word) {
+  static constexpr struct {
+    std::string_view word;
+    FileCategory category;
+  } kCategories[] = {{"image", FileCategory::kImage},
+                     {"video", FileCategory::kVideo},
+                     {"audio", FileCategory::kAudio},
+                     {"document", FileCategory::kDocument},
+                     {"archive", FileCategory::kArchive}};
+  const std::string folded = AsciiLower(word);
+  std::unique_ptr<KindComp> comp(new KindComp);
+  comp->any_ = folded.empty();
+  if (folded.empty() || folded == "file") return comp;
+  if (folded == "dir") {
+    comp->dirs_ = true;
+    return comp;
+  }
+  for (const auto& known : kCategories) {
+    if (folded != known.word) continue;
+    comp->category_ = known.category;
+    return comp;
+  }
+  return nullptr;
+}
+
+bool KindComp::match(const FileSearch::WalkEntry& entry) const {
+  if (any_) return true;
+  if (entry.is_dir != dirs_) return false;
+  return !category_ || IsInCategory(ExtensionOf(entry.name->folded()), *category_);
+}
+
+bool OwnerComp::match(const FileSearch::WalkEntry& entry) const {
+  return entry.attributes->uid == uid_;
+}
+
+bool GroupComp::match(const FileSearch::WalkEntry& entry) const {
+  return entry.attributes->gid == gid_;
+}
+
+namespace {
+
+// Each makes one comparator, or returns null with the last error set.
+std::unique_ptr<FileSearch::FindComp> MakePattern(const char* text) {
+  std::string trouble;
+  auto pattern = NamePattern::Parse(text, trouble);
+  if (pattern) return std::make_unique<PatternComp>(std::move(*pattern));
+  syslog(LOG_NOTICE, "search pattern refused: %s", trouble.c_str());
+  SetLastError(kErrorIllegal);
+  return nullptr;
+}
+
+std::unique_ptr<FileSearch::FindComp> MakeKind(const char* word) {
+  auto comp = KindComp::Parse(word);
+  if (!comp) SetLastError(kErrorIllegal);
+  return comp;
+}
+
+std::unique_ptr<FileSearch::FindComp> MakeOwner(const char* name) {
+  NUVAUSER* user = nullptr;
+  if (NUVAUserGet(name, &user) != 0) return nullptr;
+  auto comp = std::make_unique<OwnerComp>(user->nUid);
+  NUVAUserFree(user);
+  return comp;
+}
+
+std::unique_ptr<FileSearch::FindComp> MakeGroup(const char* name) {
+  NUVAGROUP* group = nullptr;
+  if (NUVAGroupGet(name, &group) != 0) return nullptr;
+  auto comp = std::make_unique<GroupComp>(group->nGid);
+  NUVAGroupFree(group);
+  return comp;
+}
+
+}  // namespace
+}  // namespace nas
+
+namespace FileSearch {
+
+FindSizeComp::FindSizeComp(const char* op, long long bytes)
+    : at_least_(std::strcmp(op, "greater") == 0), bytes_(bytes) {}
+
+bool FindSizeComp::match(const WalkEntry& entry) const {
+  if (entry.is_dir) return false;
+  const auto size = static_cast<long long>(entry.attributes->size);
+  return at_least_ ? size >= bytes_ : size <= bytes_;
+}
+
+FindTimeComp::FindTimeComp(const char* op, long seconds)
+    : after_(std::strcmp(op, "after") == 0), seconds_(seconds) {}
+
+bool FindTimeComp::InRange(std::int64_t file_seconds) const {
+  return after_ ? file_seconds >= seconds_ : file_seconds <= seconds_;
+}
+
+bool FindMTimeComp::match(const WalkEntry& entry) const { return InRange(entry.attributes->mtime); }
+
+bool FindCRTimeComp::match(const WalkEntry& entry) const {
+  return entry.attributes->crtime != nas::FileAttributes::kNoTime &&
+         InRange(entry.attributes->crtime);
+}
+
+bool FindATimeComp::match(const WalkEntry& entry) const { return InRange(entry.attributes->atime); }
+
+int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
+                              std::vector<FindComp*>& comps) {
+  const char* text = field == FIND_FILETYPE ? arg1 : arg2;
+  std::unique_ptr<FindComp> comp;
+  if (text == nullptr) {
+    nas::SetLastError(nas::kErrorIllegal);
+    return 0;
+  }
+  switch (field) {
+    case FIND_PATTERN:
+      comp = nas::MakePattern(text);
+      break;
+    case FIND_FILETYPE:
+      comp = nas::MakeKind(text);
+      break;
+    case FIND_EXTENSION:
+      comp = std::make_unique<nas::ExtensionComp>(text);
+      break;
+    case FIND_OWNER:
+      comp = nas::MakeOwner(text);
+      break;
+    case FIND_GROUP:
+      comp = nas::MakeGroup(text);
+      break;
+  }
+  if (!comp) return 0;
+  comps.push_back(comp.get());
+  comp.release();
+  return 1;
+}
+
+}  // namespace FileSearch

@@ -1,0 +1,96 @@
+#include "nas/search/location.h"
+
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "nas/base/error.h"
+#include "nas/base/real_path.h"
+#include "nas/system/volumes.h"
+
+namespace nas {
+namespace {
+
+// Cuts "/SHARE/below" into its share and a path without empty and "." components. False for a
+// text that is no location.
+bool SplitLocation(std::string_view text, std::string& share, std::string& path) {
+  if (!text.starts_with('/') || text.find('\0') != std::string_view::npos) return false;
+  while (!text.empty()) {
+    text.remove_prefix(1);
+    const std::string_view component = text.substr(0, text.find('/'));
+    text.remove_prefix(component.size());
+    if (component == "..") return false;
+    if (component.empty() || component == ".") continue;
+    if (share.empty()) {
+      share = component;
+    } else {
+      if (!path.empty()) path.push_back('/');
+      path.append(component);
+    }
+  }
+  return !share.empty();
+}
+
+// A path that leads out of its share is not a missing folder but one that may not be asked for.
+PlatformError LocationError(int error_number) {
+  switch (error_number) {
+    case EXDEV:
+    case ELOOP:
+    case ENAMETOOLONG:
+      return kErrorIllegal;
+    case ENOENT:
+    case ENOTDIR:
+      return kErrorNoSuchFolder;
+    default:
+      return ErrorFromErrno(error_number);
+  }
+}
+
+// Whether the folder is the temporary folder of a volume, or lies in one.
+bool IsTemporary(int folder) {
+  const auto path = RealPath("/proc/self/fd/" + std::to_string(folder));
+  if (!path) return false;
+  std::vector<std::string> volumes = ListVolumes();
+  volumes.push_back(ScratchVolume());
+  return std::ranges::any_of(volumes, [&path](const std::string& volume) {
+    const auto temporary = RealPath(volume + "/" + kTemporaryFolder);
+    return temporary && (*path + "/").starts_with(*temporary + "/");
+  });
+}
+
+std::optional<Location> Fail(PlatformError error) {
+  SetLastError(error);
+  return std::nullopt;
+}
+
+}  // namespace
+
+std::optional<Location> OpenLocation(const std::string& text) {
+  Location location;
+  std::string share_name;
+  if (!SplitLocation(text, share_name, location.path)) return Fail(kErrorIllegal);
+  const std::optional<Share> share = FindShare(share_name);
+  if (!share) return Fail(kErrorNoSuchFolder);
+  location.share = *share;
+
+  const std::string root = share->root.empty() ? "/" : share->root;
+  const UniqueFd root_fd(open(root.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!root_fd) return Fail(LocationError(errno));
+  location.fd = OpenAt2(root_fd.get(), location.path.empty() ? "." : location.path.c_str(),
+                        O_PATH | O_DIRECTORY, RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
+  if (!location.fd) return Fail(LocationError(errno));
+  // A folder that cannot be read is the location's own error, not one of a search inside it.
+  const UniqueFd readable(openat(location.fd.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  struct stat status;
+  if (!readable || fstat(readable.get(), &status) != 0) return Fail(LocationError(errno));
+  if (IsTemporary(readable.get())) return Fail(kErrorIllegal);
+  location.device = status.st_dev;
+  location.inode = status.st_ino;
+  return location;
+}
+
+}  // namespace nas

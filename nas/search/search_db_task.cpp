@@ -1,0 +1,207 @@
+// Result databases as listings see them.
+
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <memory>
+
+#include "nas/base/error.h"
+#include "nas/match/file_kinds.h"
+#include "nas/results/result_file.h"
+#include "nas/results/result_reader.h"
+#include "nas/system/shares.h"
+#include "platform/filesearch.h"
+
+namespace FileSearch {
+namespace {
+
+std::string RelativePath(const nas::ResultRow& row) {
+  std::string path(row.folder);
+  if (!path.empty()) path.push_back('/');
+  return path.append(row.name);
+}
+
+std::string RealPath(const nas::ResultRow& row) {
+  return std::string(row.share_root) + "/" + RelativePath(row);
+}
+
+// Listings take a file for vanished when it cannot be reached, but a dangling symbolic link and a
+// file in a folder that was closed meanwhile are still there.
+bool HasVanished(const std::string& path) {
+  struct stat info;
+  return lstat(path.c_str(), &info) != 0 && (errno == ENOENT || errno == ENOTDIR);
+}
+
+// Lends rows to a callback in the platform's form, row after row from the same memory.
+class Lender {
+ public:
+  Lender(nas::ResultReader& reader, SelectCallback callback, void* context)
+      : reader_(reader), callback_(callback), context_(context) {}
+
+  BOOL Lend(const nas::ResultRow& row) {
+    const nas::FileAttributes& file = *row.attributes;
+    relative_path_.assign(row.folder);
+    if (!relative_path_.empty()) relative_path_.push_back('/');
+    relative_path_.append(row.name);
+    __tag_FILE_INFO_DATA data{};
+    data.share_root = Keep(share_root_, row.share_root);
+    data.share_name = Keep(share_name_, row.share_name);
+    data.name = Keep(name_, row.name);
+    data.relative_path = relative_path_.data();
+    data.extension = Keep(extension_, nas::ExtensionOf(row.name));
+    data.mode = file.mode;
+    data.owner_name = Keep(owner_, reader_.UserName(file.uid));
+    data.group_name = Keep(group_, reader_.GroupName(file.gid));
+    data.uid = file.uid;
+    data.gid = file.gid;
+    data.is_dir = S_ISDIR(file.mode);
+    data.size = file.size;
+    data.atime = file.atime;
+    data.mtime = file.mtime;
+    data.ctime = file.ctime;
+    data.crtime = file.crtime == nas::FileAttributes::kNoTime ? 0 : file.crtime;
+    return callback_(&data, context_);
+  }
+
+ private:
+  static char* Keep(std::string& kept, std::string_view text) {
+    kept.assign(text);
+    return kept.data();
+  }
+
+  nas::ResultReader& reader_;
+  const SelectCallback callback_;
+  void* const context_;
+  std::string share_root_;
+  std::string share_name_;
+  std::string name_;
+  std::string relative_path_;
+  std::string extension_;
+  std::string owner_;
+  std::string group_;
+};
+
+}  // namespace
+
+class WfmSearchDBTask::Impl {
+ public:
+  explicit Impl(const std::string& path) : path_(path), reader_(path) {}
+
+  bool Query(unsigned long offset, unsigned long limit, const nas::Selection& selection,
+             SelectCallback callback, void* context, unsigned long long* total);
+  bool Delete(const std::string& share_name, const std::string& real_path);
+  bool Remove() { return nas::RemoveResultFile(path_); }
+
+ private:
+  void FlushPurges();
+
+  const std::string path_;
+  nas::ResultReader reader_;
+  // Purges asked for by a running selection wait for its end: it reads one state of the file. Once
+  // storing them has failed (a full disk), further ones are refused, so that the caller does not
+  // ask for ever.
+  std::optional<std::uint32_t> current_;  // the row lent to the callback
+  std::vector<std::uint32_t> purges_;
+  bool purging_fails_ = false;
+};
+
+bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
+                                  const nas::Selection& selection, SelectCallback callback,
+                                  void* context, unsigned long long* total) {
+  reader_.Begin();
+  const nas::ResultReader::Page page = reader_.Select(selection, offset, limit);
+  *total = page.total;
+  Lender lender(reader_, callback, context);
+  for (const std::uint32_t number : page.numbers) {
+    current_ = number;
+    if (lender.Lend(reader_.Row(number)) == 0) break;
+  }
+  current_.reset();
+  reader_.End();
+  FlushPurges();
+  return true;
+}
+
+void WfmSearchDBTask::Impl::FlushPurges() {
+  if (purges_.empty()) return;
+  try {
+    reader_.Purge(purges_);
+  } catch (const nas::SqliteError& error) {
+    syslog(LOG_ERR, "search results: %s", error.what());
+    purging_fails_ = true;
+  }
+  purges_.clear();
+}
+
+bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::string& real_path) {
+  if (purging_fails_) return false;
+  const auto is_the_file = [&](const nas::ResultRow& row) {
+    return row.share_name == share_name && RealPath(row) == real_path;
+  };
+  if (current_) {
+    if (!is_the_file(reader_.Row(*current_)) || !HasVanished(real_path)) return false;
+    purges_.push_back(*current_);
+    return true;
+  }
+  reader_.Begin();
+  for (std::uint32_t row = 0; row < reader_.rows(); ++row) {
+    if (!reader_.purged(row) && is_the_file(reader_.Row(row))) purges_.push_back(row);
+  }
+  reader_.End();
+  const bool found = !purges_.empty();
+  FlushPurges();
+  return found && !purging_fails_;
+}
+
+WfmSearchDBTask::WfmSearchDBTask(std::unique_ptr<Impl> impl) : impl_(std::move(impl)) {}
+
+WfmSearchDBTask::~WfmSearchDBTask() = default;
+
+bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, const char* sort_by,
+                                  const bool* ascending, const _tag_dir_entry_type_* type,
+                                  const char* pattern, SelectCallback callback, void* context,
+                                  unsigned long long* total) const try {
+  nas::Selection selection;
+  if (sort_by != nullptr) {
+    const std::optional<nas::SortColumn> column = nas::ParseSortColumn(sort_by);
+    if (!column) return false;
+    selection.column = *column;
+  }
+  selection.ascending = ascending == nullptr || *ascending;
+  if (type != nullptr && *type != DIR_ENTRY_ALL) selection.directories = *type == DIR_ENTRY_DIR;
+  if (pattern != nullptr) {
+    std::string trouble;
+    selection.pattern = nas::NamePattern::Parse(pattern, trouble);
+    if (!selection.pattern) return false;
+    if (selection.pattern->terms().empty()) selection.pattern.reset();
+  }
+  return impl_->Query(offset, limit, selection, callback, context, total);
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return false;
+}
+
+bool WfmSearchDBTask::delRecs(std::string share_name, std::string real_path) try {
+  return impl_->Delete(share_name, real_path);
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return false;
+}
+
+bool WfmSearchDBTask::remove() { return impl_->Remove(); }
+
+WfmSearchDBTaskMgr::WfmSearchDBTaskMgr(const char* user) : user_(user) {}
+
+WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* id) const try {
+  if (!nas::IsResultId(id)) return nullptr;
+  const std::string folder = nas::ResultFolder(volume, user_);
+  if (folder.empty()) return nullptr;
+  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(nas::ResultPath(folder, id)));
+} catch (const std::exception& error) {
+  syslog(LOG_ERR, "search results: %s", error.what());
+  return nullptr;
+}
+
+}  // namespace FileSearch

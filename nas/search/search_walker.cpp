@@ -1,0 +1,262 @@
+// The walker that a search worker runs: opens the locations, makes the result database, runs the
+// job and tells the task how it goes.
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <system_error>
+
+#include "nas/base/error.h"
+#include "nas/base/file_io.h"
+#include "nas/base/unique_fd.h"
+#include "nas/results/result_file.h"
+#include "nas/results/result_reader.h"
+#include "nas/results/result_writer.h"
+#include "nas/search/location.h"
+#include "nas/search/search_job.h"
+#include "nas/system/shares.h"
+#include "platform/filesearch.h"
+#include "platform/system.h"
+
+namespace FileSearch {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// The task record is written at most this often for the sake of progress.
+constexpr std::chrono::milliseconds kReportInterval(200);
+// Rows name their location in 16 bits.
+constexpr size_t kMostLocations = 65'535;
+
+// Each location and each level of a tree that is being read holds a descriptor, so the usual soft
+// bound of 1,024 would end at some hundred folders.
+void RaiseDescriptorLimit() {
+  rlimit limit;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+// The kind of trouble, as the walk counts what it skips.
+int ErrnoOf(nas::PlatformError error) {
+  if (error == nas::kErrorPermission) return EACCES;
+  return error == nas::kErrorNoSuchFolder ? ENOENT : EINVAL;
+}
+
+// Turns what a job threw into the last error. To be called in a catch block.
+void SetErrorFromException() {
+  try {
+    throw;
+  } catch (const nas::SqliteError& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(error.code() == SQLITE_FULL ? nas::kErrorNoSpace : nas::kErrorDatabase);
+  } catch (const std::system_error& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(nas::ErrorFromErrno(error.code().value()));
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "search: %s", error.what());
+    nas::SetLastError(nas::kErrorOther);
+  }
+}
+
+// Results from this many on take noticeably long to sort for the first time.
+constexpr std::uint64_t kWorthSorting = 100'000;
+// A million rows take three quarters of it. Sorting goes on after that, but the search has
+// finished.
+constexpr std::chrono::milliseconds kSortingPatience(1000);
+constexpr std::chrono::milliseconds kStopTick(25);
+constexpr int kSortingNiceness = 10;
+
+// Sorts a search's results by every column, so that no listing of a finished search has to wait for
+// it. Done in a process of its own, because it takes some 100 bytes of memory a row, more than a
+// worker shall have, and because the worker may go before it. It gives up every descriptor first:
+// one of them says that the search's worker is alive. No SQLite handle may be open in this process.
+pid_t StartSorting(const std::string& path) {
+  const pid_t child = fork();
+  if (child != 0) return child;  // where no process can be had, listings sort for themselves
+  signal(SIGTERM, SIG_DFL);
+  closelog();
+  close_range(0, ~0U, 0);
+  if (nice(kSortingNiceness) == -1) errno = 0;
+  // Where memory runs out, this is what the machine can best do without.
+  if (const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC)); score) {
+    nas::WriteAll(score.get(), "1000");
+  }
+  try {
+    nas::ResultReader(path).KeepAllOrderings();
+  } catch (const std::exception&) {
+  }
+  _exit(0);
+}
+
+}  // namespace
+
+class WfmSearchWalker::Impl {
+ public:
+  Impl(const char* user, OKT::Task* task, const int* stop_flag)
+      : user_(user), task_(task), stop_flag_(*stop_flag) {}
+
+  bool Init(const std::vector<std::string>& texts, const std::vector<FindComp*>& comps);
+  bool Walk(const Json::Value& options);
+  void set_current_only(bool current_only) { current_only_ = current_only; }
+  const char* id() const { return id_.c_str(); }
+  const char* volume() const { return volume_.c_str(); }
+
+ private:
+  void Report(const nas::WalkProgress& progress, bool last);
+  void WaitForSorting(pid_t child) const;
+  [[noreturn]] void EndWorker();
+
+  const std::string user_;
+  OKT::Task* const task_;
+  const int& stop_flag_;
+  std::vector<FindComp*> comps_;
+  std::vector<nas::Location> locations_;
+  std::vector<int> unopened_;  // why each of the other locations is not searched
+  std::string volume_;
+  std::string folder_;
+  std::string id_;
+  std::unique_ptr<nas::ResultWriter> writer_;
+  bool current_only_ = false;
+  bool told_ready_ = false;
+  Clock::time_point reported_;
+};
+
+bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
+                                 const std::vector<FindComp*>& comps) try {
+  comps_ = comps;
+  nas::PlatformError first_error = nas::kErrorNoSuchFolder;
+  RaiseDescriptorLimit();
+  for (const std::string& text : texts) {
+    std::optional<nas::Location> location;
+    nas::SetLastError(nas::kErrorOther);
+    if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
+    if (location) {
+      locations_.push_back(std::move(*location));
+      continue;
+    }
+    const auto error = static_cast<nas::PlatformError>(NLIBCErrGet());
+    if (unopened_.empty()) first_error = error;
+    unopened_.push_back(ErrnoOf(error));
+  }
+  if (locations_.empty()) {
+    nas::SetLastError(first_error);
+    return false;
+  }
+  volume_ = nas::ResultVolume(locations_.front().share, user_);
+  if (volume_.empty()) return false;
+  folder_ = nas::ResultFolder(volume_, user_);
+  if (folder_.empty()) return false;
+  nas::SweepResultFolder(folder_);
+  id_ = nas::NewResultId();
+  // Where the file cannot be made whole nobody will ever know its name.
+  struct Cleanup {
+    const std::string path;
+    bool keep = false;
+    ~Cleanup() {
+      if (!keep) nas::RemoveResultFile(path);
+    }
+  } file{nas::ResultPath(folder_, id_)};
+  writer_ = std::make_unique<nas::ResultWriter>(file.path);
+  for (size_t i = 0; i < locations_.size(); ++i) {
+    writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
+                         locations_[i].share.root);
+  }
+  file.keep = true;
+  return true;
+} catch (...) {
+  SetErrorFromException();
+  return false;
+}
+
+bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
+  nas::SearchJob job(
+      locations_, comps_, *writer_, stop_flag_,
+      {.recursive = !current_only_,
+       .search_content = options.get("search_content", false).asBool(),
+       .temporary_folder = folder_,
+       .unopened = unopened_,
+       .report = [this](const nas::WalkProgress& progress) { Report(progress, false); },
+       .stuck = [this] { EndWorker(); }});
+  const bool completed = job.Run();
+  writer_->Complete();
+  Report(job.progress(), true);
+  if (writer_->rows() >= kWorthSorting) {
+    writer_.reset();
+    WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
+  }
+  return completed;
+} catch (...) {
+  SetErrorFromException();
+  return false;
+}
+
+void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
+  const auto stopped = [this] { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; };
+  // What a stopped search has found is sorted without anybody waiting for it.
+  if (child < 0 || stopped()) return;
+  const Clock::time_point end = Clock::now() + kSortingPatience;
+  const nas::UniqueFd sorting(static_cast<int>(syscall(SYS_pidfd_open, child, 0)));
+  pollfd ended{sorting.get(), POLLIN, 0};
+  while (sorting && !stopped() && Clock::now() < end) {
+    if (poll(&ended, 1, static_cast<int>(kStopTick.count())) > 0) break;
+  }
+  // Who stops a search that has found everything has no more use for it.
+  if (stopped()) kill(child, SIGKILL);
+  waitpid(child, nullptr, WNOHANG);
+}
+
+// A thread cannot be ended, but a process can: this is how a stopped search's worker ends, only
+// without waiting for the walk to return.
+void WfmSearchWalker::Impl::EndWorker() {
+  task_->finish(false);
+  _exit(0);
+}
+
+void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {
+  const Clock::time_point now = Clock::now();
+  if (!last && told_ready_ && now - reported_ < kReportInterval) return;
+  reported_ = now;
+  task_->beginUpdate();
+  task_->setProperty("walk", progress.ToJson());
+  if (!told_ready_) task_->setProperty("result_ready", true);
+  // A task that was removed meanwhile has nobody left to tell.
+  task_->endUpdate();
+  told_ready_ = true;
+}
+
+WfmSearchWalker::WfmSearchWalker(const char* user, const char* /*session*/, OKT::Task* task,
+                                 int* stop_flag)
+    : impl_(std::make_unique<Impl>(user, task, stop_flag)) {}
+
+WfmSearchWalker::~WfmSearchWalker() = default;
+
+bool WfmSearchWalker::init(const std::vector<std::string>& locations,
+                           const std::vector<FindComp*>& comps) {
+  return impl_->Init(locations, comps);
+}
+
+void WfmSearchWalker::setSearchCurrentDir(bool current_only) {
+  impl_->set_current_only(current_only);
+}
+
+const char* WfmSearchWalker::getDBTaskId() { return impl_->id(); }
+
+const char* WfmSearchWalker::getDBVol() { return impl_->volume(); }
+
+// Access times are among the criteria given to init, and those are judged before any file is read,
+// so the separate list has nothing to add.
+bool WfmSearchWalker::Walk(const std::vector<FindATimeComp*>& /*atime_comps*/,
+                           const Json::Value& options) {
+  return impl_->Walk(options);
+}
+
+}  // namespace FileSearch
