@@ -1,10 +1,10 @@
-// The last platform error number, and its translation into web API codes. Nothing here touches
-// errno: callers log it with %m afterwards.
+// Failures as values, the last platform error number, and its translation into web API codes.
 
 #include "nas/base/error.h"
 
 #include <atomic>
 #include <cerrno>
+#include <cstring>
 
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -40,6 +40,22 @@ PlatformError ErrorFromErrno(int error_number) {
     default:
       return kErrorOther;
   }
+}
+
+std::string Error::Text() const {
+  const char* meaning = error_number != 0 ? std::strerror(error_number) : "failed";
+  return path.empty() ? meaning : path + ": " + meaning;
+}
+
+Error ErrnoError(std::string path) { return ErrnoError(errno, std::move(path)); }
+
+Error ErrnoError(int error_number, std::string path) {
+  return {ErrorFromErrno(error_number), error_number, std::move(path)};
+}
+
+void Report(const Error& error) {
+  SetLastError(error.kind);
+  errno = error.error_number;
 }
 
 }  // namespace nas
