@@ -28,6 +28,8 @@ def parse_arguments():
     parser.add_argument("--quick", action="store_true", help="trees of a tenth of the size")
     parser.add_argument("--write", action="store_true", help="write docs/benchmarks.md")
     parser.add_argument("--only", default="", help="rows whose name holds this text")
+    parser.add_argument("--before", type=pathlib.Path, metavar="DIR",
+                        help="an older build's bin folder, measured as one more peer")
     return parser.parse_args()
 
 
@@ -212,6 +214,9 @@ def main():
     rows = []
     for name, commands, target in comparisons(args, trees):
         if args.only in name:
+            if args.before:
+                older = [args.before / "arbory", *commands["ours"][1:]]
+                commands = {"ours": commands["ours"], "before": older, **commands}
             rows += compare(name, commands, target)
             print(*(" | ".join(row) for row in rows[-len(commands) + 1:]), sep="\n",
                   file=sys.stderr)
