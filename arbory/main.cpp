@@ -3,13 +3,13 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
-#include <cstdint>
 #include <exception>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "arbory/call_command.h"
+#include "arbory/command_line.h"
 #include "arbory/options.h"
 #include "arbory/search_command.h"
 #include "arbory/serve_command.h"
@@ -19,16 +19,9 @@ namespace arbory {
 namespace {
 
 // Lines of these texts fit a terminal of 80 columns.
-constexpr char kPatternHelp[] =
-    "PATTERN is compared with names, letter case ignored: a word matches anywhere in\n"
-    "the name, with *, ? or [ ] the whole name. Several words must all match; a|b is\n"
-    "either, !a is not, \"a b\" is one word, regex: begins a regular expression and ''\n"
-    "is every name. A -- ends the options.\n"
-    "\n"
-    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31,\n"
-    "2026-01-31T12:00, an age such as 30m, 12h or 7d, or seconds since 1970. Bounds\n"
-    "are inclusive; a date alone means the whole day. COLUMN is name, path, size,\n"
-    "type, user, group, mode, mtime, atime, ctime or crtime.\n"
+constexpr char kSearchHelp[] =
+    "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or\n"
+    "crtime.\n"
     "\n"
     "Exit status: 0 found, 1 nothing found, 2 error, 130 interrupted.\n"
     "\n"
@@ -66,21 +59,13 @@ class Formatter : public CLI::Formatter {
   }
 };
 
-void AddCommon(CLI::App* app, CommonOptions* common) {
-  app->add_option("--user", common->user, "Act for this user (root only)")->type_name("NAME");
-  app->add_option("--share", common->shares, "Offer the directory as a share, for this run")
-      ->type_name("NAME=DIR")
-      ->allow_extra_args(false);
-  app->add_option("--config", common->config, "Configuration file")->type_name("FILE");
-}
-
 CLI::App* AddCall(CLI::App* app, CallOptions* options) {
   CLI::App* call = app->add_subcommand("call", "Make one API call and print its reply");
   call->add_option("API", options->api, "Name of the API")->required();
   call->add_option("VERSION", options->version, "Version of the API")->required();
   call->add_option("METHOD", options->method, "Method of the API")->required();
   call->add_option("JSON", options->params, "Parameters");
-  AddCommon(call, &options->common);
+  AddCommonOptions(call, &options->common);
   call->footer(kCallHelp);
   return call;
 }
@@ -89,37 +74,9 @@ CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
   CLI::App* serve = app->add_subcommand("serve", "Serve the search page and the API over HTTP");
   serve->add_option("--listen", options->listen, "Address to listen on; 127.0.0.1:8750 by default")
       ->type_name("HOST:PORT");
-  AddCommon(serve, &options->common);
+  AddCommonOptions(serve, &options->common);
   serve->footer(kServeHelp);
   return serve;
-}
-
-void AddTimes(CLI::App* search, const std::string& name, const std::string& verb,
-              TimeRange* range) {
-  search->add_option("--" + name + "-from", range->from, verb + " then or later")
-      ->type_name("TIME");
-  search->add_option("--" + name + "-to", range->to, verb + " then or earlier")->type_name("TIME");
-}
-
-void AddCriteria(CLI::App* search, SearchOptions* options) {
-  search->option_defaults()->group("Criteria");
-  search->add_option("-e,--extension", options->extensions, "Extensions: jpg, or jpg,png")
-      ->type_name("EXT")
-      ->allow_extra_args(false);
-  search
-      ->add_option("-t,--type", options->type, "file, dir, image, video, audio, document, archive")
-      ->type_name("TYPE");
-  search->add_option("--size-from", options->size_from, "At least this large")->type_name("SIZE");
-  search->add_option("--size-to", options->size_to, "At most this large")->type_name("SIZE");
-  AddTimes(search, "mtime", "Modified", &options->mtime);
-  AddTimes(search, "crtime", "Created", &options->crtime);
-  AddTimes(search, "atime", "Last read", &options->atime);
-  search->add_option("--owner", options->owner, "Owned by this user")->type_name("NAME");
-  search->add_option("--group", options->group, "Of this group")->type_name("NAME");
-  search->add_flag_function(
-      "--no-recursive", [options](std::int64_t) { options->recursive = false; },
-      "Do not enter the folders in FOLDER");
-  search->add_flag("--content", options->content, "Also files whose contents hold the pattern");
 }
 
 void AddOutput(CLI::App* search, SearchOptions* options) {
@@ -154,30 +111,11 @@ void AddOutput(CLI::App* search, SearchOptions* options) {
 
 void AddSearch(CLI::App* app, SearchOptions* options) {
   CLI::App* search = app->add_subcommand("search", "Search folders and print what is found");
-  search->add_option("PATTERN", options->pattern, "What to look for")->required();
-  search->add_option("FOLDER", options->folders, "Folders to search; the current one by default");
-  AddCriteria(search, options);
+  AddQueryOptions(search, &options->query);
   AddOutput(search, options);
   search->option_defaults()->group("Where and as whom");
-  AddCommon(search, &options->common);
-  search->footer(kPatternHelp);
-}
-
-// The option parser takes "[a,b]" for a list of two values, but here it is the name of a folder. A
-// mark in front, taken off again after the parsing, keeps such a word whole.
-constexpr char kMark = '\x1f';
-
-std::vector<std::string> MarkedArguments(int argc, char** argv) {
-  std::vector<std::string> arguments;
-  for (int at = argc - 1; at > 0; --at) {  // the parser wants them in reverse
-    const std::string argument = argv[at];
-    arguments.push_back(argument.starts_with('[') ? kMark + argument : argument);
-  }
-  return arguments;
-}
-
-void Unmark(std::string* text) {
-  if (text->starts_with(kMark)) text->erase(0, 1);
+  AddCommonOptions(search, &options->common);
+  search->footer(std::string(kQueryHelp) + kSearchHelp);
 }
 
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
@@ -221,9 +159,6 @@ int Run(int argc, char** argv) {
     return RunCallCommand(call_options);
   }
   if (serve->parsed()) return RunServeCommand(serve_options);
-  Unmark(&search_options.pattern);
-  for (std::string& folder : search_options.folders) Unmark(&folder);
-  if (search_options.folders.empty()) search_options.folders = {"."};
   return RunSearchCommand(search_options);
 }
 

@@ -9,7 +9,7 @@
 
 namespace arbory {
 
-// The exit codes of both commands.
+// The exit codes of all commands.
 enum ExitCode : int {
   kExitSuccess = 0,
   kExitNothing = 1,  // no file found; or a reply with a code other than 0
@@ -47,8 +47,8 @@ struct TimeRange {
   std::string to;
 };
 
-struct SearchOptions {
-  CommonOptions common;
+// What is searched for and where.
+struct SearchQuery {
   std::string pattern;
   std::vector<std::string> folders;
 
@@ -63,6 +63,11 @@ struct SearchOptions {
   std::string group;
   bool recursive = true;
   bool content = false;
+};
+
+struct SearchOptions {
+  CommonOptions common;
+  SearchQuery query;
 
   std::string sort_by;
   bool descending = false;

@@ -13,7 +13,6 @@
 #include <optional>
 #include <string>
 
-#include "arbory/folders.h"
 #include "arbory/interrupt.h"
 #include "arbory/page_reader.h"
 #include "arbory/rows.h"
@@ -24,7 +23,6 @@
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
 #include "nas/system/accounts.h"
-#include "nas/system/shares.h"
 
 namespace arbory {
 namespace {
@@ -208,7 +206,7 @@ class Search {
 
   bool CameToEnd(Ending ending, const SearchState& state) {
     if (state.progress < 0) {
-      Complain(FailureSentence(state.error, options_.folders));
+      Complain(FailureSentence(state.error, options_.query.folders));
     } else if (!state.exists || (state.finished && state.progress == 0)) {
       Complain("the search was stopped before it was complete");
     } else if (ending == Ending::kFailed) {
@@ -253,9 +251,7 @@ int RunSearchCommand(const SearchOptions& options) {
   WatchForInterrupt();
   Session session(options.common);
   nas::LoadNameService();
-  const Locations locations = LocateFolders(options.folders, nas::ListShares(), options.recursive);
-  session.AddShares(locations.added);
-  const Json::Value params = SearchRequest(options, locations.paths, std::time(nullptr));
+  const Json::Value params = PrepareSearch(options.query, &session);
   return Search(&session, options).Run(params);
 }
 

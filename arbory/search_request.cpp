@@ -1,6 +1,8 @@
 #include "arbory/search_request.h"
 
+#include "arbory/folders.h"
 #include "arbory/parse.h"
+#include "nas/system/shares.h"
 #include "platform/filesearch.h"
 #include "platform/system.h"
 
@@ -48,40 +50,46 @@ std::string Joined(const std::vector<std::string>& words) {
 
 }  // namespace
 
-Json::Value SearchRequest(const SearchOptions& options, const std::vector<std::string>& locations,
+Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::string>& locations,
                           std::time_t now) {
   using Factory = FileSearch::FindFactory;
   Json::Value params(Json::objectValue);
   for (const std::string& location : locations) params["folder_path"].append(location);
-  CheckText(Factory::FIND_PATTERN, options.pattern,
+  CheckText(Factory::FIND_PATTERN, query.pattern,
             "pattern that can be searched for; see arbory search --help");
-  params["pattern"] = options.pattern;
-  const std::string extensions = Joined(options.extensions);
+  params["pattern"] = query.pattern;
+  const std::string extensions = Joined(query.extensions);
   if (!extensions.empty()) {
     CheckText(Factory::FIND_EXTENSION, extensions, "list of extensions");
     params["extension"] = extensions;
   }
-  if (!options.type.empty()) {
-    CheckText(Factory::FIND_FILETYPE, options.type,
+  if (!query.type.empty()) {
+    CheckText(Factory::FIND_FILETYPE, query.type,
               "file type; there are file, dir, image, video, audio, document and archive");
-    params["filetype"] = options.type;
+    params["filetype"] = query.type;
   }
-  if (!options.size_from.empty()) params["size_from"] = Json::Int64{ParseSize(options.size_from)};
-  if (!options.size_to.empty()) params["size_to"] = Json::Int64{ParseSize(options.size_to)};
-  SetTimes(options.mtime, "mtime", now, &params);
-  SetTimes(options.crtime, "crtime", now, &params);
-  SetTimes(options.atime, "atime", now, &params);
-  if (!options.owner.empty()) {
-    CheckOwner(options.owner);
-    params["owner"] = options.owner;
+  if (!query.size_from.empty()) params["size_from"] = Json::Int64{ParseSize(query.size_from)};
+  if (!query.size_to.empty()) params["size_to"] = Json::Int64{ParseSize(query.size_to)};
+  SetTimes(query.mtime, "mtime", now, &params);
+  SetTimes(query.crtime, "crtime", now, &params);
+  SetTimes(query.atime, "atime", now, &params);
+  if (!query.owner.empty()) {
+    CheckOwner(query.owner);
+    params["owner"] = query.owner;
   }
-  if (!options.group.empty()) {
-    CheckGroup(options.group);
-    params["group"] = options.group;
+  if (!query.group.empty()) {
+    CheckGroup(query.group);
+    params["group"] = query.group;
   }
-  params["recursive"] = options.recursive;
-  params["search_content"] = options.content;
+  params["recursive"] = query.recursive;
+  params["search_content"] = query.content;
   return params;
+}
+
+Json::Value PrepareSearch(const SearchQuery& query, Session* session) {
+  const Locations locations = LocateFolders(query.folders, nas::ListShares(), query.recursive);
+  session->AddShares(locations.added);
+  return SearchRequest(query, locations.paths, std::time(nullptr));
 }
 
 }  // namespace arbory

@@ -8,13 +8,19 @@
 #include <vector>
 
 #include "arbory/options.h"
+#include "arbory/session.h"
 
 namespace arbory {
 
 // `now` is what ages count back from. Throws UsageError for a value that cannot be understood and
 // for what a search would otherwise leave out silently or refuse without saying which part was
 // wrong: an unknown owner or group, an illegal pattern, extension or file type.
-Json::Value SearchRequest(const SearchOptions& options, const std::vector<std::string>& locations,
+Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::string>& locations,
                           std::time_t now);
+
+// The same for the folders as they were given: finds the share that each lies in, and offers a new
+// one in the session where it lies in none. Throws UsageError for a folder that cannot be searched
+// too.
+Json::Value PrepareSearch(const SearchQuery& query, Session* session);
 
 }  // namespace arbory

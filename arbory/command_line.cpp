@@ -1,0 +1,83 @@
+#include "arbory/command_line.h"
+
+#include <CLI/CLI.hpp>
+#include <cstdint>
+
+namespace arbory {
+namespace {
+
+// Not to be typed by accident, and no beginning of an option.
+constexpr char kMark = '\x1f';
+
+void AddTimes(CLI::App* command, const std::string& name, const std::string& verb,
+              TimeRange* range) {
+  command->add_option("--" + name + "-from", range->from, verb + " then or later")
+      ->type_name("TIME");
+  command->add_option("--" + name + "-to", range->to, verb + " then or earlier")->type_name("TIME");
+}
+
+void AddCriteria(CLI::App* command, SearchQuery* query) {
+  command->option_defaults()->group("Criteria");
+  command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
+      ->type_name("EXT")
+      ->allow_extra_args(false);
+  command->add_option("-t,--type", query->type, "file, dir, image, video, audio, document, archive")
+      ->type_name("TYPE");
+  command->add_option("--size-from", query->size_from, "At least this large")->type_name("SIZE");
+  command->add_option("--size-to", query->size_to, "At most this large")->type_name("SIZE");
+  AddTimes(command, "mtime", "Modified", &query->mtime);
+  AddTimes(command, "crtime", "Created", &query->crtime);
+  AddTimes(command, "atime", "Last read", &query->atime);
+  command->add_option("--owner", query->owner, "Owned by this user")->type_name("NAME");
+  command->add_option("--group", query->group, "Of this group")->type_name("NAME");
+  command->add_flag_function(
+      "--no-recursive", [query](std::int64_t) { query->recursive = false; },
+      "Do not enter the folders in FOLDER");
+  command->add_flag("--content", query->content, "Also files whose contents hold the pattern");
+}
+
+}  // namespace
+
+const char kQueryHelp[] =
+    "PATTERN is compared with names, letter case ignored: a word matches anywhere in\n"
+    "the name, with *, ? or [ ] the whole name. Several words must all match; a|b is\n"
+    "either, !a is not, \"a b\" is one word, regex: begins a regular expression and ''\n"
+    "is every name. A -- ends the options.\n"
+    "\n"
+    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31,\n"
+    "2026-01-31T12:00, an age such as 30m, 12h or 7d, or seconds since 1970. Bounds\n"
+    "are inclusive; a date alone means the whole day.\n";
+
+std::vector<std::string> MarkedArguments(int argc, char** argv) {
+  std::vector<std::string> arguments;
+  for (int at = argc - 1; at > 0; --at) {  // the parser wants them in reverse
+    const std::string argument = argv[at];
+    arguments.push_back(argument.starts_with('[') ? kMark + argument : argument);
+  }
+  return arguments;
+}
+
+void Unmark(std::string* text) {
+  if (text->starts_with(kMark)) text->erase(0, 1);
+}
+
+void AddCommonOptions(CLI::App* command, CommonOptions* common) {
+  command->add_option("--user", common->user, "Act for this user (root only)")->type_name("NAME");
+  command->add_option("--share", common->shares, "Offer the directory as a share, for this run")
+      ->type_name("NAME=DIR")
+      ->allow_extra_args(false);
+  command->add_option("--config", common->config, "Configuration file")->type_name("FILE");
+}
+
+void AddQueryOptions(CLI::App* command, SearchQuery* query) {
+  command->add_option("PATTERN", query->pattern, "What to look for")->required();
+  command->add_option("FOLDER", query->folders, "Folders to search; the current one by default");
+  AddCriteria(command, query);
+  command->final_callback([query] {
+    Unmark(&query->pattern);
+    for (std::string& folder : query->folders) Unmark(&folder);
+    if (query->folders.empty()) query->folders = {"."};
+  });
+}
+
+}  // namespace arbory

@@ -1,0 +1,32 @@
+#pragma once
+// The options that several commands share, and words of the command line as they were typed.
+
+#include <string>
+#include <vector>
+
+#include "arbory/options.h"
+
+namespace CLI {
+class App;
+}
+
+namespace arbory {
+
+// A word that begins with "[" is a folder's name here and a list of values to the option parser.
+// The first function takes the words of main, the program's own left out, marks those and returns
+// all in reverse, as the parser wants them; the second takes a mark off again.
+std::vector<std::string> MarkedArguments(int argc, char** argv);
+void Unmark(std::string* text);
+
+// --user, --share and --config, in the current group of `command`.
+void AddCommonOptions(CLI::App* command, CommonOptions* common);
+
+// PATTERN, FOLDER and the criteria in a group of their own. When the command has been parsed,
+// `query` holds words without marks and the current folder where none was given; before, it must
+// not be read. `query` must live as long as `command`.
+void AddQueryOptions(CLI::App* command, SearchQuery* query);
+
+// What PATTERN, SIZE and TIME may be; lines that fit a terminal of 80 columns.
+extern const char kQueryHelp[];
+
+}  // namespace arbory
