@@ -5,11 +5,10 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
-#include <memory>
 
 #include "arbory/options.h"
+#include "nas/base/paths.h"
 #include "nas/system/share_names.h"
 
 namespace arbory {
@@ -20,17 +19,12 @@ std::string RealFolder(const std::string& folder) {
   const auto fail = [&](const char* trouble) {
     throw UsageError("cannot search '" + folder + "': " + trouble);
   };
-  const std::unique_ptr<char, void (*)(void*)> real(realpath(folder.c_str(), nullptr), std::free);
-  if (!real) fail(std::strerror(errno));
+  const auto real = nas::RealPath(folder);
+  if (!real) fail(std::strerror(real.error().error_number));
   struct stat info;
-  if (stat(real.get(), &info) != 0) fail(std::strerror(errno));
+  if (stat(real->c_str(), &info) != 0) fail(std::strerror(errno));
   if (!S_ISDIR(info.st_mode)) fail("it is not a folder");
-  const std::string path = real.get();
-  return path == "/" ? std::string() : path;
-}
-
-bool IsInside(const std::string& path, const std::string& folder) {
-  return path.size() > folder.size() && path.starts_with(folder) && path[folder.size()] == '/';
+  return *real == "/" ? std::string() : *real;
 }
 
 std::vector<std::string> RealFolders(const std::vector<std::string>& folders, bool recursive) {
@@ -42,8 +36,9 @@ std::vector<std::string> RealFolders(const std::vector<std::string>& folders, bo
   if (!recursive) return real;
   std::vector<std::string> outermost;
   for (const std::string& path : real) {
-    const bool covered = std::any_of(
-        real.begin(), real.end(), [&](const std::string& other) { return IsInside(path, other); });
+    const bool covered = std::any_of(real.begin(), real.end(), [&](const std::string& other) {
+      return path != other && nas::IsWithin(path, other);
+    });
     if (!covered) outermost.push_back(path);
   }
   return outermost;
@@ -52,7 +47,7 @@ std::vector<std::string> RealFolders(const std::vector<std::string>& folders, bo
 const nas::Share* InnermostShare(const std::string& path, const std::vector<nas::Share>& shares) {
   const nas::Share* best = nullptr;
   for (const nas::Share& share : shares) {
-    const bool holds = path == share.root || IsInside(path, share.root);
+    const bool holds = nas::IsWithin(path, share.root);
     if (holds && (best == nullptr || share.root.size() > best->root.size())) best = &share;
   }
   return best;

@@ -7,6 +7,7 @@
 
 #include "arbory/terminal.h"
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 
 namespace arbory {
 namespace {
@@ -81,7 +82,7 @@ void AppendJsonRow(const Json::Value& file, const RowFormat& format, std::string
       const auto byte = static_cast<unsigned char>(text[at]);
       const bool second_set =
           byte == 0xC2 && at + 1 < text.size() && static_cast<unsigned char>(text[at + 1]) < 0xA0;
-      if (byte != 0x7F && !second_set) continue;
+      if (!nas::IsControl(byte) && !second_set) continue;
       const unsigned code = second_set ? static_cast<unsigned char>(text[at + 1]) : byte;
       char escape[sizeof("\\u009b")];
       std::snprintf(escape, sizeof escape, "\\u%04x", code);

@@ -17,12 +17,6 @@ constexpr std::chrono::milliseconds kNextLine{100};
 constexpr size_t kUsualColumns = 80;
 constexpr char kClearLine[] = "\r\x1b[K";
 
-bool IsControl(unsigned char byte) {
-  constexpr unsigned char kFirstPrintable = 0x20;
-  constexpr unsigned char kDelete = 0x7F;
-  return byte < kFirstPrintable || byte == kDelete;
-}
-
 // Whether a valid sequence of several bytes is a C1 control (U+0080 to U+009F), a line separator
 // or a mark that turns the direction of writing (U+200E/F, U+2028 to U+202E, U+2066 to U+2069).
 bool IsTrick(std::string_view sequence) {
@@ -45,7 +39,7 @@ void AppendEscaped(std::string_view text, std::string* out) {
     const nas::Utf8Step step = nas::NextUtf8(text);
     const std::string_view sequence = text.substr(0, step.length);
     text.remove_prefix(step.length);
-    const bool bad = step.length == 1 ? IsControl(static_cast<unsigned char>(sequence.front()))
+    const bool bad = step.length == 1 ? nas::IsControl(static_cast<unsigned char>(sequence.front()))
                                       : IsTrick(sequence);
     if (step.valid && !bad) {
       *out += sequence;

@@ -53,6 +53,7 @@ class [[nodiscard]] Result {
   const T& operator*() const { return std::get<0>(held_); }
   T* operator->() { return &std::get<0>(held_); }
   const T* operator->() const { return &std::get<0>(held_); }
+  T value_or(T other) && { return ok() ? std::move(**this) : std::move(other); }
   // Of one that is not ok.
   const Error& error() const { return std::get<1>(held_); }
 

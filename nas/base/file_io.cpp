@@ -1,14 +1,14 @@
 #include "nas/base/file_io.h"
 
 #include <fcntl.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <stdexcept>
 
+#include "nas/base/random_name.h"
+#include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
 
 namespace nas {
@@ -54,8 +54,7 @@ void RemoveQuietly(int dir_fd, const std::string& name) {
 
 bool WriteAll(int fd, std::string_view bytes) {
   while (!bytes.empty()) {
-    const ssize_t count = write(fd, bytes.data(), bytes.size());
-    if (count < 0 && errno == EINTR) continue;
+    const ssize_t count = Uninterrupted([&] { return write(fd, bytes.data(), bytes.size()); });
     if (count < 0) return false;
     bytes.remove_prefix(static_cast<size_t>(count));
   }
@@ -73,9 +72,9 @@ bool ReadWholeFile(int dir_fd, const char* name, size_t max_bytes, std::string* 
   for (;;) {
     const size_t used = content.size();
     content.resize(used + room);
-    const ssize_t count = read(fd.get(), content.data() + used, room);
+    const ssize_t count =
+        Uninterrupted([&] { return read(fd.get(), content.data() + used, room); });
     content.resize(used + static_cast<size_t>(std::max<ssize_t>(count, 0)));
-    if (count < 0 && errno == EINTR) continue;
     if (count < 0) return false;
     if (count == 0) break;
     if (content.size() > max_bytes) {
@@ -104,21 +103,6 @@ bool CreateFile(int dir_fd, const char* name, std::string_view bytes, mode_t mod
                     linkat(dir_fd, fresh.c_str(), dir_fd, name, 0) == 0;
   RemoveQuietly(dir_fd, fresh);
   return made;
-}
-
-std::string RandomName() {
-  constexpr size_t kRandomBytes = 16;  // 128 bits: no two meet, and nobody guesses one
-  unsigned char random[kRandomBytes];
-  if (getrandom(random, sizeof random, 0) != static_cast<ssize_t>(sizeof random)) {
-    throw std::runtime_error("no random bytes from the system");
-  }
-  constexpr char kDigits[] = "0123456789abcdef";
-  std::string name;
-  for (const unsigned char byte : random) {
-    name += kDigits[byte >> 4];
-    name += kDigits[byte & 0xF];
-  }
-  return name;
 }
 
 }  // namespace nas

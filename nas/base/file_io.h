@@ -27,8 +27,4 @@ bool CreateFile(int dir_fd, const char* name, std::string_view bytes, mode_t mod
 
 inline constexpr std::string_view kTemporaryPrefix = ".arbory-new-";
 
-// 32 lower-case hexadecimal digits that cannot be guessed. Throws std::runtime_error where the
-// system has no randomness to give.
-std::string RandomName();
-
 }  // namespace nas

@@ -21,6 +21,13 @@ Utf8Step NextUtf8(std::string_view text);
 // `text` with each bad sequence replaced by U+FFFD.
 std::string ToValidUtf8(std::string_view text);
 
+// Whether the byte is one of ASCII's control characters.
+constexpr bool IsControl(unsigned char byte) {
+  constexpr unsigned char kFirstPrintable = 0x20;
+  constexpr unsigned char kDelete = 0x7F;
+  return byte < kFirstPrintable || byte == kDelete;
+}
+
 inline constexpr std::string_view kReplacementCharacter = "\xEF\xBF\xBD";
 
 }  // namespace nas

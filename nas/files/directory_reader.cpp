@@ -6,6 +6,8 @@
 
 #include <cerrno>
 
+#include "nas/base/system_call.h"
+
 namespace nas {
 namespace {
 
@@ -23,10 +25,8 @@ void DirectoryReader::Start(int fd) {
 }
 
 bool DirectoryReader::Fill() {
-  long count;
-  do {
-    count = syscall(SYS_getdents64, fd_, buffer_.get(), kBufferBytes);
-  } while (count < 0 && errno == EINTR);
+  const long count =
+      Uninterrupted([this] { return syscall(SYS_getdents64, fd_, buffer_.get(), kBufferBytes); });
   at_ = 0;
   filled_ = count > 0 ? static_cast<size_t>(count) : 0;
   if (count < 0) failed_ = errno;

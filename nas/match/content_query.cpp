@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
 
 namespace nas {
@@ -112,10 +113,7 @@ ContentScanner::Result ContentScanner::ScanOpen(int fd) {
   for (bool first = true;; first = false) {
     if (__atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0) return Result::kStopped;
     const size_t room = buffer_.size() - kept;
-    ssize_t count;
-    do {
-      count = read(fd, buffer_.data() + kept, room);
-    } while (count < 0 && errno == EINTR);
+    const ssize_t count = Uninterrupted([&] { return read(fd, buffer_.data() + kept, room); });
     if (count < 0) return Result::kFailed;
     const size_t filled = kept + static_cast<size_t>(count);
     if (first && std::memchr(buffer_.data(), 0, std::min(filled, kFirstBlockBytes)) != nullptr) {

@@ -1,6 +1,6 @@
 #include "nas/results/result_file.h"
 
-#include <dirent.h>
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -8,16 +8,14 @@
 #include <array>
 #include <cerrno>
 #include <ctime>
-#include <memory>
 #include <utility>
-#include <vector>
 
-#include "nas/base/file_io.h"
+#include "nas/base/paths.h"
+#include "nas/base/random_name.h"
 
 namespace nas {
 namespace {
 
-constexpr size_t kIdDigits = 32;
 constexpr std::string_view kSuffix = ".db";
 constexpr char kLogSuffix[] = "-wal";
 constexpr std::array<const char*, 3> kCompanions = {"", kLogSuffix, "-shm"};
@@ -50,10 +48,7 @@ bool ResultWatch::Changed() {
 
 std::string NewResultId() { return RandomName(); }
 
-bool IsResultId(std::string_view id) {
-  return id.size() == kIdDigits &&
-         id.find_first_not_of("0123456789abcdef") == std::string_view::npos;
-}
+bool IsResultId(std::string_view id) { return IsRandomName(id); }
 
 std::string ResultPath(const std::string& folder, const std::string& id) {
   return folder + "/" + id + std::string(kSuffix);
@@ -66,12 +61,9 @@ bool RemoveResultFile(const std::string& path) {
 }
 
 void SweepResultFolder(const std::string& folder) {
-  std::vector<std::string> stale;
-  const std::unique_ptr<DIR, int (*)(DIR*)> dir(opendir(folder.c_str()), closedir);
-  if (!dir) return;
   const time_t oldest_kept = time(nullptr) - kKeepSeconds;
-  while (const dirent* entry = readdir(dir.get())) {
-    std::string_view name = entry->d_name;
+  for (const std::string& entry : NamesIn(AT_FDCWD, folder).value_or({})) {
+    std::string_view name = entry;
     // A companion can be all that is left: a reader makes one anew while the file is deleted.
     for (const std::string_view companion : kCompanions) {
       if (name.ends_with(companion)) name.remove_suffix(companion.size());
@@ -80,9 +72,8 @@ void SweepResultFolder(const std::string& folder) {
       continue;
     }
     const std::string path = folder + "/" + std::string(name);
-    if (LastWritten(path) < oldest_kept) stale.push_back(path);
+    if (LastWritten(path) < oldest_kept) RemoveResultFile(path);
   }
-  for (const std::string& path : stale) RemoveResultFile(path);
 }
 
 }  // namespace nas

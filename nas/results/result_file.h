@@ -65,7 +65,7 @@ class ResultWatch {
   Stamp seen_;
 };
 
-// Random, 32 hexadecimal digits.
+// Of the form of random_name.h.
 std::string NewResultId();
 bool IsResultId(std::string_view id);
 std::string ResultPath(const std::string& folder, const std::string& id);

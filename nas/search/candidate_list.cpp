@@ -9,6 +9,8 @@
 #include <cstring>
 #include <system_error>
 
+#include "nas/base/system_call.h"
+
 namespace nas {
 namespace {
 
@@ -50,9 +52,9 @@ void CandidateList::Add(std::uint16_t location, std::string_view folder_path,
 
 void CandidateList::Write(std::string_view bytes) {
   while (!bytes.empty()) {
-    const ssize_t count =
-        pwrite(file_.get(), bytes.data(), bytes.size(), static_cast<off_t>(written_));
-    if (count < 0 && errno == EINTR) continue;
+    const ssize_t count = Uninterrupted([&] {
+      return pwrite(file_.get(), bytes.data(), bytes.size(), static_cast<off_t>(written_));
+    });
     if (count <= 0) Fail(count < 0 ? errno : ENOSPC);
     written_ += static_cast<size_t>(count);
     bytes.remove_prefix(static_cast<size_t>(count));
@@ -70,8 +72,9 @@ void CandidateList::Read(char* to, size_t count) {
         if (unread_.empty()) Fail(EIO);
       } else {
         unread_.resize(std::min<std::uint64_t>(kPieceBytes, written_ - read_));
-        const ssize_t got =
-            pread(file_.get(), unread_.data(), unread_.size(), static_cast<off_t>(read_));
+        const ssize_t got = Uninterrupted([&] {
+          return pread(file_.get(), unread_.data(), unread_.size(), static_cast<off_t>(read_));
+        });
         if (got <= 0) Fail(got < 0 ? errno : EIO);
         unread_.resize(static_cast<size_t>(got));
         read_ += static_cast<size_t>(got);

@@ -9,7 +9,7 @@
 #include <cerrno>
 
 #include "nas/base/error.h"
-#include "nas/base/real_path.h"
+#include "nas/base/paths.h"
 #include "nas/system/volumes.h"
 
 namespace nas {
@@ -58,7 +58,7 @@ bool IsTemporary(int folder) {
   volumes.push_back(ScratchVolume());
   return std::ranges::any_of(volumes, [&path](const std::string& volume) {
     const auto temporary = RealPath(volume + "/" + kTemporaryFolder);
-    return temporary && (*path + "/").starts_with(*temporary + "/");
+    return temporary && IsWithin(*path, *temporary);
   });
 }
 

@@ -8,7 +8,7 @@
 #include <memory>
 #include <set>
 
-#include "nas/base/real_path.h"
+#include "nas/base/paths.h"
 #include "nas/system/share_names.h"
 
 namespace nas {

@@ -20,6 +20,7 @@
 
 #include "nas/base/error.h"
 #include "nas/base/json_text.h"
+#include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
 #include "nas/system/shares.h"
 #include "nas/system/volumes.h"
@@ -96,8 +97,7 @@ std::string ReadToEnd(int fd) {
   std::string all;
   char bytes[kReadBytes];
   for (;;) {
-    const ssize_t count = read(fd, bytes, sizeof bytes);
-    if (count < 0 && errno == EINTR) continue;
+    const ssize_t count = Uninterrupted([&] { return read(fd, bytes, sizeof bytes); });
     if (count <= 0) return all;
     all.append(bytes, static_cast<size_t>(count));
   }
@@ -124,9 +124,7 @@ int RunConfined(const std::vector<const char*>& command) {
   }
   status.Reset();
   const std::string text = ReadToEnd(report.get());
-  int ended = 0;
-  while (waitpid(child, &ended, 0) < 0 && errno == EINTR) {
-  }
+  Uninterrupted([=] { return waitpid(child, nullptr, 0); });
   const int code = ReportedStatus(text);
   if (code < 0) SetLastError(kErrorOther);
   return code;

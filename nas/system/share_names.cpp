@@ -2,12 +2,12 @@
 
 #include <algorithm>
 
+#include "nas/base/utf8.h"
+
 namespace nas {
 namespace {
 
 constexpr size_t kMaxNameBytes = 255;
-constexpr unsigned char kFirstPrintable = 0x20;
-constexpr unsigned char kDelete = 0x7F;
 constexpr char kHomeAlias[] = "home";
 
 }  // namespace
@@ -19,7 +19,7 @@ std::string TroubleWithShareName(const std::string& name) {
   if (name == kHomeAlias) return "the name stands for every user's own home";
   for (const unsigned char byte : name) {
     if (byte == '/' || byte == ',') return std::string("the name holds \"") + char(byte) + "\"";
-    if (byte < kFirstPrintable || byte == kDelete) return "the name holds a control character";
+    if (IsControl(byte)) return "the name holds a control character";
   }
   return {};
 }

@@ -1,13 +1,12 @@
 #include "nas/system/shares.h"
 
-#include <dirent.h>
+#include <fcntl.h>
 #include <sys/stat.h>
 
 #include <map>
-#include <memory>
 #include <set>
 
-#include "nas/base/real_path.h"
+#include "nas/base/paths.h"
 #include "nas/system/config.h"
 #include "nas/system/share_names.h"
 #include "nas/system/volumes.h"
@@ -16,16 +15,12 @@ namespace nas {
 
 namespace {
 
-bool IsBelow(const std::string& path, const std::string& folder) {
-  return path == folder || folder == "/" || path.starts_with(folder + "/");
-}
-
 std::string VolumeOf(const std::string& real_path) {
   std::string best;
   size_t best_length = 0;
   for (const std::string& volume : ListVolumes()) {
     const auto real = RealPath(volume);
-    if (real && IsBelow(real_path, *real) && real->size() > best_length) {
+    if (real && IsWithin(real_path, *real) && real->size() > best_length) {
       best = volume;
       best_length = real->size();
     }
@@ -54,14 +49,6 @@ std::optional<Share> ShareOnVolume(const std::string& volume, const std::string&
   return MakeShare(name, directory);
 }
 
-std::vector<std::string> NamesIn(const std::string& folder) {
-  std::vector<std::string> names;
-  const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(folder.c_str()), closedir);
-  if (!stream) return names;
-  while (const dirent* entry = readdir(stream.get())) names.emplace_back(entry->d_name);
-  return names;
-}
-
 }  // namespace
 
 std::optional<Share> FindShare(const std::string& name) {
@@ -84,7 +71,7 @@ std::vector<Share> ListShares() {
     }
   }
   for (const std::string& volume : ListVolumes()) {
-    for (const std::string& name : NamesIn(volume)) {
+    for (const std::string& name : NamesIn(AT_FDCWD, volume).value_or({})) {
       if (configured.contains(name) || shares.contains(name)) continue;
       if (const auto share = ShareOnVolume(volume, name)) shares.emplace(name, *share);
     }

@@ -9,6 +9,7 @@
 
 #include "nas/base/error.h"
 #include "nas/base/file_io.h"
+#include "nas/base/utf8.h"
 #include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/folders.h"
@@ -18,8 +19,6 @@ namespace nas {
 namespace {
 
 constexpr size_t kMaxUserNameBytes = 255;  // it names a folder
-constexpr unsigned char kFirstPrintable = 0x20;
-constexpr unsigned char kDelete = 0x7F;
 constexpr char kUsers[] = "users";
 constexpr char kPreference[] = "preference";
 constexpr char kTasks[] = "tasks";
@@ -73,9 +72,8 @@ bool MakeContents(int folder_fd, uid_t uid) {
 
 bool IsUserName(const std::string& name) {
   if (name.empty() || name == "." || name == ".." || name.size() > kMaxUserNameBytes) return false;
-  return std::none_of(name.begin(), name.end(), [](unsigned char byte) {
-    return byte == '/' || byte < kFirstPrintable || byte == kDelete;
-  });
+  return std::none_of(name.begin(), name.end(),
+                      [](unsigned char byte) { return byte == '/' || IsControl(byte); });
 }
 
 std::string PreferenceFolder(const std::string& user) {

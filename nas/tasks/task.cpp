@@ -5,6 +5,7 @@
 #include <stdexcept>
 
 #include "nas/base/pause.h"
+#include "nas/base/random_name.h"
 #include "nas/tasks/task_files.h"
 
 namespace OKT {
@@ -17,7 +18,7 @@ class Task::Record {
       id_ = files_.Create(&life_);
       return;
     }
-    if (!nas::IsTaskId(id)) throw std::runtime_error("not a task id");
+    if (!nas::IsRandomName(id)) throw std::runtime_error("not a task id");
     id_ = id;
     if (!Read()) throw std::runtime_error("no such task: " + id_);
   }

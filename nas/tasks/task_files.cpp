@@ -1,23 +1,21 @@
 #include "nas/tasks/task_files.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <ctime>
-#include <memory>
 #include <stdexcept>
 #include <string_view>
-#include <vector>
 
 #include "nas/base/error.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/base/paths.h"
 #include "nas/base/pause.h"
+#include "nas/base/random_name.h"
 #include "nas/system/config.h"
 #include "nas/system/user_state.h"
 
@@ -30,7 +28,6 @@ constexpr off_t kFolderByte = 0;
 constexpr char kFolderLock[] = "lock";
 constexpr std::string_view kRecordSuffix = ".json";
 constexpr std::string_view kLockSuffix = ".lock";
-constexpr size_t kIdDigits = 32;
 constexpr int kRecordVersion = 1;
 constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
 // A record holds a request's parameters and little more.
@@ -49,7 +46,7 @@ std::string IdOf(std::string_view name, std::string_view suffix) {
   if (!name.ends_with(suffix)) return {};
   name.remove_suffix(suffix.size());
   std::string id(name);
-  return IsTaskId(id) ? id : std::string();
+  return IsRandomName(id) ? id : std::string();
 }
 
 struct flock WriteLockOn(off_t byte) {
@@ -80,12 +77,6 @@ bool TakeLock(int fd, off_t byte) {
 }
 
 }  // namespace
-
-bool IsTaskId(const std::string& id) {
-  return id.size() == kIdDigits && std::all_of(id.begin(), id.end(), [](char digit) {
-           return (digit >= '0' && digit <= '9') || (digit >= 'a' && digit <= 'f');
-         });
-}
 
 TaskFiles::TaskFiles(const char* owner) {
   if (owner == nullptr || !IsUserName(owner)) Throw("no such task owner", EINVAL);
@@ -183,19 +174,9 @@ bool TaskFiles::IsUntouched(const std::string& name, time_t now) const {
 }
 
 int TaskFiles::CountRunningAndSweep() const {
-  const int fd = openat(folder_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (fd < 0) return 0;
-  const std::unique_ptr<DIR, int (*)(DIR*)> stream(fdopendir(fd), closedir);
-  if (!stream) {
-    close(fd);
-    return 0;
-  }
-  std::vector<std::string> names;
-  while (const dirent* entry = readdir(stream.get())) names.emplace_back(entry->d_name);
-
   int running = 0;
   const time_t now = time(nullptr);
-  for (const std::string& name : names) {
+  for (const std::string& name : NamesIn(folder_.get(), ".").value_or({})) {
     // Each task has a lock file from its first moment to its last.
     const std::string id = IdOf(name, kLockSuffix);
     if (id.empty()) {

@@ -1,8 +1,8 @@
 #pragma once
 // Task records on disk. The one owner of their names and locks.
 //
-// In the owner's task folder (0700, user_state.h), for a task ID of 32 lower-case hexadecimal
-// digits:
+// In the owner's task folder (0700, user_state.h), for a task ID
+// (random_name.h):
 //
 //   ID.json   {"version":1,"finished":BOOL,"properties":{...}}, replaced as a whole by rename
 //   ID.lock   for locks on two of its bytes, and as a reserve of space that is given up when the
@@ -27,8 +27,6 @@
 #include "nas/base/unique_fd.h"
 
 namespace nas {
-
-bool IsTaskId(const std::string& id);
 
 struct TaskState {
   bool finished = false;

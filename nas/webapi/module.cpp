@@ -6,7 +6,7 @@
 
 #include <stdexcept>
 
-#include "nas/base/real_path.h"
+#include "nas/base/paths.h"
 #include "nas/system/config.h"
 #include "nas/webapi/runner.h"
 
@@ -19,8 +19,7 @@ constexpr char kEntryPoint[] = "GetAPITable";
 // Beside the program in a build tree; where libraries are kept when it is installed.
 std::string FindModule() {
   if (!CurrentConfig().module.empty()) return CurrentConfig().module;
-  const std::string program = RealPath("/proc/self/exe").value_or("");
-  const std::string folder = program.substr(0, program.rfind('/') + 1);
+  const std::string folder = ProgramFolder();
   for (const char* place : {"", "../lib/arbory/"}) {
     std::string path = folder + place + kModuleName;
     if (access(path.c_str(), R_OK) == 0) return path;

@@ -14,6 +14,7 @@
 
 #include "nas/base/error.h"
 #include "nas/base/json_text.h"
+#include "nas/base/system_call.h"
 #include "nas/webapi/request_child.h"
 
 namespace nas {
@@ -31,8 +32,7 @@ constexpr int kForever = -1;
 // Reads once. False at the end of the pipe or on an error.
 bool ReadSome(int fd, std::string* buffer, FrameReader* frame) {
   buffer->resize(kReadBytes);
-  const ssize_t count = read(fd, buffer->data(), buffer->size());
-  if (count < 0) return errno == EINTR;
+  const ssize_t count = Uninterrupted([&] { return read(fd, buffer->data(), buffer->size()); });
   if (count > 0) frame->Feed(buffer->data(), static_cast<size_t>(count));
   return count > 0;
 }
@@ -63,8 +63,7 @@ bool Collect(const RunningCall& running, int process_fd, const std::function<boo
 }
 
 void Reap(pid_t child) {
-  while (waitpid(child, nullptr, 0) < 0 && errno == EINTR) {
-  }
+  Uninterrupted([=] { return waitpid(child, nullptr, 0); });
 }
 
 }  // namespace

@@ -14,6 +14,7 @@
 #include <thread>
 
 #include "nas/base/file_io.h"
+#include "nas/base/random_name.h"
 #include "nas/system/user_state.h"
 #include "nas/tasks/task_files.h"
 #include "platform/task.h"
@@ -59,7 +60,7 @@ long long MillisecondsOf(const std::function<void()>& work) {
 TEST_F(TasksTest, ABatchIsSeenAtOnceAndTheMarkStays) {
   const auto task = New();
   const auto reader = Open(task->getTaskId());
-  EXPECT_TRUE(nas::IsTaskId(task->getTaskId()));
+  EXPECT_TRUE(nas::IsRandomName(task->getTaskId()));
   EXPECT_EQ(ModeOf(RecordFile(task->getTaskId())), 0600U);
   task->beginUpdate();
   EXPECT_TRUE(task->setProperty("progress", 0));

@@ -13,6 +13,7 @@
 #include "arbory/server/transport/child.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
+#include "nas/base/system_call.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -114,9 +115,8 @@ void SendBytes(int pipe, int file, const ByteRange& range) {
   std::string buffer(kReadBytes, '\0');
   for (std::uint64_t done = 0; done < range.count;) {
     const size_t wanted = std::min<std::uint64_t>(range.count - done, buffer.size());
-    const ssize_t count =
-        pread(file, buffer.data(), wanted, static_cast<off_t>(range.first + done));
-    if (count < 0 && errno == EINTR) continue;
+    const ssize_t count = nas::Uninterrupted(
+        [&] { return pread(file, buffer.data(), wanted, static_cast<off_t>(range.first + done)); });
     if (count <= 0) return;
     if (!nas::WriteAll(pipe, std::string_view(buffer.data(), static_cast<size_t>(count)))) return;
     done += static_cast<std::uint64_t>(count);

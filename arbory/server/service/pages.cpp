@@ -7,7 +7,7 @@
 
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
-#include "nas/base/real_path.h"
+#include "nas/base/paths.h"
 
 namespace arbory {
 namespace {
@@ -50,8 +50,7 @@ bool IsPageFile(const std::string& name) {
 
 std::string FindWebFolder(const std::string& configured) {
   if (!configured.empty()) return configured;
-  const std::string program = nas::RealPath("/proc/self/exe").value_or("");
-  const std::string folder = program.substr(0, program.rfind('/') + 1);
+  const std::string folder = nas::ProgramFolder();
   for (const std::string& place : {folder + "../share/arbory/web", folder + "../web"}) {
     if (access((place + "/" + kIndex).c_str(), R_OK) == 0) return place;
   }

@@ -10,6 +10,7 @@
 
 #include "arbory/server/service/sample_picture.h"
 #include "nas/base/file_io.h"
+#include "nas/base/random_name.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"
 

@@ -14,6 +14,7 @@
 #include "arbory/server/transport/processes.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/base/random_name.h"
 
 namespace arbory {
 namespace {

@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "nas/base/file_io.h"
+#include "nas/base/random_name.h"
 
 namespace arbory {
 namespace {

@@ -1,6 +1,5 @@
 #include "arbory/server/service/user_calls.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -10,9 +9,10 @@
 #include <vector>
 
 #include "arbory/server/transport/child.h"
+#include "nas/base/paths.h"
+#include "nas/base/random_name.h"
 #include "nas/system/shares.h"
 #include "nas/system/user_state.h"
-#include "nas/tasks/task_files.h"
 #include "platform/system.h"
 #include "platform/task.h"
 #include "platform/webfm.h"
@@ -89,14 +89,10 @@ void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
 std::vector<std::string> RunningTasks(const std::string& user) {
   std::vector<std::string> ids;
   constexpr std::string_view kRecord = ".json";
-  const std::unique_ptr<DIR, int (*)(DIR*)> folder(opendir(nas::TaskFolder(user).c_str()),
-                                                   closedir);
-  if (!folder) return ids;
-  while (const dirent* entry = readdir(folder.get())) {
-    std::string name = entry->d_name;
+  for (std::string name : nas::NamesIn(AT_FDCWD, nas::TaskFolder(user)).value_or({})) {
     if (!name.ends_with(kRecord)) continue;
     name.resize(name.size() - kRecord.size());
-    const auto task = nas::IsTaskId(name) ? OpenTask(user, name) : nullptr;
+    const auto task = nas::IsRandomName(name) ? OpenTask(user, name) : nullptr;
     if (task && !task->isFinished()) ids.push_back(name);
   }
   return ids;

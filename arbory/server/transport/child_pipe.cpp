@@ -6,6 +6,8 @@
 #include <boost/asio/post.hpp>
 #include <cerrno>
 
+#include "nas/base/system_call.h"
+
 namespace arbory {
 namespace {
 
@@ -46,10 +48,8 @@ void ChildPipe::Wait() {
 
 void ChildPipe::Deliver(bool may_wait) {
   if (!reader_ || !pipe_.is_open()) return;
-  ssize_t count;
-  do {
-    count = read(pipe_.native_handle(), buffer_.data(), buffer_.size());
-  } while (count < 0 && errno == EINTR);
+  const ssize_t count = nas::Uninterrupted(
+      [this] { return read(pipe_.native_handle(), buffer_.data(), buffer_.size()); });
   if (count < 0 && errno == EAGAIN && may_wait) return Wait();
   timer_.cancel();  // from here on it is the client who is waited for
   const Reader reader = std::move(reader_);

@@ -3,17 +3,14 @@
 #include <algorithm>
 
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 
 namespace arbory {
 namespace {
 
-constexpr unsigned char kFirstPrintable = 0x20;
-constexpr unsigned char kDelete = 0x7F;
 constexpr char kHexDigits[] = "0123456789ABCDEF";
 constexpr int kBitsPerDigit = 4;
 constexpr int kDigitMask = 0xF;
-
-bool IsControl(unsigned char byte) { return byte < kFirstPrintable || byte == kDelete; }
 
 bool IsUnreserved(char byte) {
   return (byte >= 'a' && byte <= 'z') || (byte >= 'A' && byte <= 'Z') ||
@@ -48,7 +45,7 @@ std::optional<std::string> Decoded(std::string_view text) {
 bool IsPlainSegment(const std::string& segment) {
   return !segment.empty() && segment != "." && segment != ".." &&
          std::none_of(segment.begin(), segment.end(),
-                      [](char byte) { return byte == '/' || IsControl(byte); });
+                      [](char byte) { return byte == '/' || nas::IsControl(byte); });
 }
 
 }  // namespace
@@ -132,7 +129,7 @@ std::string Cookie(const HttpRequest& request, std::string_view name) {
 std::string ContentDisposition(bool inline_shown, const std::string& name) {
   std::string plain = name;
   for (char& byte : plain) {
-    const bool safe = byte >= ' ' && byte < kDelete && byte != '"' && byte != '\\' && byte != '%';
+    const bool safe = byte >= ' ' && byte <= '~' && byte != '"' && byte != '\\' && byte != '%';
     if (!safe) byte = '_';
   }
   return std::string(inline_shown ? "inline" : "attachment") + "; filename=\"" + plain +
