@@ -18,8 +18,10 @@ enum _tag_dir_entry_type_ { DIR_ENTRY_DIR = 0, DIR_ENTRY_FILE = 1, DIR_ENTRY_ALL
 
 namespace FileSearch {
 
-// What the walker knows of one file while it judges it; the engine's own.
+// What the walker knows of one file while it judges it, and why it leaves one out; the engine's
+// own.
 struct WalkEntry;
+enum class Refusal;
 
 // One criterion: a file is a result when every criterion matches it. Comparators are immutable and
 // may be asked by several threads at once.
@@ -27,9 +29,11 @@ class FindComp {
  public:
   virtual ~FindComp() = default;
   // What has to be known of a file before the criterion can judge it, cheapest first.
-  enum class Needs { kName, kKind, kAttributes };
+  enum class Needs { kName, kAttributes };
   virtual Needs needs() const = 0;
   virtual bool match(const WalkEntry& entry) const = 0;
+  // Why a file that it does not match is left out; the same for all of them.
+  virtual Refusal refusal() const = 0;
 };
 
 // Size in bytes; both bounds are inclusive ("greater": at least, "less": at most). Folders never
@@ -39,6 +43,7 @@ class FindSizeComp : public FindComp {
   FindSizeComp(const char* op, long long bytes);
   Needs needs() const override { return Needs::kAttributes; }
   bool match(const WalkEntry& entry) const override;
+  Refusal refusal() const override;
 
  private:
   bool at_least_;
@@ -55,6 +60,7 @@ class FindTimeComp : public FindComp {
  protected:
   FindTimeComp(const char* op, long seconds);
   bool InRange(std::int64_t file_seconds) const;
+  Refusal OutOfRange(Refusal earlier, Refusal later) const { return after_ ? earlier : later; }
 
  private:
   bool after_;
@@ -64,16 +70,19 @@ class FindMTimeComp : public FindTimeComp {
  public:
   FindMTimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
   bool match(const WalkEntry& entry) const override;
+  Refusal refusal() const override;
 };
 class FindCRTimeComp : public FindTimeComp {
  public:
   FindCRTimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
   bool match(const WalkEntry& entry) const override;
+  Refusal refusal() const override;
 };
 class FindATimeComp : public FindTimeComp {
  public:
   FindATimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
   bool match(const WalkEntry& entry) const override;
+  Refusal refusal() const override;
 };
 
 class FindFactory {

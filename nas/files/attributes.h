@@ -3,6 +3,8 @@
 
 #include <cstdint>
 
+#include "nas/base/error.h"
+
 namespace nas {
 
 // The attributes that are stored with a result and asked by criteria. Times in seconds since the
@@ -23,5 +25,13 @@ struct FileAttributes {
   std::uint32_t folder = 0;
 };
 static_assert(sizeof(FileAttributes) == 56, "the layout of a stored row, without gaps");
+
+// Of `name` in the folder open at `folder` (O_PATH will do), itself where it is a symbolic link.
+// One system call; a file server is not asked anew for what the kernel holds. The error names no
+// path, so that failing costs no memory.
+Result<FileAttributes> ReadAttributes(int folder, const char* name);
+
+// Only the type, as DT_*; DT_UNKNOWN where it cannot be had.
+unsigned char ReadType(int folder, const char* name);
 
 }  // namespace nas

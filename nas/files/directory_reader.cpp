@@ -7,6 +7,7 @@
 #include <cerrno>
 
 #include "nas/base/system_call.h"
+#include "nas/files/attributes.h"
 
 namespace nas {
 namespace {
@@ -42,6 +43,7 @@ bool DirectoryReader::Next(Entry& entry) {
     if (entry.name == "." || entry.name == "..") continue;
     entry.inode = record->d_ino;
     entry.type = record->d_type;
+    if (entry.type == DT_UNKNOWN) entry.type = ReadType(fd_, record->d_name);
     return true;
   }
 }

@@ -15,7 +15,8 @@ class DirectoryReader {
   struct Entry {
     std::string_view name;  // NUL-ended, into the buffer
     ino_t inode = 0;
-    unsigned char type = 0;  // DT_*, DT_UNKNOWN on file systems that do not tell
+    unsigned char type =
+        0;  // DT_*; looked up where the directory does not tell, DT_UNKNOWN where that fails
   };
 
   DirectoryReader();

@@ -101,23 +101,23 @@ int ContentScanner::Open(int folder, const char* name) {
   return openat(folder, name, kFlags);
 }
 
-ContentScanner::Result ContentScanner::Scan(int folder, const char* name) {
+ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name) {
   const UniqueFd fd(Open(folder, name));
-  if (!fd) return Result::kFailed;
+  if (!fd) return Outcome::kFailed;
   return ScanOpen(fd.get());
 }
 
-ContentScanner::Result ContentScanner::ScanOpen(int fd) {
+ContentScanner::Outcome ContentScanner::ScanOpen(int fd) {
   std::fill(found_.begin(), found_.end(), false);
   size_t kept = 0;  // bytes at the front of the buffer carried over from the piece before
   for (bool first = true;; first = false) {
-    if (__atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0) return Result::kStopped;
+    if (__atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0) return Outcome::kStopped;
     const size_t room = buffer_.size() - kept;
     const ssize_t count = Uninterrupted([&] { return read(fd, buffer_.data() + kept, room); });
-    if (count < 0) return Result::kFailed;
+    if (count < 0) return Outcome::kFailed;
     const size_t filled = kept + static_cast<size_t>(count);
     if (first && std::memchr(buffer_.data(), 0, std::min(filled, kFirstBlockBytes)) != nullptr) {
-      return Result::kNoMatch;
+      return Outcome::kBinary;
     }
     // A regular file gives less than asked for only at its end.
     const bool at_end = static_cast<size_t>(count) < room;
@@ -138,8 +138,8 @@ ContentScanner::Result ContentScanner::ScanOpen(int fd) {
                                      return found_[i] != query_.needles_[i].negated;
                                    });
                                  })
-                 ? Result::kMatch
-                 : Result::kNoMatch;
+                 ? Outcome::kMatch
+                 : Outcome::kNoMatch;
     }
     kept = filled - keep_from;
     std::memmove(buffer_.data(), buffer_.data() + keep_from, kept);

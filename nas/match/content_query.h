@@ -46,14 +46,14 @@ class ContentScanner {
  public:
   explicit ContentScanner(const ContentQuery& query, const int& stop_flag);
 
-  enum class Result { kMatch, kNoMatch, kStopped, kFailed };
+  enum class Outcome { kMatch, kNoMatch, kBinary, kStopped, kFailed };
   // Whether the regular file `name` in `folder` matches. kFailed leaves errno. Ends within one
   // piece once the stop flag is set.
-  Result Scan(int folder, const char* name);
+  Outcome Scan(int folder, const char* name);
 
  private:
   int Open(int folder, const char* name);
-  Result ScanOpen(int fd);
+  Outcome ScanOpen(int fd);
   void Search(std::string_view text);
   bool Decided(bool at_end) const;
 

@@ -6,20 +6,19 @@
 #include <string>
 
 #include "nas/base/sqlite.h"
-#include "nas/results/row_block.h"
+#include "nas/results/row_sink.h"
 
 namespace nas {
 
-class ResultWriter {
+class ResultWriter : public RowSink {
  public:
   // Makes the file, which must not exist. Throws SqliteError.
   explicit ResultWriter(const std::string& path);
 
   // Registers where rows lie; to be called before any block that names it. Throws SqliteError.
   void AddLocation(std::uint16_t id, const std::string& share_name, const std::string& share_root);
-  // Appends the block's rows and empties it; they are visible to listings at once. Callable from
-  // any thread. Throws SqliteError; the block then keeps its rows.
-  void Append(RowBlock& block);
+  // The rows are visible to listings at once. Throws SqliteError.
+  void Append(RowBlock& block) override;
   // Says that no rows will follow, so that orderings are worth keeping. Throws SqliteError.
   void Complete();
   std::uint64_t rows();

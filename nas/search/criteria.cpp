@@ -123,6 +123,10 @@ bool FindSizeComp::match(const WalkEntry& entry) const {
   return at_least_ ? size >= bytes_ : size <= bytes_;
 }
 
+Refusal FindSizeComp::refusal() const {
+  return at_least_ ? Refusal::kTooSmall : Refusal::kTooLarge;
+}
+
 FindTimeComp::FindTimeComp(const char* op, long seconds)
     : after_(std::strcmp(op, "after") == 0), seconds_(seconds) {}
 
@@ -138,6 +142,18 @@ bool FindCRTimeComp::match(const WalkEntry& entry) const {
 }
 
 bool FindATimeComp::match(const WalkEntry& entry) const { return InRange(entry.attributes->atime); }
+
+Refusal FindMTimeComp::refusal() const {
+  return OutOfRange(Refusal::kModifiedEarlier, Refusal::kModifiedLater);
+}
+
+Refusal FindCRTimeComp::refusal() const {
+  return OutOfRange(Refusal::kCreatedEarlier, Refusal::kCreatedLater);
+}
+
+Refusal FindATimeComp::refusal() const {
+  return OutOfRange(Refusal::kReadEarlier, Refusal::kReadLater);
+}
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                               std::vector<FindComp*>& comps) {

@@ -11,6 +11,7 @@
 
 #include "nas/match/file_kinds.h"
 #include "nas/match/name_pattern.h"
+#include "nas/search/refusal.h"
 #include "platform/filesearch.h"
 
 namespace nas {
@@ -20,6 +21,7 @@ class PatternComp : public FileSearch::FindComp {
   explicit PatternComp(NamePattern pattern) : pattern_(std::move(pattern)) {}
   Needs needs() const override { return Needs::kName; }
   bool match(const FileSearch::WalkEntry& entry) const override;
+  Refusal refusal() const override { return Refusal::kName; }
   const NamePattern& pattern() const { return pattern_; }
 
  private:
@@ -34,6 +36,7 @@ class ExtensionComp : public FileSearch::FindComp {
   explicit ExtensionComp(std::string_view list);
   Needs needs() const override { return Needs::kName; }
   bool match(const FileSearch::WalkEntry& entry) const override;
+  Refusal refusal() const override { return Refusal::kExtension; }
 
  private:
   std::vector<std::string> suffixes_;  // folded, each with its dot
@@ -44,8 +47,9 @@ class KindComp : public FileSearch::FindComp {
   // "file", "dir", "image", "video", "audio", "document", "archive" in any letter case; an empty
   // word restricts nothing. Null for any other.
   static std::unique_ptr<KindComp> Parse(std::string_view word);
-  Needs needs() const override { return Needs::kKind; }
+  Needs needs() const override { return Needs::kName; }
   bool match(const FileSearch::WalkEntry& entry) const override;
+  Refusal refusal() const override { return Refusal::kKind; }
 
  private:
   KindComp() = default;
@@ -59,6 +63,7 @@ class OwnerComp : public FileSearch::FindComp {
   explicit OwnerComp(uid_t uid) : uid_(uid) {}
   Needs needs() const override { return Needs::kAttributes; }
   bool match(const FileSearch::WalkEntry& entry) const override;
+  Refusal refusal() const override { return Refusal::kOwner; }
 
  private:
   uid_t uid_;
@@ -69,6 +74,7 @@ class GroupComp : public FileSearch::FindComp {
   explicit GroupComp(gid_t gid) : gid_(gid) {}
   Needs needs() const override { return Needs::kAttributes; }
   bool match(const FileSearch::WalkEntry& entry) const override;
+  Refusal refusal() const override { return Refusal::kGroup; }
 
  private:
   gid_t gid_;

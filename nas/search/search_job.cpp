@@ -1,8 +1,6 @@
 #include "nas/search/search_job.h"
 
-#include <fcntl.h>
 #include <sys/resource.h>
-#include <sys/stat.h>
 
 #include <algorithm>
 #include <chrono>
@@ -32,7 +30,7 @@ constexpr int kFlushShare = 200;  // one part of the elapsed time
 // half a megabyte.
 constexpr unsigned kFewestThreads = 2;
 constexpr unsigned kMostAtFirst = 8;
-constexpr size_t kMostThreads = FolderStack::kMostThreads;
+constexpr size_t kMostThreads = NameSource::kMostThreads;
 // A search that got less than this part of its cores, and read from a disk, waits for the disk.
 constexpr double kBusyShare = 0.7;
 
@@ -70,78 +68,38 @@ unsigned ThreadsAtFirst() {
 
 }  // namespace
 
-SearchJob::SearchJob(const std::vector<Location>& locations,
-                     const std::vector<FileSearch::FindComp*>& comps, ResultWriter& writer,
-                     const int& stop_flag, Settings settings)
-    : settings_(std::move(settings)), shared_(locations, comps, writer, stop_flag) {
-  shared_.recursive = settings_.recursive;
-  for (const int error_number : settings_.unopened) shared_.progress.AddSkipped(error_number);
-  if (settings_.search_content && shared_.criteria.pattern != nullptr) {
-    shared_.content = ContentQuery::From(shared_.criteria.pattern->pattern());
-  }
-  if (shared_.content) {
-    shared_.candidates = std::make_unique<CandidateList>(settings_.temporary_folder);
-  }
-  std::vector<std::string> volumes = ListVolumes();
-  volumes.push_back(ScratchVolume());
-  for (const std::string& volume : volumes) {
-    struct stat status;
-    if (stat((volume + "/@tmp").c_str(), &status) == 0) {
-      shared_.never_entered.emplace(status.st_dev, status.st_ino);
-    }
-  }
-}
-
 void SearchJob::Fail(std::exception_ptr failure) {
   const std::lock_guard lock(mutex_);
   if (!failure_) failure_ = std::move(failure);
-  shared_.failed = true;
-  shared_.stack.Abort();
+  search_.failed = true;
+  source_->Abort();
 }
 
-bool SearchJob::Run() {
-  PushLocations();
-  RunPhase(&WalkThread::WalkNames);
-  if (shared_.content && !shared_.stopping()) {
-    shared_.progress.SetPhase(WalkProgress::Phase::kContents);
-    RunPhase(&WalkThread::WalkContents);
+bool SearchJob::Run(NameSource& names, NameSource& contents) {
+  RunPhase(names);
+  if (search_.content && !search_.stopping()) {
+    search_.progress.SetPhase(WalkProgress::Phase::kContents);
+    RunPhase(contents);
   }
   if (failure_) std::rethrow_exception(failure_);
   Flush();
-  const bool completed = !shared_.stopping();
-  if (completed) shared_.progress.SetPhase(WalkProgress::Phase::kDone);
+  const bool completed = !search_.stopping();
+  if (completed) search_.progress.SetPhase(WalkProgress::Phase::kDone);
   return completed;
 }
 
-void SearchJob::PushLocations() {
-  const std::vector<Location>& locations = shared_.locations;
-  for (size_t i = 0; i < locations.size(); ++i) {
-    const Location& location = locations[i];
-    if (locations.size() > 1 &&
-        !shared_.location_ids.emplace(location.device, location.inode).second) {
-      continue;  // the same folder once more
-    }
-    auto batch = std::make_shared<FolderBatch>();
-    batch->parent = UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0));
-    batch->location = static_cast<std::uint16_t>(i);
-    batch->parent_path = location.path;
-    batch->names.assign(".\0", 2);
-    shared_.stack.Push(0, std::move(batch));
-  }
-}
-
-void SearchJob::RunPhase(Work work) {
+void SearchJob::RunPhase(NameSource& source) {
+  source_ = &source;
   const unsigned count = ThreadsAtFirst();
-  for (unsigned i = 0; i < count; ++i) StartThread(work);
-  Tend(work);
+  for (unsigned i = 0; i < count; ++i) StartThread(source);
+  Tend(source);
   handles_.clear();
 }
 
 // Starts one more thread. Where the machine gives none, the search goes on with those it has.
-void SearchJob::StartThread(Work work) {
+void SearchJob::StartThread(NameSource& source) {
   const size_t number = handles_.size();
-  if (number == threads_.size()) threads_.push_back(std::make_unique<WalkThread>(shared_, number));
-  WalkThread* thread = threads_[number].get();
+  if (number == judges_.size()) judges_.push_back(std::make_unique<Judge>(search_));
   {
     const std::lock_guard lock(mutex_);
     ++running_;
@@ -151,9 +109,9 @@ void SearchJob::StartThread(Work work) {
     if (--running_ == 0) ended_.notify_all();
   };
   try {
-    handles_.emplace_back([this, thread, work, ended] {
+    handles_.emplace_back([this, number, &source, judge = judges_[number].get(), ended] {
       try {
-        (thread->*work)();
+        source.Feed(number, *judge);
       } catch (...) {
         Fail(std::current_exception());
       }
@@ -166,7 +124,7 @@ void SearchJob::StartThread(Work work) {
 }
 
 // Waits for the threads; meanwhile looks after the stop flag, the rows, the report and the disk.
-void SearchJob::Tend(Work work) {
+void SearchJob::Tend(NameSource& source) {
   const Clock::time_point begun = Clock::now();
   Clock::time_point flushed;
   DiskWatch disk(ThreadsAtFirst());
@@ -175,7 +133,7 @@ void SearchJob::Tend(Work work) {
   while (!ended_.wait_for(lock, tick, [this] { return running_ == 0; })) {
     lock.unlock();
     tick = kTick;
-    if (shared_.stopping()) shared_.stack.Abort();
+    if (search_.stopping()) source_->Abort();
     const Clock::time_point now = Clock::now();
     const auto interval =
         std::clamp(std::chrono::duration_cast<milliseconds>((now - begun) / kFlushShare),
@@ -185,9 +143,9 @@ void SearchJob::Tend(Work work) {
         Flush();
         flushed = now;
       }
-      settings_.report(shared_.progress);
+      settings_.report(search_.progress);
       LookForStuckThreads(now);
-      if (disk.Waiting() && handles_.size() < kMostThreads) StartThread(work);
+      if (disk.Waiting() && handles_.size() < kMostThreads) StartThread(source);
     } catch (...) {
       Fail(std::current_exception());
     }
@@ -196,7 +154,7 @@ void SearchJob::Tend(Work work) {
 }
 
 void SearchJob::LookForStuckThreads(Clock::time_point now) {
-  if (__atomic_load_n(&shared_.stop_flag, __ATOMIC_RELAXED) == 0 || told_stuck_) return;
+  if (!search_.stopped() || told_stuck_) return;
   if (!stop_seen_) stop_seen_ = now;
   if (now - *stop_seen_ < kStopPatience) return;
   told_stuck_ = true;
@@ -205,7 +163,7 @@ void SearchJob::LookForStuckThreads(Clock::time_point now) {
 }
 
 void SearchJob::Flush() {
-  for (const auto& thread : threads_) thread->Flush();
+  for (const auto& judge : judges_) judge->Flush();
 }
 
 }  // namespace nas

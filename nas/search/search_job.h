@@ -1,30 +1,25 @@
 #pragma once
-// One search from its first folder to its last: starts the threads (walk_thread.h), as many as the
-// machine can use, makes their rows visible in time, reports, and ends them.
-
-#include <sys/types.h>
+// One search from its first entry to its last: starts threads, as many as the machine can use, on
+// each source of names in turn, makes their rows visible in time, reports, and ends them.
 
 #include <chrono>
 #include <condition_variable>
 #include <exception>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <optional>
-#include <string>
 #include <thread>
 #include <vector>
 
-#include "nas/search/walk_thread.h"
+#include "nas/search/judge.h"
+#include "nas/search/name_source.h"
 
 namespace nas {
 
 class SearchJob {
  public:
   struct Settings {
-    bool recursive = true;
-    bool search_content = false;
-    std::string temporary_folder;  // for the list of files to read
-    std::vector<int> unopened;     // errno of each location asked for that is not searched
     // Called by the thread that runs the job, every few hundredths of a second, after the rows
     // found so far have been made visible.
     std::function<void(const WalkProgress&)> report;
@@ -35,28 +30,27 @@ class SearchJob {
     std::function<void()> stuck;
   };
 
-  SearchJob(const std::vector<Location>& locations, const std::vector<FileSearch::FindComp*>& comps,
-            ResultWriter& writer, const int& stop_flag, Settings settings);
+  // `search` is borrowed.
+  SearchJob(SharedSearch& search, Settings settings)
+      : settings_(std::move(settings)), search_(search) {}
 
-  // Runs to the end. False when the stop flag ended it. Throws what a thread failed with:
-  // SqliteError, std::system_error, std::bad_alloc.
-  bool Run();
-  const WalkProgress& progress() const { return shared_.progress; }
+  // Runs to the end, once: all of `names`, then `contents` if the search asks for them. False when
+  // the stop flag ended it. Every thread has ended when it returns, all rows are with the sink.
+  // Throws what a thread failed with: what the sink or a source throws, std::bad_alloc.
+  bool Run(NameSource& names, NameSource& contents);
 
  private:
-  using Work = void (WalkThread::*)();
-
-  void PushLocations();
-  void RunPhase(Work work);
-  void StartThread(Work work);
-  void Tend(Work work);
+  void RunPhase(NameSource& source);
+  void StartThread(NameSource& source);
+  void Tend(NameSource& source);
   void LookForStuckThreads(std::chrono::steady_clock::time_point now);
   void Flush();
   void Fail(std::exception_ptr failure);
 
   const Settings settings_;
-  SharedWalk shared_;
-  std::vector<std::unique_ptr<WalkThread>> threads_;
+  SharedSearch& search_;
+  std::vector<std::unique_ptr<Judge>> judges_;  // by thread
+  NameSource* source_ = nullptr;                // that threads feed from
   std::optional<std::chrono::steady_clock::time_point> stop_seen_;
   bool told_stuck_ = false;
 

@@ -20,6 +20,8 @@
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
+#include "nas/search/content_reading.h"
+#include "nas/search/folder_walk.h"
 #include "nas/search/location.h"
 #include "nas/search/search_job.h"
 #include "nas/system/shares.h"
@@ -178,17 +180,16 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
 }
 
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
-  nas::SearchJob job(
-      locations_, comps_, *writer_, stop_flag_,
-      {.recursive = !current_only_,
-       .search_content = options.get("search_content", false).asBool(),
-       .temporary_folder = folder_,
-       .unopened = unopened_,
-       .report = [this](const nas::WalkProgress& progress) { Report(progress, false); },
-       .stuck = [this] { EndWorker(); }});
-  const bool completed = job.Run();
+  nas::SharedSearch search(comps_, *writer_, stop_flag_);
+  for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
+  if (options.get("search_content", false).asBool()) search.SearchContents(folder_);
+  nas::FolderWalk walk(locations_, !current_only_, search);
+  nas::ContentReading contents(locations_, search);
+  nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },
+                              .stuck = [this] { EndWorker(); }});
+  const bool completed = job.Run(walk, contents);
   writer_->Complete();
-  Report(job.progress(), true);
+  Report(search.progress, true);
   if (writer_->rows() >= kWorthSorting) {
     writer_.reset();
     WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));

@@ -23,7 +23,7 @@ class Contents : public testing::Test {
   }
   ~Contents() override { std::filesystem::remove_all(folder_); }
 
-  ContentScanner::Result Scan(const std::string& pattern_text, const std::string& content) {
+  ContentScanner::Outcome Scan(const std::string& pattern_text, const std::string& content) {
     std::string trouble;
     const auto query = ContentQuery::From(NamePattern::Parse(pattern_text, trouble).value());
     EXPECT_TRUE(query) << pattern_text;
@@ -31,7 +31,7 @@ class Contents : public testing::Test {
     return ContentScanner(*query, stop_).Scan(fd_.get(), "file");
   }
   bool Finds(const std::string& pattern, const std::string& content) {
-    return Scan(pattern, content) == ContentScanner::Result::kMatch;
+    return Scan(pattern, content) == ContentScanner::Outcome::kMatch;
   }
 
   const std::string folder_ = testing::TempDir() + "contents-" + std::to_string(getpid());
@@ -124,13 +124,13 @@ TEST_F(Contents, LiteralAgainstPlainSearch) {
 
 TEST_F(Contents, StopsAndFails) {
   stop_ = 1;
-  EXPECT_EQ(Scan("x", "x"), ContentScanner::Result::kStopped);
+  EXPECT_EQ(Scan("x", "x"), ContentScanner::Outcome::kStopped);
   stop_ = 0;
   std::filesystem::remove(folder_ + "/file");
   std::filesystem::create_symlink("/etc/passwd", folder_ + "/file");
   std::string trouble;
   const auto query = ContentQuery::From(NamePattern::Parse("root", trouble).value());
-  EXPECT_EQ(ContentScanner(*query, stop_).Scan(fd_.get(), "file"), ContentScanner::Result::kFailed)
+  EXPECT_EQ(ContentScanner(*query, stop_).Scan(fd_.get(), "file"), ContentScanner::Outcome::kFailed)
       << "links are not followed";
 }
 

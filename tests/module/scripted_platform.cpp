@@ -56,6 +56,7 @@ class TextComp : public FileSearch::FindComp {
   explicit TextComp(const std::string& text) { MadeWith(this) = text; }
   ~TextComp() override { Note("~" + MadeWith(this)); }
   Needs needs() const override { return Needs::kName; }
+  FileSearch::Refusal refusal() const override { return {}; }
   bool match(const FileSearch::WalkEntry& /*entry*/) const override { return true; }
 };
 
@@ -446,6 +447,7 @@ FindSizeComp::FindSizeComp(const char* op, long long bytes) : at_least_(*op == '
   MadeWith(this) = std::string("size ") + op + " " + std::to_string(bytes);
 }
 bool FindSizeComp::match(const WalkEntry& /*entry*/) const { return at_least_ && bytes_ != 0; }
+Refusal FindSizeComp::refusal() const { return {}; }
 FindTimeComp::FindTimeComp(const char* op, long seconds) : after_(*op == 'a'), seconds_(seconds) {
   MadeWith(this) = std::string(op) + " " + std::to_string(seconds);
 }
@@ -453,8 +455,11 @@ bool FindTimeComp::InRange(std::int64_t file_seconds) const {
   return after_ == (file_seconds >= seconds_);
 }
 bool FindMTimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
+Refusal FindMTimeComp::refusal() const { return {}; }
 bool FindCRTimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
+Refusal FindCRTimeComp::refusal() const { return {}; }
 bool FindATimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
+Refusal FindATimeComp::refusal() const { return {}; }
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                               std::vector<FindComp*>& comps) {

@@ -1,0 +1,58 @@
+#include "nas/search/folder_gate.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <string>
+#include <string_view>
+
+#include "nas/files/beneath.h"
+#include "nas/files/file_systems.h"
+#include "nas/system/shares.h"
+#include "nas/system/volumes.h"
+
+namespace nas {
+
+FolderGate::FolderGate(const std::vector<Location>& locations, bool recursive)
+    : recursive_(recursive) {
+  std::vector<std::string> volumes = ListVolumes();
+  volumes.push_back(ScratchVolume());
+  for (const std::string& volume : volumes) {
+    struct stat status;
+    if (stat((volume + "/" + kTemporaryFolder).c_str(), &status) == 0) {
+      temporary_.emplace(status.st_dev, status.st_ino);
+    }
+  }
+  if (locations.size() == 1) return;
+  for (const Location& location : locations) locations_.emplace(location.device, location.inode);
+}
+
+FolderGate::Opened FolderGate::Open(int parent, const char* name) const {
+  constexpr int kFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC | O_NONBLOCK;
+  const bool is_location = std::string_view(name) == ".";
+  // Mount points answer EXDEV, so that every other folder is spared the question what it is on.
+  bool crossed = false;
+  UniqueFd fd = OpenOnSameMount(parent, name, kFlags);
+  if (!fd && errno == EXDEV) {
+    crossed = true;
+    fd.Reset(openat(parent, name, kFlags));
+  }
+  if (!fd) return {UniqueFd(), Refusal::kFolderUnreadable, errno};
+  const Refusal refusal = is_location ? Refusal::kNone : MayEnter(fd.get(), name, crossed);
+  if (refusal != Refusal::kNone) fd.Reset();
+  return {std::move(fd), refusal, 0};
+}
+
+Refusal FolderGate::MayEnter(int fd, std::string_view name, bool crossed) const {
+  if (crossed && IsPseudoFileSystem(fd)) return Refusal::kPseudoFileSystem;
+  const bool may_be_temporary = name == kTemporaryFolder && !temporary_.empty();
+  if (!may_be_temporary && locations_.empty()) return Refusal::kNone;
+  struct stat status;
+  if (fstat(fd, &status) != 0) return Refusal::kNone;
+  const std::pair id(status.st_dev, status.st_ino);
+  if (temporary_.contains(id)) return Refusal::kTemporaryFolder;
+  return locations_.contains(id) ? Refusal::kOtherLocation : Refusal::kNone;
+}
+
+}  // namespace nas

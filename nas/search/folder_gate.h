@@ -1,0 +1,54 @@
+#pragma once
+// Which folders a search enters.
+//
+// Symbolic links are results, never followed. A folder on another file system is entered unless it
+// is a pseudo file system (proc, sysfs and their like) below a location; the temporary folders
+// "@tmp" of volumes are never entered. A location inside another is entered as a location only, so
+// that its files are found once.
+
+#include <dirent.h>
+#include <sys/types.h>
+
+#include <set>
+#include <utility>
+#include <vector>
+
+#include "nas/base/unique_fd.h"
+#include "nas/search/location.h"
+#include "nas/search/refusal.h"
+
+namespace nas {
+
+// Does not change once made: any thread may ask.
+class FolderGate {
+ public:
+  // Looks where the volumes' temporary folders are.
+  FolderGate(const std::vector<Location>& locations, bool recursive);
+
+  // Whether an entry of this type (DT_*) is a folder whose own entries are searched too; kNone, or
+  // why not. Says nothing yet of that very folder: Open does.
+  Refusal Below(unsigned char type) const {
+    if (type != DT_DIR) return type == DT_LNK ? Refusal::kSymbolicLink : Refusal::kNoFolder;
+    return recursive_ ? Refusal::kNone : Refusal::kNotRecursive;
+  }
+
+  // The folder to read, or why it is left out: with kFolderUnreadable errno says more.
+  struct Opened {
+    UniqueFd fd;
+    Refusal refusal = Refusal::kNone;
+    int error_number = 0;
+  };
+  // `name` (NUL-ended) in the folder open at `parent`; "." is `parent` itself, a location.
+  Opened Open(int parent, const char* name) const;
+
+ private:
+  using FolderIds = std::set<std::pair<dev_t, ino_t>>;
+
+  Refusal MayEnter(int fd, std::string_view name, bool crossed) const;
+
+  const bool recursive_;
+  FolderIds temporary_;  // the @tmp folders of volumes
+  FolderIds locations_;  // filled when there is more than one
+};
+
+}  // namespace nas

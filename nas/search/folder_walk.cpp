@@ -1,0 +1,73 @@
+#include "nas/search/folder_walk.h"
+
+#include <fcntl.h>
+
+#include <memory>
+#include <set>
+#include <utility>
+
+namespace nas {
+
+static_assert(FolderStack::kMostThreads >= NameSource::kMostThreads);
+
+FolderWalk::FolderWalk(const std::vector<Location>& locations, bool recursive, SharedSearch& search)
+    : search_(search), gate_(locations, recursive) {
+  std::set<std::pair<dev_t, ino_t>> known;
+  for (size_t i = 0; i < locations.size(); ++i) {
+    const bool added = known.emplace(locations[i].device, locations[i].inode).second;
+    if (added) Push(static_cast<std::uint16_t>(i), locations[i]);
+  }
+}
+
+void FolderWalk::Push(std::uint16_t number, const Location& location) {
+  auto batch = std::make_shared<FolderBatch>();
+  batch->parent = UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0));
+  batch->location = number;
+  batch->parent_path = location.path;
+  batch->names.assign(".\0", 2);
+  stack_.Push(0, std::move(batch));
+}
+
+void FolderWalk::Feed(size_t thread, Judge& judge) {
+  Reading reading{thread, judge, {}, {}};
+  FolderStack::Item item;
+  while (stack_.Take(thread, item)) {
+    FolderGate::Opened folder = gate_.Open(item.batch->parent.get(), item.name.data());
+    if (folder.fd) {
+      ReadFolder(item, std::move(folder.fd), reading);
+    } else if (folder.refusal == Refusal::kFolderUnreadable) {
+      search_.progress.AddSkipped(folder.error_number);
+    }
+    if (search_.stopping()) stack_.Abort();
+  }
+}
+
+void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading& reading) {
+  const std::uint16_t location = item.batch->location;
+  std::string& path = reading.path;
+  path = item.batch->parent_path;
+  if (item.name != ".") {
+    if (!path.empty()) path.push_back('/');
+    path.append(item.name);
+  }
+  auto below = std::make_shared<FolderBatch>();
+  std::uint64_t entries = 0;
+  DirectoryReader::Entry entry;
+  reading.reader.Start(fd.get());
+  reading.judge.Enter(fd.get(), location, path);
+  while (reading.reader.Next(entry) && !search_.stopping()) {
+    ++entries;
+    if (gate_.Below(entry.type) == Refusal::kNone) below->names.append(entry.name).push_back('\0');
+    reading.judge.Entry(entry);
+  }
+  if (reading.reader.failed() != 0) search_.progress.AddSkipped(reading.reader.failed());
+  search_.progress.AddFolder(entries);
+  reading.judge.Leave();
+  if (below->names.empty()) return;
+  below->location = location;
+  below->parent_path = path;
+  below->parent = std::move(fd);
+  stack_.Push(reading.thread, std::move(below));
+}
+
+}  // namespace nas
