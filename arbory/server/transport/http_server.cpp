@@ -12,9 +12,9 @@
 #include <boost/asio/steady_timer.hpp>
 #include <charconv>
 #include <set>
+#include <stdexcept>
 #include <unordered_map>
 
-#include "arbory/options.h"
 #include "arbory/server/transport/child_pipe.h"
 #include "arbory/server/transport/connection.h"
 #include "arbory/server/transport/processes.h"
@@ -45,7 +45,8 @@ tcp::endpoint ParseAddress(const std::string& text) {
   Error error;
   const auto address = asio::ip::make_address(host, error);
   if (error || parsed.ec != std::errc() || parsed.ptr != port.data() + port.size()) {
-    throw UsageError("'" + text + "' is no address to listen on; give one like 127.0.0.1:8750");
+    throw std::runtime_error("'" + text +
+                             "' is no address to listen on; give one like 127.0.0.1:8750");
   }
   return {address, number};
 }
@@ -132,8 +133,8 @@ class HttpServer::Loop : public ConnectionHost {
       acceptor_.listen(asio::socket_base::max_listen_connections);
       endpoint_ = acceptor_.local_endpoint();
     } catch (const boost::system::system_error& error) {
-      throw UsageError("cannot listen on " + AddressText(wanted) + ": " + error.code().message() +
-                       "; give another address with --listen");
+      throw std::runtime_error("cannot listen on " + AddressText(wanted) + ": " +
+                               error.code().message() + "; give another address with --listen");
     }
     address_ = AddressText(endpoint_);
   }

@@ -18,7 +18,8 @@ namespace arbory {
 
 class HttpServer {
  public:
-  // Listens. Throws UsageError for an address that is none or cannot be had.
+  // Listens. Throws std::runtime_error, in words for the user, for an address that is none or
+  // cannot be had.
   explicit HttpServer(const nas::ServerSettings& settings);
   ~HttpServer();
   HttpServer(const HttpServer&) = delete;
