@@ -269,7 +269,7 @@ TEST_F(CallTest, StoppingLeavesSearchesWhole) {
   EXPECT_TRUE(server.Get("/searches/" + last).json()["finished"].asBool());
 }
 
-TEST_F(CallTest, TheDescriptionIsWholeAndTheCountsAreThere) {
+TEST_F(CallTest, TheCountsAreThere) {
   Server server = Start();
   server.Open();
   server.Call("list", "{}");
@@ -280,22 +280,6 @@ TEST_F(CallTest, TheDescriptionIsWholeAndTheCountsAreThere) {
         "arbory_call_seconds_count{method=\"shares\"} 1\n", "arbory_sessions 1\n",
         "arbory_replies_total{status=\"303\"} 1\n"}) {
     EXPECT_NE(metrics.find(line), std::string::npos) << line << metrics;
-  }
-  const Reply reply = server.Get("/api/openapi.json");
-  const Json::Value document = reply.json();
-  EXPECT_EQ(document["openapi"], "3.1.0");
-  for (const Json::Value& row : server.Get("/api").json()) {
-    const std::string path = "/api/" + row["api"].asString() + "/" + row["version"].asString() +
-                             "/" + row["method"].asString();
-    EXPECT_TRUE(document["paths"][path]["post"]["requestBody"].isObject()) << path;
-  }
-  constexpr std::string_view kRef = "\"$ref\":\"#/";
-  for (size_t at = 0; (at = reply.body.find(kRef, at)) != std::string::npos; ++at) {
-    const size_t from = at + kRef.size();
-    std::stringstream path(reply.body.substr(from, reply.body.find('"', from) - from));
-    const Json::Value* node = &document;
-    for (std::string part; std::getline(path, part, '/');) node = &(*node)[part];
-    EXPECT_TRUE(node->isObject()) << path.str();
   }
 }
 

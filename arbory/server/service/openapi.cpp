@@ -44,6 +44,8 @@ constexpr Parameter kParameters[] = {
     {kSearch, "start", "recursive", "boolean", false, "Enter the folders inside."},
     {kSearch, "start", "search_content", "boolean", false,
      "Find also files whose contents hold the pattern."},
+    {kSearch, "start", "search_type", "string", false,
+     "simple, the default, or advance: the history that the search enters."},
     {kSearch, "list", "taskid", "string", true, "The search, as start named it."},
     {kSearch, "list", "offset", "integer", false, "Rows to leave out; 0 by default."},
     {kSearch, "list", "limit", "integer", false, "Rows in the page; 0, the default, for all."},
@@ -95,27 +97,6 @@ constexpr Method kMethods[] = {
     {kHistory, "set", "Remember a search", R"({"type":"null"})", "401 no pattern, or not stored"},
     {kHistory, "delete", "Forget all searches of one kind", R"({"type":"null"})",
      "401 not deleted"},
-};
-
-struct Route {
-  const char* method;
-  const char* path;
-  const char* summary;
-  const char* type;  // of the reply
-};
-
-constexpr Route kRoutes[] = {
-    {"get", "/api", "The rows of the method table", "application/json"},
-    {"post", "/login", "Begin a session with {\"user\", \"password\"}", "application/json"},
-    {"post", "/logout", "End the session; {\"stop_searches\": true} stops the user's searches",
-     "application/json"},
-    {"get", "/session", "Who is logged in and until when", "application/json"},
-    {"get", "/shares", "The shares the user can enter", "application/json"},
-    {"get", "/searches/{taskid}", "How far a search has come", "application/json"},
-    {"get", "/files/{share}/{path}", "One file, as a download or with preview=1 to look at",
-     "application/octet-stream"},
-    {"get", "/health", "Whether the server answers", "application/json"},
-    {"get", "/metrics", "Counts, in the Prometheus text format", "text/plain"},
 };
 
 constexpr char kComponents[] = R"({
@@ -183,7 +164,24 @@ void AddErrors(std::initializer_list<const char*> statuses, Json::Value* respons
   }
 }
 
-void AddCall(const NUVA::APIMethod& row, Json::Value* paths) {
+// The pattern with `values` in the place of its parts in braces.
+std::string FilledIn(std::string pattern, std::initializer_list<std::string> values) {
+  for (const std::string& value : values) {
+    const size_t open = pattern.find('{');
+    pattern.replace(open, pattern.find('}', open) + 1 - open, value);
+  }
+  return pattern;
+}
+
+void AddAccess(const Route& route, Json::Value* operation) {
+  if (route.access == Access::kLoggedIn) {
+    (*operation)["security"] = Parsed(R"([{"session":[]}])");
+  }
+}
+
+const char* Verb(const Route& route) { return route.method == RouteMethod::kPost ? "post" : "get"; }
+
+void AddCall(const Route& route, const NUVA::APIMethod& row, Json::Value* paths) {
   const Method* known = nullptr;
   for (const Method& method : kMethods) {
     if (std::string(method.api) == row.api && strcasecmp(method.method, row.method) == 0) {
@@ -191,24 +189,27 @@ void AddCall(const NUVA::APIMethod& row, Json::Value* paths) {
     }
   }
   const std::string version = std::to_string(row.version);
-  Json::Value& post =
-      (*paths)["/api/" + std::string(row.api) + "/" + version + "/" + row.method]["post"];
-  post["summary"] = known == nullptr ? row.method : known->summary;
-  post["operationId"] = std::string(row.api) + "." + version + "." + row.method;
-  post["security"] = Parsed(R"([{"session":[]}])");
-  post["requestBody"]["content"]["application/json"]["schema"] = BodySchema(row.api, row.method);
-  post["responses"] = CallResponses(known);
-  AddErrors({"400", "401", "403", "404", "413", "415", "503"}, &post["responses"]);
+  const std::string path = FilledIn(route.pattern, {row.api, version, row.method});
+  Json::Value& operation = (*paths)[path][Verb(route)];
+  operation["summary"] = known == nullptr ? row.method : known->summary;
+  operation["operationId"] = std::string(row.api) + "." + version + "." + row.method;
+  AddAccess(route, &operation);
+  operation["requestBody"]["content"][route.reply_type]["schema"] = BodySchema(row.api, row.method);
+  operation["responses"] = CallResponses(known);
+  AddErrors({"400", "401", "403", "404", "413", "415", "503"}, &operation["responses"]);
 }
 
 void AddRoute(const Route& route, Json::Value* paths) {
-  Json::Value& operation = (*paths)[route.path][route.method];
+  std::string path = route.pattern;
+  const size_t many = path.find(kManyParts);
+  if (many != std::string::npos) path.replace(many, std::string_view(kManyParts).size(), "}");
+  Json::Value& operation = (*paths)[path][Verb(route)];
   operation["summary"] = route.summary;
+  AddAccess(route, &operation);
   Json::Value& ok = operation["responses"]["200"];
   ok["description"] = "As docs/http.md says.";
-  ok["content"][route.type] = Json::Value(Json::objectValue);
+  ok["content"][route.reply_type] = Json::Value(Json::objectValue);
   AddErrors({"400", "401", "403", "404", "429", "503"}, &operation["responses"]);
-  const std::string path = route.path;
   for (size_t open = path.find('{'); open != std::string::npos; open = path.find('{', open + 1)) {
     Json::Value parameter;
     parameter["name"] = path.substr(open + 1, path.find('}', open) - open - 1);
@@ -221,16 +222,22 @@ void AddRoute(const Route& route, Json::Value* paths) {
 
 }  // namespace
 
-std::string OpenApiText(const nas::Module& module) {
+std::string OpenApiText(const nas::Module& module, std::span<const Route> routes) {
   Json::Value document;
   document["openapi"] = "3.1.0";
   document["info"]["title"] = "Arbory Search";
   document["info"]["version"] = ARBORY_VERSION;
   document["components"] = Parsed(kComponents);
-  for (const NUVA::APIMethod* row = module.table(); row->api != nullptr; ++row) {
-    AddCall(*row, &document["paths"]);
+  for (const Route& route : routes) {
+    if (route.summary == nullptr) continue;
+    if (route.pattern != std::string_view(kCallPattern)) {
+      AddRoute(route, &document["paths"]);
+      continue;
+    }
+    for (const NUVA::APIMethod* row = module.table(); row->api != nullptr; ++row) {
+      AddCall(route, *row, &document["paths"]);
+    }
   }
-  for (const Route& route : kRoutes) AddRoute(route, &document["paths"]);
   return nas::JsonText(document, nas::JsonBytes::kClean);
 }
 

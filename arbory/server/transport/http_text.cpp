@@ -168,6 +168,15 @@ std::string LowerCase(std::string_view text) {
   return lower;
 }
 
+std::optional<Json::Value> JsonBody(const HttpRequest& request) {
+  Json::Value params(Json::objectValue);
+  if (request.body.empty()) return params;
+  const bool read = nas::ParseJson(request.body, &params, nas::kRequestMaxDepth);
+  return read && params.isObject() ? std::optional(params) : std::nullopt;
+}
+
+HttpReply BadBodyReply() { return ErrorReply(kBadRequest, "The body must be one JSON object."); }
+
 HttpReply JsonReply(int status, std::string body) {
   return {status,
           {{"Content-Type", "application/json"}, {"Cache-Control", "no-store"}},

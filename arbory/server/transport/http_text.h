@@ -1,6 +1,8 @@
 #pragma once
 // The texts of HTTP: targets, cookies, headers and error bodies.
 
+#include <json/value.h>
+
 #include <optional>
 #include <string>
 #include <string_view>
@@ -28,6 +30,11 @@ std::string ContentDisposition(bool inline_shown, const std::string& name);
 
 std::string_view ReasonPhrase(int status);
 std::string LowerCase(std::string_view text);
+
+// The parameters in a request's body, a JSON object; an empty one for an empty body, and nothing
+// for any other, which BadBodyReply answers.
+std::optional<Json::Value> JsonBody(const HttpRequest& request);
+HttpReply BadBodyReply();
 
 HttpReply JsonReply(int status, std::string body);
 // {"code":STATUS,"error":SENTENCE}, or with a code of its own.

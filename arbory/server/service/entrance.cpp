@@ -1,14 +1,12 @@
-// The service's routes that begin and end sessions.
+#include "arbory/server/service/entrance.h"
 
 #include <algorithm>
-#include <ctime>
 
-#include "arbory/server/service/login.h"
-#include "arbory/server/service/service.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http_text.h"
 #include "arbory/session.h"
 #include "nas/base/json_text.h"
+#include "nas/base/random_name.h"
 
 namespace arbory {
 namespace {
@@ -39,38 +37,61 @@ bool IsAbsurd(const std::string& text) {
 
 }  // namespace
 
-Answer Service::OpenByToken(const HttpRequest& request) {
+Entrance::Entrance(Rules rules, const nas::Module& module, Calls* calls, Metrics* metrics)
+    : rules_(std::move(rules)),
+      module_(module),
+      calls_(*calls),
+      metrics_(*metrics),
+      sessions_(std::chrono::seconds(rules_.session_minutes * kMinuteSeconds)),
+      login_limit_(rules_.logins_per_minute) {}
+
+const std::string& Entrance::NewToken() { return token_ = nas::RandomName(); }
+
+std::string Entrance::SessionId(const HttpRequest& request) const {
+  return Cookie(request, rules_.cookie);
+}
+
+std::optional<HttpReply> Entrance::LetIn(HttpRequest* request) {
+  const auto session = sessions_.Find(SessionId(*request), std::time(nullptr));
+  if (!session) return NotLoggedIn();
+  request->user = session->user;
+  return std::nullopt;
+}
+
+HttpReply Entrance::Describe(const HttpRequest& request) {
+  const auto session = sessions_.Find(SessionId(request), std::time(nullptr));
+  return session ? SessionReply(*session) : NotLoggedIn();
+}
+
+Answer Entrance::OpenByToken(const HttpRequest& request) {
   const auto given = QueryValue(request.query(), "token");
   const bool good = !token_.empty() && given && SameText(*given, token_);
-  if (setup_.single_user.empty() || !good) {
+  if (rules_.single_user.empty() || !good) {
     return ErrorReply(kForbidden,
                       "This address opens the page only once. Print a new one: send the server "
                       "the signal HUP, or start it again.");
   }
   if (request.method != "GET") return NotAllowedReply("GET");
   token_.clear();
-  const std::string id = sessions_.Begin(setup_.single_user, std::time(nullptr));
+  const std::string id = sessions_.Begin(rules_.single_user, std::time(nullptr));
   HttpReply reply;
   reply.status = kSeeOther;
   reply.fields = {
-      {"Location", "/"},
-      {"Set-Cookie", SessionCookie(id, setup_.settings.session_minutes * kMinuteSeconds)},
-      {"Cache-Control", "no-store"}};
+      {"Location", "/"}, {"Set-Cookie", NewSessionCookie(id)}, {"Cache-Control", "no-store"}};
   return reply;
 }
 
-Answer Service::Login(const HttpRequest& request) {
-  if (!setup_.single_user.empty()) {
+Answer Entrance::Login(const HttpRequest& request) {
+  if (!rules_.single_user.empty()) {
     return ErrorReply(kForbidden, "This server has one user; open the address it printed.");
   }
   if (request.body.size() > kMaxLoginBytes) {
     return ErrorReply(kTooLarge, "The user or the password is too long.");
   }
-  Json::Value params;
-  Answer refusal;
-  if (!ParseBody(request, &params, &refusal)) return refusal;
-  const Json::Value& user = params["user"];
-  const Json::Value& password = params["password"];
+  const auto params = JsonBody(request);
+  if (!params) return BadBodyReply();
+  const Json::Value& user = (*params)["user"];
+  const Json::Value& password = (*params)["password"];
   if (!user.isString() || !password.isString() || user.asString().empty()) {
     return ErrorReply(kBadRequest, R"(Send {"user": TEXT, "password": TEXT}.)");
   }
@@ -84,8 +105,8 @@ Answer Service::Login(const HttpRequest& request) {
     return BusyReply(kTooMany, "Too many refused logins; wait a minute and try again.",
                      std::to_string(wait));
   }
-  const PamService pam{setup_.settings.pam_service, setup_.settings.pam_dir};
-  Answer answer = Run(request, "login", [&] { return StartLogin(credentials, pam); });
+  Answer answer =
+      calls_.Run(request.user, "login", [&] { return StartLogin(credentials, rules_.pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, Clock::now()},
                          count = std::move(child->make_reply)](const ChildHead* head) {
@@ -96,16 +117,15 @@ Answer Service::Login(const HttpRequest& request) {
   return answer;
 }
 
-HttpReply Service::LoginReply(const Attempt& attempt, const ChildHead* head) {
+HttpReply Entrance::LoginReply(const Attempt& attempt, const ChildHead* head) {
   if (head != nullptr && head->status == kOk) {
     const auto named = SplitPath("/" + head->fields.at(0).second);
     const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
     login_limit_.Succeeded(attempt.peer, attempt.user);
     const std::time_t now = std::time(nullptr);
     const std::string id = sessions_.Begin(user, now);
-    HttpReply reply = SessionReply(kOk, *sessions_.Find(id, now));
-    reply.fields.emplace_back("Set-Cookie",
-                              SessionCookie(id, setup_.settings.session_minutes * kMinuteSeconds));
+    HttpReply reply = SessionReply(*sessions_.Find(id, now));
+    reply.fields.emplace_back("Set-Cookie", NewSessionCookie(id));
     return reply;
   }
   metrics_.CountRefusedLogin();
@@ -118,15 +138,14 @@ HttpReply Service::LoginReply(const Attempt& attempt, const ChildHead* head) {
   return reply;
 }
 
-Answer Service::Logout(HttpRequest* request) {
-  Json::Value params;
-  Answer answer;
-  if (!Authenticate(request, &answer) || !ParseBody(*request, &params, &answer)) return answer;
-  const Json::Value& stops = params["stop_searches"];
+Answer Entrance::Logout(const HttpRequest& request) {
+  const auto params = JsonBody(request);
+  if (!params) return BadBodyReply();
+  const Json::Value& stops = (*params)["stop_searches"];
   if (!stops.isNull() && !stops.isBool()) {
     return ErrorReply(kBadRequest, R"(Send {"stop_searches": true} or false.)");
   }
-  sessions_.End(Cookie(*request, setup_.cookie));
+  sessions_.End(SessionId(request));
   const std::string gone = SessionCookie("", 0);
   const NUVA::APIMethod* stop = module_.Find(kSearchApi, 1, kStopMethod);
   if (!stops.isBool() || !stops.asBool() || stop == nullptr) {
@@ -134,7 +153,8 @@ Answer Service::Logout(HttpRequest* request) {
     reply.fields.emplace_back("Set-Cookie", gone);
     return reply;
   }
-  answer = Run(*request, "logout", [&] { return StartStopSearches(request->user, *stop); });
+  Answer answer =
+      calls_.Run(request.user, "logout", [&] { return StartStopSearches(request.user, *stop); });
   if (auto* busy = std::get_if<HttpReply>(&answer)) {
     busy->fields.emplace_back("Set-Cookie", gone);
     return answer;
@@ -148,34 +168,27 @@ Answer Service::Logout(HttpRequest* request) {
   return answer;
 }
 
-HttpReply Service::SessionReply(int status, const Sessions::Session& session) const {
+HttpReply Entrance::SessionReply(const Sessions::Session& session) const {
   Json::Value body;
   body["user"] = session.user;
-  body["mode"] = setup_.single_user.empty() ? "login" : "single";
+  body["mode"] = rules_.single_user.empty() ? "login" : "single";
   body["expires"] = Json::Int64{session.expires};
   body["version"] = ARBORY_VERSION;
-  return JsonReply(status, nas::JsonText(body, nas::JsonBytes::kClean));
+  return JsonReply(kOk, nas::JsonText(body, nas::JsonBytes::kClean));
 }
 
-std::string Service::SessionCookie(const std::string& id, long max_age) const {
-  return setup_.cookie + "=" + id +
+std::string Entrance::SessionCookie(const std::string& id, long max_age) const {
+  return rules_.cookie + "=" + id +
          "; Path=/; HttpOnly; SameSite=Strict; Max-Age=" + std::to_string(max_age) +
-         (setup_.site.behind_tls ? "; Secure" : "");
+         (rules_.behind_tls ? "; Secure" : "");
 }
 
-bool Service::Authenticate(HttpRequest* request, Answer* refusal) {
-  const std::string id = Cookie(*request, setup_.cookie);
-  const auto session = sessions_.Find(id, std::time(nullptr));
-  if (session) {
-    request->user = session->user;
-    return true;
-  }
-  *refusal = NotLoggedIn();
-  return false;
+std::string Entrance::NewSessionCookie(const std::string& id) const {
+  return SessionCookie(id, rules_.session_minutes * kMinuteSeconds);
 }
 
-HttpReply Service::NotLoggedIn() const {
-  const bool single = !setup_.single_user.empty();
+HttpReply Entrance::NotLoggedIn() const {
+  const bool single = !rules_.single_user.empty();
   Json::Value body;
   body["code"] = kUnauthorized;
   body["error"] = single ? "Open the address that the server printed when it started; a used one "
