@@ -9,20 +9,15 @@
 
 #include "nas/files/beneath.h"
 #include "nas/files/file_systems.h"
-#include "nas/system/shares.h"
 #include "nas/system/volumes.h"
 
 namespace nas {
 
 FolderGate::FolderGate(const std::vector<Location>& locations, bool recursive)
     : recursive_(recursive) {
-  std::vector<std::string> volumes = ListVolumes();
-  volumes.push_back(ScratchVolume());
-  for (const std::string& volume : volumes) {
+  for (const std::string& folder : TemporaryFolders()) {
     struct stat status;
-    if (stat((volume + "/" + kTemporaryFolder).c_str(), &status) == 0) {
-      temporary_.emplace(status.st_dev, status.st_ino);
-    }
+    if (stat(folder.c_str(), &status) == 0) temporary_.emplace(status.st_dev, status.st_ino);
   }
   if (locations.size() == 1) return;
   for (const Location& location : locations) locations_.emplace(location.device, location.inode);

@@ -54,10 +54,8 @@ PlatformError LocationError(int error_number) {
 bool IsTemporary(int folder) {
   const auto path = RealPath("/proc/self/fd/" + std::to_string(folder));
   if (!path) return false;
-  std::vector<std::string> volumes = ListVolumes();
-  volumes.push_back(ScratchVolume());
-  return std::ranges::any_of(volumes, [&path](const std::string& volume) {
-    const auto temporary = RealPath(volume + "/" + kTemporaryFolder);
+  return std::ranges::any_of(TemporaryFolders(), [&path](const std::string& name) {
+    const auto temporary = RealPath(name);
     return temporary && IsWithin(*path, *temporary);
   });
 }

@@ -11,7 +11,7 @@
 #include "nas/match/file_kinds.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
-#include "nas/system/shares.h"
+#include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 
 namespace FileSearch {
@@ -196,9 +196,12 @@ WfmSearchDBTaskMgr::WfmSearchDBTaskMgr(const char* user) : user_(user) {}
 
 WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* id) const try {
   if (!nas::IsResultId(id)) return nullptr;
-  const std::string folder = nas::ResultFolder(volume, user_);
-  if (folder.empty()) return nullptr;
-  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(nas::ResultPath(folder, id)));
+  const auto folder = nas::ResultFolder(volume, user_);
+  if (!folder) {
+    nas::Report(folder.error());
+    return nullptr;
+  }
+  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(nas::ResultPath(*folder, id)));
 } catch (const std::exception& error) {
   syslog(LOG_ERR, "search results: %s", error.what());
   return nullptr;

@@ -24,7 +24,7 @@
 #include "nas/search/folder_walk.h"
 #include "nas/search/location.h"
 #include "nas/search/search_job.h"
-#include "nas/system/shares.h"
+#include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 #include "platform/system.h"
 
@@ -153,10 +153,13 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
     nas::SetLastError(first_error);
     return false;
   }
-  volume_ = nas::ResultVolume(locations_.front().share, user_);
-  if (volume_.empty()) return false;
-  folder_ = nas::ResultFolder(volume_, user_);
-  if (folder_.empty()) return false;
+  const auto volume = nas::ResultVolume(locations_.front().share.volume, user_);
+  if (!volume) {
+    nas::Report(volume.error());
+    return false;
+  }
+  volume_ = *volume;
+  folder_ = nas::ResultFolderPath(volume_, user_);
   nas::SweepResultFolder(folder_);
   id_ = nas::NewResultId();
   // Where the file cannot be made whole nobody will ever know its name.

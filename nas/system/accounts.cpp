@@ -4,13 +4,13 @@
 #include <pwd.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
 #include <vector>
 
-#include "nas/base/error.h"
-#include "nas/system/user_state.h"
+#include "nas/base/utf8.h"
 #include "platform/system.h"
 
 namespace nas {
@@ -20,15 +20,17 @@ constexpr size_t kFirstRecordBytes = 1024;
 // A group of a large directory service lists all its members; beyond this it is taken as broken.
 constexpr size_t kMaxRecordBytes = size_t{16} << 20;
 
+constexpr size_t kMaxUserNameBytes = 255;  // it names a folder
+
 // The name service's reentrant calls want a buffer of unknown size: asks again with more room
-// until the record fits. Returns null with errno and the last error set.
+// until the record fits. `record` then points into `buffer`.
 template <typename Record, typename Ask>
-Record* Lookup(Ask ask, Record* record, std::vector<char>* buffer, PlatformError unknown) {
+Status Lookup(Ask ask, PlatformError unknown, Record* record, std::vector<char>* buffer) {
   for (size_t room = kFirstRecordBytes; room <= kMaxRecordBytes; room *= 2) {
     buffer->resize(room);
     Record* found = nullptr;
     const int error = ask(record, buffer->data(), room, &found);
-    if (found != nullptr) return found;
+    if (found != nullptr) return {};
     if (error == ERANGE) continue;
     if (error == EINTR) {
       room /= 2;
@@ -37,45 +39,41 @@ Record* Lookup(Ask ask, Record* record, std::vector<char>* buffer, PlatformError
     // Several services report an unknown name as an error of their own.
     const bool absent =
         error == 0 || error == ENOENT || error == ESRCH || error == EBADF || error == EPERM;
-    SetLastError(absent ? unknown : kErrorOther);
-    errno = absent ? ENOENT : error;
-    return nullptr;
+    return absent ? Error{unknown, ENOENT} : Error{kErrorOther, error};
   }
-  SetLastError(kErrorOther);
-  errno = ERANGE;
-  return nullptr;
+  return Error{kErrorOther, ERANGE};
 }
 
 template <typename Ask>
-std::optional<Account> AccountOf(Ask ask) {
+Result<Account> AccountOf(Ask ask) {
   passwd record;
   std::vector<char> buffer;
-  const passwd* found = Lookup(ask, &record, &buffer, kErrorUnknownUser);
-  if (found == nullptr) return std::nullopt;
-  return Account{found->pw_name, found->pw_uid, found->pw_gid, found->pw_dir};
+  const Status found = Lookup(ask, kErrorUnknownUser, &record, &buffer);
+  if (!found) return found.error();
+  return Account{record.pw_name, record.pw_uid, record.pw_gid, record.pw_dir};
 }
 
-template <typename Record>
-Record* Allocate() {
-  auto* record = static_cast<Record*>(std::calloc(1, sizeof(Record)));
-  if (record == nullptr) SetLastError(kErrorOther);
-  return record;
+int ReportFailure(const Error& error) {
+  Report(error);
+  return -1;
 }
 
 }  // namespace
 
-std::optional<Account> FindAccount(const std::string& name) {
-  if (!IsUserName(name)) {
-    SetLastError(kErrorUnknownUser);
-    errno = ENOENT;
-    return std::nullopt;
-  }
+bool IsUserName(const std::string& name) {
+  if (name.empty() || name == "." || name == ".." || name.size() > kMaxUserNameBytes) return false;
+  return std::none_of(name.begin(), name.end(),
+                      [](unsigned char byte) { return byte == '/' || IsControl(byte); });
+}
+
+Result<Account> FindAccount(const std::string& name) {
+  if (!IsUserName(name)) return Error{kErrorUnknownUser, ENOENT, name};
   return AccountOf([&](passwd* record, char* buffer, size_t room, passwd** found) {
     return getpwnam_r(name.c_str(), record, buffer, room, found);
   });
 }
 
-std::optional<Account> FindAccount(uid_t uid) {
+Result<Account> FindAccount(uid_t uid) {
   return AccountOf([&](passwd* record, char* buffer, size_t room, passwd** found) {
     return getpwuid_r(uid, record, buffer, room, found);
   });
@@ -95,17 +93,16 @@ int NUVAUserGet(const char* name, NUVAUSER** out) {
   if (out == nullptr) return -1;
   *out = nullptr;
   const auto account = nas::FindAccount(std::string(name == nullptr ? "" : name));
-  if (!account) return -1;
-  auto* user = nas::Allocate<NUVAUSER>();
-  if (user == nullptr) return -1;
+  if (!account) return nas::ReportFailure(account.error());
+  auto* user = static_cast<NUVAUSER*>(std::calloc(1, sizeof(NUVAUSER)));
+  if (user == nullptr) return nas::ReportFailure(nas::ErrnoError());
   user->szName = strdup(account->name.c_str());
   user->szHome = strdup(account->home.c_str());
   user->nUid = account->uid;
   user->nGid = account->gid;
   if (user->szName == nullptr || user->szHome == nullptr) {
     NUVAUserFree(user);
-    nas::SetLastError(nas::kErrorOther);
-    return -1;
+    return nas::ReportFailure(nas::ErrnoError(ENOMEM, {}));
   }
   *out = user;
   return 0;
@@ -126,16 +123,15 @@ int NUVAGroupGet(const char* name, NUVAGROUP** out) {
   const auto ask = [&](struct group* entry, char* bytes, size_t room, struct group** found) {
     return getgrnam_r(name == nullptr ? "" : name, entry, bytes, room, found);
   };
-  const struct group* found = nas::Lookup(ask, &record, &buffer, nas::kErrorUnknownGroup);
-  if (found == nullptr) return -1;
-  auto* result = nas::Allocate<NUVAGROUP>();
-  if (result == nullptr) return -1;
-  result->szName = strdup(found->gr_name);
-  result->nGid = found->gr_gid;
+  const nas::Status found = nas::Lookup(ask, nas::kErrorUnknownGroup, &record, &buffer);
+  if (!found) return nas::ReportFailure(found.error());
+  auto* result = static_cast<NUVAGROUP*>(std::calloc(1, sizeof(NUVAGROUP)));
+  if (result == nullptr) return nas::ReportFailure(nas::ErrnoError());
+  result->szName = strdup(record.gr_name);
+  result->nGid = record.gr_gid;
   if (result->szName == nullptr) {
     NUVAGroupFree(result);
-    nas::SetLastError(nas::kErrorOther);
-    return -1;
+    return nas::ReportFailure(nas::ErrnoError(ENOMEM, {}));
   }
   *out = result;
   return 0;

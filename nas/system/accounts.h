@@ -1,10 +1,13 @@
 #pragma once
-// Users of the machine, through its name service.
+// Users and groups of the machine, through its name service. Any thread may call; nothing is
+// remembered here, since a server lives longer than an answer stays true (identity.h knows whom
+// this process has become).
 
 #include <sys/types.h>
 
-#include <optional>
 #include <string>
+
+#include "nas/base/error.h"
 
 namespace nas {
 
@@ -15,9 +18,14 @@ struct Account {
   std::string home;  // the login's home directory, not the home share's
 };
 
-// Nothing with errno (ENOENT when there is no such user) and the last error set.
-std::optional<Account> FindAccount(const std::string& name);
-std::optional<Account> FindAccount(uid_t uid);
+// Whether `name` can be a user's: not empty, not "." or "..", no "/", control character, at most
+// 255 bytes. Such a name can name a folder.
+bool IsUserName(const std::string& name);
+
+// kErrorUnknownUser with ENOENT when there is no such user; kErrorOther when the name service
+// fails.
+Result<Account> FindAccount(const std::string& name);
+Result<Account> FindAccount(uid_t uid);
 
 // For a process that makes calls: their children would each load the libraries of the name service
 // anew, which is a third of what a short call takes; what this process has loaded they inherit.

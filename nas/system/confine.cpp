@@ -22,7 +22,6 @@
 #include "nas/base/json_text.h"
 #include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
-#include "nas/system/shares.h"
 #include "nas/system/volumes.h"
 #include "platform/system.h"
 

@@ -14,46 +14,52 @@ constexpr mode_t kPermissionBits = 0777;
 
 }  // namespace
 
-UniqueFd OpenFolder(int dir_fd, const std::string& name) {
-  return UniqueFd(openat(dir_fd, name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+Result<UniqueFd> OpenFolder(int dir_fd, const std::string& name) {
+  UniqueFd folder(openat(dir_fd, name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  if (!folder) return ErrnoError(name);
+  return folder;
 }
 
-UniqueFd OpenOrMakeFolder(int dir_fd, const std::string& name, mode_t mode) {
-  UniqueFd folder = OpenFolder(dir_fd, name);
-  if (folder || errno != ENOENT) return folder;
+Result<UniqueFd> OpenOrMakeFolder(int dir_fd, const std::string& name, mode_t mode) {
+  Result<UniqueFd> folder = OpenFolder(dir_fd, name);
+  if (folder || folder.error().error_number != ENOENT) return folder;
   const ScopedUmask exact(0);
-  if (mkdirat(dir_fd, name.c_str(), mode) != 0 && errno != EEXIST) return {};
+  if (mkdirat(dir_fd, name.c_str(), mode) != 0 && errno != EEXIST) return ErrnoError(name);
   return OpenFolder(dir_fd, name);
 }
 
-bool MakeFolders(const std::string& path, mode_t mode) {
+Result<UniqueFd> OpenTopFolder(const std::string& path) {
+  UniqueFd folder(open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!folder) return ErrnoError(path);
+  return folder;
+}
+
+Status MakeFolders(const std::string& path, mode_t mode) {
   const ScopedUmask exact(0);
   for (size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
     if (mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
       // A folder on the way may refuse with another error though it exists.
       struct stat info;
-      if (stat(part.c_str(), &info) != 0) return false;
+      if (stat(part.c_str(), &info) != 0) return ErrnoError(part);
     }
-    if (end == std::string::npos) return true;
+    if (end == std::string::npos) return {};
   }
 }
 
-bool IsSafeFrom(int folder_fd, uid_t user) {
+Status CheckSafeFrom(int folder_fd, uid_t user) {
   struct stat info;
-  if (fstat(folder_fd, &info) != 0) return false;
+  if (fstat(folder_fd, &info) != 0) return ErrnoError();
   const bool owned = info.st_uid == 0 || info.st_uid == user;
   const bool closed = (info.st_mode & (S_IWGRP | S_IWOTH)) == 0 || (info.st_mode & S_ISVTX) != 0;
-  if (!owned || !closed) errno = EPERM;
-  return owned && closed;
+  return owned && closed ? Status() : ErrnoError(EPERM, {});
 }
 
-bool IsPrivateTo(int folder_fd, uid_t user) {
+Status CheckPrivateTo(int folder_fd, uid_t user) {
   struct stat info;
-  if (fstat(folder_fd, &info) != 0) return false;
+  if (fstat(folder_fd, &info) != 0) return ErrnoError();
   const bool good = info.st_uid == user && (info.st_mode & kPermissionBits) == S_IRWXU;
-  if (!good) errno = EPERM;
-  return good;
+  return good ? Status() : ErrnoError(EPERM, {});
 }
 
 }  // namespace nas

@@ -6,31 +6,37 @@
 #include <cstring>
 
 #include "nas/base/error.h"
+#include "nas/system/accounts.h"
 #include "nas/system/share_names.h"
 #include "nas/system/shares.h"
-#include "nas/system/user_state.h"
 #include "platform/system.h"
 
+namespace nas {
 namespace {
 
-int Fail(int error_number) {
-  nas::SetLastError(nas::ErrorFromErrno(error_number));
-  errno = error_number;
-  return -1;
+Result<std::string> HomeOf(const std::string& user) {
+  const auto homes = FindShare(kHomesShare);
+  if (!homes || !IsUserName(user)) return ErrnoError(ENOENT, user);
+  const std::string path = homes->root + "/" + user;
+  struct stat info;
+  if (lstat(path.c_str(), &info) != 0) return ErrnoError(path);
+  if (!S_ISDIR(info.st_mode)) return ErrnoError(ENOTDIR, path);
+  return path;
 }
 
 }  // namespace
+}  // namespace nas
 
 int NUVAServiceHomePathGet(const char* user, char* buffer, size_t size) {
-  if (user == nullptr || buffer == nullptr || !nas::IsUserName(user)) return Fail(ENOENT);
-  const auto homes = nas::FindShare(nas::kHomesShare);
-  if (!homes) return Fail(ENOENT);
-  const std::string path = homes->root + "/" + user;
-  struct stat info;
-  if (lstat(path.c_str(), &info) != 0) return Fail(errno);
-  if (!S_ISDIR(info.st_mode)) return Fail(ENOTDIR);
-  if (path.size() + 1 > size) return Fail(ENAMETOOLONG);
-  std::memcpy(buffer, path.c_str(), path.size() + 1);
+  nas::Result<std::string> home = nas::HomeOf(user == nullptr ? "" : user);
+  if (home && (buffer == nullptr || home->size() + 1 > size)) {
+    home = nas::ErrnoError(ENAMETOOLONG, *home);
+  }
+  if (!home) {
+    nas::Report(home.error());
+    return -1;
+  }
+  std::memcpy(buffer, home->c_str(), home->size() + 1);
   return 0;
 }
 

@@ -8,9 +8,8 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
+#include <optional>
 
-#include "nas/base/error.h"
-#include "nas/system/accounts.h"
 #include "platform/webfm.h"
 
 namespace nas {
@@ -36,12 +35,6 @@ bool HasRoot(const Ids& ids) {
                      [](uid_t id) { return id == kRoot; });
 }
 
-int Fail(PlatformError error, int error_number) {
-  SetLastError(error);
-  errno = error_number;
-  return -1;
-}
-
 std::vector<gid_t> CurrentGroups() {
   for (;;) {
     const int count = getgroups(0, nullptr);
@@ -54,17 +47,18 @@ std::vector<gid_t> CurrentGroups() {
   }
 }
 
-// The user whose groups this process was given last, so that a second switch to the same user
-// costs no look-up of groups. Guard: single-threaded use, as identity.h demands.
-std::string g_switched_to;
+// Whom this process has become last. Guard: single-threaded use, as identity.h demands.
+std::optional<Account> g_self;
 
-bool IsAlready(const Account& account, const Ids& ids) {
-  return g_switched_to == account.name && ids.user[0] == account.uid &&
-         ids.user[1] == account.uid && ids.group[0] == account.gid && ids.group[1] == account.gid;
+// Whether it still is: somebody else may have changed the process's ids since.
+bool IsSelf(const std::string& user, const Ids& ids) {
+  return g_self && g_self->name == user && ids.user[0] == g_self->uid &&
+         ids.user[1] == g_self->uid &&
+         (!HasRoot(ids) || (ids.group[0] == g_self->gid && ids.group[1] == g_self->gid));
 }
 
 // The group ids need no saved root: whoever regains user id 0 can set any group.
-bool Become(const Account& account) {
+bool TakeIds(const Account& account) {
   if (seteuid(kRoot) != 0) return false;
   return initgroups(account.name.c_str(), account.gid) == 0 &&
          setresgid(account.gid, account.gid, account.gid) == 0 &&
@@ -84,6 +78,34 @@ void Restore(const uid_t (&users)[3], const gid_t (&groups)[3], const std::vecto
 
 bool CanBeRoot() { return HasRoot(CurrentIds()); }
 
+Result<Account> BecomeUser(const std::string& user) {
+  const Ids ids = CurrentIds();
+  if (IsSelf(user, ids)) return *g_self;
+  Result<Account> account = FindAccount(user);
+  if (!account) return account;
+  if (!HasRoot(ids)) {
+    if (ids.user[0] != account->uid || ids.user[1] != account->uid) return ErrnoError(EPERM, user);
+  } else {
+    const std::vector<gid_t> groups = CurrentGroups();
+    g_self.reset();
+    if (!TakeIds(*account)) {
+      const Error cause = ErrnoError(user);
+      // In a user namespace root may be unable to become anybody: then it stays what it was.
+      if (seteuid(kRoot) == 0) Restore(ids.user, ids.group, groups);
+      return cause;
+    }
+  }
+  g_self = *account;
+  return account;
+}
+
+Status CheckActsAs(const std::string& user) {
+  if (IsSelf(user, CurrentIds())) return {};
+  const Result<Account> account = FindAccount(user);
+  if (!account) return account.error();
+  return account->uid == geteuid() ? Status() : ErrnoError(EPERM, user);
+}
+
 ScopedRoot::ScopedRoot() : user_(geteuid()), group_(getegid()) {
   if (user_ == kRoot || !CanBeRoot() || seteuid(kRoot) != 0) return;
   raised_ = true;
@@ -102,14 +124,14 @@ ScopedUser::ScopedUser(const std::string& user) {
   std::copy(std::begin(ids.user), std::end(ids.user), users_);
   std::copy(std::begin(ids.group), std::end(ids.group), group_ids_);
   groups_ = CurrentGroups();
-  ok_ = WfmLibUGIDSet(nullptr, user.c_str()) == 0;
+  if (const auto account = BecomeUser(user); !account) status_ = account.error();
 }
 
 ScopedUser::~ScopedUser() {
-  if (!ok_ || !CanBeRoot()) return;
+  if (!status_ || !CanBeRoot()) return;
   const int saved = errno;
   Restore(users_, group_ids_, groups_);
-  g_switched_to.clear();
+  g_self.reset();
   errno = saved;
 }
 
@@ -123,24 +145,8 @@ unsigned int WfmLibUmask() { return umask(nas::kFileManagerUmask); }
 void WfmLibRestoreUmask(unsigned int mask) { umask(mask); }
 
 int WfmLibUGIDSet(const char* /*session*/, const char* user) {
-  using namespace nas;
-  if (user == nullptr) return Fail(kErrorUnknownUser, ENOENT);
-  const std::optional<Account> account = FindAccount(user);
-  if (!account) return -1;
-  const Ids ids = CurrentIds();
-  if (!HasRoot(ids)) {
-    const bool own = ids.user[0] == account->uid && ids.user[1] == account->uid;
-    return own ? 0 : Fail(kErrorPermission, EPERM);
-  }
-  if (IsAlready(*account, ids)) return 0;
-  const std::vector<gid_t> groups = CurrentGroups();
-  g_switched_to.clear();
-  if (!Become(*account)) {
-    const int cause = errno;
-    // In a user namespace root may be unable to become anybody: then it stays what it was.
-    if (seteuid(kRoot) == 0) Restore(ids.user, ids.group, groups);
-    return Fail(ErrorFromErrno(cause), cause);
-  }
-  g_switched_to = account->name;
-  return 0;
+  const auto account = nas::BecomeUser(user == nullptr ? "" : user);
+  if (account) return 0;
+  nas::Report(account.error());
+  return -1;
 }

@@ -10,10 +10,21 @@
 #include <string>
 #include <vector>
 
+#include "nas/base/error.h"
+#include "nas/system/accounts.h"
+
 namespace nas {
 
 // Whether the process is root or could become root again.
 bool CanBeRoot();
+
+// Makes the process `user`'s, with the user's groups; root stays its saved user id where it had it.
+// Only root's processes can become anybody; others are told EPERM unless they are that user
+// already. Fails with the identity unchanged: kErrorUnknownUser, or what the system said. The
+// process and its forks remember whom they have become, so that asking again costs no look-up.
+Result<Account> BecomeUser(const std::string& user);
+// EPERM unless the process acts as `user` now; kErrorUnknownUser when there is none.
+Status CheckActsAs(const std::string& user);
 
 // Root for the time of a few system calls, then the identity before it. Does nothing where root
 // was never there. A process that cannot step down again aborts.
@@ -38,14 +49,14 @@ class ScopedUser {
   ~ScopedUser();
   ScopedUser(const ScopedUser&) = delete;
   ScopedUser& operator=(const ScopedUser&) = delete;
-  // False, with errno and the last error set: the identity is unchanged.
-  bool ok() const { return ok_; }
+  // A failure leaves the identity unchanged.
+  const Status& status() const { return status_; }
 
  private:
   uid_t users_[3];
   gid_t group_ids_[3];
   std::vector<gid_t> groups_;
-  bool ok_ = false;
+  Status status_;
 };
 
 // Sets the umask for a time, where the exact mode of what is made matters.

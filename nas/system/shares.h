@@ -1,7 +1,8 @@
 #pragma once
-// Shares and volumes. A share is a name and a directory: every directory directly inside a volume
+// Shares. A share is a name and a directory: every directory directly inside a volume (volumes.h)
 // whose name does not begin with "@", "." or "#", and what the configuration adds. A location is
-// "/SHARE" or "/SHARE/below".
+// "/SHARE" or "/SHARE/below". Any thread may ask; what a user may not see is told all the same, and
+// cannot be opened.
 
 #include <optional>
 #include <string>
@@ -20,19 +21,5 @@ struct Share {
 std::optional<Share> FindShare(const std::string& name);
 // All shares, sorted by name.
 std::vector<Share> ListShares();
-
-// The volumes that exist, sorted. The scratch volume, which holds what belongs to shares outside
-// every volume, is not among them.
-std::vector<std::string> ListVolumes();
-std::string ScratchVolume();
-
-// The folder on `volume` that holds the user's result databases, made where missing, with mode 0700
-// and the user as its owner. Empty, with the last error and errno set, where `volume` is neither a
-// volume nor the scratch volume, or the folder cannot be made or is not the user's own and closed.
-// The process must have the user's identity (WfmLibUGIDSet).
-std::string ResultFolder(const std::string& volume, const std::string& user);
-// The volume for a share's result databases: its own where the user can have a folder there,
-// otherwise the scratch volume. Empty, with the last error set, if neither works.
-std::string ResultVolume(const Share& share, const std::string& user);
 
 }  // namespace nas

@@ -4,12 +4,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 
-#include "nas/base/error.h"
 #include "nas/base/file_io.h"
-#include "nas/base/utf8.h"
 #include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/folders.h"
@@ -18,7 +15,6 @@
 namespace nas {
 namespace {
 
-constexpr size_t kMaxUserNameBytes = 255;  // it names a folder
 constexpr char kUsers[] = "users";
 constexpr char kPreference[] = "preference";
 constexpr char kTasks[] = "tasks";
@@ -30,51 +26,76 @@ std::string UserFolder(const std::string& user) {
   return CurrentConfig().state_dir + "/" + kUsers + "/" + user;
 }
 
-bool Fail() {
-  SetLastError(ErrorFromErrno(errno));
-  return false;
+// Goes on to the folder `name` and demands of it what `check` does.
+template <typename Check>
+Status Enter(Result<UniqueFd> next, Check check, uid_t user, UniqueFd* folder) {
+  if (!next) return next.error();
+  *folder = std::move(*next);
+  return check(folder->get(), user);
+}
+
+// Looks at what there is, by descriptor, so that nothing can be put in its place meanwhile.
+// `maker` made what lies above the user's folder.
+Status CheckFolders(const Account& account, uid_t maker) {
+  UniqueFd folder;
+  Status good = Enter(OpenTopFolder(CurrentConfig().state_dir), CheckSafeFrom, maker, &folder);
+  if (good) good = Enter(OpenFolder(folder.get(), kUsers), CheckSafeFrom, maker, &folder);
+  if (good) {
+    good = Enter(OpenFolder(folder.get(), account.name), CheckPrivateTo, account.uid, &folder);
+  }
+  UniqueFd below;
+  if (good) good = Enter(OpenFolder(folder.get(), kTasks), CheckPrivateTo, account.uid, &below);
+  if (good) {
+    good = Enter(OpenFolder(folder.get(), kPreference), CheckPrivateTo, account.uid, &below);
+  }
+  struct stat info;
+  if (good && fstatat(below.get(), kUserSettings, &info, AT_SYMLINK_NOFOLLOW) != 0) {
+    return ErrnoError(kUserSettings);
+  }
+  return good;
 }
 
 // STATE/users/USER, made where missing. Root's state directory is open to all to pass through, as
 // each user reaches only their own folder in it; a user's own one is closed.
-UniqueFd MakeUserFolder(const std::string& user, const Account& account) {
+Result<UniqueFd> MakeUserFolder(const Account& account, uid_t maker) {
   const ScopedRoot root;
-  const uid_t maker = geteuid();
   const std::string& state_dir = CurrentConfig().state_dir;
-  const mode_t mode = maker == 0 ? kOpenMode : kPrivateMode;
-  if (!MakeFolders(state_dir, mode)) return {};
-  const UniqueFd state(open(state_dir.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  if (!state || !IsSafeFrom(state.get(), maker)) return {};
-  const UniqueFd users = OpenOrMakeFolder(state.get(), kUsers, kOpenMode);
-  if (!users || !IsSafeFrom(users.get(), maker)) return {};
-  UniqueFd folder = OpenOrMakeFolder(users.get(), user, kPrivateMode);
+  const Status made = MakeFolders(state_dir, maker == 0 ? kOpenMode : kPrivateMode);
+  if (!made) return made.error();
+  UniqueFd above;
+  Status good = Enter(OpenTopFolder(state_dir), CheckSafeFrom, maker, &above);
+  if (good) {
+    good = Enter(OpenOrMakeFolder(above.get(), kUsers, kOpenMode), CheckSafeFrom, maker, &above);
+  }
+  if (!good) return good.error();
+  Result<UniqueFd> folder = OpenOrMakeFolder(above.get(), account.name, kPrivateMode);
   struct stat info;
-  if (!folder || fstat(folder.get(), &info) != 0) return {};
+  if (!folder) return folder;
+  if (fstat(folder->get(), &info) != 0) return ErrnoError(account.name);
   // Nobody but root can put anything here, so a folder of root's is one just being made.
   if (maker == 0 && info.st_uid == 0 && account.uid != 0 &&
-      fchownat(folder.get(), "", account.uid, account.gid, AT_EMPTY_PATH) != 0) {
-    return {};
+      fchownat(folder->get(), "", account.uid, account.gid, AT_EMPTY_PATH) != 0) {
+    return ErrnoError(account.name);
   }
   return folder;
 }
 
-bool MakeContents(int folder_fd, uid_t uid) {
-  const UniqueFd tasks = OpenOrMakeFolder(folder_fd, kTasks, kPrivateMode);
-  const UniqueFd preference = OpenOrMakeFolder(folder_fd, kPreference, kPrivateMode);
-  if (!tasks || !preference) return false;
-  if (!IsPrivateTo(tasks.get(), uid) || !IsPrivateTo(preference.get(), uid)) return false;
-  struct stat info;
-  if (fstatat(preference.get(), kUserSettings, &info, AT_SYMLINK_NOFOLLOW) == 0) return true;
-  return CreateFile(preference.get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR) || errno == EEXIST;
+Status MakeFoldersOf(const Account& account, uid_t maker) {
+  const Result<UniqueFd> folder = MakeUserFolder(account, maker);
+  if (!folder) return folder.error();
+  const Status good = CheckPrivateTo(folder->get(), account.uid);
+  if (!good) return good;
+  const Result<UniqueFd> tasks = OpenOrMakeFolder(folder->get(), kTasks, kPrivateMode);
+  if (!tasks) return tasks.error();
+  const Result<UniqueFd> preference = OpenOrMakeFolder(folder->get(), kPreference, kPrivateMode);
+  if (!preference) return preference.error();
+  if (CreateFile(preference->get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR) || errno == EEXIST) {
+    return {};
+  }
+  return ErrnoError(kUserSettings);
 }
 
 }  // namespace
-
-bool IsUserName(const std::string& name) {
-  if (name.empty() || name == "." || name == ".." || name.size() > kMaxUserNameBytes) return false;
-  return std::none_of(name.begin(), name.end(),
-                      [](unsigned char byte) { return byte == '/' || IsControl(byte); });
-}
 
 std::string PreferenceFolder(const std::string& user) {
   return UserFolder(user) + "/" + kPreference;
@@ -82,19 +103,17 @@ std::string PreferenceFolder(const std::string& user) {
 
 std::string TaskFolder(const std::string& user) { return UserFolder(user) + "/" + kTasks; }
 
-bool PrepareUserState(const std::string& user) {
-  const auto account = FindAccount(user);
-  if (!account) return false;
-  if (!CanBeRoot() && account->uid != geteuid()) {
-    errno = EPERM;
-    return Fail();
+Status EnterUserState(const std::string& user) {
+  const Result<Account> account = BecomeUser(user);
+  if (!account) return account.error();
+  const uid_t maker = CanBeRoot() ? 0 : account->uid;
+  const Status found = CheckFolders(*account, maker);
+  // Not the user's own is also the folder that another call is just about to hand over.
+  if (found || (found.error().error_number != ENOENT && found.error().error_number != EPERM)) {
+    return found;
   }
-  const UniqueFd folder = MakeUserFolder(user, *account);
-  if (!folder) return Fail();
-  const ScopedUser as(user);
-  if (!as.ok()) return false;
-  if (!IsPrivateTo(folder.get(), account->uid)) return Fail();
-  return MakeContents(folder.get(), account->uid) || Fail();
+  const Status made = MakeFoldersOf(*account, maker);
+  return made ? CheckFolders(*account, maker) : made;
 }
 
 }  // namespace nas

@@ -4,23 +4,22 @@
 //   STATE/users/USER/             0700, the user's own
 //   STATE/users/USER/preference/  settings and histories: usersettings, search_history.db, ...
 //   STATE/users/USER/tasks/       task records (nas/tasks)
-//   STATE/volume0/@tmp/...        the scratch volume (shares.h)
+//   STATE/volume0/@tmp/...        the scratch volume (volumes.h)
 
 #include <string>
 
-namespace nas {
+#include "nas/base/error.h"
 
-// Whether `name` can be a user's: not empty, not "." or "..", no "/", control character, at most
-// 255 bytes.
-bool IsUserName(const std::string& name);
+namespace nas {
 
 std::string PreferenceFolder(const std::string& user);
 std::string TaskFolder(const std::string& user);
 
-// Makes the folders above and a "usersettings" holding {} where they are missing. To be called with
-// the identity the process started with, before it switches to the user. False with the last error
-// and errno set: no such user, a user other than the caller when not root, no space, or a folder
-// that is not the user's own and closed to others.
-bool PrepareUserState(const std::string& user);
+// Makes the process the user's (BecomeUser) and sees that the folders above and a "usersettings",
+// {} at first, are there and nobody else's. It looks as the user, and goes back to root only to
+// make what is missing. Fails with the identity changed or not: no such user, a user other than the
+// caller when not root, no space, or a folder that is not the user's own and closed to others
+// (EPERM). For the one thread of a process that is the user's from then on.
+Status EnterUserState(const std::string& user);
 
 }  // namespace nas

@@ -1,6 +1,6 @@
 #include "nas/system/volumes.h"
 
-#include <fcntl.h>
+#include <fnmatch.h>
 #include <glob.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -8,15 +8,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <set>
-#include <string>
-#include <vector>
+#include <utility>
 
-#include "nas/base/error.h"
-#include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"
-#include "nas/system/shares.h"
 
 namespace nas {
 namespace {
@@ -49,32 +45,74 @@ std::vector<std::string> Expand(const std::string& pattern) {
   return paths;
 }
 
-// Goes down the road, as root where it can, since only root may write to a volume itself.
-UniqueFd OpenResultRoad(const std::string& volume) {
-  const uid_t user = geteuid();
-  const ScopedRoot root;
-  UniqueFd folder(open(volume.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  if (!folder || !IsSafeFrom(folder.get(), user)) return {};
+std::string Trimmed(std::string path) {
+  while (path.size() > 1 && path.ends_with('/')) path.pop_back();
+  return path;
+}
+
+// What ListVolumes would tell, without reading the folders that the patterns name.
+bool IsVolume(const std::string& path) {
+  const auto matches = [&](const std::string& pattern) {
+    return fnmatch(Trimmed(pattern).c_str(), path.c_str(), FNM_PATHNAME | FNM_PERIOD) == 0;
+  };
+  return path != ScratchVolume() && std::ranges::any_of(CurrentConfig().volumes, matches) &&
+         IsDirectory(path);
+}
+
+using Opener = Result<UniqueFd> (*)(int dir_fd, const std::string& name, mode_t mode);
+
+Result<UniqueFd> OpenOnly(int dir_fd, const std::string& name, mode_t /*mode*/) {
+  return OpenFolder(dir_fd, name);
+}
+
+// Goes down to the folder that holds every user's.
+Result<UniqueFd> TakeRoad(const std::string& volume, uid_t user, Opener open_step) {
+  Result<UniqueFd> folder = OpenTopFolder(volume);
+  if (!folder) return folder;
+  if (const Status safe = CheckSafeFrom(folder->get(), user); !safe) return safe.error();
   for (const Step& step : kResultRoad) {
-    folder = OpenOrMakeFolder(folder.get(), step.name, step.mode);
-    if (!folder || !IsSafeFrom(folder.get(), user)) return {};
+    Result<UniqueFd> next = open_step(folder->get(), step.name, step.mode);
+    if (!next) return next;
+    if (const Status safe = CheckSafeFrom(next->get(), user); !safe) return safe.error();
+    folder = std::move(next);
   }
   return folder;
+}
+
+Result<std::string> OpenOwnFolder(const Result<UniqueFd>& road, const std::string& volume,
+                                  const std::string& user, Opener open_step) {
+  if (!road) return road.error();
+  const Result<UniqueFd> folder = open_step(road->get(), user, kPrivateMode);
+  if (!folder) {
+    // Something else in its place was put there by somebody: not a missing folder.
+    const int cause = folder.error().error_number;
+    return ErrnoError(cause == ENOTDIR ? EPERM : cause, user);
+  }
+  const Status own = CheckPrivateTo(folder->get(), geteuid());
+  if (!own) return own.error();
+  return ResultFolderPath(volume, user);
+}
+
+// Whether results may be kept there for this process's user.
+Status CheckResultPlace(const std::string& volume, const std::string& user) {
+  // A folder made under another identity would keep its rightful owner out for good.
+  const Status own = CheckActsAs(user);
+  if (!own || volume == ScratchVolume()) return own;
+  return IsVolume(volume) ? Status() : ErrnoError(ENOENT, volume);
 }
 
 bool IsSeenByVolumePattern(const std::string& volume) {
   return volume.starts_with("/volume") && volume.find('/', 1) == std::string::npos;
 }
 
-bool MakeScratchVolume() {
+Result<UniqueFd> MakeRoad(const std::string& volume) {
+  const uid_t user = geteuid();
   const ScopedRoot root;
-  return MakeFolders(ScratchVolume(), geteuid() == 0 ? kPassMode : kPrivateMode);
-}
-
-std::string Fail(int error_number) {
-  SetLastError(ErrorFromErrno(error_number));
-  errno = error_number;
-  return {};
+  if (volume == ScratchVolume()) {
+    const Status made = MakeFolders(volume, geteuid() == 0 ? kPassMode : kPrivateMode);
+    if (!made) return made.error();
+  }
+  return TakeRoad(volume, user, OpenOrMakeFolder);
 }
 
 }  // namespace
@@ -82,8 +120,8 @@ std::string Fail(int error_number) {
 std::vector<std::string> ListVolumes() {
   std::vector<std::string> volumes;
   for (const std::string& pattern : CurrentConfig().volumes) {
-    for (std::string path : Expand(pattern)) {
-      while (path.size() > 1 && path.ends_with('/')) path.pop_back();
+    for (const std::string& found : Expand(pattern)) {
+      std::string path = Trimmed(found);
       if (path != ScratchVolume() && IsDirectory(path)) volumes.push_back(std::move(path));
     }
   }
@@ -93,6 +131,13 @@ std::vector<std::string> ListVolumes() {
 }
 
 std::string ScratchVolume() { return CurrentConfig().state_dir + "/" + kScratchFolder; }
+
+std::vector<std::string> TemporaryFolders() {
+  std::vector<std::string> folders = ListVolumes();
+  folders.push_back(ScratchVolume());
+  for (std::string& folder : folders) folder += std::string("/") + kTemporaryFolder;
+  return folders;
+}
 
 std::map<std::string, std::string> NamesInSandbox(const std::vector<std::string>& volumes,
                                                   const std::string& scratch) {
@@ -120,31 +165,25 @@ std::string ResultFolderPath(const std::string& volume, const std::string& user)
   return path + "/" + user;
 }
 
-std::string ResultFolder(const std::string& volume, const std::string& user) {
-  const auto account = FindAccount(user);
-  if (!account) return {};
-  // A folder made under another identity would keep its rightful owner out for good.
-  if (account->uid != geteuid()) return Fail(EPERM);
-  const std::vector<std::string> volumes = ListVolumes();
-  const bool scratch = volume == ScratchVolume();
-  if (!scratch && std::find(volumes.begin(), volumes.end(), volume) == volumes.end()) {
-    return Fail(ENOENT);
-  }
-  if (scratch && !MakeScratchVolume()) return Fail(errno);
-  const UniqueFd road = OpenResultRoad(volume);
-  if (!road) return Fail(errno);
-  const UniqueFd folder = OpenOrMakeFolder(road.get(), user, kPrivateMode);
-  // Something else in its place was put there by somebody: not a missing folder.
-  if (!folder) return Fail(errno == ENOTDIR ? EPERM : errno);
-  if (!IsPrivateTo(folder.get(), geteuid())) return Fail(errno);
-  return ResultFolderPath(volume, user);
+Result<std::string> ResultFolder(const std::string& volume, const std::string& user) {
+  const Status good = CheckResultPlace(volume, user);
+  if (!good) return good.error();
+  return OpenOwnFolder(TakeRoad(volume, geteuid(), OpenOnly), volume, user, OpenOnly);
 }
 
-std::string ResultVolume(const Share& share, const std::string& user) {
-  for (const std::string& volume : {share.volume, ScratchVolume()}) {
-    if (!volume.empty() && !ResultFolder(volume, user).empty()) return volume;
-  }
-  return {};
+Result<std::string> MakeResultFolder(const std::string& volume, const std::string& user) {
+  Result<std::string> found = ResultFolder(volume, user);
+  if (found || found.error().error_number != ENOENT) return found;
+  const Status good = CheckResultPlace(volume, user);
+  if (!good) return good.error();
+  return OpenOwnFolder(MakeRoad(volume), volume, user, OpenOrMakeFolder);
+}
+
+Result<std::string> ResultVolume(const std::string& own_volume, const std::string& user) {
+  if (!own_volume.empty() && MakeResultFolder(own_volume, user)) return own_volume;
+  const Result<std::string> scratch = MakeResultFolder(ScratchVolume(), user);
+  if (!scratch) return scratch.error();
+  return ScratchVolume();
 }
 
 }  // namespace nas

@@ -16,6 +16,7 @@
 #include "nas/base/paths.h"
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"
+#include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/user_state.h"
 

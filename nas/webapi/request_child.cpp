@@ -98,7 +98,10 @@ void SendFrame(int fd, const std::string& payload) {
 }
 
 std::string Serve(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
-  if (!PrepareUserState(call.user)) return encode(WfmLibGetErr(), Json::Value());
+  if (const Status entered = EnterUserState(call.user); !entered) {
+    Report(entered.error());
+    return encode(WfmLibGetErr(), Json::Value());
+  }
   Request request(row, call);
   Response response(encode);
   try {

@@ -5,10 +5,12 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <filesystem>
 
 #include "nas/system/config.h"
 #include "nas/system/shares.h"
 #include "nas/system/user_state.h"
+#include "nas/system/volumes.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
 #include "tests/nas/fixture.h"
@@ -189,7 +191,8 @@ TEST_F(UserStateTest, IsMadeOnceAndPrivate) {
   umask(0077);  // what is made must not depend on it
   for (const std::string& user :
        AmRoot() ? std::vector<std::string>{Me(), kOtherUser} : std::vector<std::string>{Me()}) {
-    ASSERT_TRUE(nas::PrepareUserState(user)) << user;
+    const auto enter = [&] { EXPECT_TRUE(nas::EnterUserState(user)) << user; };
+    ASSERT_TRUE(InChild(enter));
     const std::string preference = nas::PreferenceFolder(user);
     EXPECT_EQ(ReadFile(preference + "/usersettings"), "{}\n");
     EXPECT_EQ(ModeOf(preference + "/usersettings"), 0600U);
@@ -203,31 +206,37 @@ TEST_F(UserStateTest, IsMadeOnceAndPrivate) {
       NUVAUserFree(account);
     }
     WriteFile(preference + "/usersettings", "kept");
-    ASSERT_TRUE(nas::PrepareUserState(user));
+    ASSERT_TRUE(InChild(enter));
     EXPECT_EQ(ReadFile(preference + "/usersettings"), "kept");
+    for (const std::string& folder : {preference, nas::TaskFolder(user)}) {
+      std::filesystem::remove_all(folder);
+      ASSERT_TRUE(InChild(enter)) << "what is missing is made again";
+      EXPECT_EQ(ModeOf(folder), 0700U);
+    }
   }
   EXPECT_EQ(ModeOf(state_), AmRoot() ? 0755U : 0700U);
-  EXPECT_EQ(Me(), AmRoot() ? "root" : Me()) << "the caller's identity is back";
 }
 
 TEST_F(UserStateTest, IsRefusedWhereItIsNotTheUsersOwn) {
   for (const char* name : {"", ".", "..", "../x", "a/b", "no-such-user-here", "a\nb"}) {
-    EXPECT_FALSE(nas::PrepareUserState(name)) << name;
-    EXPECT_EQ(NLIBCErrGet(), 0x1800) << name;
+    const nas::Status status = nas::EnterUserState(name);
+    ASSERT_FALSE(status) << name;
+    EXPECT_EQ(status.error().kind, nas::kErrorUnknownUser) << name;
   }
-  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  ASSERT_TRUE(nas::EnterUserState(Me()));
   const std::string preference = nas::PreferenceFolder(Me());
   ASSERT_EQ(chmod(preference.c_str(), 0750), 0);
-  EXPECT_FALSE(nas::PrepareUserState(Me())) << "open to a group";
-  EXPECT_EQ(NLIBCErrGet(), 0x0300);
+  const nas::Status open_to_group = nas::EnterUserState(Me());
+  ASSERT_FALSE(open_to_group);
+  EXPECT_EQ(open_to_group.error().kind, nas::kErrorPermission);
   ASSERT_EQ(rename(preference.c_str(), (dir_ + "/moved").c_str()), 0);
   ASSERT_EQ(chmod((dir_ + "/moved").c_str(), 0700), 0);
   ASSERT_EQ(symlink((dir_ + "/moved").c_str(), preference.c_str()), 0);
-  EXPECT_FALSE(nas::PrepareUserState(Me())) << "a link";
+  EXPECT_FALSE(nas::EnterUserState(Me())) << "a link";
   EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
-    EXPECT_FALSE(nas::PrepareUserState("root")) << "another user's";
-    EXPECT_EQ(NLIBCErrGet(), 0x0300);
-    EXPECT_EQ(errno, EPERM);
+    const nas::Status others = nas::EnterUserState("root");
+    ASSERT_FALSE(others) << "another user's";
+    EXPECT_EQ(others.error().error_number, EPERM);
   }));
 }
 
@@ -236,27 +245,31 @@ class ResultFolderTest : public PlatformTest {};
 TEST_F(ResultFolderTest, LiesOnTheVolumeOrInTheScratchVolume) {
   const std::string share = MakeFolder("volume1/photo");
   Configure({{"far", MakeFolder("far")}});
-  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  ASSERT_TRUE(nas::EnterUserState(Me()));
   const std::string volume = dir_ + "/volume1";
-  EXPECT_EQ(nas::ResultVolume(*nas::FindShare("photo"), Me()), volume);
-  EXPECT_EQ(nas::ResultVolume(*nas::FindShare("far"), Me()), nas::ScratchVolume());
+  EXPECT_FALSE(nas::ResultFolder(volume, Me())) << "reading makes nothing";
+  EXPECT_FALSE(std::filesystem::exists(volume + "/@tmp"));
+  EXPECT_EQ(*nas::ResultVolume(nas::FindShare("photo")->volume, Me()), volume);
+  EXPECT_EQ(*nas::ResultVolume(nas::FindShare("far")->volume, Me()), nas::ScratchVolume());
   for (const std::string& on : {volume, nas::ScratchVolume()}) {
-    EXPECT_EQ(nas::ResultFolder(on, Me()), on + "/@tmp/webfm/FBSearch/" + Me());
+    EXPECT_EQ(*nas::ResultFolder(on, Me()), on + "/@tmp/webfm/FBSearch/" + Me());
     EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch"), 01777U);
     EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch/" + Me()), 0700U);
   }
-  for (const std::string& other : {dir_ + "/far", std::string("/"), volume + "/photo"}) {
-    EXPECT_EQ(nas::ResultFolder(other, Me()), "") << "no volume: " << other;
+  for (const std::string& other : {dir_ + "/far", std::string("/"), volume + "/photo", volume + "/",
+                                   volume + "/../volume1", dir_ + "/volume2"}) {
+    EXPECT_FALSE(nas::MakeResultFolder(other, Me())) << "no volume: " << other;
   }
-  EXPECT_EQ(nas::ResultFolder(volume, "../x"), "");
+  EXPECT_FALSE(nas::MakeResultFolder(volume, "../x"));
 }
 
 TEST_F(ResultFolderTest, IsNotTakenFromOthers) {
   MakeFolder("volume1");
-  ASSERT_TRUE(nas::PrepareUserState(Me()));
+  ASSERT_TRUE(nas::EnterUserState(Me()));
   const std::string volume = dir_ + "/volume1";
-  const std::string mine = nas::ResultFolder(volume, Me());
-  ASSERT_NE(mine, "");
+  const auto made = nas::MakeResultFolder(volume, Me());
+  ASSERT_TRUE(made);
+  const std::string mine = *made;
   const struct {
     const char* why;
     std::function<void()> spoil;
@@ -275,28 +288,31 @@ TEST_F(ResultFolderTest, IsNotTakenFromOthers) {
   };
   for (const auto& row : rows) {
     row.spoil();
-    EXPECT_EQ(nas::ResultFolder(volume, Me()), "") << row.why;
-    EXPECT_EQ(NLIBCErrGet(), 0x0300) << row.why;
+    for (const auto& refused :
+         {nas::ResultFolder(volume, Me()), nas::MakeResultFolder(volume, Me())}) {
+      ASSERT_FALSE(refused) << row.why;
+      EXPECT_EQ(refused.error().error_number, EPERM) << row.why;
+    }
   }
-  const nas::Share share = {"x", volume, volume};
-  EXPECT_EQ(nas::ResultVolume(share, Me()), nas::ScratchVolume()) << "then the scratch volume";
+  EXPECT_EQ(*nas::ResultVolume(volume, Me()), nas::ScratchVolume()) << "then the scratch volume";
 }
 
 TEST_F(ResultFolderTest, IsMadeByRootForTheUser) {
   SKIP_UNLESS_ROOT();
   MakeFolder("volume1");
-  ASSERT_TRUE(nas::PrepareUserState(kOtherUser));
   EXPECT_TRUE(InChild([&] {
-    EXPECT_EQ(nas::ResultFolder(dir_ + "/volume1", kOtherUser), "") << "root is not that user";
-    ASSERT_EQ(WfmLibUGIDSet(nullptr, kOtherUser), 0);
-    const std::string folder = nas::ResultFolder(dir_ + "/volume1", kOtherUser);
+    const auto not_root = nas::MakeResultFolder(dir_ + "/volume1", kOtherUser);
+    ASSERT_FALSE(not_root) << "root is not that user";
+    ASSERT_TRUE(nas::EnterUserState(kOtherUser));
+    const auto folder = nas::MakeResultFolder(dir_ + "/volume1", kOtherUser);
+    ASSERT_TRUE(folder);
     struct stat info;
-    ASSERT_EQ(stat(folder.c_str(), &info), 0);
+    ASSERT_EQ(stat(folder->c_str(), &info), 0);
     EXPECT_EQ(info.st_uid, geteuid());
-    ASSERT_EQ(stat((folder + "/..").c_str(), &info), 0);
+    ASSERT_EQ(stat((*folder + "/..").c_str(), &info), 0);
     EXPECT_EQ(info.st_uid, 0U);
     EXPECT_NE(geteuid(), 0U) << "stepped down again";
-    EXPECT_NE(nas::ResultFolder(nas::ScratchVolume(), kOtherUser), "");
+    EXPECT_TRUE(nas::MakeResultFolder(nas::ScratchVolume(), kOtherUser));
   }));
 }
 

@@ -205,7 +205,7 @@ TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
   SKIP_UNLESS_ROOT();
   const std::string reply = Run(
       [](APIRequest* request, APIResponse* r) {
-        const uid_t before = geteuid();
+        const uid_t before = getuid();
         if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) != 0) return;
         const bool wrote = Json::Value(open((request->GetPreferenceDir() + "/x").c_str(),
                                             O_CREAT | O_WRONLY | O_CLOEXEC, 0600) >= 0)
@@ -217,7 +217,7 @@ TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
         r->SetError(0, data);
       },
       Json::Value(), kOtherUser);
-  EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":0,"wrote":true}})");
+  EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":65534,"wrote":true}})");
 }
 
 TEST_F(RunnerTest, FramesAreTakenInAnyPieces) {

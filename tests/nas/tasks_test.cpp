@@ -29,7 +29,7 @@ class TasksTest : public PlatformTest {
  protected:
   void SetUp() override {
     PlatformTest::SetUp();
-    ASSERT_TRUE(nas::PrepareUserState(Me()));
+    ASSERT_TRUE(nas::EnterUserState(Me()));
     me_ = Me();
   }
 
