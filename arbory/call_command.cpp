@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "arbory/session.h"
+#include "arbory/caller.h"
 #include "arbory/terminal.h"
 #include "nas/base/json_text.h"
 
@@ -33,17 +33,17 @@ std::string Methods(const nas::Module& module) {
 
 int RunCallCommand(const CallOptions& options) {
   const Json::Value params = ParseParams(options.params);
-  Session session(options.common);
-  const NUVA::APIMethod* row = session.module().Find(options.api, options.version, options.method);
+  Caller caller(options.common);
+  const NUVA::APIMethod* row = caller.module().Find(options.api, options.version, options.method);
   if (row == nullptr) {
     throw UsageError("no method " + options.api + " " + std::to_string(options.version) + " " +
-                     options.method + "; there are " + Methods(session.module()));
+                     options.method + "; there are " + Methods(caller.module()));
   }
   // One byte ahead of the line tells the exit code.
   const auto encode = [](int code, const Json::Value& data) {
     return (code == 0 ? "0" : "1") + nas::EncodeJsonReply(code, data) + "\n";
   };
-  const std::string reply = session.Call(*row, options.method, params, encode);
+  const std::string reply = caller.Call(*row, options.method, params, encode);
   if (!WriteOut(STDOUT_FILENO, std::string_view(reply).substr(1))) {
     throw std::runtime_error("the reply could not be written");
   }

@@ -23,9 +23,9 @@ size_t PagesAhead() { return std::clamp(std::thread::hardware_concurrency(), 1U,
 
 }  // namespace
 
-PageReader::PageReader(Session* session, const SearchOptions& options, const RowFormat& format,
+PageReader::PageReader(Caller* caller, const SearchOptions& options, const RowFormat& format,
                        const std::string& task_id)
-    : session_(*session),
+    : caller_(*caller),
       encode_(PageEncoder(format)),
       params_(Json::objectValue),
       at_(options.offset),
@@ -44,7 +44,7 @@ void PageReader::Ask() {
   params_["offset"] = Json::UInt64{next_};
   params_["limit"] = Json::UInt64{rows};
   constexpr char kMethod[] = "list";
-  asked_.push_back({session_.Begin(session_.Method(kMethod), kMethod, params_, encode_), rows});
+  asked_.push_back({caller_.Begin(caller_.Method(kMethod), kMethod, params_, encode_), rows});
   next_ += rows;
 }
 

@@ -7,16 +7,16 @@
 #include <functional>
 #include <string>
 
+#include "arbory/caller.h"
 #include "arbory/options.h"
 #include "arbory/rows.h"
-#include "arbory/session.h"
 
 namespace arbory {
 
 class PageReader {
  public:
   // Reads the rows that `options` asks for, in its order. All but `options` is borrowed.
-  PageReader(Session* session, const SearchOptions& options, const RowFormat& format,
+  PageReader(Caller* caller, const SearchOptions& options, const RowFormat& format,
              const std::string& task_id);
   ~PageReader();
   PageReader(const PageReader&) = delete;
@@ -41,7 +41,7 @@ class PageReader {
   void Forget();
   Page Take(const std::function<bool()>& go_on);
 
-  Session& session_;
+  Caller& caller_;
   const nas::ReplyEncoder encode_;
   Json::Value params_;
   std::uint64_t at_;    // the first row of the next page

@@ -13,12 +13,12 @@
 #include <optional>
 #include <string>
 
+#include "arbory/caller.h"
 #include "arbory/interrupt.h"
 #include "arbory/page_reader.h"
 #include "arbory/rows.h"
+#include "arbory/running_search.h"
 #include "arbory/search_request.h"
-#include "arbory/search_task.h"
-#include "arbory/session.h"
 #include "arbory/terminal.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
@@ -67,8 +67,8 @@ std::string FailureSentence(int code, const std::vector<std::string>& folders) {
 
 class Search {
  public:
-  Search(Session* session, const SearchOptions& options)
-      : session_(*session), options_(options), started_(Clock::now()) {
+  Search(Caller* caller, const SearchOptions& options)
+      : caller_(*caller), options_(options), started_(Clock::now()) {
     if (options.json) format_.kind = RowFormat::Kind::kJson;
     if (options.long_format) format_.kind = RowFormat::Kind::kLong;
     if (options.null_separated) format_.end = '\0';
@@ -92,7 +92,7 @@ class Search {
   using Clock = std::chrono::steady_clock;
 
   std::string Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode) {
-    return session_.Call(session_.Method(method), method, params, encode);
+    return caller_.Call(caller_.Method(method), method, params, encode);
   }
 
   void Start(const Json::Value& params) {
@@ -105,17 +105,17 @@ class Search {
       task_id_ = reply;
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
-          static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(session_.user(), task_id_).pid, 0)));
+          static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
       return;
     }
-    const std::string why = WhyNoTask(session_);
+    const std::string why = WhyNoTask(caller_);
     throw std::runtime_error("the search cannot be started: " +
                              (why.empty() ? "code" + reply : why));
   }
 
   // Prints rows in the order they are found.
   Ending Stream() {
-    PageReader pages(&session_, options_, format_, task_id_);
+    PageReader pages(&caller_, options_, format_, task_id_);
     while (!pages.AtEnd()) {
       const bool walked = HasWalked();
       const Page page = pages.Next(walked, [this] {
@@ -125,7 +125,7 @@ class Search {
       if (Interrupted()) return Ending::kInterrupted;
       if (page.code() != 0) {
         // No results to be had: because the search failed, or because it has not come so far yet.
-        const SearchState state = ReadSearch(session_.user(), task_id_);
+        const SearchState state = ReadSearch(caller_.user(), task_id_);
         failure_ = page.code();
         if (state.finished || !state.exists) return Ending::kFailed;
       }
@@ -142,7 +142,7 @@ class Search {
   Ending ListSorted() {
     for (SearchState state; !state.finished; Wait()) {
       if (Interrupted()) return Ending::kInterrupted;
-      state = ReadSearch(session_.user(), task_id_);
+      state = ReadSearch(caller_.user(), task_id_);
       if (!state.exists) return Ending::kFailed;
       if (state.finished) break;
     }
@@ -175,7 +175,7 @@ class Search {
   // Whether no more rows will come, though the worker may still be sorting what it has found. Rows
   // that do come after this are noticed, however early the search is.
   bool HasWalked() {
-    const SearchState state = ReadSearch(session_.user(), task_id_);
+    const SearchState state = ReadSearch(caller_.user(), task_id_);
     if (!watch_ && !state.results.empty()) watch_.emplace(state.results);
     return state.phase == "done";
   }
@@ -183,14 +183,14 @@ class Search {
   void ShowProgress() {
     if (!progress_.Due()) return;
     const auto ran = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - started_);
-    progress_.Show(ProgressText(ReadSearch(session_.user(), task_id_), ran.count()));
+    progress_.Show(ProgressText(ReadSearch(caller_.user(), task_id_), ran.count()));
   }
 
   // Says what has to be said at the end and returns the exit code.
   int Report(Ending ending) {
     progress_.Clear();
     if (ending == Ending::kInterrupted) return kExitInterrupted;
-    const SearchState state = ReadSearch(session_.user(), task_id_);
+    const SearchState state = ReadSearch(caller_.user(), task_id_);
     running_ = state.exists && !state.finished;
     if (ending == Ending::kUnwritable) {
       // A reader that has seen enough, such as head, is no failure.
@@ -231,7 +231,7 @@ class Search {
     Call("clean", params, ignore);
   }
 
-  Session& session_;
+  Caller& caller_;
   const SearchOptions& options_;
   const Clock::time_point started_;
   RowFormat format_;
@@ -249,10 +249,10 @@ class Search {
 
 int RunSearchCommand(const SearchOptions& options) {
   WatchForInterrupt();
-  Session session(options.common);
+  Caller caller(options.common);
   nas::LoadNameService();
-  const Json::Value params = PrepareSearch(options.query, &session);
-  return Search(&session, options).Run(params);
+  const Json::Value params = PrepareSearch(options.query, &caller);
+  return Search(&caller, options).Run(params);
 }
 
 }  // namespace arbory

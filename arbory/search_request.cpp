@@ -1,6 +1,6 @@
 #include "arbory/search_request.h"
 
-#include "arbory/folders.h"
+#include "arbory/locate.h"
 #include "arbory/parse.h"
 #include "nas/system/shares.h"
 #include "platform/filesearch.h"
@@ -86,9 +86,9 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
   return params;
 }
 
-Json::Value PrepareSearch(const SearchQuery& query, Session* session) {
+Json::Value PrepareSearch(const SearchQuery& query, Caller* caller) {
   const Locations locations = LocateFolders(query.folders, nas::ListShares(), query.recursive);
-  session->AddShares(locations.added);
+  caller->AddShares(locations.added);
   return SearchRequest(query, locations.paths, std::time(nullptr));
 }
 

@@ -4,11 +4,11 @@
 
 #include <string>
 
+#include "arbory/caller.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/sample_share.h"
 #include "arbory/server/service/service.h"
 #include "arbory/server/transport/http_server.h"
-#include "arbory/session.h"
 #include "arbory/terminal.h"
 #include "nas/system/accounts.h"
 #include "nas/system/shares.h"
@@ -28,10 +28,10 @@ nas::ServerSettings SettingsOf(const ServeOptions& options) {
 }
 
 // A share to try it with, where there is nothing else to search.
-void OfferSample(Session* session) {
+void OfferSample(Caller* caller) {
   if (!nas::ListShares().empty() || !nas::CurrentConfig().shares.empty()) return;
   const std::string folder = MakeSampleShare(nas::CurrentConfig().state_dir);
-  session->AddShares({{kSampleShare, folder}});
+  caller->AddShares({{kSampleShare, folder}});
   Say("No share is configured: offering the sample share in " + folder);
 }
 
@@ -41,10 +41,10 @@ bool HasLogins(const ServeOptions& options) {
 }
 
 Service::Setup SetupOf(const ServeOptions& options, const nas::ServerSettings& settings,
-                       const Session& session, const HttpServer& server) {
+                       const Caller& caller, const HttpServer& server) {
   Service::Setup setup;
   setup.settings = settings;
-  if (!HasLogins(options)) setup.single_user = session.user();
+  if (!HasLogins(options)) setup.single_user = caller.user();
   // Browsers keep one cookie jar for all ports of a machine; the prefix binds it to this host.
   setup.cookie = settings.behind_tls ? "__Host-arbory" : "arbory_" + std::to_string(server.port());
   setup.site = {server.on_loopback(), settings.behind_tls, settings.origins};
@@ -72,11 +72,11 @@ void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& set
 }  // namespace
 
 int RunServeCommand(const ServeOptions& options) {
-  Session session(options.common);
-  OfferSample(&session);
+  Caller caller(options.common);
+  OfferSample(&caller);
   const nas::ServerSettings settings = SettingsOf(options);
   HttpServer server(settings);
-  Service service(SetupOf(options, settings, session, server), session.module());
+  Service service(SetupOf(options, settings, caller, server), caller.module());
   WarnOfOpenDoors(options, settings, server);
   nas::LoadNameService();
   const std::string base = "http://" + server.address() + "/";

@@ -8,7 +8,7 @@
 #include <ctime>
 #include <set>
 
-#include "arbory/folders.h"
+#include "arbory/locate.h"
 #include "arbory/options.h"
 #include "arbory/parse.h"
 #include "arbory/terminal.h"

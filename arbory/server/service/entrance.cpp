@@ -4,7 +4,7 @@
 
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http_text.h"
-#include "arbory/session.h"
+#include "arbory/caller.h"
 #include "nas/base/json_text.h"
 #include "nas/base/random_name.h"
 

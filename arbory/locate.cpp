@@ -1,4 +1,4 @@
-#include "arbory/folders.h"
+#include "arbory/locate.h"
 
 #include <strings.h>
 #include <sys/stat.h>

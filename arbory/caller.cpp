@@ -1,4 +1,4 @@
-#include "arbory/session.h"
+#include "arbory/caller.h"
 
 #include <unistd.h>
 
@@ -24,36 +24,36 @@ std::string ActingUser(const std::string& wanted) {
 
 }  // namespace
 
-Session::Session(const CommonOptions& options) : config_(nas::LoadConfig(options.config)) {
+Caller::Caller(const CommonOptions& options) : config_(nas::LoadConfig(options.config)) {
   for (const std::string& share : options.shares) config_.shares.push_back(ParseShare(share));
   nas::Configure(config_);
   user_ = ActingUser(options.user);
 }
 
-void Session::AddShares(const std::vector<nas::ShareSetting>& shares) {
+void Caller::AddShares(const std::vector<nas::ShareSetting>& shares) {
   if (shares.empty()) return;
   config_.shares.insert(config_.shares.end(), shares.begin(), shares.end());
   nas::Configure(config_);
 }
 
-const nas::Module& Session::module() {
+const nas::Module& Caller::module() {
   if (!module_) module_ = std::make_unique<nas::Module>(std::string());
   return *module_;
 }
 
-const NUVA::APIMethod& Session::Method(const char* method) {
+const NUVA::APIMethod& Caller::Method(const char* method) {
   const NUVA::APIMethod* row = module().Find(kSearchApi, kSearchVersion, method);
   if (row == nullptr) throw std::runtime_error(std::string("the module has no ") + method);
   return *row;
 }
 
-std::string Session::Call(const NUVA::APIMethod& row, const std::string& method,
-                          const Json::Value& params, const nas::ReplyEncoder& encode) const {
+std::string Caller::Call(const NUVA::APIMethod& row, const std::string& method,
+                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
   return nas::FinishCall(Begin(row, method, params, encode), encode);
 }
 
-nas::RunningCall Session::Begin(const NUVA::APIMethod& row, const std::string& method,
-                                const Json::Value& params, const nas::ReplyEncoder& encode) const {
+nas::RunningCall Caller::Begin(const NUVA::APIMethod& row, const std::string& method,
+                               const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
   return nas::StartCall(row, {method, params, user_, "terminal"}, encode);
 }

@@ -16,11 +16,11 @@ namespace arbory {
 inline constexpr char kSearchApi[] = "NUVA.Arbory.Search";
 inline constexpr int kSearchVersion = 2;
 
-class Session {
+class Caller {
  public:
   // Reads the configuration and makes it the process's. Throws UsageError or nas::ConfigError, also
   // for a user that the caller may not act for.
-  explicit Session(const CommonOptions& options);
+  explicit Caller(const CommonOptions& options);
 
   // Offers more shares, for this run.
   void AddShares(const std::vector<nas::ShareSetting>& shares);

@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <string>
 
-#include "arbory/session.h"
+#include "arbory/caller.h"
 
 namespace arbory {
 
@@ -30,7 +30,7 @@ std::string Counted(std::uint64_t number, const char* one, const char* many);
 // "Searching 3 s: 1,204 folders, 23,456 entries, 42 found".
 std::string ProgressText(const SearchState& state, long seconds);
 
-// Why no search can be started for the session's user just now; a sentence, or empty when one can.
-std::string WhyNoTask(const Session& session);
+// Why no search can be started for the caller's user just now; a sentence, or empty when one can.
+std::string WhyNoTask(const Caller& caller);
 
 }  // namespace arbory

@@ -1,4 +1,4 @@
-#include "arbory/search_task.h"
+#include "arbory/running_search.h"
 
 #include <exception>
 #include <memory>
@@ -86,7 +86,7 @@ std::string ProgressText(const SearchState& state, long seconds) {
   return text;
 }
 
-std::string WhyNoTask(const Session& session) {
+std::string WhyNoTask(const Caller& caller) {
   const NUVA::APIMethod row = {"", 1, "", TryTask};
   const auto encode = [](int code, const Json::Value& data) {
     // Without a text the call did not come as far as making a task.
@@ -94,7 +94,7 @@ std::string WhyNoTask(const Session& session) {
     return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (code " +
            std::to_string(code) + ")";
   };
-  return session.Call(row, "", Json::Value(), encode);
+  return caller.Call(row, "", Json::Value(), encode);
 }
 
 }  // namespace arbory
