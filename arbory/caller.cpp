@@ -2,8 +2,12 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
+
 #include "arbory/parse.h"
 #include "nas/system/accounts.h"
+#include "platform/webfm.h"
 
 namespace arbory {
 namespace {
@@ -45,6 +49,11 @@ const NUVA::APIMethod& Caller::Method(const char* method) {
   const NUVA::APIMethod* row = module().Find(kSearchApi, kSearchVersion, method);
   if (row == nullptr) throw std::runtime_error(std::string("the module has no ") + method);
   return *row;
+}
+
+void Caller::BecomeUser() const {
+  if (WfmLibUGIDSet(nullptr, user_.c_str()) == 0) return;
+  throw std::runtime_error("cannot act for the user '" + user_ + "': " + std::strerror(errno));
 }
 
 std::string Caller::Call(const NUVA::APIMethod& row, const std::string& method,

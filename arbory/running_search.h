@@ -1,36 +1,41 @@
 #pragma once
-// A search's task record as the terminal reads it: whether the search has ended and how, and what
-// its walk has seen so far.
+// A search as it is seen from outside the module, running or ended: what its task record says. The
+// record is read under the identity the process has, which must be the user's: the record lies in
+// a folder of the user's own, and what it names is of the user's choosing.
+
+#include <json/value.h>
 
 #include <cstdint>
 #include <string>
-
-#include "arbory/caller.h"
+#include <vector>
 
 namespace arbory {
 
-struct SearchState {
-  bool exists = false;
+// Values of a wrong type read as absent ones: a record is no better than its last writer.
+struct RunningSearch {
+  bool exists = false;  // false: cleaned, or never there; the rest is as it stands here then
   bool finished = false;
-  int progress = 0;     // 1: complete, -1: failed with `error`, 0: running, or ended before its end
-  int error = 0;        // web API code
-  int pid = 0;          // of the worker, which may have ended
-  std::string results;  // path of the result file, empty until there is one
-  std::string phase;    // empty until the walk has begun
+  int progress = 0;  // 1: complete, -1: failed with `error`, 0: running, or ended before its end
+  int error = 0;     // web API code
+  int pid = 0;       // of the worker, which may have ended
+  std::string
+      results;  // path of the result file, empty until there is one; nobody has looked there
+  Json::Value location;  // the folders, as they were normalised at the start
+
+  Json::Value walk;  // as the walk reports it to clients, null until it has begun; below, its parts
+  bool all_found = false;  // no more rows will come
+  bool reads_contents = false;
   std::uint64_t folders = 0;
   std::uint64_t entries = 0;
   std::uint64_t matches = 0;
   std::uint64_t unreadable = 0;  // folders skipped for lack of permission
   std::uint64_t troubled = 0;  // folders skipped for other reasons; those that vanished not counted
 };
-SearchState ReadSearch(const std::string& user, const std::string& task_id);
 
-// "1 folder", "1,204 folders".
-std::string Counted(std::uint64_t number, const char* one, const char* many);
-// "Searching 3 s: 1,204 folders, 23,456 entries, 42 found".
-std::string ProgressText(const SearchState& state, long seconds);
+// Throws nothing: a record that cannot be read is that of a search that does not exist.
+RunningSearch ReadSearch(const std::string& user, const std::string& task_id);
 
-// Why no search can be started for the caller's user just now; a sentence, or empty when one can.
-std::string WhyNoTask(const Caller& caller);
+// The ids of the user's searches that have not finished; none where they cannot be looked up.
+std::vector<std::string> UnfinishedSearches(const std::string& user);
 
 }  // namespace arbory

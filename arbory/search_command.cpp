@@ -19,6 +19,7 @@
 #include "arbory/rows.h"
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
+#include "arbory/search_text.h"
 #include "arbory/terminal.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
@@ -44,25 +45,6 @@ enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
 void Complain(const std::string& sentence) {
   WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
-}
-
-// Codes of a failed search, see docs/api.md.
-std::string FailureSentence(int code, const std::vector<std::string>& folders) {
-  constexpr int kPermission = 407, kNoFolder = 408, kUnknownName = 405, kIllegal = 418;
-  std::string where;
-  for (const std::string& folder : folders) where += (where.empty() ? "'" : ", '") + folder + "'";
-  switch (code) {
-    case kPermission:
-      return "permission denied: " + where;
-    case kNoFolder:
-      return "no such folder: " + where;
-    case kUnknownName:
-      return "unknown user or group";
-    case kIllegal:
-      return "illegal pattern, file type or folder: " + where;
-    default:
-      return "the search failed (code " + std::to_string(code) + "); the system log may tell";
-  }
 }
 
 class Search {
@@ -108,7 +90,7 @@ class Search {
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
       return;
     }
-    const std::string why = WhyNoTask(caller_);
+    const std::string why = WhyNoSearch(caller_);
     throw std::runtime_error("the search cannot be started: " +
                              (why.empty() ? "code" + reply : why));
   }
@@ -125,7 +107,7 @@ class Search {
       if (Interrupted()) return Ending::kInterrupted;
       if (page.code() != 0) {
         // No results to be had: because the search failed, or because it has not come so far yet.
-        const SearchState state = ReadSearch(caller_.user(), task_id_);
+        const RunningSearch state = ReadSearch(caller_.user(), task_id_);
         failure_ = page.code();
         if (state.finished || !state.exists) return Ending::kFailed;
       }
@@ -140,7 +122,7 @@ class Search {
 
   // Prints the rows of the finished search.
   Ending ListSorted() {
-    for (SearchState state; !state.finished; Wait()) {
+    for (RunningSearch state; !state.finished; Wait()) {
       if (Interrupted()) return Ending::kInterrupted;
       state = ReadSearch(caller_.user(), task_id_);
       if (!state.exists) return Ending::kFailed;
@@ -175,9 +157,9 @@ class Search {
   // Whether no more rows will come, though the worker may still be sorting what it has found. Rows
   // that do come after this are noticed, however early the search is.
   bool HasWalked() {
-    const SearchState state = ReadSearch(caller_.user(), task_id_);
+    const RunningSearch state = ReadSearch(caller_.user(), task_id_);
     if (!watch_ && !state.results.empty()) watch_.emplace(state.results);
-    return state.phase == "done";
+    return state.all_found;
   }
 
   void ShowProgress() {
@@ -190,7 +172,7 @@ class Search {
   int Report(Ending ending) {
     progress_.Clear();
     if (ending == Ending::kInterrupted) return kExitInterrupted;
-    const SearchState state = ReadSearch(caller_.user(), task_id_);
+    const RunningSearch state = ReadSearch(caller_.user(), task_id_);
     running_ = state.exists && !state.finished;
     if (ending == Ending::kUnwritable) {
       // A reader that has seen enough, such as head, is no failure.
@@ -204,7 +186,7 @@ class Search {
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
 
-  bool CameToEnd(Ending ending, const SearchState& state) {
+  bool CameToEnd(Ending ending, const RunningSearch& state) {
     if (state.progress < 0) {
       Complain(FailureSentence(state.error, options_.query.folders));
     } else if (!state.exists || (state.finished && state.progress == 0)) {
@@ -252,6 +234,9 @@ int RunSearchCommand(const SearchOptions& options) {
   Caller caller(options.common);
   nas::LoadNameService();
   const Json::Value params = PrepareSearch(options.query, &caller);
+  // From here on the program follows what the user's own processes write.
+  caller.module();
+  caller.BecomeUser();
   return Search(&caller, options).Run(params);
 }
 

@@ -19,8 +19,8 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
                           std::time_t now);
 
 // The same for the folders as they were given: finds the share that each lies in, and offers a new
-// one through the caller where it lies in none. Throws UsageError for a folder that cannot be searched
-// too.
+// one through the caller where it lies in none. Throws UsageError for a folder that cannot be
+// searched too.
 Json::Value PrepareSearch(const SearchQuery& query, Caller* caller);
 
 }  // namespace arbory

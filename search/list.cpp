@@ -8,11 +8,15 @@
 
 #include "api/codes.h"
 #include "api/log.h"
+#include "platform/task_record.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
-#include "search/task_record.h"
 
 namespace {
+
+// Tenths of a second: opening the locations of a busy machine takes time, a first page little more.
+constexpr int kDatabaseBound = 500;
+constexpr int kResultReadyBound = 100;
 
 struct AttributeName {
   const char* name;
@@ -101,7 +105,7 @@ bool ArboryFindHandler::AnswerPage(int additional, const std::string& task_id) {
 // be asked for again, a record without data may not.
 bool ArboryFindHandler::WaitForDatabase(const std::string& task_id, Json::Value& task_data) {
   if (WaitForTaskDataKeyReady(pTask, task_record::kData, task_record::kDatabaseId,
-                              task_record::kDatabaseBound) == 0) {
+                              kDatabaseBound) == 0) {
     SetError(kCodeNoResults);
     syslog(LOG_ERR, "%s:%d Failed to get json data, %s.", kLogSource, log_line::kListNotReady,
            task_id.c_str());
@@ -114,7 +118,7 @@ bool ArboryFindHandler::WaitForDatabase(const std::string& task_id, Json::Value&
            task_id.c_str());
     return false;
   }
-  WaitForTaskDataReady(pTask, task_record::kResultReady, task_record::kResultReadyBound);
+  WaitForTaskDataReady(pTask, task_record::kResultReady, kResultReadyBound);
   return true;
 }
 

@@ -17,11 +17,14 @@
 #include "api/codes.h"
 #include "api/log.h"
 #include "platform/system.h"
+#include "platform/task_record.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
-#include "search/task_record.h"
 
 namespace {
+
+// Tenths of a second: the parent writes right after the fork.
+constexpr int kFirstWriteBound = 60;
 
 // "/SHARE/below" and "/SHARE" name the share SHARE. Throws std::out_of_range for an empty text.
 std::string ShareOf(const std::string& location) {
@@ -100,7 +103,7 @@ bool ArboryFindHandler::RunWorker(const Json::Value& locations) {
   bool as_user = true;
   try {
     std::signal(SIGTERM, DelSigHandler);
-    WaitForTaskDataReady(pTask, task_record::kData, task_record::kFirstWriteBound);
+    WaitForTaskDataReady(pTask, task_record::kData, kFirstWriteBound);
     const std::string session = request()->GetSessionID();
     std::vector<std::string> folders;
     for (const Json::Value& location : locations) folders.push_back(location.asString());

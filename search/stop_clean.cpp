@@ -20,11 +20,14 @@
 #include "api/codes.h"
 #include "api/log.h"
 #include "platform/system.h"
+#include "platform/task_record.h"
 #include "search/find_handler.h"
 #include "search/search_state.h"
-#include "search/task_record.h"
 
 namespace {
+
+// Tenths of a second: a search that never got so far is stopped or cleaned as it is.
+constexpr int kCleanBound = 60;
 
 // Every temporary search folder of the user, on whatever volume.
 constexpr char kRemoveCommand[] = "rm -rf /volume*/%s/%s";
@@ -43,7 +46,7 @@ OKT::Task* OpenTask(const OKT::TaskMgr& tasks, const Json::Value& id) {
 
 // Null when the search never got so far as to write the member, or its data are gone. Logged.
 Json::Value WaitForData(OKT::Task* task, const char* member, int not_ready_line, int null_line) {
-  if (WaitForTaskDataKeyReady(task, task_record::kData, member, task_record::kCleanBound) == 0) {
+  if (WaitForTaskDataKeyReady(task, task_record::kData, member, kCleanBound) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, not_ready_line);
     return Json::Value();
   }

@@ -8,10 +8,10 @@
 #include <memory>
 
 #include "api/log.h"
+#include "platform/task_record.h"
 #include "search/find_handler.h"
 #include "search/owned_list.h"
 #include "search/search_state.h"
-#include "search/task_record.h"
 
 namespace {
 

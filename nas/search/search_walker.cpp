@@ -27,6 +27,7 @@
 #include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 #include "platform/system.h"
+#include "platform/task_record.h"
 
 namespace FileSearch {
 namespace {
@@ -230,8 +231,8 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   if (!last && told_ready_ && now - reported_ < kReportInterval) return;
   reported_ = now;
   task_->beginUpdate();
-  task_->setProperty("walk", progress.ToJson());
-  if (!told_ready_) task_->setProperty("result_ready", true);
+  task_->setProperty(task_record::kWalk, progress.ToJson());
+  if (!told_ready_) task_->setProperty(task_record::kResultReady, true);
   // A task that was removed meanwhile has nobody left to tell.
   task_->endUpdate();
   told_ready_ = true;

@@ -1,12 +1,14 @@
 #pragma once
-// What a walk has seen so far, as clients are told: the task property "walk"
-// {"phase", "folders", "entries", "matches", "skipped": {"permission", "vanished", "other"}}.
+// What a walk has seen so far, as clients are told: the task property "walk" of
+// platform/task_record.h.
 
 #include <json/value.h>
 
 #include <atomic>
 #include <cerrno>
 #include <cstdint>
+
+#include "platform/task_record.h"
 
 namespace nas {
 
@@ -33,15 +35,16 @@ class WalkProgress {
   void SetPhase(Phase phase) { phase_ = phase; }
 
   Json::Value ToJson() const {
-    constexpr const char* kPhases[] = {"names", "contents", "done"};
+    using namespace task_record;
+    constexpr const char* kPhases[] = {kNamesPhase, kContentsPhase, kDonePhase};
     Json::Value json;
-    json["phase"] = kPhases[static_cast<int>(phase_.load())];
-    json["folders"] = Json::UInt64{folders_};
-    json["entries"] = Json::UInt64{entries_};
-    json["matches"] = Json::UInt64{matches_};
-    json["skipped"]["permission"] = Json::UInt64{permission_};
-    json["skipped"]["vanished"] = Json::UInt64{vanished_};
-    json["skipped"]["other"] = Json::UInt64{other_};
+    json[kPhase] = kPhases[static_cast<int>(phase_.load())];
+    json[kFolders] = Json::UInt64{folders_};
+    json[kEntries] = Json::UInt64{entries_};
+    json[kMatches] = Json::UInt64{matches_};
+    json[kSkipped][kPermission] = Json::UInt64{permission_};
+    json[kSkipped][kVanished] = Json::UInt64{vanished_};
+    json[kSkipped][kOther] = Json::UInt64{other_};
     return json;
   }
 

@@ -107,6 +107,15 @@ std::string TaskFiles::Create(UniqueFd* life) const {
   return id;
 }
 
+std::vector<std::string> TaskFiles::Ids() const {
+  std::vector<std::string> ids;
+  for (const std::string& name : NamesIn(folder_.get(), ".").value_or({})) {
+    std::string id = IdOf(name, kRecordSuffix);
+    if (!id.empty()) ids.push_back(std::move(id));
+  }
+  return ids;
+}
+
 bool TaskFiles::IsAlive(const std::string& id) const {
   const UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
   if (!fd) return false;

@@ -23,6 +23,7 @@
 #include <json/value.h>
 
 #include <string>
+#include <vector>
 
 #include "nas/base/unique_fd.h"
 
@@ -42,6 +43,9 @@ class TaskFiles {
   // std::runtime_error when the owner has as many running tasks as the
   // configuration allows or it cannot be stored.
   std::string Create(UniqueFd* life) const;
+
+  // Of the owner's tasks, running and finished, in no order; none where the folder cannot be read.
+  std::vector<std::string> Ids() const;
 
   // Whether some process still works on the task.
   bool IsAlive(const std::string& id) const;

@@ -7,6 +7,7 @@
 #include <chrono>
 #include <filesystem>
 
+#include "arbory/running_search.h"
 #include "nas/system/user_state.h"
 #include "tests/program/program_test.h"
 
@@ -15,6 +16,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using testing::ElementsAre;
+using testing::HasSubstr;
 using testing::IsEmpty;
 
 class Lifecycle : public ProgramTest {
@@ -45,6 +47,15 @@ class Lifecycle : public ProgramTest {
       if (stage == "located") return data.isObject() && data.isMember("sdbid");
       return walk.isObject() && walk["phase"].asString() == stage;
     });
+  }
+  // The id of the one search that the user has, once it walks.
+  std::string OneThatWalks(const std::string& user) {
+    std::vector<std::string> ids;
+    EXPECT_TRUE(Eventually([&] {
+      ids = arbory::UnfinishedSearches(user);
+      return ids.size() == 1 && !arbory::ReadSearch(user, ids.front()).walk.isNull();
+    }));
+    return ids.empty() ? std::string() : ids.front();
   }
   pid_t Worker(const std::string& id) { return TaskProperty(id, "data")["pid"].asInt(); }
   static bool Lives(pid_t process) {
@@ -178,22 +189,32 @@ TEST_F(Lifecycle, AnInterruptedProgramCleansUp) {
   for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
     SCOPED_TRACE(strsignal(signal_number));
     const pid_t program = Launch({"search", "one", "--content"});
-    const std::string tasks = nas::TaskFolder(nas_test::Me());
-    std::string id;
-    ASSERT_TRUE(Eventually([&] {
-      std::error_code none;
-      for (const auto& entry : fs::directory_iterator(tasks, none)) {
-        if (entry.path().extension() == ".json") id = entry.path().stem();
-      }
-      return !id.empty() && TaskProperty(id, "walk").isObject();
-    }));
-    const pid_t worker = Worker(id);
+    const pid_t worker = Worker(OneThatWalks(nas_test::Me()));
     ASSERT_TRUE(Lives(worker));
     kill(program, signal_number);
     const Output output = Finish(program);
     EXPECT_EQ(output.exit_code, 130);
     EXPECT_TRUE(Eventually([&] { return !Lives(worker) && Remains().empty(); }));
   }
+}
+
+// Root's program for a user follows records that the user can write, and looks where they point: it
+// must not see more there than the user, nor with root's groups.
+TEST_F(Lifecycle, RootsProgramForAUserIsTheUser) {
+  SKIP_UNLESS_ROOT();
+  MakeEndlessFile(share_ + "/endless.log");
+  const pid_t program = Launch({"search", "one", "--content", "--user", nas_test::kOtherUser});
+  OneThatWalks(nas_test::kOtherUser);
+  const std::string status = nas_test::ReadFile("/proc/" + std::to_string(program) + "/status");
+  kill(program, SIGTERM);
+  EXPECT_EQ(Finish(program).exit_code, 130);
+  const passwd* user = getpwnam(nas_test::kOtherUser);
+  const std::string uid = std::to_string(user->pw_uid);
+  const std::string gid = std::to_string(user->pw_gid);
+  EXPECT_THAT(status, HasSubstr("Uid:\t" + uid + "\t" + uid + "\t0\t" + uid + "\n"));
+  EXPECT_THAT(status, HasSubstr("Gid:\t" + gid + "\t" + gid + "\t" + gid + "\t" + gid + "\n"));
+  EXPECT_THAT(status, HasSubstr("Groups:\t" + gid + " \n"));
+  EXPECT_TRUE(Eventually([&] { return Remains(nas_test::kOtherUser).empty(); }));
 }
 
 // Two users of one machine: neither sees the other's searches, results or history.

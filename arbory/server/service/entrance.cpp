@@ -2,9 +2,9 @@
 
 #include <algorithm>
 
+#include "arbory/caller.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http_text.h"
-#include "arbory/caller.h"
 #include "nas/base/json_text.h"
 #include "nas/base/random_name.h"
 

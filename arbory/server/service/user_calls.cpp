@@ -4,17 +4,12 @@
 #include <unistd.h>
 
 #include <climits>
-#include <exception>
-#include <memory>
 #include <vector>
 
+#include "arbory/running_search.h"
 #include "arbory/server/transport/child.h"
-#include "nas/base/paths.h"
-#include "nas/base/random_name.h"
 #include "nas/system/shares.h"
-#include "nas/system/user_state.h"
 #include "platform/system.h"
-#include "platform/task.h"
 #include "platform/webfm.h"
 
 namespace arbory {
@@ -57,45 +52,22 @@ void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   response->SetError(kOk, body);
 }
 
-std::unique_ptr<OKT::Task> OpenTask(const std::string& user, const std::string& id) {
-  try {
-    return std::unique_ptr<OKT::Task>(OKT::TaskMgr(user.c_str()).getTaskWithThrow(id.c_str()));
-  } catch (const std::exception&) {
-    return nullptr;
-  }
-}
-
 void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   if (!Become(request, response)) return;
   const std::string id = request->GetParam(kTaskId, "").asString();
-  const auto task = OpenTask(request->GetLoginUserName(), id);
-  if (!task) {
+  const RunningSearch search = ReadSearch(request->GetLoginUserName(), id);
+  if (!search.exists) {
     response->SetError(kNotFound, Error(kNotFound, "There is no such search; start a new one."));
     return;
   }
-  const Json::Value data = task->getProperty("data");
   Json::Value body;
   body[kTaskId] = id;
-  body["finished"] = task->isFinished();
-  body["progress"] = task->getProperty("progress");
-  if (data.isObject()) {
-    if (data.isMember("errno")) body["errno"] = data["errno"];
-    body["location"] = data["location"];
-  }
-  body["walk"] = task->getProperty("walk");
+  body["finished"] = search.finished;
+  body["progress"] = search.progress;
+  if (search.progress < 0) body["errno"] = search.error;
+  body["location"] = search.location;
+  body["walk"] = search.walk;
   response->SetError(kOk, body);
-}
-
-std::vector<std::string> RunningTasks(const std::string& user) {
-  std::vector<std::string> ids;
-  constexpr std::string_view kRecord = ".json";
-  for (std::string name : nas::NamesIn(AT_FDCWD, nas::TaskFolder(user)).value_or({})) {
-    if (!name.ends_with(kRecord)) continue;
-    name.resize(name.size() - kRecord.size());
-    const auto task = nas::IsRandomName(name) ? OpenTask(user, name) : nullptr;
-    if (task && !task->isFinished()) ids.push_back(name);
-  }
-  return ids;
 }
 
 // The same request as one for the method "stop" of these searches.
@@ -131,7 +103,7 @@ const NUVA::APIMethod* g_stop = nullptr;
 void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   if (!Become(request, response)) return;
   Json::Value ids(Json::arrayValue);
-  for (const std::string& id : RunningTasks(request->GetLoginUserName())) ids.append(id);
+  for (const std::string& id : UnfinishedSearches(request->GetLoginUserName())) ids.append(id);
   Json::Value body;
   body["stopped"] = ids.size();
   if (!ids.empty()) {

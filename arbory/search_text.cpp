@@ -1,0 +1,76 @@
+#include "arbory/search_text.h"
+
+#include <exception>
+
+#include "platform/task.h"
+#include "platform/webfm.h"
+
+namespace arbory {
+namespace {
+
+std::string Grouped(std::uint64_t number) {
+  constexpr int kGroup = 3;
+  std::string text = std::to_string(number);
+  for (int at = static_cast<int>(text.size()) - kGroup; at > 0; at -= kGroup) text.insert(at, ",");
+  return text;
+}
+
+// A table row of the program's own: makes a task as the user and removes it again, because the
+// module keeps to itself why it could not make one.
+void TryTask(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  const std::string user = request->GetLoginUserName();
+  try {
+    if (WfmLibUGIDSet(nullptr, user.c_str()) < 0) throw std::runtime_error("no such user");
+    OKT::Task(user.c_str(), nullptr).remove();
+    response->SetError(0, "");
+  } catch (const std::exception& error) {
+    response->SetError(nas::kCodeUnknownFailure, error.what());
+  }
+}
+
+}  // namespace
+
+std::string Counted(std::uint64_t number, const char* one, const char* many) {
+  return Grouped(number) + " " + (number == 1 ? one : many);
+}
+
+std::string ProgressText(const RunningSearch& search, long seconds) {
+  std::string text = "Searching " + std::to_string(seconds) + " s";
+  if (search.walk.isNull()) return text;
+  text += ": " + Counted(search.folders, "folder", "folders") + ", " +
+          Counted(search.entries, "entry", "entries") + ", " + Grouped(search.matches) + " found";
+  if (search.reads_contents) text += ", reading contents";
+  return text;
+}
+
+// Codes of a failed search, see docs/api.md.
+std::string FailureSentence(int code, const std::vector<std::string>& folders) {
+  constexpr int kPermission = 407, kNoFolder = 408, kUnknownName = 405, kIllegal = 418;
+  std::string where;
+  for (const std::string& folder : folders) where += (where.empty() ? "'" : ", '") + folder + "'";
+  switch (code) {
+    case kPermission:
+      return "permission denied: " + where;
+    case kNoFolder:
+      return "no such folder: " + where;
+    case kUnknownName:
+      return "unknown user or group";
+    case kIllegal:
+      return "illegal pattern, file type or folder: " + where;
+    default:
+      return "the search failed (code " + std::to_string(code) + "); the system log may tell";
+  }
+}
+
+std::string WhyNoSearch(const Caller& caller) {
+  const NUVA::APIMethod row = {"", 1, "", TryTask};
+  const auto encode = [](int code, const Json::Value& data) {
+    // Without a text the call did not come as far as making a task.
+    if (data.isString()) return data.asString();
+    return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (code " +
+           std::to_string(code) + ")";
+  };
+  return caller.Call(row, "", Json::Value(), encode);
+}
+
+}  // namespace arbory

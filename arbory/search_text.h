@@ -1,0 +1,23 @@
+#pragma once
+// What the terminal says of a search: how far it has come, and why it could not be run.
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "arbory/caller.h"
+#include "arbory/running_search.h"
+
+namespace arbory {
+
+// "1 folder", "1,204 folders".
+std::string Counted(std::uint64_t number, const char* one, const char* many);
+// "Searching 3 s: 1,204 folders, 23,456 entries, 42 found".
+std::string ProgressText(const RunningSearch& search, long seconds);
+
+// Why a search of `folders` failed with the web API code `code`.
+std::string FailureSentence(int code, const std::vector<std::string>& folders);
+// Why no search can be started for the caller's user just now; empty when one can.
+std::string WhyNoSearch(const Caller& caller);
+
+}  // namespace arbory
