@@ -2,6 +2,7 @@
 
 #include <exception>
 
+#include "platform/errors.h"
 #include "platform/task.h"
 #include "platform/webfm.h"
 
@@ -43,19 +44,17 @@ std::string ProgressText(const RunningSearch& search, long seconds) {
   return text;
 }
 
-// Codes of a failed search, see docs/api.md.
 std::string FailureSentence(int code, const std::vector<std::string>& folders) {
-  constexpr int kPermission = 407, kNoFolder = 408, kUnknownName = 405, kIllegal = 418;
   std::string where;
   for (const std::string& folder : folders) where += (where.empty() ? "'" : ", '") + folder + "'";
   switch (code) {
-    case kPermission:
+    case web_code::kPermission:
       return "permission denied: " + where;
-    case kNoFolder:
+    case web_code::kNoSuchFolder:
       return "no such folder: " + where;
-    case kUnknownName:
+    case web_code::kNoSuchAccount:
       return "unknown user or group";
-    case kIllegal:
+    case web_code::kIllegal:
       return "illegal pattern, file type or folder: " + where;
     default:
       return "the search failed (code " + std::to_string(code) + "); the system log may tell";

@@ -96,7 +96,8 @@ class FindFactory {
   };
   // Appends the comparator of a textual field. The file type is read from `arg1`, every other field
   // from `arg2`. Returns non-zero on success; zero leaves the reason in WfmLibGetErr and
-  // NLIBCErrGet (0x9A00 for a text that is no pattern or type, 0x1800, 0x1D00).
+  // NLIBCErrGet (errors.h: kIllegal for a text that is no pattern or type, kNoSuchUser,
+  // kNoSuchGroup).
   static int createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                           std::vector<FindComp*>& comps);
 };

@@ -7,7 +7,7 @@
 #include <cstddef>
 
 // Users and groups by name. Get returns 0 and a record that the matching Free releases, or a
-// negative value with the last error set (0x1800 no such user, 0x1D00 no such group).
+// negative value with the last error set (errors.h: kNoSuchUser, kNoSuchGroup).
 struct NUVAUSER {
   char* szName;
   uid_t nUid;
@@ -53,7 +53,5 @@ int NLIBCExec(const char* program, const char* arg1, const char* arg2, const cha
 // or -1 if it does not fit.
 int NLIBCEncShParam(const char* text, char* buffer, size_t size);
 
-// The last platform error number of this process: 0x0300 permission denied, 0x0600 no such folder,
-// 0x1800 unknown user, 0x1D00 unknown group, 0x9A00 illegal path or criterion, others I/O, space or
-// database trouble. Set only by failures.
+// The last platform error number of this process (errors.h). Set only by failures.
 int NLIBCErrGet();

@@ -24,9 +24,9 @@ int WfmLibUGIDSet(const char* session, const char* user);
 // WfmParseErrnoToError of the last platform error number.
 int WfmLibGetErr();
 
-// Maps a platform error number (see NLIBCErrGet) to a web API error code:
-// 0x0300 -> 407, 0x0600 -> 408, 0x1800 and 0x1D00 -> 405, 0x9A00 -> 418, anything else -> 401.
-// The paths name what the error is about and do not change the code; either may be null.
+// Maps a platform error number (see NLIBCErrGet) to the web API error code of errors.h that means
+// the same, kFailed where none does. The paths name what the error is about and do not change the
+// code; either may be null.
 int WfmParseErrnoToError(int error, const char* path, const char* other_path);
 
 // Splits a request parameter into a JSON array of strings. An array of strings is returned as it

@@ -4,6 +4,7 @@
 
 #include "api/codes.h"
 #include "api/log.h"
+#include "history/recording.h"
 #include "platform/system.h"
 #include "search/find_handler.h"
 #include "search/owned_list.h"
@@ -14,17 +15,17 @@ namespace {
 // The codes that a failed walk is reported with, by the platform's error number.
 int WalkErrorCode(int platform_error) {
   switch (platform_error) {
-    case 0x0300:
-      return kCodePermission;
-    case 0x0600:
-      return kCodeNoSuchFolder;
-    case 0x1800:
-    case 0x1D00:
-      return kCodeNoSuchAccount;
-    case 0x9A00:
-      return kCodeIllegalPath;
+    case platform_error::kPermission:
+      return web_code::kPermission;
+    case platform_error::kNoSuchFolder:
+      return web_code::kNoSuchFolder;
+    case platform_error::kNoSuchUser:
+    case platform_error::kNoSuchGroup:
+      return web_code::kNoSuchAccount;
+    case platform_error::kIllegal:
+      return web_code::kIllegal;
     default:
-      return kCodeFailed;
+      return web_code::kFailed;
   }
 }
 
@@ -49,3 +50,9 @@ bool ArboryFindHandler::WebFMFindAction(const std::vector<std::string>& folders,
          log_line::kWalkFailed, static_cast<unsigned>(NLIBCErrGet()));
   return false;
 }
+
+void ArboryFindHandler::SetSearchHistory(const Json::Value& criteria) {
+  RecordSearch(*request(), criteria);
+}
+
+void ArboryFindHandler::SetSearchCount() { CountSearch(*request()); }

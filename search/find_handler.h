@@ -1,7 +1,9 @@
 #pragma once
 // Handler of the API "NUVA.Arbory.Search". Starting a search forks a worker process that runs it;
 // listing, stopping and cleaning are later requests that find the search through its task record
-// (task_record.h). There are no threads; every fork happens here, in start and in the two cleans.
+// (platform/task_record.h). There are no threads. Processes are forked in start.cpp and
+// stop_clean.cpp, which say what each may touch and how it ends; WebFMFindAction and what it calls
+// run in the worker, all else in the process that serves the request, under the user's identity.
 
 #include <sys/types.h>
 
@@ -33,7 +35,9 @@ class ArboryFindHandler final : public FileWebAPI, private WebfmUserEnum {
   void Process() override;
 
   // The method handlers. Each answers through SetResponse or SetError; the truth value says
-  // whether a result was prepared.
+  // whether a result was prepared. Listing may wait for a minute, as may stopping for each search
+  // that has not got going; the others answer at once. The worker that starting forks does not
+  // return from here, nor do the children of the cleans, with the one exception told in start.cpp.
   bool WebFMFindHandler();
   bool WebFMFindRemainResultHandler();
   bool WebFMFindCancelHandler();
@@ -58,7 +62,8 @@ class ArboryFindHandler final : public FileWebAPI, private WebfmUserEnum {
   bool Recursive_Find(const std::vector<std::string>& paths,
                       const std::vector<FileSearch::FindComp*>& comps, Json::Value& options);
 
-  // Remember the search for the user. They report nothing, throw nothing and never stop a search.
+  // Remember the search for the user, see history/recording.h. They report nothing, throw nothing
+  // and never stop a search.
   void SetSearchHistory(const Json::Value& criteria);
   void SetSearchCount();
 
@@ -76,15 +81,18 @@ class ArboryFindHandler final : public FileWebAPI, private WebfmUserEnum {
   static void StringExplodeCB(std::string& piece, long context);
 
  private:
+  // Start, in the parent and in the worker.
   bool AnswerStart(pid_t worker, const Json::Value& locations);
   bool RunWorker(const Json::Value& locations);
   bool TakeSessionIdentity(const std::string& session);
   bool RecordOutcome(bool succeeded, Json::Value& result);
   bool WriteWalkRecord(FileSearch::WfmSearchWalker& walker);
+  // Listing; those that return false have set the error.
   bool AnswerPage(int additional, const std::string& task_id);
   bool WaitForDatabase(const std::string& task_id, Json::Value& task_data);
   _tag_dir_entry_type_ RequestedType() const;
   bool RequestedPage(unsigned long& offset, unsigned long& limit);
+  // Stopping and cleaning.
   Json::Value RequestedTaskIds() const;
   void CleanSearches(const Json::Value& ids, OKT::TaskMgr& tasks,
                      const FileSearch::WfmSearchDBTaskMgr& databases);

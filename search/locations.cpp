@@ -18,7 +18,7 @@ namespace {
 constexpr std::string_view kHome = "/home";
 constexpr std::string_view kHomes = "/homes";
 constexpr char kHomesFolder[] = "/homes/";
-constexpr size_t kHomePathBytes = 4096;
+constexpr size_t kHomePathBytes = 4096;  // of the longest path on this system
 
 // Whether `path` lies below `folder`.
 bool IsInside(std::string_view path, std::string_view folder) {

@@ -24,9 +24,10 @@ namespace {
 constexpr size_t kPathChars = 4096;
 constexpr char kHomesFolder[] = "/homes/";
 constexpr char kHomesShare[] = "homes";
-constexpr std::uint32_t kAllRows = 0x7FFFFFFF;
+constexpr std::uint32_t kAllRows = 0x7FFFFFFF;  // for a limit of 0: more than any result has
+// What the platform reserves them for.
 constexpr int kAclNoFd = -1;
-constexpr int kAclMode = 2;
+constexpr int kAclFlags = 2;
 
 // Paths on this system end there; what is longer is cut.
 std::string CutPath(std::string path) {
@@ -105,7 +106,7 @@ void FillAttributes(const FileSearch::__tag_FILE_INFO_DATA& row, int additional,
   if ((additional & kPerm) != 0) {
     file.mode = row.mode;
     file.acl_privilege = GetACLPrivilege(file.real_path.c_str());
-    file.acl_mode = NUVAACLIsSupport(file.real_path.c_str(), kAclNoFd, kAclMode) != 0;
+    file.acl_mode = NUVAACLIsSupport(file.real_path.c_str(), kAclNoFd, kAclFlags) != 0;
   }
 }
 

@@ -32,8 +32,12 @@ constexpr int kCleanBound = 60;
 // Every temporary search folder of the user, on whatever volume.
 constexpr char kRemoveCommand[] = "rm -rf /volume*/%s/%s";
 constexpr char kSearchFolder[] = "@tmp/webfm/FBSearch";
+// Room for a user's name as one shell word: some 360 bytes of it if each had to be escaped, and no
+// name is longer than 255. One that does not fit is not put into a command.
 constexpr size_t kEscapedNameBytes = 1477;
+// A command that was cut could remove another folder than the user's.
 constexpr size_t kCommandBytes = 5088;
+static_assert(kCommandBytes >= sizeof(kRemoveCommand) + sizeof(kSearchFolder) + kEscapedNameBytes);
 
 // Null for an id that names no task.
 OKT::Task* OpenTask(const OKT::TaskMgr& tasks, const Json::Value& id) {

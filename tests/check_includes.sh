@@ -9,7 +9,7 @@ set -eu
 rules='
 platform                 :
 api                      : platform
-history                  : api platform search
+history                  : api platform
 search                   : history api platform
 module                   : search history platform
 nas/base                 : platform <sqlite3.h>

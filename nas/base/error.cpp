@@ -65,22 +65,17 @@ int NLIBCErrGet() { return nas::g_last_error.load(std::memory_order_relaxed); }
 int WfmLibGetErr() { return WfmParseErrnoToError(NLIBCErrGet(), nullptr, nullptr); }
 
 int WfmParseErrnoToError(int error, const char* /*path*/, const char* /*other_path*/) {
-  constexpr int kCodePermission = 407;
-  constexpr int kCodeNoSuchFolder = 408;
-  constexpr int kCodeNoSuchAccount = 405;
-  constexpr int kCodeIllegal = 418;
-  constexpr int kCodeFailed = 401;
   switch (error) {
     case nas::kErrorPermission:
-      return kCodePermission;
+      return web_code::kPermission;
     case nas::kErrorNoSuchFolder:
-      return kCodeNoSuchFolder;
+      return web_code::kNoSuchFolder;
     case nas::kErrorUnknownUser:
     case nas::kErrorUnknownGroup:
-      return kCodeNoSuchAccount;
+      return web_code::kNoSuchAccount;
     case nas::kErrorIllegal:
-      return kCodeIllegal;
+      return web_code::kIllegal;
     default:
-      return kCodeFailed;
+      return web_code::kFailed;
   }
 }

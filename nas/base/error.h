@@ -9,19 +9,21 @@
 #include <utility>
 #include <variant>
 
+#include "platform/errors.h"
+
 namespace nas {
 
 enum PlatformError : int {
   kErrorNone = 0,
   kErrorOther = 0x0100,
   kErrorIo = 0x0200,
-  kErrorPermission = 0x0300,
+  kErrorPermission = platform_error::kPermission,
   kErrorNoSpace = 0x0400,
   kErrorDatabase = 0x0500,
-  kErrorNoSuchFolder = 0x0600,
-  kErrorUnknownUser = 0x1800,
-  kErrorUnknownGroup = 0x1D00,
-  kErrorIllegal = 0x9A00,
+  kErrorNoSuchFolder = platform_error::kNoSuchFolder,
+  kErrorUnknownUser = platform_error::kNoSuchUser,
+  kErrorUnknownGroup = platform_error::kNoSuchGroup,
+  kErrorIllegal = platform_error::kIllegal,
 };
 
 struct Error {

@@ -1,6 +1,4 @@
-// How a search worker remembers its search: in the user's history, and in the count of searches
-// among the user's personal settings. Remembering is a courtesy: whatever goes wrong here, the
-// search goes on.
+#include "history/recording.h"
 
 #include <syslog.h>
 
@@ -9,17 +7,16 @@
 #include "api/log.h"
 #include "history/history_store.h"
 #include "platform/json_file.h"
-#include "search/find_handler.h"
 
 namespace {
 
 constexpr char kSettingsFile[] = "/usersettings";
 constexpr char kSettingsKey[] = "NUVA.VTX.App.PersonalSettings.Instance";
 constexpr char kCountKey[] = "search_count";
-constexpr long kRecentSlots = 3;
+constexpr long kRecentSlots = 3;  // how far back a store that sorts by time looks
 
 // The old record is found by the request's pattern; the new one carries that of the criteria.
-void RecordSearch(const NUVA::APIRequest& request, const Json::Value& criteria) {
+void WriteRecord(const NUVA::APIRequest& request, const Json::Value& criteria) {
   NUVA::WEBFM::FileDB store(HistoryDBPath(request));
   const std::string pattern = request.GetParam("pattern", "").asString();
   if (!store.IsGood() || pattern.empty()) return;
@@ -33,9 +30,7 @@ void RecordSearch(const NUVA::APIRequest& request, const Json::Value& criteria) 
   store.UpdateLastByTime(record, kRecentSlots);
 }
 
-// Two searches started at once may count as one; a lock on the desktop's own file would not be
-// worth that.
-void CountSearch(const NUVA::APIRequest& request) {
+void AddToCount(const NUVA::APIRequest& request) {
   const std::string path = request.GetPreferenceDir() + kSettingsFile;
   Json::Value settings;
   if (!Json::fromFile(path, settings)) {
@@ -52,17 +47,17 @@ void CountSearch(const NUVA::APIRequest& request) {
 
 }  // namespace
 
-void ArboryFindHandler::SetSearchHistory(const Json::Value& criteria) {
+void RecordSearch(const NUVA::APIRequest& request, const Json::Value& criteria) {
   try {
-    RecordSearch(*request(), criteria);
+    WriteRecord(request, criteria);
   } catch (...) {
     // A parameter of a type that names no history.
   }
 }
 
-void ArboryFindHandler::SetSearchCount() {
+void CountSearch(const NUVA::APIRequest& request) {
   try {
-    CountSearch(*request());
+    AddToCount(request);
   } catch (...) {
     // Settings of another shape than ours are left as they are.
   }
