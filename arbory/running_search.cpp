@@ -64,13 +64,11 @@ RunningSearch ReadSearch(const std::string& user, const std::string& task_id) {
 
 std::vector<std::string> UnfinishedSearches(const std::string& user) {
   std::vector<std::string> unfinished;
-  try {
-    for (const std::string& id : nas::TaskFiles(user.c_str()).Ids()) {
-      const RunningSearch search = ReadSearch(user, id);
-      if (search.exists && !search.finished) unfinished.push_back(id);
-    }
-  } catch (const std::exception&) {
-    // A user who never searched has no tasks.
+  const auto tasks = nas::TaskFiles::Open(user.c_str());
+  if (!tasks) return unfinished;  // a user who never searched has no tasks
+  for (const std::string& id : tasks->Ids()) {
+    const RunningSearch search = ReadSearch(user, id);
+    if (search.exists && !search.finished) unfinished.push_back(id);
   }
   return unfinished;
 }

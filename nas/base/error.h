@@ -33,12 +33,14 @@ struct Error {
 
   // For logs and messages: "PATH: what errno means".
   std::string Text() const;
+  // The same failure, told of another path.
+  Error Of(std::string other_path) const { return {kind, error_number, std::move(other_path)}; }
 };
 
 PlatformError ErrorFromErrno(int error_number);
 // The failure of the system call just made; the kind follows from errno.
 Error ErrnoError(std::string path = {});
-Error ErrnoError(int error_number, std::string path);
+Error ErrnoError(int error_number, std::string path = {});
 
 // A value or the reason why there is none. Like std::optional to use: test it, then dereference.
 template <typename T>

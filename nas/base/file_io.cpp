@@ -15,26 +15,45 @@ namespace nas {
 namespace {
 
 constexpr size_t kReadBytes = size_t{64} << 10;
+constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
 
-bool IsReadable(const UniqueFd& fd, size_t max_bytes, size_t* size) {
+// The size of what may be read, or errno of why it may not.
+Result<size_t> ReadableSize(int fd, size_t max_bytes) {
   struct stat info;
-  if (fstat(fd.get(), &info) != 0) return false;
-  if (!S_ISREG(info.st_mode)) {
-    errno = S_ISDIR(info.st_mode) ? EISDIR : EINVAL;
-    return false;
-  }
-  *size = static_cast<size_t>(info.st_size);
-  if (*size > max_bytes) errno = EFBIG;
-  return *size <= max_bytes;
+  if (fstat(fd, &info) != 0) return ErrnoError();
+  if (!S_ISREG(info.st_mode)) return ErrnoError(S_ISDIR(info.st_mode) ? EISDIR : EINVAL);
+  const auto size = static_cast<size_t>(info.st_size);
+  if (size > max_bytes) return ErrnoError(EFBIG);
+  return size;
 }
 
-bool FillNew(int dir_fd, const char* name, std::string_view bytes, mode_t mode, bool durable) {
-  const UniqueFd fd(openat(dir_fd, name, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
-                           S_IRUSR | S_IWUSR));
-  if (!fd) return false;
-  if (!WriteAll(fd.get(), bytes)) return false;
-  if (mode != (S_IRUSR | S_IWUSR) && fchmod(fd.get(), mode) != 0) return false;
-  return !durable || fdatasync(fd.get()) == 0;
+Result<std::string> ReadToEnd(int fd, size_t max_bytes) {
+  const auto size = ReadableSize(fd, max_bytes);
+  if (!size) return size.error();
+  std::string content;
+  // One byte more than the size, so that the end is seen without another round.
+  size_t room = *size + 1;
+  for (;;) {
+    const size_t used = content.size();
+    content.resize(used + room);
+    const ssize_t count = Uninterrupted([&] { return read(fd, content.data() + used, room); });
+    if (count < 0) return ErrnoError();
+    content.resize(used + static_cast<size_t>(count));
+    if (count == 0) return content;
+    if (content.size() > max_bytes) return ErrnoError(EFBIG);
+    room = kReadBytes;
+  }
+}
+
+Status FillNew(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
+               bool durable) {
+  constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+  const UniqueFd fd(openat(dir_fd, name.c_str(), kFlags, kPrivateMode));
+  if (!fd) return ErrnoError();
+  if (Status written = WriteAll(fd.get(), bytes); !written) return written;
+  if (mode != kPrivateMode && fchmod(fd.get(), mode) != 0) return ErrnoError();
+  if (durable && fdatasync(fd.get()) != 0) return ErrnoError();
+  return {};
 }
 
 std::string NameBeside(std::string_view name) {
@@ -44,65 +63,44 @@ std::string NameBeside(std::string_view name) {
   return fresh + RandomName();
 }
 
-void RemoveQuietly(int dir_fd, const std::string& name) {
-  const int saved = errno;
-  unlinkat(dir_fd, name.c_str(), 0);
-  errno = saved;
-}
-
 }  // namespace
 
-bool WriteAll(int fd, std::string_view bytes) {
+Status WriteAll(int fd, std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = Uninterrupted([&] { return write(fd, bytes.data(), bytes.size()); });
-    if (count < 0) return false;
+    if (count < 0) return ErrnoError();
     bytes.remove_prefix(static_cast<size_t>(count));
   }
-  return true;
+  return {};
 }
 
-bool ReadWholeFile(int dir_fd, const char* name, size_t max_bytes, std::string* bytes) {
+Result<std::string> ReadWholeFile(int dir_fd, const std::string& name, size_t max_bytes) {
   // Not blocking: a named pipe in the file's place must not hold the process up.
-  const UniqueFd fd(openat(dir_fd, name, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-  size_t size = 0;
-  if (!fd || !IsReadable(fd, max_bytes, &size)) return false;
-  std::string content;
-  // One byte more than the size, so that the end is seen without another round.
-  size_t room = size + 1;
-  for (;;) {
-    const size_t used = content.size();
-    content.resize(used + room);
-    const ssize_t count =
-        Uninterrupted([&] { return read(fd.get(), content.data() + used, room); });
-    content.resize(used + static_cast<size_t>(std::max<ssize_t>(count, 0)));
-    if (count < 0) return false;
-    if (count == 0) break;
-    if (content.size() > max_bytes) {
-      errno = EFBIG;
-      return false;
-    }
-    room = kReadBytes;
-  }
-  *bytes = std::move(content);
-  return true;
+  constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
+  const UniqueFd fd(openat(dir_fd, name.c_str(), kFlags));
+  if (!fd) return ErrnoError(name);
+  auto content = ReadToEnd(fd.get(), max_bytes);
+  if (!content) return content.error().Of(name);
+  return content;
 }
 
-bool ReplaceFile(int dir_fd, const char* name, std::string_view bytes, mode_t mode, bool durable) {
+Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
+                   bool durable) {
   const std::string fresh = NameBeside(name);
-  if (FillNew(dir_fd, fresh.c_str(), bytes, mode, durable) &&
-      renameat(dir_fd, fresh.c_str(), dir_fd, name) == 0) {
-    return true;
-  }
-  RemoveQuietly(dir_fd, fresh);
-  return false;
+  Status done = FillNew(dir_fd, fresh, bytes, mode, durable);
+  if (done && renameat(dir_fd, fresh.c_str(), dir_fd, name.c_str()) != 0) done = ErrnoError();
+  if (done) return done;
+  unlinkat(dir_fd, fresh.c_str(), 0);
+  return done.error().Of(name);
 }
 
-bool CreateFile(int dir_fd, const char* name, std::string_view bytes, mode_t mode) {
+Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode) {
   const std::string fresh = NameBeside(name);
-  const bool made = FillNew(dir_fd, fresh.c_str(), bytes, mode, /*durable=*/false) &&
-                    linkat(dir_fd, fresh.c_str(), dir_fd, name, 0) == 0;
-  RemoveQuietly(dir_fd, fresh);
-  return made;
+  Status done = FillNew(dir_fd, fresh, bytes, mode, /*durable=*/false);
+  if (done && linkat(dir_fd, fresh.c_str(), dir_fd, name.c_str(), 0) != 0) done = ErrnoError();
+  unlinkat(dir_fd, fresh.c_str(), 0);
+  if (done) return done;
+  return done.error().Of(name);
 }
 
 }  // namespace nas

@@ -1,5 +1,8 @@
 #pragma once
-// Whole-file reading and atomic replacement; EINTR and short transfers are handled here.
+// Whole files: reading and atomic replacement. Short transfers and signals are dealt with here.
+//
+// `name` is relative to `dir_fd`, which may be AT_FDCWD, and stands in the error of a failure.
+// Callable from any thread; a descriptor given stays the caller's.
 
 #include <sys/types.h>
 
@@ -7,23 +10,27 @@
 #include <string>
 #include <string_view>
 
+#include "nas/base/error.h"
+
 namespace nas {
 
-// Writes all of it; false with errno set.
-bool WriteAll(int fd, std::string_view bytes);
+// Writes all of it, waiting where `fd` makes it wait. After a failure a part may have been written.
+Status WriteAll(int fd, std::string_view bytes);
 
-// Reads the regular file `name`, relative to `dir_fd` or AT_FDCWD. False with errno set: EISDIR for
-// a directory, EINVAL for another kind of file, EFBIG beyond `max_bytes`.
-bool ReadWholeFile(int dir_fd, const char* name, size_t max_bytes, std::string* bytes);
+// The content of a regular file. EISDIR for a directory, EINVAL for another kind of file (a named
+// pipe is not waited for), EFBIG for more than `max_bytes`.
+Result<std::string> ReadWholeFile(int dir_fd, const std::string& name, size_t max_bytes);
 
 // Puts a file with this content and mode in the place of `name`, at once: a reader finds the old
-// one or the new one, whole. The new content is first written to a file of another name beside it,
-// which a process killed meanwhile leaves behind (kTemporaryPrefix tells it). False with errno set
-// and the old file untouched. Not synced to the disk unless `durable`.
-bool ReplaceFile(int dir_fd, const char* name, std::string_view bytes, mode_t mode, bool durable);
+// one or the new one, whole; after a failure it is the old one. The new content is first written to
+// a file of another name beside it, which a process killed meanwhile leaves behind
+// (kTemporaryPrefix tells it). A symbolic link is replaced, not followed. Not synced to the disk
+// unless `durable`.
+Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
+                   bool durable);
 
 // The same for a file that must not exist yet: EEXIST where it does.
-bool CreateFile(int dir_fd, const char* name, std::string_view bytes, mode_t mode);
+Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode);
 
 inline constexpr std::string_view kTemporaryPrefix = ".arbory-new-";
 

@@ -19,11 +19,10 @@ constexpr mode_t kModeBits = 07777;
 }  // namespace
 
 bool fromFile(const std::string& path, Value& out) {
-  std::string text;
-  if (!nas::ReadWholeFile(AT_FDCWD, path.c_str(), kMaxFileBytes, &text)) return false;
-  if (nas::ParseJson(text, &out)) return true;
-  errno = EBADMSG;
-  return false;
+  const auto text = nas::ReadWholeFile(AT_FDCWD, path, kMaxFileBytes);
+  const bool good = text && nas::ParseJson(*text, &out);
+  if (!good) errno = text ? EBADMSG : text.error().error_number;
+  return good;
 }
 
 // Synced before it takes the old file's place: a settings file holds more than this system's
@@ -34,7 +33,9 @@ bool toFile(const std::string& path, const Value& value) {
   const mode_t mode = exists ? (info.st_mode & kModeBits) : kNewFileMode;
   std::string text = nas::JsonText(value, nas::JsonBytes::kRaw);
   text += '\n';
-  return nas::ReplaceFile(AT_FDCWD, path.c_str(), text, mode, /*durable=*/true);
+  const nas::Status replaced = nas::ReplaceFile(AT_FDCWD, path, text, mode, /*durable=*/true);
+  if (!replaced) errno = replaced.error().error_number;
+  return replaced.ok();
 }
 
 }  // namespace Json

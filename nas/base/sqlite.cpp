@@ -4,10 +4,41 @@
 
 namespace nas {
 
+namespace {
+
+constexpr int kPrimaryCode = 0xFF;  // the rest of an extended result code is detail
+
+int NearestErrno(sqlite3* db) {
+  switch (sqlite3_errcode(db) & kPrimaryCode) {
+    case SQLITE_NOTADB:
+    case SQLITE_CORRUPT:
+      return EBADMSG;
+    case SQLITE_BUSY:
+    case SQLITE_LOCKED:
+      return EBUSY;
+    case SQLITE_FULL:
+      return ENOSPC;
+    case SQLITE_READONLY:
+    case SQLITE_PERM:
+      return EACCES;
+    case SQLITE_NOMEM:
+      return ENOMEM;
+    default:
+      return sqlite3_system_errno(db) != 0 ? sqlite3_system_errno(db) : EIO;
+  }
+}
+
+// SQLite gives no handle only where there is no memory for one.
+Error ErrorOf(sqlite3* db, const std::string& what) {
+  const int error_number = db != nullptr ? NearestErrno(db) : ENOMEM;
+  return {error_number == ENOSPC ? kErrorNoSpace : kErrorDatabase, error_number, what};
+}
+
+}  // namespace
+
 SqliteError::SqliteError(sqlite3* db, const std::string& what)
     : std::runtime_error(what + ": " + (db != nullptr ? sqlite3_errmsg(db) : "out of memory")),
-      code_(db != nullptr ? sqlite3_errcode(db) & 0xff : SQLITE_NOMEM),
-      system_errno_(db != nullptr ? sqlite3_system_errno(db) : ENOMEM) {}
+      error_(ErrorOf(db, what)) {}
 
 Database::Database(const std::string& path, int flags, int busy_milliseconds) {
   if (sqlite3_open_v2(path.c_str(), &db_, flags | SQLITE_OPEN_NOMUTEX, nullptr) != SQLITE_OK) {
@@ -41,11 +72,6 @@ Statement& Statement::Bind(int index, std::int64_t value) {
 
 Statement& Statement::BindBlob(int index, std::string_view bytes) {
   sqlite3_bind_blob64(statement_, index, bytes.data(), bytes.size(), SQLITE_STATIC);
-  return *this;
-}
-
-Statement& Statement::BindText(int index, std::string_view text) {
-  sqlite3_bind_text64(statement_, index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
   return *this;
 }
 

@@ -1,6 +1,8 @@
 #pragma once
-// Owners of SQLite handles and statements, and errors as exceptions. A handle belongs to the
-// process that opened it: never keep one across a fork.
+// Owners of SQLite handles and statements. Failures are exceptions here, as a database can fail at
+// every row; whoever runs the work catches SqliteError once and goes on with its error(). A handle
+// belongs to the process that opened it: never keep one across a fork. None may be used by two
+// threads at once.
 
 #include <sqlite3.h>
 
@@ -10,18 +12,20 @@
 #include <string_view>
 #include <utility>
 
+#include "nas/base/error.h"
+
 namespace nas {
 
+// What these classes throw. what() is for logs: the statement or path, and SQLite's own words.
 class SqliteError : public std::runtime_error {
  public:
   SqliteError(sqlite3* db, const std::string& what);
-  // SQLite's primary result code, and errno of the system call that failed (0 when none did).
-  int code() const { return code_; }
-  int system_errno() const { return system_errno_; }
+  // For whoever catches it: kErrorNoSpace or kErrorDatabase, and the errno that is nearest, such as
+  // EBADMSG for a file that is no database and EBUSY for one that stays locked.
+  const Error& error() const { return error_; }
 
  private:
-  int code_;
-  int system_errno_;
+  Error error_;
 };
 
 class Database {
@@ -33,7 +37,7 @@ class Database {
   Database(Database&& other) noexcept : db_(std::exchange(other.db_, nullptr)) {}
   Database& operator=(Database&&) = delete;
 
-  // Runs statements that yield no rows and take no values. Throws SqliteError.
+  // Runs statements, separated by ";", that yield no rows and take no values. Throws SqliteError.
   void Execute(const char* sql);
   // Of a file in WAL mode, for whoever has written much and is about to close it: closing would
   // empty the log as well, but keep everybody else from opening the file meanwhile. What cannot be
@@ -45,9 +49,11 @@ class Database {
   sqlite3* db_ = nullptr;
 };
 
-// A prepared statement. Bound texts and blobs must stay alive until the next Step or Reset.
+// A prepared statement of a database that outlives it. Values and columns are numbered as SQLite
+// does: values from 1, columns from 0. A bound blob must stay alive until Reset.
 class Statement {
  public:
+  // Throws SqliteError.
   Statement(const Database& db, const char* sql);
   ~Statement() { sqlite3_finalize(statement_); }
   Statement(const Statement&) = delete;
@@ -55,11 +61,11 @@ class Statement {
 
   Statement& Bind(int index, std::int64_t value);
   Statement& BindBlob(int index, std::string_view bytes);
-  Statement& BindText(int index, std::string_view text);
   // True while there is a row. Throws SqliteError; the statement is then reset.
   bool Step();
-  // Runs to the end and makes ready for the next values.
+  // Runs to the end and makes ready for the next values. Throws SqliteError.
   void Run();
+  // Forgets rows and values.
   void Reset();
 
   std::int64_t Integer(int column) const { return sqlite3_column_int64(statement_, column); }
@@ -71,10 +77,13 @@ class Statement {
   sqlite3_stmt* statement_ = nullptr;
 };
 
-// Rolls back on destruction unless committed.
+// Rolls back on destruction unless committed. The database must outlive it.
 class Transaction {
  public:
+  // A writer takes the database's one write lock at once, so that it cannot fail half-way for
+  // another writer; a reader sees the database as it is at its first row.
   enum class Kind { kRead, kWrite };
+  // Both throw SqliteError.
   Transaction(Database& db, Kind kind);
   ~Transaction();
   Transaction(const Transaction&) = delete;

@@ -58,26 +58,6 @@ bool CreatePrivately(const std::string& path) {
   return fd || errno == EEXIST;
 }
 
-int ErrnoOf(const nas::SqliteError& error) {
-  switch (error.code()) {
-    case SQLITE_NOTADB:
-    case SQLITE_CORRUPT:
-      return EBADMSG;
-    case SQLITE_BUSY:
-    case SQLITE_LOCKED:
-      return EBUSY;
-    case SQLITE_FULL:
-      return ENOSPC;
-    case SQLITE_READONLY:
-    case SQLITE_PERM:
-      return EACCES;
-    case SQLITE_NOMEM:
-      return ENOMEM;
-    default:
-      return error.system_errno() != 0 ? error.system_errno() : EIO;
-  }
-}
-
 }  // namespace
 
 class FileDB::Store {
@@ -156,7 +136,7 @@ class FileDB::Store {
     try {
       work();
     } catch (const nas::SqliteError& error) {
-      Fail(ErrnoOf(error));
+      Fail(error.error().error_number);
     }
   }
 

@@ -60,7 +60,7 @@ void SetErrorFromException() {
     throw;
   } catch (const nas::SqliteError& error) {
     syslog(LOG_ERR, "search: %s", error.what());
-    nas::SetLastError(error.code() == SQLITE_FULL ? nas::kErrorNoSpace : nas::kErrorDatabase);
+    nas::SetLastError(error.error().kind);
   } catch (const std::system_error& error) {
     syslog(LOG_ERR, "search: %s", error.what());
     nas::SetLastError(nas::ErrorFromErrno(error.code().value()));
@@ -91,7 +91,7 @@ pid_t StartSorting(const std::string& path) {
   if (nice(kSortingNiceness) == -1) errno = 0;
   // Where memory runs out, this is what the machine can best do without.
   if (const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC)); score) {
-    nas::WriteAll(score.get(), "1000");
+    (void)nas::WriteAll(score.get(), "1000");
   }
   try {
     nas::ResultReader(path).KeepAllOrderings();

@@ -14,9 +14,7 @@
 #include <unistd.h>
 
 #include <toml++/toml.h>
-#include <cerrno>
 #include <cstdlib>
-#include <cstring>
 #include <functional>
 #include <map>
 
@@ -74,11 +72,9 @@ class Reader {
   explicit Reader(const std::string& file) : file_(file) {}
 
   void Read(Config* config) {
-    std::string text;
-    if (!ReadWholeFile(AT_FDCWD, file_.c_str(), kMaxFileBytes, &text)) {
-      throw ConfigError(file_ + ": " + std::strerror(errno));
-    }
-    const toml::table document = Parse(text);
+    const auto text = ReadWholeFile(AT_FDCWD, file_, kMaxFileBytes);
+    if (!text) throw ConfigError(text.error().Text());
+    const toml::table document = Parse(*text);
     const Keys keys = {
         {"state_dir", [&](const toml::node& node) { config->state_dir = Path(node); }},
         {"module", [&](const toml::node& node) { config->module = Path(node); }},

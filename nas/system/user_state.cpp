@@ -89,10 +89,9 @@ Status MakeFoldersOf(const Account& account, uid_t maker) {
   if (!tasks) return tasks.error();
   const Result<UniqueFd> preference = OpenOrMakeFolder(folder->get(), kPreference, kPrivateMode);
   if (!preference) return preference.error();
-  if (CreateFile(preference->get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR) || errno == EEXIST) {
-    return {};
-  }
-  return ErrnoError(kUserSettings);
+  const Status made = CreateFile(preference->get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR);
+  if (!made && made.error().error_number != EEXIST) return made.error();
+  return {};
 }
 
 }  // namespace

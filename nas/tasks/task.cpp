@@ -9,13 +9,26 @@
 #include "nas/tasks/task_files.h"
 
 namespace OKT {
+namespace {
+
+// Where failures become the exceptions that this interface has.
+template <typename T>
+T OrThrow(nas::Result<T> result) {
+  if (result) return std::move(*result);
+  nas::Report(result.error());
+  throw std::runtime_error(result.error().Text());
+}
+
+}  // namespace
 
 // Guard: every member below `mutex` is used with it held.
 class Task::Record {
  public:
-  Record(const char* owner, const char* id) : files_(owner) {
+  Record(const char* owner, const char* id) : files_(OrThrow(nas::TaskFiles::Open(owner))) {
     if (id == nullptr) {
-      id_ = files_.Create(&life_);
+      auto task = OrThrow(files_.Create());
+      id_ = std::move(task.id);
+      life_ = std::move(task.life);
       return;
     }
     if (!nas::IsRandomName(id)) throw std::runtime_error("not a task id");
@@ -28,9 +41,9 @@ class Task::Record {
   // Life first: a task found dead can no longer change, so what is read after that is complete.
   bool Read() {
     const bool alive = files_.IsAlive(id_);
-    nas::TaskState state;
-    if (!files_.Load(id_, &state)) return false;
-    Take(std::move(state));
+    auto state = files_.Load(id_);
+    if (!state) return false;
+    Take(std::move(*state));
     finished_ = finished_ || !alive;
     return true;
   }
@@ -39,13 +52,14 @@ class Task::Record {
     std::map<std::string, Json::Value> changes;
     changes.swap(pending);
     in_batch = false;
-    const nas::UniqueFd lock = files_.LockForWriting(id_);
-    nas::TaskState state;
-    if (!lock || !files_.Load(id_, &state)) return false;
-    for (auto& [name, value] : changes) state.properties[name].swap(value);
-    state.finished = state.finished || finish;
-    if (!files_.Store(id_, state)) return false;
-    Take(std::move(state));
+    const auto lock = files_.LockForWriting(id_);
+    if (!lock) return false;
+    auto state = files_.Load(id_);
+    if (!state) return false;
+    for (auto& [name, value] : changes) state->properties[name].swap(value);
+    state->finished = state->finished || finish;
+    if (!files_.Store(id_, *state)) return false;
+    Take(std::move(*state));
     return true;
   }
 
@@ -55,7 +69,7 @@ class Task::Record {
   }
 
   bool finished() const { return finished_; }
-  bool Remove() { return files_.Remove(id_); }
+  bool Remove() { return files_.Remove(id_).ok(); }
 
   mutable std::mutex mutex;
   bool in_batch = false;

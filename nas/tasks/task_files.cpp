@@ -5,12 +5,8 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstring>
-#include <ctime>
-#include <stdexcept>
 #include <string_view>
 
-#include "nas/base/error.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
 #include "nas/base/paths.h"
@@ -29,15 +25,17 @@ constexpr off_t kFolderByte = 0;
 constexpr char kFolderLock[] = "lock";
 constexpr std::string_view kRecordSuffix = ".json";
 constexpr std::string_view kLockSuffix = ".lock";
-constexpr int kRecordVersion = 1;
 constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
 // A record holds a request's parameters and little more.
 constexpr size_t kMaxRecordBytes = size_t{16} << 20;
 // Kept in the lock file for the day the disk is full: a search that ends for want of space must
 // still be able to say so. Two blocks, as a directory may need one besides the record.
 constexpr off_t kReserveBytes = 8 * 1024;
-// A lock is held for the time of one small write; a holder that is stopped must not stop others.
-constexpr int kLockTenths = 50;
+
+constexpr int kRecordVersion = 1;
+constexpr char kVersion[] = "version";
+constexpr char kFinished[] = "finished";
+constexpr char kProperties[] = "properties";
 
 std::string RecordName(const std::string& id) { return id + std::string(kRecordSuffix); }
 std::string LockName(const std::string& id) { return id + std::string(kLockSuffix); }
@@ -46,8 +44,7 @@ std::string LockName(const std::string& id) { return id + std::string(kLockSuffi
 std::string IdOf(std::string_view name, std::string_view suffix) {
   if (!name.ends_with(suffix)) return {};
   name.remove_suffix(suffix.size());
-  std::string id(name);
-  return IsRandomName(id) ? id : std::string();
+  return IsRandomName(name) ? std::string(name) : std::string();
 }
 
 struct flock WriteLockOn(off_t byte) {
@@ -59,52 +56,61 @@ struct flock WriteLockOn(off_t byte) {
   return lock;
 }
 
-bool TakeLock(int fd, off_t byte) {
+Status TakeLock(int fd, off_t byte) {
   GrowingPause pause(kLockTenths);
   for (;;) {
     struct flock lock = WriteLockOn(byte);
-    if (fcntl(fd, F_OFD_SETLK, &lock) == 0) return true;
-    if (errno != EAGAIN && errno != EACCES && errno != EINTR) return false;
-    if (!pause.Wait()) {
-      errno = EBUSY;
-      return false;
-    }
+    if (fcntl(fd, F_OFD_SETLK, &lock) == 0) return {};
+    if (errno != EAGAIN && errno != EACCES && errno != EINTR) return ErrnoError();
+    if (!pause.Wait()) return ErrnoError(EBUSY);
   }
 }
 
-[[noreturn]] void Throw(const std::string& what, int error_number) {
-  SetLastError(ErrorFromErrno(error_number));
-  throw std::runtime_error(what + ": " + std::strerror(error_number));
+std::string TextOf(const TaskState& state) {
+  Json::Value record(Json::objectValue);
+  record[kVersion] = kRecordVersion;
+  record[kFinished] = state.finished;
+  record[kProperties] = state.properties;
+  return JsonText(record, JsonBytes::kRaw);
 }
 
 }  // namespace
 
-TaskFiles::TaskFiles(const char* owner) {
-  if (owner == nullptr || !IsUserName(owner)) Throw("no such task owner", EINVAL);
-  folder_ =
-      UniqueFd(open(TaskFolder(owner).c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-  if (!folder_) Throw("the task folder cannot be opened", errno);
+Result<TaskFiles> TaskFiles::Open(const char* owner) {
+  if (owner == nullptr || !IsUserName(owner)) return ErrnoError(EINVAL, "no such task owner");
+  const std::string path = TaskFolder(owner);
+  UniqueFd folder(open(path.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  if (!folder) return ErrnoError(path);
+  return TaskFiles(std::move(folder));
 }
 
-std::string TaskFiles::Create(UniqueFd* life) const {
-  const int flags = O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC;
-  const UniqueFd guard(openat(folder_.get(), kFolderLock, flags, kPrivateMode));
-  if (!guard || !TakeLock(guard.get(), kFolderByte)) Throw("the task folder is locked", errno);
-  if (CountRunningAndSweep() >= CurrentConfig().searches_per_user)
-    Throw("too many running tasks", EAGAIN);
+UniqueFd TaskFiles::OpenLock(const std::string& id, int flags) const {
+  return UniqueFd(openat(folder_.get(), LockName(id).c_str(),
+                         O_RDWR | O_NOFOLLOW | O_CLOEXEC | flags, kPrivateMode));
+}
 
-  std::string id = RandomName();
-  UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), flags | O_EXCL, kPrivateMode));
-  if (!fd) Throw("a task cannot be made", errno);
-  if (!TakeLock(fd.get(), kLifeByte) || !Store(id, TaskState())) {
-    const int cause = errno;
-    unlinkat(folder_.get(), LockName(id).c_str(), 0);
-    Throw("a task cannot be stored", cause);
+Result<TaskFiles::NewTask> TaskFiles::Create() const {
+  constexpr int kFlags = O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC;
+  const UniqueFd guard(openat(folder_.get(), kFolderLock, kFlags, kPrivateMode));
+  if (!guard) return ErrnoError(kFolderLock);
+  if (const Status locked = TakeLock(guard.get(), kFolderByte); !locked) {
+    return locked.error().Of(kFolderLock);
   }
-  // Without it the task is no worse than with it used up.
-  if (fallocate(fd.get(), 0, 0, kReserveBytes) != 0) errno = 0;
-  *life = std::move(fd);
-  return id;
+  if (CountRunningAndSweep() >= CurrentConfig().searches_per_user) {
+    return ErrnoError(EAGAIN, "too many running tasks");
+  }
+  NewTask task{RandomName(), {}};
+  task.life = OpenLock(task.id, O_CREAT | O_EXCL);
+  if (!task.life) return ErrnoError(LockName(task.id));
+  Status stored = TakeLock(task.life.get(), kLifeByte);
+  if (stored) stored = Store(task.id, TaskState());
+  if (!stored) {
+    unlinkat(folder_.get(), LockName(task.id).c_str(), 0);
+    return stored.error();
+  }
+  // A task without a reserve is no worse than one that has used it up.
+  (void)fallocate(task.life.get(), 0, 0, kReserveBytes);
+  return task;
 }
 
 std::vector<std::string> TaskFiles::Ids() const {
@@ -117,63 +123,60 @@ std::vector<std::string> TaskFiles::Ids() const {
 }
 
 bool TaskFiles::IsAlive(const std::string& id) const {
-  const UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
+  const UniqueFd fd = OpenLock(id, 0);
   if (!fd) return false;
   struct flock lock = WriteLockOn(kLifeByte);
   return fcntl(fd.get(), F_OFD_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
 }
 
-bool TaskFiles::Load(const std::string& id, TaskState* state) const {
-  std::string text;
-  if (!ReadWholeFile(folder_.get(), RecordName(id).c_str(), kMaxRecordBytes, &text)) return false;
+Result<TaskState> TaskFiles::Load(const std::string& id) const {
+  const auto text = ReadWholeFile(folder_.get(), RecordName(id), kMaxRecordBytes);
+  if (!text) return text.error();
   Json::Value record;
-  if (!ParseJson(text, &record) || !record.isObject() || record["version"] != kRecordVersion ||
-      !record["finished"].isBool() || !record["properties"].isObject()) {
-    errno = EBADMSG;
-    return false;
+  if (!ParseJson(*text, &record) || !record.isObject() || record[kVersion] != kRecordVersion ||
+      !record[kFinished].isBool() || !record[kProperties].isObject()) {
+    return ErrnoError(EBADMSG, RecordName(id));
   }
-  state->finished = record["finished"].asBool();
-  state->properties.swap(record["properties"]);
-  return true;
+  TaskState state;
+  state.finished = record[kFinished].asBool();
+  state.properties.swap(record[kProperties]);
+  return state;
 }
 
-UniqueFd TaskFiles::LockForWriting(const std::string& id) const {
-  UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
-  if (fd && !TakeLock(fd.get(), kWriteByte)) return {};
+Result<UniqueFd> TaskFiles::LockForWriting(const std::string& id) const {
+  UniqueFd fd = OpenLock(id, 0);
+  if (!fd) return ErrnoError(LockName(id));
+  if (const Status locked = TakeLock(fd.get(), kWriteByte); !locked) {
+    return locked.error().Of(LockName(id));
+  }
   return fd;
 }
 
-bool TaskFiles::Store(const std::string& id, const TaskState& state) const {
-  Json::Value record(Json::objectValue);
-  record["version"] = kRecordVersion;
-  record["finished"] = state.finished;
-  record["properties"] = state.properties;
-  const std::string text = JsonText(record, JsonBytes::kRaw);
-  if (text.size() > kMaxRecordBytes) {
-    errno = EFBIG;
-    return false;
-  }
+Status TaskFiles::Store(const std::string& id, const TaskState& state) const {
+  const std::string text = TextOf(state);
+  if (text.size() > kMaxRecordBytes) return ErrnoError(EFBIG, RecordName(id));
   const auto replace = [&] {
-    return ReplaceFile(folder_.get(), RecordName(id).c_str(), text, kPrivateMode,
-                       /*durable=*/false);
+    return ReplaceFile(folder_.get(), RecordName(id), text, kPrivateMode, /*durable=*/false);
   };
-  if (replace()) return true;
-  return (errno == ENOSPC || errno == EDQUOT) && FreeReserve(id) && replace();
+  const Status stored = replace();
+  const bool full = !stored && stored.error().kind == kErrorNoSpace;
+  return full && FreeReserve(id) ? replace() : stored;
 }
 
 bool TaskFiles::FreeReserve(const std::string& id) const {
-  const UniqueFd fd(openat(folder_.get(), LockName(id).c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC));
+  const UniqueFd fd = OpenLock(id, 0);
   return fd && ftruncate(fd.get(), 0) == 0;
 }
 
 // The record goes first: a writer that gets the lock of a file already gone finds no record.
-bool TaskFiles::Remove(const std::string& id) const {
-  const UniqueFd lock = LockForWriting(id);
-  if (!lock) return false;
-  const bool removed = unlinkat(folder_.get(), RecordName(id).c_str(), 0) == 0;
-  const int cause = errno;
-  if (removed || cause == ENOENT) unlinkat(folder_.get(), LockName(id).c_str(), 0);
-  errno = cause;
+Status TaskFiles::Remove(const std::string& id) const {
+  const auto lock = LockForWriting(id);
+  if (!lock) return lock.error();
+  Status removed;
+  if (unlinkat(folder_.get(), RecordName(id).c_str(), 0) != 0) removed = ErrnoError(RecordName(id));
+  if (removed || removed.error().error_number == ENOENT) {
+    unlinkat(folder_.get(), LockName(id).c_str(), 0);
+  }
   return removed;
 }
 
@@ -183,6 +186,13 @@ bool TaskFiles::IsUntouched(const std::string& name, time_t now) const {
          now - info.st_mtime > kKeepSeconds;
 }
 
+// Of what has no lock file: a record whose task was never removed, or a temporary file.
+void TaskFiles::SweepRecord(const std::string& name, time_t now) const {
+  const std::string id = IdOf(name, kRecordSuffix);
+  const bool ours = name.starts_with(kTemporaryPrefix) || !id.empty();
+  if (ours && IsUntouched(name, now) && !IsAlive(id)) unlinkat(folder_.get(), name.c_str(), 0);
+}
+
 int TaskFiles::CountRunningAndSweep() const {
   int running = 0;
   const time_t now = time(nullptr);
@@ -190,17 +200,12 @@ int TaskFiles::CountRunningAndSweep() const {
     // Each task has a lock file from its first moment to its last.
     const std::string id = IdOf(name, kLockSuffix);
     if (id.empty()) {
-      const bool ours = name.starts_with(kTemporaryPrefix) || !IdOf(name, kRecordSuffix).empty();
-      if (ours && IsUntouched(name, now) && !IsAlive(IdOf(name, kRecordSuffix))) {
-        unlinkat(folder_.get(), name.c_str(), 0);
-      }
-      continue;
-    }
-    TaskState state;
-    if (IsAlive(id)) {
-      if (Load(id, &state) && !state.finished) ++running;
-    } else if (IsUntouched(name, now) && (IsUntouched(RecordName(id), now) || !Load(id, &state))) {
-      Remove(id);
+      SweepRecord(name, now);
+    } else if (IsAlive(id)) {
+      const auto state = Load(id);
+      if (state && !state->finished) ++running;
+    } else if (IsUntouched(name, now) && (IsUntouched(RecordName(id), now) || !Load(id))) {
+      (void)Remove(id);
     }
   }
   return running;

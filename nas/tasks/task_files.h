@@ -1,13 +1,11 @@
 #pragma once
 // Task records on disk. The one owner of their names and locks.
 //
-// In the owner's task folder (0700, user_state.h), for a task ID
-// (random_name.h):
+// In the owner's task folder (0700, user_state.h), for a task ID (random_name.h):
 //
 //   ID.json   {"version":1,"finished":BOOL,"properties":{...}}, replaced as a whole by rename
 //   ID.lock   for locks on two of its bytes, and as a reserve of space that is given up when the
-//   disk
-//             is full:
+//             disk is full:
 //             byte 0, life: held by the process that made the task and by what it forked, as they
 //                     share one open file description. Nobody holds it: nobody works on the task.
 //             byte 1, write: held for each read-merge-write of ID.json
@@ -22,9 +20,11 @@
 
 #include <json/value.h>
 
+#include <ctime>
 #include <string>
 #include <vector>
 
+#include "nas/base/error.h"
 #include "nas/base/unique_fd.h"
 
 namespace nas {
@@ -34,40 +34,53 @@ struct TaskState {
   Json::Value properties{Json::objectValue};
 };
 
+// The tasks of one owner. Every operation works on the disk alone, so several processes and threads
+// may use objects of the same owner at once. Ids must be of the form of random_name.h: they become
+// parts of paths.
 class TaskFiles {
  public:
-  // Throws std::runtime_error when the owner cannot be one or has no task folder.
-  explicit TaskFiles(const char* owner);
+  // EINVAL for an owner (null too) that cannot be one; ENOENT where there is no task folder.
+  static Result<TaskFiles> Open(const char* owner);
 
-  // Makes a task with an empty record. `life` receives the descriptor that keeps it alive. Throws
-  // std::runtime_error when the owner has as many running tasks as the
-  // configuration allows or it cannot be stored.
-  std::string Create(UniqueFd* life) const;
+  struct NewTask {
+    std::string id;
+    UniqueFd life;  // keeps the task alive while it, or what a fork inherited of it, is open
+  };
+  // Makes a task with an empty record, and removes those that are stale. EAGAIN when the owner has
+  // as many running tasks as the configuration allows, EBUSY when another process holds the lock
+  // for longer than kLockTenths.
+  Result<NewTask> Create() const;
 
   // Of the owner's tasks, running and finished, in no order; none where the folder cannot be read.
   std::vector<std::string> Ids() const;
 
   // Whether some process still works on the task.
   bool IsAlive(const std::string& id) const;
-  // False, with errno set and `state` untouched, when there is no readable record.
-  bool Load(const std::string& id, TaskState* state) const;
+  // ENOENT without a record, EBADMSG for one that is not readable.
+  Result<TaskState> Load(const std::string& id) const;
 
-  // The write lock; empty, with errno set, when the task is gone or the lock stays taken.
-  UniqueFd LockForWriting(const std::string& id) const;
-  // To be called with the write lock held. False with errno set; the old record is then whole.
-  bool Store(const std::string& id, const TaskState& state) const;
-  // Gives the task's reserve of space back to the disk.
-  bool FreeReserve(const std::string& id) const;
-  // Takes the write lock itself. False when there was no task or it could not be deleted.
-  bool Remove(const std::string& id) const;
+  // The write lock, held while the descriptor is open. ENOENT when the task is gone, EBUSY when the
+  // lock stays taken.
+  Result<UniqueFd> LockForWriting(const std::string& id) const;
+  // To be called with the write lock held. After a failure the old record is whole. EFBIG beyond
+  // what Load takes; where the disk is full, the task's reserve of space is used up first.
+  Status Store(const std::string& id, const TaskState& state) const;
+  // Takes the write lock itself. ENOENT when there was no task.
+  Status Remove(const std::string& id) const;
 
  private:
+  explicit TaskFiles(UniqueFd folder) : folder_(std::move(folder)) {}
+  UniqueFd OpenLock(const std::string& id, int flags) const;
+  bool FreeReserve(const std::string& id) const;
   int CountRunningAndSweep() const;
+  void SweepRecord(const std::string& name, time_t now) const;
   bool IsUntouched(const std::string& name, time_t now) const;
 
   UniqueFd folder_;
 };
 
+// A lock is held for the time of one small write; a holder that is stopped must not stop others.
+inline constexpr int kLockTenths = 50;
 // Tasks of clients that never cleaned up go after this long.
 inline constexpr long kKeepSeconds = 24L * 60 * 60;
 

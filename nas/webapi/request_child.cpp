@@ -94,7 +94,7 @@ void SendFrame(int fd, const std::string& payload) {
   const std::uint64_t length = payload.size();
   const std::string_view header(reinterpret_cast<const char*>(&length), sizeof length);
   // Nobody is left to be told of a failure here: the caller has gone.
-  if (WriteAll(fd, header)) WriteAll(fd, payload);
+  if (WriteAll(fd, header)) (void)WriteAll(fd, payload);
 }
 
 std::string Serve(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {

@@ -64,8 +64,9 @@ HttpReply PageReply(const std::string& folder, const std::vector<std::string>& p
   const bool known =
       path.size() <= 1 + (is_asset ? 1U : 0U) && std::all_of(path.begin(), path.end(), IsPageFile);
   HttpReply reply;
-  if (!known ||
-      !nas::ReadWholeFile(AT_FDCWD, (folder + "/" + file).c_str(), kMaxFileBytes, &reply.body)) {
+  auto content = known ? nas::ReadWholeFile(AT_FDCWD, folder + "/" + file, kMaxFileBytes)
+                       : nas::ErrnoError(ENOENT, file);
+  if (!content) {
     if (!path.empty()) return ErrorReply(kNotFound, "There is nothing here; open / for the page.");
     reply.body = "The page has not been built. Build it with scripts/build-page, then reload.\n";
     reply.status = kNotFound;
@@ -73,6 +74,7 @@ HttpReply PageReply(const std::string& folder, const std::vector<std::string>& p
     return reply;
   }
   reply.status = kOk;
+  reply.body = std::move(*content);
   reply.fields = {{"Content-Type", TypeOf(file)},
                   {"Content-Security-Policy", kPolicy},
                   {"Cross-Origin-Opener-Policy", "same-origin"},

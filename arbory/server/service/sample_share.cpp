@@ -3,8 +3,6 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
-#include <cerrno>
-#include <cstring>
 #include <stdexcept>
 #include <string_view>
 
@@ -43,15 +41,17 @@ const SampleFile kFiles[] = {
     {"Code/notes.json", "{\"todo\": [\"index the attic\", \"find the tea budget\"]}\n"},
 };
 
-[[noreturn]] void Fail(const std::string& path) {
-  throw std::runtime_error("cannot make the sample share: " + path + ": " + std::strerror(errno));
+[[noreturn]] void Fail(const nas::Error& error) {
+  throw std::runtime_error("cannot make the sample share: " + error.Text());
 }
 
 void Put(const std::string& root, const SampleFile& file) {
   const std::string path = root + "/" + file.path;
   const std::string folder = path.substr(0, path.rfind('/'));
-  if (!nas::MakeFolders(folder, kFolderMode)) Fail(folder);
-  if (!nas::CreateFile(AT_FDCWD, path.c_str(), file.content, kFileMode)) Fail(path);
+  if (!nas::MakeFolders(folder, kFolderMode)) Fail(nas::ErrnoError(folder));
+  if (const auto made = nas::CreateFile(AT_FDCWD, path, file.content, kFileMode); !made) {
+    Fail(made.error());
+  }
 }
 
 }  // namespace
@@ -65,7 +65,7 @@ std::string MakeSampleShare(const std::string& state_dir) {
   const std::string fresh =
       state_dir + "/" + std::string(nas::kTemporaryPrefix) + kSampleShare + nas::RandomName();
   for (const SampleFile& file : kFiles) Put(fresh, file);
-  if (rename(fresh.c_str(), root.c_str()) != 0) Fail(root);
+  if (rename(fresh.c_str(), root.c_str()) != 0) Fail(nas::ErrnoError(root));
   return root;
 }
 

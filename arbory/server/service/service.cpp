@@ -118,7 +118,7 @@ Service::Service(Setup setup, const nas::Module& module)
 void Service::Finished(const HttpRequest& request, int status, std::uint64_t bytes) {
   metrics_.CountReply(status, bytes);
   if (setup_.settings.access_log) {
-    nas::WriteAll(STDERR_FILENO, AccessLine(request, status, bytes));
+    (void)nas::WriteAll(STDERR_FILENO, AccessLine(request, status, bytes));
   }
 }
 

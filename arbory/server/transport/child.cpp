@@ -79,11 +79,11 @@ bool SendHead(int pipe, const ChildHead& head, std::uint64_t body_bytes) {
   const std::string text = HeadText(head);
   const std::uint64_t length = text.size() + body_bytes;
   std::string bytes(reinterpret_cast<const char*>(&length), sizeof length);
-  return nas::WriteAll(pipe, bytes + text);
+  return nas::WriteAll(pipe, bytes + text).ok();
 }
 
 bool SendReply(int pipe, const ChildHead& head, std::string_view body) {
-  return SendHead(pipe, head, body.size()) && nas::WriteAll(pipe, body);
+  return SendHead(pipe, head, body.size()) && nas::WriteAll(pipe, body).ok();
 }
 
 HeadReader::State HeadReader::Feed(std::string_view bytes) {
