@@ -67,6 +67,10 @@ TEST_F(DescriptionTest, TheServerAnswersWhatItDescribes) {
       const Reply known =
           method == "POST" ? server_.Post(target, "{}") : server_.Ask(method, target);
       EXPECT_EQ(known.status, 200) << shown;
+      const std::string type = known.fields.at("content-type");
+      EXPECT_TRUE(
+          paths[path][verb]["responses"]["200"]["content"].isMember(type.substr(0, type.find(';'))))
+          << shown << " " << type;
     }
   }
   EXPECT_EQ(server_.Post("/logout", "{}").status, 200);

@@ -52,7 +52,7 @@ Entrance::Rules RulesOf(const Service::Setup& setup) {
 std::span<const Route> Service::Routes() {
   constexpr auto kGet = RouteMethod::kGet;
   constexpr auto kPost = RouteMethod::kPost;
-  constexpr char kJson[] = "application/json";
+  static constexpr char kJson[] = "application/json";
   using Self = Service&;
   using Request = HttpRequest*;
   using Path = const RequestPath&;
