@@ -26,9 +26,12 @@ Criteria::Criteria(const std::vector<FileSearch::FindComp*>& comps) {
   }
 }
 
+void SharedSearch::AskContents() {
+  if (criteria.pattern != nullptr) content = ContentQuery::From(criteria.pattern->pattern());
+}
+
 void SharedSearch::SearchContents(const std::string& temporary_folder) {
-  if (criteria.pattern == nullptr) return;
-  content = ContentQuery::From(criteria.pattern->pattern());
+  AskContents();
   if (content) candidates = std::make_unique<CandidateList>(temporary_folder);
 }
 
@@ -65,11 +68,15 @@ Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
   return Refusal::kNone;
 }
 
-// Counts what cannot be looked at.
 Result<FileAttributes> Judge::Look(const char* name) {
   Result<FileAttributes> attributes = ReadAttributes(folder_.fd, name);
-  if (!attributes) search_.progress.AddSkipped(attributes.error().error_number);
+  if (!attributes) Skip(attributes.error().error_number);
   return attributes;
+}
+
+void Judge::Skip(int error_number) {
+  error_number_ = error_number;
+  search_.progress.AddSkipped(error_number);
 }
 
 Refusal Judge::Contents(const char* name) {
@@ -84,7 +91,7 @@ Refusal Judge::Contents(const char* name) {
     case ContentScanner::Outcome::kStopped:
       return Refusal::kStopped;
     case ContentScanner::Outcome::kFailed:
-      search_.progress.AddSkipped(errno);
+      Skip(errno);
       return Refusal::kFileUnreadable;
   }
   const Result<FileAttributes> attributes = Look(name);

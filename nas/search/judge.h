@@ -43,8 +43,10 @@ struct SharedSearch {
   SharedSearch(const std::vector<FileSearch::FindComp*>& comps, RowSink& row_sink, const int& flag)
       : criteria(comps), sink(row_sink), stop_flag(flag) {}
 
-  // Lets contents stand in for names, where the pattern is one that can be looked for in them. The
-  // files to read wait in a file without a name in `temporary_folder`. Throws std::system_error.
+  // Lets contents stand in for names, where the pattern is one that can be looked for in them.
+  void AskContents();
+  // The same, with somebody to read them: the files to read wait in a file without a name in
+  // `temporary_folder`. Throws std::system_error.
   void SearchContents(const std::string& temporary_folder);
   bool stopped() const { return __atomic_load_n(&stop_flag, __ATOMIC_RELAXED) != 0; }
   bool stopping() const { return stopped() || failed.load(std::memory_order_relaxed); }
@@ -53,7 +55,7 @@ struct SharedSearch {
   RowSink& sink;
   const int& stop_flag;
   std::optional<ContentQuery> content;
-  std::unique_ptr<CandidateList> candidates;  // set with content, or null: nobody will read them
+  std::unique_ptr<CandidateList> candidates;  // of SearchContents
   WalkProgress progress;
   std::atomic<bool> failed = false;  // a thread has thrown: the others shall end
 };
@@ -74,6 +76,8 @@ class Judge {
   Refusal Contents(const char* name);
   // Hands over the folder's candidates.
   void Leave();
+  // What the last kVanished or kFileUnreadable came of.
+  int error_number() const { return error_number_; }
 
   // Makes the rows found so far visible. Callable from any thread.
   void Flush();
@@ -87,12 +91,14 @@ class Judge {
   };
 
   Result<FileAttributes> Look(const char* name);
+  void Skip(int error_number);
   void AddRow(std::string_view name, const FileAttributes& attributes);
 
   SharedSearch& search_;
   FoldedName folded_;
   FileSearch::WalkEntry entry_;
   Folder folder_;
+  int error_number_ = 0;
   std::vector<std::pair<ino_t, std::string>> candidates_;
   std::optional<ContentScanner> scanner_;
 

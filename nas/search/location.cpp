@@ -35,21 +35,6 @@ bool SplitLocation(std::string_view text, std::string& share, std::string& path)
   return !share.empty();
 }
 
-// A path that leads out of its share is not a missing folder but one that may not be asked for.
-PlatformError LocationError(int error_number) {
-  switch (error_number) {
-    case EXDEV:
-    case ELOOP:
-    case ENAMETOOLONG:
-      return kErrorIllegal;
-    case ENOENT:
-    case ENOTDIR:
-      return kErrorNoSuchFolder;
-    default:
-      return ErrorFromErrno(error_number);
-  }
-}
-
 // Whether the folder is the temporary folder of a volume, or lies in one.
 bool IsTemporary(int folder) {
   const auto path = RealPath("/proc/self/fd/" + std::to_string(folder));
@@ -60,32 +45,27 @@ bool IsTemporary(int folder) {
   });
 }
 
-std::optional<Location> Fail(PlatformError error) {
-  SetLastError(error);
-  return std::nullopt;
-}
-
 }  // namespace
 
-std::optional<Location> OpenLocation(const std::string& text) {
+Result<Location> OpenLocation(const std::string& text) {
   Location location;
   std::string share_name;
-  if (!SplitLocation(text, share_name, location.path)) return Fail(kErrorIllegal);
+  if (!SplitLocation(text, share_name, location.path)) return Error{kErrorIllegal, EINVAL, text};
   const std::optional<Share> share = FindShare(share_name);
-  if (!share) return Fail(kErrorNoSuchFolder);
+  if (!share) return Error{kErrorNoSuchFolder, ENOENT, text};
   location.share = *share;
 
   const std::string root = share->root.empty() ? "/" : share->root;
   const UniqueFd root_fd(open(root.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  if (!root_fd) return Fail(LocationError(errno));
+  if (!root_fd) return ErrnoError(text);
   location.fd = OpenAt2(root_fd.get(), location.path.empty() ? "." : location.path.c_str(),
                         O_PATH | O_DIRECTORY, RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
-  if (!location.fd) return Fail(LocationError(errno));
+  if (!location.fd) return ErrnoError(text);
   // A folder that cannot be read is the location's own error, not one of a search inside it.
   const UniqueFd readable(openat(location.fd.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   struct stat status;
-  if (!readable || fstat(readable.get(), &status) != 0) return Fail(LocationError(errno));
-  if (IsTemporary(readable.get())) return Fail(kErrorIllegal);
+  if (!readable || fstat(readable.get(), &status) != 0) return ErrnoError(text);
+  if (IsTemporary(readable.get())) return Error{kErrorIllegal, EINVAL, text};
   location.device = status.st_dev;
   location.inode = status.st_ino;
   return location;

@@ -4,9 +4,9 @@
 
 #include <sys/types.h>
 
-#include <optional>
 #include <string>
 
+#include "nas/base/error.h"
 #include "nas/base/unique_fd.h"
 #include "nas/system/shares.h"
 
@@ -20,8 +20,10 @@ struct Location {
   ino_t inode = 0;
 };
 
-// Nothing, with the last error set: an illegal location, no such share or folder, a file, a folder
-// that may not be entered, or one in a volume's temporary folder.
-std::optional<Location> OpenLocation(const std::string& text);
+// Fails for a text that is no location or leads out of its share, and for a volume's temporary
+// folder or one in it (kErrorIllegal); where there is no such share or folder, or a file
+// (kErrorNoSuchFolder); for a folder that may not be read (kErrorPermission). The error's path is
+// `text`. The process must have the user's identity.
+Result<Location> OpenLocation(const std::string& text);
 
 }  // namespace nas

@@ -40,5 +40,12 @@ enum class Refusal {
 }  // namespace FileSearch
 
 namespace nas {
+
 using FileSearch::Refusal;
+
+// Whether it is about a folder on the way to the entry instead of the entry itself.
+inline bool IsOfFolder(Refusal refusal) { return refusal >= Refusal::kFolderUnreadable; }
+// For people: what comes after the path of the entry or the folder, as "is smaller than asked for".
+const char* Words(Refusal refusal);
+
 }  // namespace nas

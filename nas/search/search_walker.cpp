@@ -26,7 +26,6 @@
 #include "nas/search/search_job.h"
 #include "nas/system/volumes.h"
 #include "platform/filesearch.h"
-#include "platform/system.h"
 #include "platform/task_record.h"
 
 namespace FileSearch {
@@ -46,12 +45,6 @@ void RaiseDescriptorLimit() {
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
   limit.rlim_cur = limit.rlim_max;
   setrlimit(RLIMIT_NOFILE, &limit);
-}
-
-// The kind of trouble, as the walk counts what it skips.
-int ErrnoOf(nas::PlatformError error) {
-  if (error == nas::kErrorPermission) return EACCES;
-  return error == nas::kErrorNoSuchFolder ? ENOENT : EINVAL;
 }
 
 // Turns what a job threw into the last error. To be called in a catch block.
@@ -114,6 +107,7 @@ class WfmSearchWalker::Impl {
   const char* volume() const { return volume_.c_str(); }
 
  private:
+  nas::Status OpenLocations(const std::vector<std::string>& texts);
   void Report(const nas::WalkProgress& progress, bool last);
   void WaitForSorting(pid_t child) const;
   [[noreturn]] void EndWorker();
@@ -123,7 +117,7 @@ class WfmSearchWalker::Impl {
   const int& stop_flag_;
   std::vector<FindComp*> comps_;
   std::vector<nas::Location> locations_;
-  std::vector<int> unopened_;  // why each of the other locations is not searched
+  std::vector<int> unopened_;  // errno of each of the others
   std::string volume_;
   std::string folder_;
   std::string id_;
@@ -133,25 +127,29 @@ class WfmSearchWalker::Impl {
   Clock::time_point reported_;
 };
 
-bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
-                                 const std::vector<FindComp*>& comps) try {
-  comps_ = comps;
-  nas::PlatformError first_error = nas::kErrorNoSuchFolder;
-  RaiseDescriptorLimit();
+// Fails, with what is wrong with the first, where none can be opened.
+nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>& texts) {
+  std::optional<nas::Error> first;
   for (const std::string& text : texts) {
-    std::optional<nas::Location> location;
-    nas::SetLastError(nas::kErrorOther);
+    nas::Result<nas::Location> location = nas::Error{nas::kErrorOther, E2BIG, text};
     if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
     if (location) {
       locations_.push_back(std::move(*location));
       continue;
     }
-    const auto error = static_cast<nas::PlatformError>(NLIBCErrGet());
-    if (unopened_.empty()) first_error = error;
-    unopened_.push_back(ErrnoOf(error));
+    unopened_.push_back(location.error().error_number);
+    if (!first) first = location.error();
   }
-  if (locations_.empty()) {
-    nas::SetLastError(first_error);
+  if (!locations_.empty()) return {};
+  return first ? *first : nas::Error{nas::kErrorNoSuchFolder, ENOENT};
+}
+
+bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
+                                 const std::vector<FindComp*>& comps) try {
+  comps_ = comps;
+  RaiseDescriptorLimit();
+  if (const nas::Status opened = OpenLocations(texts); !opened) {
+    nas::Report(opened.error());
     return false;
   }
   const auto volume = nas::ResultVolume(locations_.front().share.volume, user_);

@@ -22,7 +22,6 @@
 #include "nas/search/folder_walk.h"
 #include "nas/search/search_job.h"
 #include "nas/system/config.h"
-#include "platform/system.h"
 
 namespace nas {
 namespace {
@@ -61,7 +60,7 @@ class Job : public testing::Test {
                              const std::vector<std::string>& texts = {"/tree"},
                              bool content = false) {
     std::vector<Location> locations;
-    for (const std::string& text : texts) locations.push_back(OpenLocation(text).value());
+    for (const std::string& text : texts) locations.push_back(std::move(*OpenLocation(text)));
     std::string trouble;
     PatternComp pattern(NamePattern::Parse(pattern_text, trouble).value());
     const std::string path = ResultPath(base_ + "/results", NewResultId());
@@ -273,9 +272,7 @@ TEST_F(Job, LocationErrors) {
   };
   for (const auto& row : rows) {
     const auto location = OpenLocation(row.text);
-    EXPECT_EQ(location.has_value(), row.error == 0) << row.text;
-    if (location) continue;
-    EXPECT_EQ(NLIBCErrGet(), row.error) << row.text.substr(0, 40);
+    EXPECT_EQ(location ? kErrorNone : location.error().kind, row.error) << row.text.substr(0, 40);
   }
 }
 
