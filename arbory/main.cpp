@@ -14,6 +14,7 @@
 #include "arbory/search_command.h"
 #include "arbory/serve_command.h"
 #include "arbory/terminal.h"
+#include "arbory/why_command.h"
 
 namespace arbory {
 namespace {
@@ -49,6 +50,16 @@ constexpr char kServeHelp[] =
     "  arbory serve --share photos=$HOME/Pictures\n"
     "  arbory serve --config /etc/arbory/arbory.toml --listen 192.168.1.2:8750\n";
 
+constexpr char kWhyHelp[] =
+    "For a search that does not find what it should: put \"why FILE\" in the place of\n"
+    "\"search\". All its options are taken; those on output make no difference.\n"
+    "\n"
+    "Exit status: 0 FILE matches, 1 it is left out, 2 error.\n"
+    "\n"
+    "Examples:\n"
+    "  arbory why ~/photos/IMG_1.jpg holiday ~/photos -t image\n"
+    "  arbory why /var/log/syslog 'error code' /var/log --content\n";
+
 // Help without the parser's own notes on which options need or exclude each other.
 class Formatter : public CLI::Formatter {
  public:
@@ -79,8 +90,9 @@ CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
   return serve;
 }
 
-void AddOutput(CLI::App* search, SearchOptions* options) {
-  search->option_defaults()->group("Output");
+// An empty `group` leaves them out of the help.
+void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
+  search->option_defaults()->group(group);
   CLI::Option* sort =
       search->add_option("--sort", options->sort_by, "Print sorted, when the search has finished")
           ->type_name("COLUMN")
@@ -112,10 +124,21 @@ void AddOutput(CLI::App* search, SearchOptions* options) {
 void AddSearch(CLI::App* app, SearchOptions* options) {
   CLI::App* search = app->add_subcommand("search", "Search folders and print what is found");
   AddQueryOptions(search, &options->query);
-  AddOutput(search, options);
+  AddOutput(search, options, "Output");
   search->option_defaults()->group("Where and as whom");
   AddCommonOptions(search, &options->common);
   search->footer(std::string(kQueryHelp) + kSearchHelp);
+}
+
+CLI::App* AddWhy(CLI::App* app, WhyOptions* options) {
+  CLI::App* why = app->add_subcommand("why", "Tell why a search does not find a file");
+  why->add_option("FILE", options->file, "The file, or folder, that it should find")->required();
+  AddQueryOptions(why, &options->search.query);
+  AddOutput(why, &options->search, "");
+  why->option_defaults()->group("Where and as whom");
+  AddCommonOptions(why, &options->search.common);
+  why->footer(std::string(kQueryHelp) + "\n" + kWhyHelp);
+  return why;
 }
 
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
@@ -146,7 +169,9 @@ int Run(int argc, char** argv) {
   ServeOptions serve_options;
   CLI::App* call = AddCall(&app, &call_options);
   CLI::App* serve = AddServe(&app, &serve_options);
+  WhyOptions why_options;
   AddSearch(&app, &search_options);
+  CLI::App* why = AddWhy(&app, &why_options);
   try {
     app.parse(MarkedArguments(argc, argv));
   } catch (const CLI::Success& asked) {
@@ -159,6 +184,10 @@ int Run(int argc, char** argv) {
     return RunCallCommand(call_options);
   }
   if (serve->parsed()) return RunServeCommand(serve_options);
+  if (why->parsed()) {
+    Unmark(&why_options.file);
+    return RunWhyCommand(why_options);
+  }
   return RunSearchCommand(search_options);
 }
 

@@ -12,7 +12,7 @@ namespace arbory {
 // The exit codes of all commands.
 enum ExitCode : int {
   kExitSuccess = 0,
-  kExitNothing = 1,  // no file found; or a reply with a code other than 0
+  kExitNothing = 1,  // no file found; a reply with a code other than 0; a file left out
   kExitError = 2,
   kExitInterrupted = 130,
 };
@@ -76,6 +76,11 @@ struct SearchOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
+};
+
+struct WhyOptions {
+  std::string file;
+  SearchOptions search;  // whose results FILE is not among
 };
 
 }  // namespace arbory

@@ -1,0 +1,65 @@
+#include "nas/search/refusal.h"
+
+namespace nas {
+
+const char* Words(Refusal refusal) {
+  switch (refusal) {
+    case Refusal::kNone:
+      return "matches";
+    case Refusal::kName:
+      return "has a name that does not match the pattern";
+    case Refusal::kExtension:
+      return "has none of the extensions asked for";
+    case Refusal::kKind:
+      return "is not of the type asked for";
+    case Refusal::kTooSmall:
+      return "is smaller than asked for";
+    case Refusal::kTooLarge:
+      return "is larger than asked for";
+    case Refusal::kModifiedEarlier:
+      return "was modified earlier than asked for";
+    case Refusal::kModifiedLater:
+      return "was modified later than asked for";
+    case Refusal::kCreatedEarlier:
+      return "was created earlier than asked for";
+    case Refusal::kCreatedLater:
+      return "was created later than asked for";
+    case Refusal::kReadEarlier:
+      return "was last read earlier than asked for";
+    case Refusal::kReadLater:
+      return "was last read later than asked for";
+    case Refusal::kOwner:
+      return "is not owned by the user asked for";
+    case Refusal::kGroup:
+      return "is not of the group asked for";
+    case Refusal::kVanished:
+      return "cannot be looked at";
+    case Refusal::kContentsUnread:
+      return "may match by its contents";
+    case Refusal::kContents:
+      return "matches neither by its name nor by its contents";
+    case Refusal::kBinary:
+      return "does not match by its name, and is binary, so its contents are not searched";
+    case Refusal::kFileUnreadable:
+      return "does not match by its name, and its contents cannot be read";
+    case Refusal::kStopped:
+      return "was not judged before the search was stopped";
+    case Refusal::kFolderUnreadable:
+      return "cannot be read";
+    case Refusal::kPseudoFileSystem:
+      return "is on a file system of the system's own, which is not searched";
+    case Refusal::kTemporaryFolder:
+      return "is the temporary folder of a volume, which is never searched";
+    case Refusal::kOtherLocation:
+      return "is one of the folders to search, and is not searched a second time by this way";
+    case Refusal::kNotRecursive:
+      return "is a folder in the one to search, and such are not entered (--no-recursive)";
+    case Refusal::kSymbolicLink:
+      return "is a symbolic link, which can be found but is not followed";
+    case Refusal::kNoFolder:
+      return "is not a folder";
+  }
+  return "is left out";
+}
+
+}  // namespace nas
