@@ -30,9 +30,15 @@ nas::ServerSettings SettingsOf(const ServeOptions& options) {
 // A share to try it with, where there is nothing else to search.
 void OfferSample(Caller* caller) {
   if (!nas::ListShares().empty() || !nas::CurrentConfig().shares.empty()) return;
-  const std::string folder = MakeSampleShare(nas::CurrentConfig().state_dir);
-  caller->AddShares({{kSampleShare, folder}});
-  Say("No share is configured: offering the sample share in " + folder);
+  const auto folder = MakeSampleShare(nas::CurrentConfig().state_dir);
+  if (!folder) {
+    Warn(
+        "no share is configured, and the sample share's files are not installed; give a folder "
+        "with --share NAME=DIR");
+    return;
+  }
+  caller->AddShares({{kSampleShare, *folder}});
+  Say("No share is configured: offering the sample share in " + *folder);
 }
 
 // The program as root without --user: people log in, and each request runs as its user.

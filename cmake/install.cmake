@@ -1,11 +1,12 @@
-# Where everything goes below the prefix. The program finds the library, the module and the page by
-# its own place.
+# Where everything goes below the prefix. The program finds the library, the module, the page and the
+# sample share by its own place.
 install(TARGETS arbory RUNTIME DESTINATION bin)
 install(TARGETS arbory_nas LIBRARY DESTINATION lib/arbory)
 if(TARGET arbory_module)
   install(TARGETS arbory_module LIBRARY DESTINATION lib/arbory)
 endif()
 install(DIRECTORY web/dist/ DESTINATION share/arbory/web OPTIONAL)
+install(DIRECTORY packaging/sample DESTINATION share/arbory)
 install(FILES packaging/arbory.service DESTINATION lib/systemd/system)
 install(FILES docs/http.md docs/deploy.md packaging/arbory.toml packaging/nginx.conf
         DESTINATION share/doc/arbory)

@@ -5,7 +5,7 @@ add_library(program_objects OBJECT ${PROGRAM_SOURCES})
 target_link_libraries(program_objects PUBLIC arbory_nas PkgConfig::JSONCPP PkgConfig::PAM
                                              Threads::Threads)
 target_compile_definitions(program_objects PRIVATE ARBORY_VERSION="${PROJECT_VERSION}"
-                           ARBORY_WEB_DIR="${CMAKE_SOURCE_DIR}/web/dist")
+                           ARBORY_SOURCE_DIR="${CMAKE_SOURCE_DIR}")
 # Half of the time these take to compile is the optimiser's, which gains nothing there: they wait
 # for clients.
 set_source_files_properties(arbory/server/transport/connection.cpp arbory/server/transport/http_server.cpp

@@ -1,18 +1,18 @@
 #include "arbory/server/service/pages.h"
 
 #include <fcntl.h>
-#include <unistd.h>
 
 #include <algorithm>
 
+#include "arbory/server/service/installed.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
-#include "nas/base/paths.h"
 
 namespace arbory {
 namespace {
 
 constexpr size_t kMaxFileBytes = size_t{16} << 20;
+const std::string kBuiltWeb = "web/dist";
 constexpr char kIndex[] = "index.html";
 constexpr char kAssets[] = "assets";  // files whose names tell their content
 constexpr char kPolicy[] =
@@ -50,11 +50,7 @@ bool IsPageFile(const std::string& name) {
 
 std::string FindWebFolder(const std::string& configured) {
   if (!configured.empty()) return configured;
-  const std::string folder = nas::ProgramFolder();
-  for (const std::string& place : {folder + "../share/arbory/web", folder + "../web"}) {
-    if (access((place + "/" + kIndex).c_str(), R_OK) == 0) return place;
-  }
-  return ARBORY_WEB_DIR;
+  return FindInstalled("web", kBuiltWeb, kIndex).value_or(ARBORY_SOURCE_DIR "/" + kBuiltWeb);
 }
 
 HttpReply PageReply(const std::string& folder, const std::vector<std::string>& path) {
