@@ -6,7 +6,7 @@
 #include <cstring>
 
 #include "arbory/parse.h"
-#include "nas/system/accounts.h"
+#include "nas/base/accounts.h"
 #include "platform/webfm.h"
 
 namespace arbory {

@@ -21,9 +21,9 @@
 #include "arbory/search_request.h"
 #include "arbory/search_text.h"
 #include "arbory/terminal.h"
+#include "nas/base/accounts.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
-#include "nas/system/accounts.h"
 
 namespace arbory {
 namespace {

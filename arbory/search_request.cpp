@@ -2,23 +2,19 @@
 
 #include "arbory/locate.h"
 #include "arbory/parse.h"
+#include "nas/base/accounts.h"
 #include "nas/system/shares.h"
 #include "platform/filesearch.h"
-#include "platform/system.h"
 
 namespace arbory {
 namespace {
 
 void CheckOwner(const std::string& name) {
-  NUVAUSER* user = nullptr;
-  if (NUVAUserGet(name.c_str(), &user) != 0) throw UsageError("there is no user '" + name + "'");
-  NUVAUserFree(user);
+  if (!nas::FindAccount(name)) throw UsageError("there is no user '" + name + "'");
 }
 
 void CheckGroup(const std::string& name) {
-  NUVAGROUP* group = nullptr;
-  if (NUVAGroupGet(name.c_str(), &group) != 0) throw UsageError("there is no group '" + name + "'");
-  NUVAGroupFree(group);
+  if (!nas::FindGroup(name)) throw UsageError("there is no group '" + name + "'");
 }
 
 // Asks the engine itself, so that what is refused here and there is the same.

@@ -10,7 +10,7 @@
 #include "arbory/server/service/service.h"
 #include "arbory/server/transport/http_server.h"
 #include "arbory/terminal.h"
-#include "nas/system/accounts.h"
+#include "nas/base/accounts.h"
 #include "nas/system/shares.h"
 
 namespace arbory {

@@ -19,9 +19,9 @@
 #include "arbory/comparators.h"
 #include "arbory/search_request.h"
 #include "arbory/terminal.h"
+#include "nas/base/accounts.h"
 #include "nas/base/paths.h"
 #include "nas/search/explain.h"
-#include "nas/system/accounts.h"
 
 namespace arbory {
 namespace {

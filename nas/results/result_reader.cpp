@@ -1,7 +1,5 @@
 #include "nas/results/result_reader.h"
 
-#include <grp.h>
-#include <pwd.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -11,6 +9,7 @@
 #include <memory>
 #include <unordered_map>
 
+#include "nas/base/accounts.h"
 #include "nas/match/file_kinds.h"
 
 namespace nas {
@@ -430,8 +429,8 @@ void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {
 const std::string& ResultReader::UserName(std::uint32_t uid) {
   const auto [name, added] = user_names_.try_emplace(uid);
   if (added) {
-    const passwd* user = getpwuid(uid);
-    name->second = user != nullptr ? user->pw_name : std::to_string(uid);
+    const auto user = FindAccount(uid_t{uid});
+    name->second = user ? user->name : std::to_string(uid);
   }
   return name->second;
 }
@@ -439,8 +438,8 @@ const std::string& ResultReader::UserName(std::uint32_t uid) {
 const std::string& ResultReader::GroupName(std::uint32_t gid) {
   const auto [name, added] = group_names_.try_emplace(gid);
   if (added) {
-    const group* found = getgrgid(gid);
-    name->second = found != nullptr ? found->gr_name : std::to_string(gid);
+    const auto found = FindGroup(gid_t{gid});
+    name->second = found ? found->name : std::to_string(gid);
   }
   return name->second;
 }

@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <cstring>
 
+#include "nas/base/accounts.h"
 #include "nas/base/error.h"
 #include "nas/search/walk_entry.h"
-#include "platform/system.h"
 
 namespace nas {
 
@@ -94,19 +94,17 @@ std::unique_ptr<FileSearch::FindComp> MakeKind(const char* word) {
 }
 
 std::unique_ptr<FileSearch::FindComp> MakeOwner(const char* name) {
-  NUVAUSER* user = nullptr;
-  if (NUVAUserGet(name, &user) != 0) return nullptr;
-  auto comp = std::make_unique<OwnerComp>(user->nUid);
-  NUVAUserFree(user);
-  return comp;
+  const auto user = FindAccount(name);
+  if (user) return std::make_unique<OwnerComp>(user->uid);
+  Report(user.error());
+  return nullptr;
 }
 
 std::unique_ptr<FileSearch::FindComp> MakeGroup(const char* name) {
-  NUVAGROUP* group = nullptr;
-  if (NUVAGroupGet(name, &group) != 0) return nullptr;
-  auto comp = std::make_unique<GroupComp>(group->nGid);
-  NUVAGroupFree(group);
-  return comp;
+  const auto group = FindGroup(name);
+  if (group) return std::make_unique<GroupComp>(group->gid);
+  Report(group.error());
+  return nullptr;
 }
 
 }  // namespace

@@ -18,8 +18,8 @@
 #include <functional>
 #include <map>
 
+#include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
-#include "nas/system/accounts.h"
 #include "nas/system/config.h"
 
 namespace nas {

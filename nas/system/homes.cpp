@@ -5,8 +5,8 @@
 #include <cerrno>
 #include <cstring>
 
+#include "nas/base/accounts.h"
 #include "nas/base/error.h"
-#include "nas/system/accounts.h"
 #include "nas/system/share_names.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"

@@ -10,8 +10,8 @@
 #include <string>
 #include <vector>
 
+#include "nas/base/accounts.h"
 #include "nas/base/error.h"
-#include "nas/system/accounts.h"
 
 namespace nas {
 

@@ -6,8 +6,8 @@
 
 #include <cerrno>
 
+#include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
-#include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"

@@ -7,12 +7,12 @@
 #include <cerrno>
 #include <string_view>
 
+#include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
 #include "nas/base/paths.h"
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"
-#include "nas/system/accounts.h"
 #include "nas/system/config.h"
 #include "nas/system/user_state.h"
 

@@ -8,7 +8,7 @@
 
 #include "arbory/server/transport/child.h"
 #include "arbory/server/transport/http_text.h"
-#include "nas/system/accounts.h"
+#include "nas/base/accounts.h"
 
 namespace arbory {
 namespace {

@@ -1,7 +1,7 @@
 #pragma once
 // Users and groups of the machine, through its name service. Any thread may call; nothing is
-// remembered here, since a server lives longer than an answer stays true (identity.h knows whom
-// this process has become).
+// remembered here, since a server lives longer than an answer stays true. A directory on the
+// network can take seconds to answer.
 
 #include <sys/types.h>
 
@@ -26,6 +26,15 @@ bool IsUserName(const std::string& name);
 // fails.
 Result<Account> FindAccount(const std::string& name);
 Result<Account> FindAccount(uid_t uid);
+
+struct Group {
+  std::string name;
+  gid_t gid = 0;
+};
+
+// The same of groups, with kErrorUnknownGroup.
+Result<Group> FindGroup(const std::string& name);
+Result<Group> FindGroup(gid_t gid);
 
 // For a process that makes calls: their children would each load the libraries of the name service
 // anew, which is a third of what a short call takes; what this process has loaded they inherit.

@@ -1,0 +1,102 @@
+#include "nas/base/accounts.h"
+
+#include <grp.h>
+#include <pwd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <vector>
+
+#include "nas/base/utf8.h"
+
+namespace nas {
+namespace {
+
+constexpr size_t kFirstRecordBytes = 1024;
+// A group of a large directory service lists all its members; beyond this it is taken as broken.
+constexpr size_t kMaxRecordBytes = size_t{16} << 20;
+
+constexpr size_t kMaxUserNameBytes = 255;  // it names a folder
+
+// The name service's reentrant calls want a buffer of unknown size: asks again with more room
+// until the record fits. `record` then points into `buffer`.
+template <typename Record, typename Ask>
+Status Lookup(Ask ask, PlatformError unknown, Record* record, std::vector<char>* buffer) {
+  for (size_t room = kFirstRecordBytes; room <= kMaxRecordBytes; room *= 2) {
+    buffer->resize(room);
+    Record* found = nullptr;
+    int error;
+    do {
+      error = ask(record, buffer->data(), room, &found);
+    } while (error == EINTR);  // returned, not set in errno
+    if (found != nullptr) return {};
+    if (error == ERANGE) continue;
+    // Several services report an unknown name as an error of their own.
+    const bool absent =
+        error == 0 || error == ENOENT || error == ESRCH || error == EBADF || error == EPERM;
+    return absent ? Error{unknown, ENOENT} : Error{kErrorOther, error};
+  }
+  return Error{kErrorOther, ERANGE};
+}
+
+template <typename Ask>
+Result<Account> AccountOf(Ask ask) {
+  passwd record;
+  std::vector<char> buffer;
+  const Status found = Lookup(ask, kErrorUnknownUser, &record, &buffer);
+  if (!found) return found.error();
+  return Account{record.pw_name, record.pw_uid, record.pw_gid, record.pw_dir};
+}
+
+template <typename Ask>
+Result<Group> GroupOf(Ask ask) {
+  group record;
+  std::vector<char> buffer;
+  const Status found = Lookup(ask, kErrorUnknownGroup, &record, &buffer);
+  if (!found) return found.error();
+  return Group{record.gr_name, record.gr_gid};
+}
+
+}  // namespace
+
+bool IsUserName(const std::string& name) {
+  if (name.empty() || name == "." || name == ".." || name.size() > kMaxUserNameBytes) return false;
+  return std::none_of(name.begin(), name.end(),
+                      [](unsigned char byte) { return byte == '/' || IsControl(byte); });
+}
+
+Result<Account> FindAccount(const std::string& name) {
+  if (!IsUserName(name)) return Error{kErrorUnknownUser, ENOENT, name};
+  return AccountOf([&](passwd* record, char* buffer, size_t room, passwd** found) {
+    return getpwnam_r(name.c_str(), record, buffer, room, found);
+  });
+}
+
+Result<Account> FindAccount(uid_t uid) {
+  return AccountOf([&](passwd* record, char* buffer, size_t room, passwd** found) {
+    return getpwuid_r(uid, record, buffer, room, found);
+  });
+}
+
+Result<Group> FindGroup(const std::string& name) {
+  return GroupOf([&](group* record, char* buffer, size_t room, group** found) {
+    return getgrnam_r(name.c_str(), record, buffer, room, found);
+  });
+}
+
+Result<Group> FindGroup(gid_t gid) {
+  return GroupOf([&](group* record, char* buffer, size_t room, group** found) {
+    return getgrgid_r(gid, record, buffer, room, found);
+  });
+}
+
+void LoadNameService() {
+  constexpr char kRoot[] = "root";
+  if (geteuid() != 0) return;  // only root's calls look up groups, to become their user
+  int count = 0;
+  getpwnam(kRoot);
+  getgrouplist(kRoot, 0, nullptr, &count);
+}
+
+}  // namespace nas
