@@ -1,130 +1,24 @@
-// Every criterion against a naive walk, over a tree of hostile names, by both roads: the program,
-// and the API as a browser uses it.
+// Every criterion against a naive walk, over a tree of hostile names, by each way there is: the
+// engine alone, the program, and the API as a browser uses it. The way over HTTP is the server
+// tests'.
 
-#include <fnmatch.h>
-#include <regex.h>
-#include <strings.h>
+#include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cstring>
+#include <mutex>
 
+#include "arbory/comparators.h"
+#include "nas/search/content_reading.h"
+#include "nas/search/explain.h"
+#include "nas/search/folder_walk.h"
+#include "nas/search/search_job.h"
+#include "nas/system/config.h"
+#include "tests/program/cases.h"
 #include "tests/program/program_test.h"
-#include "tests/program/reference.h"
 
 namespace program_test {
 namespace {
-
-using Wanted = std::function<bool(const Entry&)>;
-
-struct Case {
-  const char* why;
-  const char* params;  // of "start", without "folder_path"
-  Wanted wanted;
-};
-
-bool Holds(const std::string& text, const char* word) {
-  return strcasestr(text.c_str(), word) != nullptr;
-}
-bool Ends(const std::string& text, const std::string& end) {
-  return text.size() > end.size() &&
-         strcasecmp(text.c_str() + text.size() - end.size(), end.c_str()) == 0;
-}
-bool Glob(const Entry& entry, const char* pattern) {
-  return fnmatch(pattern, entry.name.c_str(), FNM_CASEFOLD) == 0;
-}
-bool MatchesRegex(const std::string& name, const char* expression) {
-  regex_t compiled;
-  EXPECT_EQ(regcomp(&compiled, expression, REG_EXTENDED | REG_ICASE | REG_NOSUB), 0);
-  const bool matches = regexec(&compiled, name.c_str(), 0, nullptr, 0) == 0;
-  regfree(&compiled);
-  return matches;
-}
-bool IsCafe(const std::string& name) {
-  return name.starts_with("caf\u00e9") || name.starts_with("cafe\u0301");
-}
-long Modified(const Entry& entry) { return entry.info.st_mtim.tv_sec; }
-long Read(const Entry& entry) { return entry.info.st_atim.tv_sec; }
-
-const std::vector<Case>& Cases() {
-  static const std::vector<Case> cases = {
-      {"everything", R"({"pattern": ""})", [](const Entry&) { return true; }},
-      {"nothing", R"({"pattern": "no such name"})", [](const Entry&) { return false; }},
-      {"a word, any case", R"({"pattern": "TXT"})",
-       [](const Entry& e) { return Holds(e.name, "txt"); }},
-      {"a glob is the whole name", R"({"pattern": "*.txt"})",
-       [](const Entry& e) { return Glob(e, "*.txt"); }},
-      {"one character and a set", R"({"pattern": "?mg[0-9].j*"})",
-       [](const Entry& e) { return Glob(e, "?mg[0-9].j*"); }},
-      {"two words and a third that is not", R"({"pattern": "a g !txt"})",
-       [](const Entry& e) {
-         return Holds(e.name, "a") && Holds(e.name, "g") && !Holds(e.name, "txt");
-       }},
-      {"either", R"({"pattern": "jpg|pdf"})",
-       [](const Entry& e) { return Holds(e.name, "jpg") || Holds(e.name, "pdf"); }},
-      {"a quoted wildcard is itself", R"({"pattern": "\"*\""})",
-       [](const Entry& e) { return Holds(e.name, "*"); }},
-      {"a regular expression", R"({"pattern": "regex:^[a-z]+[.](txt|jpg)$"})",
-       [](const Entry& e) { return MatchesRegex(e.name, "^[a-z]+[.](txt|jpg)$"); }},
-      {"composed finds decomposed", R"({"pattern": "caf\u00e9"})",
-       [](const Entry& e) { return IsCafe(e.name); }},
-      {"decomposed finds composed", R"({"pattern": "CAFE\u0301"})",
-       [](const Entry& e) { return IsCafe(e.name); }},
-      {"case beyond ASCII", R"({"pattern": "\u00fcber"})",
-       [](const Entry& e) { return e.name.starts_with("\u00dcB") || e.name == "\u00dcber"; }},
-      {"a newline is part of a name", R"({"pattern": "*\n*"})",
-       [](const Entry& e) { return Holds(e.name, "\n"); }},
-      {"a leading dash", R"({"pattern": "--help"})",
-       [](const Entry& e) { return e.name == "--help"; }},
-      {"what looks like SQL", R"({"pattern": "\"'; DROP\""})",
-       [](const Entry& e) { return Holds(e.name, "'; drop"); }},
-      {"one extension", R"({"extension": "txt"})",
-       [](const Entry& e) { return !e.is_dir() && Ends(e.name, ".txt"); }},
-      {"several, as people write them", R"({"extension": ".JPG; *.pdf,tar.gz"})",
-       [](const Entry& e) {
-         return !e.is_dir() &&
-                (Ends(e.name, ".jpg") || Ends(e.name, ".pdf") || Ends(e.name, ".tar.gz"));
-       }},
-      {"folders", R"({"filetype": "dir"})", [](const Entry& e) { return e.is_dir(); }},
-      {"files", R"({"filetype": "file"})", [](const Entry& e) { return !e.is_dir(); }},
-      {"a category", R"({"filetype": "image"})",
-       [](const Entry& e) {
-         return !e.is_dir() && (Ends(e.name, ".jpg") || Ends(e.name, ".png"));
-       }},
-      {"size, both edges", R"({"size_from": 1023, "size_to": 1024})",
-       [](const Entry& e) {
-         return !e.is_dir() && e.info.st_size >= 1023 && e.info.st_size <= 1024;
-       }},
-      {"empty files", R"({"size_to": 0})",
-       [](const Entry& e) { return !e.is_dir() && e.info.st_size == 0; }},
-      {"bounds that cross", R"({"size_from": 2, "size_to": 1})",
-       [](const Entry&) { return false; }},
-      {"modified, both edges", R"({"mtime_from": 1700000010, "mtime_to": 1700000020})",
-       [](const Entry& e) { return Modified(e) >= 1700000010 && Modified(e) <= 1700000020; }},
-      {"last read", R"({"atime_to": 1699999990})",
-       [](const Entry& e) { return Read(e) <= 1699999990; }},
-      {"only the folder itself", R"({"pattern": "txt", "recursive": false})",
-       [](const Entry& e) { return Holds(e.name, "txt"); }},
-      {"criteria together",
-       R"({"pattern": "a*", "extension": "txt", "size_from": 1, "mtime_from": 1700000030})",
-       [](const Entry& e) {
-         return Glob(e, "a*") && Ends(e.name, ".txt") && !e.is_dir() && e.info.st_size >= 1 &&
-                Modified(e) >= 1700000030;
-       }},
-      {"contents", R"({"pattern": "the needle", "search_content": true})",
-       [](const Entry& e) {
-         const std::string text = TextOf(e.path);
-         const auto has = [&](const char* word) {
-           return Holds(e.name, word) || Holds(text, word);
-         };
-         return (Holds(e.name, "the") && Holds(e.name, "needle")) || (has("the") && has("needle"));
-       }},
-      {"contents of large files only",
-       R"({"pattern": "needle", "size_from": 2000, "search_content": true})",
-       [](const Entry& e) {
-         return !e.is_dir() && e.info.st_size >= 2000 && Holds(TextOf(e.path), "needle");
-       }},
-  };
-  return cases;
-}
 
 // The same search as words of a command line.
 std::vector<std::string> Arguments(const Json::Value& params, const std::string& folder) {
@@ -147,51 +41,123 @@ std::vector<std::string> Arguments(const Json::Value& params, const std::string&
   return words;
 }
 
+// Rows as a search hands them over, without a result database.
+class KeptRows : public nas::RowSink {
+ public:
+  explicit KeptRows(std::string root) : root_(std::move(root)) {}
+
+  void Append(nas::RowBlock& block) override {
+    const std::lock_guard lock(mutex_);
+    std::vector<std::string> folders;
+    for (std::string_view rest = block.folders(); !rest.empty();) {
+      rest.remove_prefix(sizeof(std::uint16_t));
+      folders.emplace_back(rest.data());
+      rest.remove_prefix(folders.back().size() + 1);
+    }
+    nas::FileAttributes file;
+    size_t row = 0;
+    for (const std::string& name : Pieces(std::string(block.names()), '\0')) {
+      std::memcpy(&file, block.attributes().data() + sizeof(file) * row++, sizeof(file));
+      const std::string& folder = folders.at(file.folder);
+      paths_.push_back(root_ + (folder.empty() ? "" : "/" + folder) + "/" + name);
+    }
+    block.Clear();
+  }
+  const std::vector<std::string>& paths() const { return paths_; }
+
+ private:
+  const std::string root_;
+  std::mutex mutex_;  // guards paths_
+  std::vector<std::string> paths_;
+};
+
 class Differential : public ProgramTest {
  protected:
-  void Compare(const Case& row, const std::string& folder) {
-    SCOPED_TRACE(row.why);
-    const Json::Value params = Json_(row.params);
-    const Reference expected = Walk(folder, params.get("recursive", true).asBool(), row.wanted);
+  Found ByEngine(const Json::Value& params, const std::string& folder) const {
+    std::vector<nas::Location> locations;
+    locations.push_back(std::move(*nas::OpenLocation("/share" + folder.substr(share_.size()))));
+    const arbory::Comparators comparators(params);
+    KeptRows rows(share_);
+    const int never = 0;
+    nas::SharedSearch search(comparators.get(), rows, never);
+    if (params["search_content"].asBool()) search.SearchContents(dir_);
+    nas::FolderWalk walk(locations, params["recursive"].asBool(), search);
+    nas::ContentReading contents(locations, search);
+    nas::SearchJob job(search, {.report = [](const nas::WalkProgress&) {}, .stuck = {}});
+    EXPECT_TRUE(job.Run(walk, contents));
+    const Json::Value seen = search.progress.ToJson();
+    EXPECT_EQ(seen["matches"].asUInt64(), rows.paths().size());
+    return {rows.paths(), static_cast<size_t>(seen["skipped"]["permission"].asUInt64())};
+  }
+
+  // Asks of every file there is whether it would be found.
+  Found ByExplaining(const Json::Value& params, const std::string& folder) const {
+    std::vector<nas::Location> locations;
+    locations.push_back(std::move(*nas::OpenLocation("/share" + folder.substr(share_.size()))));
+    const arbory::Comparators comparators(params);
+    const nas::ExplainedSearch search{locations, comparators.get(), params["recursive"].asBool(),
+                                      params["search_content"].asBool()};
+    Found found;
+    for (const std::string& path : Walk(folder, true, [](const Entry&) { return true; }).paths) {
+      const auto answer = nas::Explain(search, 0, path.substr(folder.size() + 1));
+      EXPECT_TRUE(answer) << path;
+      if (answer && answer->refusal == nas::Refusal::kNone) found.paths.push_back(path);
+    }
+    return found;
+  }
+
+  Found ByProgram(const Json::Value& params, const std::string& folder) {
     const Output output = Run(Arguments(params, folder));
-    const auto pieces = Pieces(output.out, '\0');
-    EXPECT_EQ(std::set<std::string>(pieces.begin(), pieces.end()), expected.paths);
-    EXPECT_EQ(pieces.size(), expected.paths.size()) << "a path is printed twice";
-    EXPECT_EQ(output.exit_code, expected.paths.empty() ? 1 : 0) << output.err;
-    const std::string count = std::to_string(expected.unreadable);
-    const std::string skipped = "arbory: " + count + " folder" +
-                                (expected.unreadable == 1 ? "" : "s") +
-                                " could not be read (permission denied)\n";
-    const bool entered = params.get("recursive", true).asBool() && expected.unreadable > 0;
-    EXPECT_EQ(output.err, entered ? skipped : "");
+    Found found{Pieces(output.out, '\0')};
+    EXPECT_EQ(output.exit_code, found.paths.empty() ? 1 : 0) << output.err;
+    const std::string before = "arbory: ";
+    if (output.err.empty()) return found;
+    EXPECT_TRUE(output.err.starts_with(before)) << output.err;
+    found.unreadable = std::strtoul(output.err.c_str() + before.size(), nullptr, 10);
+    EXPECT_EQ(output.err, before + std::to_string(found.unreadable) + " folder" +
+                              (found.unreadable == 1 ? "" : "s") +
+                              " could not be read (permission denied)\n");
+    return found;
+  }
+
+  Found ByApi(Json::Value params, const std::string& folder) {
+    params["folder_path"] = "/share" + folder.substr(share_.size());
+    const Reply reply = ListToEnd(Start(params));
+    EXPECT_EQ(reply.data["total"].asUInt64(), reply.data["files"].size());
+    Found found{{}, 0, true};
+    for (const Json::Value& file : reply.data["files"]) {
+      found.paths.push_back(file["real_path"].asString());
+    }
+    return found;
+  }
+
+  Way Program() {
+    return [this](const auto& params, const auto& folder) { return ByProgram(params, folder); };
   }
 };
 
+TEST_F(Differential, EveryCriterionThroughTheEngine) {
+  MakeHostileTree(share_ + "/tree");
+  CompareAll(share_ + "/tree",
+             [this](const auto& params, const auto& folder) { return ByEngine(params, folder); });
+}
+
+TEST_F(Differential, EveryCriterionExplained) {
+  MakeHostileTree(share_ + "/tree");
+  CompareAll(share_ + "/tree", [this](const auto& params, const auto& folder) {
+    return ByExplaining(params, folder);
+  });
+}
+
 TEST_F(Differential, EveryCriterionThroughTheProgram) {
   MakeHostileTree(share_ + "/tree");
-  for (const Case& row : Cases()) Compare(row, share_ + "/tree");
+  CompareAll(share_ + "/tree", Program());
 }
 
 TEST_F(Differential, EveryCriterionThroughTheApi) {
   MakeHostileTree(share_ + "/tree");
-  for (const Case& row : Cases()) {
-    SCOPED_TRACE(row.why);
-    Json::Value params = Json_(row.params);
-    const Reference expected =
-        Walk(share_ + "/tree", params.get("recursive", true).asBool(), row.wanted);
-    params["folder_path"] = "/share/tree";
-    if (!params.isMember("search_content")) params["search_content"] = false;
-    const Reply reply = ListToEnd(Start(params));
-    // Names that are not UTF-8 are cleaned for the client, so paths are counted and the clean ones
-    // compared.
-    EXPECT_EQ(reply.data["total"].asUInt64(), expected.paths.size());
-    EXPECT_EQ(reply.data["files"].size(), expected.paths.size());
-    for (const Json::Value& file : reply.data["files"]) {
-      const std::string path = file["real_path"].asString();
-      const bool cleaned = path.find("\uFFFD") != std::string::npos;
-      EXPECT_TRUE(cleaned || expected.paths.contains(path)) << path;
-    }
-  }
+  CompareAll(share_ + "/tree",
+             [this](const auto& params, const auto& folder) { return ByApi(params, folder); });
 }
 
 TEST_F(Differential, UnreadableFoldersAreSkippedAndCountedForAnOrdinaryUser) {
@@ -199,9 +165,8 @@ TEST_F(Differential, UnreadableFoldersAreSkippedAndCountedForAnOrdinaryUser) {
   for (const char* below : {"/docs", "/\u00dcber"}) {
     ASSERT_EQ(chmod((share_ + "/tree" + below).c_str(), 0), 0);
   }
-  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
-    for (const Case& row : Cases()) Compare(row, share_ + "/tree");
-  }));
+  EXPECT_TRUE(
+      InOrdinaryChild([&](const std::string&) { CompareAll(share_ + "/tree", Program()); }));
 }
 
 TEST_F(Differential, OwnerAndGroup) {
@@ -212,7 +177,7 @@ TEST_F(Differential, OwnerAndGroup) {
       {"group", R"({"group": "bin"})", [](const Entry& e) { return e.info.st_gid == 2; }},
       {"both", R"({"owner": "root", "group": "bin"})", [](const Entry&) { return false; }},
   };
-  for (const Case& row : cases) Compare(row, share_ + "/tree");
+  for (const Case& row : cases) Compare(row, share_ + "/tree", Program());
 }
 
 // A folder is reached through whatever share it lies in, or one of its own, and searched once.
@@ -220,7 +185,7 @@ TEST_F(Differential, FoldersOfEveryKind) {
   MakeHostileTree(share_ + "/tree");
   MakeHostileTree(dir_ + "/elsewhere/homes/ann");
   const std::string tree = share_ + "/tree";
-  const Wanted all = [](const Entry&) { return true; };
+  const auto all = [](const Entry&) { return true; };
   struct {
     const char* why;
     std::vector<std::string> folders;
