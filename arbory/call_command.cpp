@@ -39,15 +39,11 @@ int RunCallCommand(const CallOptions& options) {
     throw UsageError("no method " + options.api + " " + std::to_string(options.version) + " " +
                      options.method + "; there are " + Methods(caller.module()));
   }
-  // One byte ahead of the line tells the exit code.
-  const auto encode = [](int code, const Json::Value& data) {
-    return (code == 0 ? "0" : "1") + nas::EncodeJsonReply(code, data) + "\n";
-  };
-  const std::string reply = caller.Call(*row, options.method, params, encode);
-  if (!WriteOut(STDOUT_FILENO, std::string_view(reply).substr(1))) {
+  const nas::Reply reply = caller.Call(*row, options.method, params, nas::EncodeJsonReply);
+  if (!WriteOut(STDOUT_FILENO, reply.body + "\n")) {
     throw std::runtime_error("the reply could not be written");
   }
-  return reply.front() == '0' ? kExitSuccess : kExitNothing;
+  return reply.head.code == 0 ? kExitSuccess : kExitNothing;
 }
 
 }  // namespace arbory

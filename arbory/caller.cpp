@@ -56,13 +56,13 @@ void Caller::BecomeUser() const {
   throw std::runtime_error("cannot act for the user '" + user_ + "': " + std::strerror(errno));
 }
 
-std::string Caller::Call(const NUVA::APIMethod& row, const std::string& method,
-                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
+nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
+                        const Json::Value& params, const nas::ReplyEncoder& encode) const {
   return nas::FinishCall(Begin(row, method, params, encode), encode);
 }
 
-nas::RunningCall Caller::Begin(const NUVA::APIMethod& row, const std::string& method,
-                               const Json::Value& params, const nas::ReplyEncoder& encode) const {
+nas::Child Caller::Begin(const NUVA::APIMethod& row, const std::string& method,
+                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
   return nas::StartCall(row, {method, params, user_, "terminal"}, encode);
 }

@@ -38,11 +38,11 @@ class Caller {
   void BecomeUser() const;
 
   // Makes one call as this user; see nas::RunCall.
-  std::string Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
-                   const nas::ReplyEncoder& encode) const;
+  nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
+                  const nas::ReplyEncoder& encode) const;
   // Begins one; see nas::StartCall.
-  nas::RunningCall Begin(const NUVA::APIMethod& row, const std::string& method,
-                         const Json::Value& params, const nas::ReplyEncoder& encode) const;
+  nas::Child Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
+                   const nas::ReplyEncoder& encode) const;
 
  private:
   nas::Config config_;

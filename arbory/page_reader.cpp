@@ -56,7 +56,7 @@ void PageReader::Forget() {
 
 Page PageReader::Take(const std::function<bool()>& go_on) {
   if (asked_.empty()) Ask();
-  nas::RunningCall call = std::move(asked_.front().call);
+  nas::Child call = std::move(asked_.front().call);
   wanted_ = asked_.front().rows;
   asked_.pop_front();
   return Page(nas::FinishCall(std::move(call), encode_, go_on));

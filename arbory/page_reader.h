@@ -33,7 +33,7 @@ class PageReader {
 
  private:
   struct Asked {
-    nas::RunningCall call;
+    nas::Child call;
     std::uint64_t rows = 0;
   };
 

@@ -123,27 +123,26 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
     const Json::Value& files = listed ? data["files"] : Json::Value::nullSingleton();
     const bool finished = listed && data["finished"].asBool();
     const Json::Value& total = listed ? data["total"] : Json::Value::nullSingleton();
-    std::string payload = std::to_string(code) + (finished ? " 1 " : " 0 ") +
-                          std::to_string(files.size()) + " " + std::to_string(total.asUInt()) +
-                          "\n";
+    nas::Reply reply{{.code = code},
+                     (finished ? "1 " : "0 ") + std::to_string(files.size()) + " " +
+                         std::to_string(total.asUInt()) + "\n"};
     constexpr size_t kUsualRowBytes = 128;
-    payload.reserve(payload.size() + files.size() * kUsualRowBytes);
-    for (const Json::Value& file : files) AppendRow(file, format, &payload);
-    return payload;
+    reply.body.reserve(reply.body.size() + files.size() * kUsualRowBytes);
+    for (const Json::Value& file : files) AppendRow(file, format, &reply.body);
+    return reply;
   };
 }
 
-Page::Page(std::string payload) : payload_(std::move(payload)) {
+Page::Page(nas::Reply reply) : body_(std::move(reply.body)) {
   int finished = 0;
   unsigned long long rows = 0;
   unsigned long long total = 0;
   int used = 0;
-  const int fields =
-      std::sscanf(payload_.c_str(), "%d %d %llu %llu%n", &code_, &finished, &rows, &total, &used);
-  if (fields != 4) {
-    code_ = nas::kCodeUnknownFailure;
+  constexpr int kNumbers = 3;
+  if (std::sscanf(body_.c_str(), "%d %llu %llu%n", &finished, &rows, &total, &used) != kNumbers) {
     return;
   }
+  code_ = reply.head.code;
   finished_ = finished != 0;
   rows_ = rows;
   total_ = total;

@@ -2,7 +2,7 @@
 // Pages of a search's listing, turned in the request child into the bytes to print: the parent then
 // only writes them, and a large page is never encoded and parsed as JSON on the way.
 //
-// A page's payload is "CODE FINISHED ROWS TOTAL\n" and the rows as they are printed.
+// A page's body is "FINISHED ROWS TOTAL\n" and the rows as they are printed.
 
 #include <cstdint>
 #include <string>
@@ -24,16 +24,16 @@ struct RowFormat {
 
 class Page {
  public:
-  explicit Page(std::string payload);
+  explicit Page(nas::Reply reply);
   int code() const { return code_; }
   bool finished() const { return finished_; }
   std::uint64_t rows() const { return rows_; }
   // How many rows the search has in all.
   std::uint64_t total() const { return total_; }
-  std::string_view text() const { return std::string_view(payload_).substr(text_at_); }
+  std::string_view text() const { return std::string_view(body_).substr(text_at_); }
 
  private:
-  std::string payload_;
+  std::string body_;
   int code_ = nas::kCodeUnknownFailure;
   bool finished_ = false;
   std::uint64_t rows_ = 0;

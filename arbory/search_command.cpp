@@ -73,18 +73,18 @@ class Search {
  private:
   using Clock = std::chrono::steady_clock;
 
-  std::string Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode) {
+  nas::Reply Call(const char* method, const Json::Value& params, const nas::ReplyEncoder& encode) {
     return caller_.Call(caller_.Method(method), method, params, encode);
   }
 
   void Start(const Json::Value& params) {
     const auto encode = [](int code, const Json::Value& data) {
-      return code == 0 ? data["taskid"].asString() : " " + std::to_string(code);
+      return nas::Reply{{.code = code}, code == 0 ? data["taskid"].asString() : ""};
     };
     // An interrupt waits for the search's id, without which the search could not be stopped.
-    const std::string reply = Call("start", params, encode);
-    if (!reply.starts_with(' ')) {
-      task_id_ = reply;
+    const nas::Reply reply = Call("start", params, encode);
+    if (reply.head.code == 0) {
+      task_id_ = reply.body;
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
@@ -92,7 +92,7 @@ class Search {
     }
     const std::string why = WhyNoSearch(caller_);
     throw std::runtime_error("the search cannot be started: " +
-                             (why.empty() ? "code" + reply : why));
+                             (why.empty() ? "code " + std::to_string(reply.head.code) : why));
   }
 
   // Prints rows in the order they are found.
@@ -208,7 +208,7 @@ class Search {
   void CleanUp() {
     Json::Value params(Json::objectValue);
     params["taskid"] = task_id_;
-    const auto ignore = [](int, const Json::Value&) { return std::string(); };
+    const auto ignore = [](int, const Json::Value&) { return nas::Reply(); };
     if (running_) Call("stop", params, ignore);
     Call("clean", params, ignore);
   }

@@ -65,11 +65,11 @@ std::string WhyNoSearch(const Caller& caller) {
   const NUVA::APIMethod row = {"", 1, "", TryTask};
   const auto encode = [](int code, const Json::Value& data) {
     // Without a text the call did not come as far as making a task.
-    if (data.isString()) return data.asString();
-    return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (code " +
-           std::to_string(code) + ")";
+    std::string why = "the state directory " + nas::CurrentConfig().state_dir +
+                      " cannot be used (code " + std::to_string(code) + ")";
+    return nas::Reply{{.code = code}, data.isString() ? data.asString() : why};
   };
-  return caller.Call(row, "", Json::Value(), encode);
+  return caller.Call(row, "", Json::Value(), encode).body;
 }
 
 }  // namespace arbory

@@ -45,11 +45,12 @@ void Print(const std::string& name, double value, const char* unit) {
 }
 
 // What a page tells, in few bytes: the page itself has been made whole in the child.
-std::string Summary(int code, const Json::Value& data) {
-  if (code != 0) return "error " + std::to_string(code);
-  if (data.isMember("taskid")) return data["taskid"].asString();
-  return std::to_string(data["files"].size()) + " " + std::to_string(data["total"].asUInt()) + " " +
-         (data["finished"].asBool() ? "1" : "0");
+nas::Reply Summary(int code, const Json::Value& data) {
+  if (code != 0) return {{.code = code}, "error " + std::to_string(code)};
+  if (data.isMember("taskid")) return {{}, data["taskid"].asString()};
+  return {{},
+          std::to_string(data["files"].size()) + " " + std::to_string(data["total"].asUInt()) +
+              " " + (data["finished"].asBool() ? "1" : "0")};
 }
 
 struct Page {
@@ -66,7 +67,7 @@ class Client {
   std::string Call(const char* method, const Json::Value& params) {
     const NUVA::APIMethod* row = module_.Find("NUVA.Arbory.Search", 2, method);
     if (row == nullptr) throw std::runtime_error("no such method");
-    return nas::RunCall(*row, {method, params, user_, "bench"}, Summary);
+    return nas::RunCall(*row, {method, params, user_, "bench"}, Summary).body;
   }
 
   void Start(const std::string& location) {

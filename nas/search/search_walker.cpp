@@ -24,6 +24,7 @@
 #include "nas/search/folder_walk.h"
 #include "nas/search/location.h"
 #include "nas/search/search_job.h"
+#include "nas/system/child.h"
 #include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 #include "platform/task_record.h"
@@ -73,24 +74,19 @@ constexpr int kSortingNiceness = 10;
 
 // Sorts a search's results by every column, so that no listing of a finished search has to wait for
 // it. Done in a process of its own, because it takes some 100 bytes of memory a row, more than a
-// worker shall have, and because the worker may go before it. It gives up every descriptor first:
-// one of them says that the search's worker is alive. No SQLite handle may be open in this process.
+// worker shall have, and because the worker may go before it. It has none of the worker's
+// descriptors, one of which says that the worker is alive. No SQLite handle may be open in this
+// process.
 pid_t StartSorting(const std::string& path) {
-  const pid_t child = fork();
-  if (child != 0) return child;  // where no process can be had, listings sort for themselves
-  signal(SIGTERM, SIG_DFL);
-  closelog();
-  close_range(0, ~0U, 0);
-  if (nice(kSortingNiceness) == -1) errno = 0;
-  // Where memory runs out, this is what the machine can best do without.
-  if (const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC)); score) {
-    (void)nas::WriteAll(score.get(), "1000");
-  }
-  try {
-    nas::ResultReader(path).KeepAllOrderings();
-  } catch (const std::exception&) {
-  }
-  _exit(0);
+  // Where no process can be had, listings sort for themselves.
+  return nas::StartChild([&](int /*pipe*/) {
+           if (nice(kSortingNiceness) == -1) errno = 0;
+           // Where memory runs out, this is what the machine can best do without.
+           const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC));
+           if (score) (void)nas::WriteAll(score.get(), "1000");
+           nas::ResultReader(path).KeepAllOrderings();
+         })
+      .pid;
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-// Running a shell command confined by bubblewrap. The command sees
+// Words for the shell, and running a shell command confined by bubblewrap. The command sees
 //
 //   /usr /bin /sbin /lib* /etc    the system's own, read-only
 //   /dev                          null, zero, random and the like
@@ -15,6 +15,7 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -102,20 +103,15 @@ std::string ReadToEnd(int fd) {
   }
 }
 
-int Fail() {
-  SetLastError(ErrorFromErrno(errno));
-  return -1;
-}
-
-int RunConfined(const std::vector<const char*>& command) {
+Result<int> RunConfined(const std::vector<const char*>& command) {
   int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) return Fail();
+  if (pipe2(ends, O_CLOEXEC) != 0) return ErrnoError();
   const UniqueFd report(ends[0]);
   UniqueFd status(ends[1]);
   CommandLine line = Confine(command, status.get());
   const std::vector<char*> words = line.Pointers();
   const pid_t child = fork();
-  if (child < 0) return Fail();
+  if (child < 0) return ErrnoError();
   if (child == 0) {
     // Kept open for bubblewrap alone, which closes it before it runs the command.
     if (fcntl(status.get(), F_SETFD, 0) == 0) execv(kBubblewrap, words.data());
@@ -123,10 +119,20 @@ int RunConfined(const std::vector<const char*>& command) {
   }
   status.Reset();
   const std::string text = ReadToEnd(report.get());
-  Uninterrupted([=] { return waitpid(child, nullptr, 0); });
+  int ended = 0;
+  while (waitpid(child, &ended, 0) < 0 && errno == EINTR) {
+  }
   const int code = ReportedStatus(text);
-  if (code < 0) SetLastError(kErrorOther);
+  if (code < 0) return Error{kErrorOther, 0, kBubblewrap};
   return code;
+}
+
+Result<int> RunForGood(const char* program, const std::vector<const char*>& command) {
+  const gid_t group = getegid();
+  const uid_t user = geteuid();
+  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) return ErrnoError();
+  if (program == nullptr || access(program, X_OK) != 0) return ErrnoError();
+  return RunConfined(command);
 }
 
 }  // namespace
@@ -134,14 +140,31 @@ int RunConfined(const std::vector<const char*>& command) {
 
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3,
               int /*flags*/) {
-  const gid_t group = getegid();
-  const uid_t user = geteuid();
-  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) return nas::Fail();
-  if (program == nullptr || access(program, X_OK) != 0) return nas::Fail();
   std::vector<const char*> command = {program};
   for (const char* argument : {arg1, arg2, arg3}) {
     if (argument == nullptr) break;
     command.push_back(argument);
   }
-  return nas::RunConfined(command);
+  const nas::Result<int> status = nas::RunForGood(program, command);
+  if (status) return *status;
+  nas::Report(status.error());
+  return -1;
+}
+
+// Within single quotes the shell gives no byte a meaning, so only a single quote itself must step
+// outside them.
+int NLIBCEncShParam(const char* text, char* buffer, size_t size) {
+  if (text == nullptr || buffer == nullptr) return -1;
+  std::string word = "'";
+  for (const char* at = text; *at != '\0'; ++at) {
+    if (*at == '\'') {
+      word += "'\\''";
+    } else {
+      word += *at;
+    }
+  }
+  word += '\'';
+  if (word.size() + 1 > size) return -1;
+  std::memcpy(buffer, word.c_str(), word.size() + 1);
+  return 0;
 }

@@ -1,18 +1,14 @@
 #pragma once
-// The life of a request child, from the fork to its end.
+// What a request child does for its call.
 
 #include "nas/webapi/runner.h"
 
 namespace nas {
 
-// Serves the call in the process that was just forked for it and ends that process. `pipe_fd` is
-// the writable end of the pipe.
-[[noreturn]] void ServeInChild(const NUVA::APIMethod& row, const ApiCall& call,
-                               const ReplyEncoder& encode, int pipe_fd);
-
-// For servers that fork children of other kinds: makes the process that was just forked a plain
-// one, as above, with only the standard streams (/dev/null) and `fd` open, whose new number is the
-// result. -1 on failure.
-int EnterChild(int fd);
+// Becomes the call's user for the rest of the process and calls the row's entry function. The code
+// of a failure to become the user, with null data, where that fails; kCodeUnknownFailure where the
+// entry function throws or gives no reply. Throws what `encode` does. A worker that the entry
+// function forked may come back from here too.
+Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
 }  // namespace nas

@@ -32,7 +32,7 @@ class RunnerTest : public PlatformTest {
   std::string Run(NUVA::APIEntry entry, const Json::Value& params = Json::Value(),
                   const std::string& user = Me()) {
     const NUVA::APIMethod row = {"Api", 2, "method", entry};
-    return nas::RunCall(row, {"MeThod", params, user, "sid"}, nas::EncodeJsonReply);
+    return nas::RunCall(row, {"MeThod", params, user, "sid"}, nas::EncodeJsonReply).body;
   }
 };
 
@@ -220,22 +220,50 @@ TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
   EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":65534,"wrote":true}})");
 }
 
-TEST_F(RunnerTest, FramesAreTakenInAnyPieces) {
-  const std::uint64_t length = 5;
-  const std::string frame =
-      std::string(reinterpret_cast<const char*>(&length), sizeof length) + "hello";
-  for (size_t piece = 1; piece <= frame.size() + 4; ++piece) {
-    nas::FrameReader reader;
-    const std::string bytes = frame + "more";
-    for (size_t at = 0; at < bytes.size(); at += piece) {
-      const size_t count = std::min(piece, bytes.size() - at);
-      EXPECT_EQ(reader.Feed(bytes.data() + at, count), at + count >= frame.size());
+std::string Frame(const std::string& text) {
+  const std::uint64_t length = text.size();
+  return std::string(reinterpret_cast<const char*>(&length), sizeof length) + text;
+}
+
+using State = nas::ReplyReader::State;
+
+TEST(ReplyReader, TakesAFrameInAnyPieces) {
+  const std::string head = Frame("206 7\nName: a: b\nOther: \n\nhello");
+  const std::string bytes = head + "what a worker wrote";
+  for (size_t piece = 1; piece <= bytes.size(); ++piece) {
+    nas::ReplyReader reader;
+    State state = State::kMore;
+    size_t at = 0;
+    for (; at < bytes.size() && state == State::kMore; at += piece) {
+      state = reader.Feed(bytes.substr(at, piece));
     }
-    EXPECT_EQ(reader.TakePayload(), "hello") << piece;
+    ASSERT_EQ(state, State::kReady) << piece;
+    EXPECT_EQ(reader.head().status, 206);
+    EXPECT_EQ(reader.head().code, 7);
+    const decltype(reader.head().fields) fields = {{"Name", "a: b"}, {"Other", ""}};
+    EXPECT_EQ(reader.head().fields, fields);
+    EXPECT_EQ(reader.body_bytes(), 5U);
+    EXPECT_EQ(reader.body_begin(), std::string("hello").substr(0, at - (head.size() - 5))) << piece;
   }
-  nas::FrameReader absurd;
-  EXPECT_FALSE(absurd.Feed(std::string(100, '\xFF').data(), 100));
-  EXPECT_TRUE(absurd.TakePayload().empty());
+}
+
+TEST(ReplyReader, RefusesWhatIsNoFrame) {
+  const struct {
+    const char* why;
+    std::string bytes;
+    State state;
+  } rows[] = {
+      {"cut within the length", Frame("200 0\n\n").substr(0, 7), State::kMore},
+      {"cut within the head", Frame("200 0\nName: x\n\n").substr(0, 20), State::kMore},
+      {"ends within the head", Frame("200 0\n"), State::kBroken},
+      {"no numbers", Frame("hello\n\n"), State::kBroken},
+      {"one number", Frame("200\n\n"), State::kBroken},
+      {"more than a number", Frame("200 0x\n\n"), State::kBroken},
+      {"a field without a value", Frame("200 0\nName\n\n"), State::kBroken},
+      {"a head without an end", Frame(std::string(17 << 10, 'x')), State::kBroken},
+      {"a length that cannot be", std::string(100, '\xFF'), State::kBroken},
+  };
+  for (const auto& row : rows) EXPECT_EQ(nas::ReplyReader().Feed(row.bytes), row.state) << row.why;
 }
 
 TEST_F(RunnerTest, WhatIsNotAModuleIsRefused) {

@@ -45,7 +45,8 @@ Reply MakeCall(const std::string& api, int version, const std::string& method,
                const Json::Value& params, const std::string& user) {
   const NUVA::APIMethod* row = LoadedModule().Find(api, version, method);
   if (row == nullptr) return {};
-  const std::string text = nas::RunCall(*row, {method, params, user, "test"}, nas::EncodeJsonReply);
+  const std::string text =
+      nas::RunCall(*row, {method, params, user, "test"}, nas::EncodeJsonReply).body;
   const Json::Value reply = Json_(text);
   return {reply["code"].asInt(), reply["data"]};
 }

@@ -160,7 +160,7 @@ class ParameterNamesTest : public nas_test::PlatformTest {
     Json::Value parsed, reply;
     EXPECT_TRUE(nas::ParseJson(params, &parsed)) << params;
     const nas::ApiCall call = {method, parsed, nas_test::Me(), "test"};
-    EXPECT_TRUE(nas::ParseJson(nas::RunCall(row, call, nas::EncodeJsonReply), &reply));
+    EXPECT_TRUE(nas::ParseJson(nas::RunCall(row, call, nas::EncodeJsonReply).body, &reply));
     EXPECT_EQ(reply["code"], 0) << method << params;
     return reply["data"];
   }

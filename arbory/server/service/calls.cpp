@@ -8,7 +8,7 @@ namespace {
 constexpr char kRetrySeconds[] = "1";
 
 // The reply as the child says it.
-HttpReply ChildsReply(const ChildHead* head) {
+HttpReply ChildsReply(const nas::ReplyHead* head) {
   if (head == nullptr) return ErrorReply(kUnavailable, "The server failed here; try again.");
   HttpReply reply;
   reply.status = head->status;
@@ -21,7 +21,7 @@ HttpReply ChildsReply(const ChildHead* head) {
 }  // namespace
 
 Answer Calls::Run(const std::string& user, const std::string& name,
-                  const std::function<nas::RunningCall()>& start) {
+                  const std::function<nas::Child()>& start) {
   int& of_user = by_user_[user];
   if (running_() >= static_cast<size_t>(limits_.all) || of_user >= limits_.of_one_user) {
     return BusyReply(kUnavailable, "The server is busy; try again in a moment.", kRetrySeconds);
@@ -37,7 +37,7 @@ Answer Calls::Run(const std::string& user, const std::string& name,
     if (--by_user_[user] == 0) by_user_.erase(user);
   });
   const auto begun = Clock::now();
-  answer.make_reply = [this, name, begun](const ChildHead* head) {
+  answer.make_reply = [this, name, begun](const nas::ReplyHead* head) {
     const std::chrono::duration<double> spent = Clock::now() - begun;
     metrics_.CountCall(name, head == nullptr ? nas::kCodeUnknownFailure : head->code,
                        spent.count());

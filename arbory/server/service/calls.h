@@ -28,7 +28,7 @@ class Calls {
   // forked. `name` names the call in the counts: a route or a row of the module, never what a
   // client made up. A child that ends without a reply is answered for with 503.
   Answer Run(const std::string& user, const std::string& name,
-             const std::function<nas::RunningCall()>& start);
+             const std::function<nas::Child()>& start);
 
  private:
   const CallLimits limits_;

@@ -109,7 +109,7 @@ Answer Entrance::Login(const HttpRequest& request) {
       calls_.Run(request.user, "login", [&] { return StartLogin(credentials, rules_.pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, Clock::now()},
-                         count = std::move(child->make_reply)](const ChildHead* head) {
+                         count = std::move(child->make_reply)](const nas::ReplyHead* head) {
       count(head);
       return LoginReply(attempt, head);
     };
@@ -117,7 +117,7 @@ Answer Entrance::Login(const HttpRequest& request) {
   return answer;
 }
 
-HttpReply Entrance::LoginReply(const Attempt& attempt, const ChildHead* head) {
+HttpReply Entrance::LoginReply(const Attempt& attempt, const nas::ReplyHead* head) {
   if (head != nullptr && head->status == kOk) {
     const auto named = SplitPath("/" + head->fields.at(0).second);
     const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
@@ -160,7 +160,7 @@ Answer Entrance::Logout(const HttpRequest& request) {
     return answer;
   }
   auto& child = std::get<ChildAnswer>(answer);
-  child.make_reply = [make = std::move(child.make_reply), gone](const ChildHead* head) {
+  child.make_reply = [make = std::move(child.make_reply), gone](const nas::ReplyHead* head) {
     HttpReply reply = make(head);
     reply.fields.emplace_back("Set-Cookie", gone);
     return reply;

@@ -52,7 +52,7 @@ class Entrance {
     std::string peer, user;
     Clock::time_point begun;  // the check, as a client may draw its request out as it likes
   };
-  HttpReply LoginReply(const Attempt& attempt, const ChildHead* head);
+  HttpReply LoginReply(const Attempt& attempt, const nas::ReplyHead* head);
   HttpReply SessionReply(const Sessions::Session& session) const;
   std::string SessionCookie(const std::string& id, long max_age) const;
   std::string NewSessionCookie(const std::string& id) const;

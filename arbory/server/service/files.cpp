@@ -10,10 +10,10 @@
 #include <charconv>
 #include <climits>
 
-#include "arbory/server/transport/child.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
 #include "nas/base/system_call.h"
+#include "nas/system/child.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -69,7 +69,7 @@ nas::UniqueFd OpenBeneath(int root, const std::vector<std::string>& path) {
 
 void SendError(int pipe, int status, const char* sentence) {
   const HttpReply reply = ErrorReply(status, sentence);
-  SendReply(pipe, {status, status, reply.fields}, reply.body);
+  nas::SendReply(pipe, {{status, status, reply.fields}, reply.body});
 }
 
 // What is no file and what lies outside the share is as if it were not there.
@@ -91,10 +91,10 @@ std::string HttpDate(time_t time) {
   return {text, strftime(text, sizeof text, "%a, %d %b %Y %H:%M:%S GMT", &parts)};
 }
 
-ChildHead HeadOf(const FileRequest& request, const struct stat& info, const ByteRange& range) {
+nas::ReplyHead HeadOf(const FileRequest& request, const struct stat& info, const ByteRange& range) {
   const std::string& name = request.path.back();
   const std::string type = request.preview ? PreviewType(name) : std::string();
-  ChildHead head{range.partial ? kPartial : kOk, 0, {}};
+  nas::ReplyHead head{range.partial ? kPartial : kOk, 0, {}};
   head.fields = {{"Content-Type", type.empty() ? "application/octet-stream" : type},
                  {"Content-Disposition", ContentDisposition(!type.empty(), name)},
                  {"Content-Security-Policy", type == kPdf ? kPdfPolicy : kPreviewPolicy},
@@ -137,12 +137,12 @@ void ServeFile(const FileRequest& request, int pipe) {
   const ByteRange range = ParseRange(request.range, size);
   if (!range.satisfiable) {
     const HttpReply reply = ErrorReply(kNotSatisfiable, "The file has none of these bytes.");
-    ChildHead head{kNotSatisfiable, kNotSatisfiable, reply.fields};
+    nas::ReplyHead head{kNotSatisfiable, kNotSatisfiable, reply.fields};
     head.fields.emplace_back("Content-Range", "bytes */" + std::to_string(size));
-    SendReply(pipe, head, reply.body);
+    nas::SendReply(pipe, {head, reply.body});
     return;
   }
-  if (!SendHead(pipe, HeadOf(request, info, range), range.count) || request.head_only) return;
+  if (!nas::SendHead(pipe, HeadOf(request, info, range), range.count) || request.head_only) return;
   SendBytes(pipe, file.get(), range);
 }
 
@@ -153,8 +153,8 @@ bool ParseNumber(std::string_view text, std::uint64_t* number) {
 
 }  // namespace
 
-nas::RunningCall StartFile(const FileRequest& request) {
-  return StartChild([&](int pipe) { ServeFile(request, pipe); });
+nas::Child StartFile(const FileRequest& request) {
+  return nas::StartChild([&](int pipe) { ServeFile(request, pipe); });
 }
 
 ByteRange ParseRange(const std::string& field, std::uint64_t size) {

@@ -20,7 +20,7 @@ struct FileRequest {
 };
 
 // Replies 200, 206 or 416 with the file's fields and bytes, or an error's status and JSON.
-nas::RunningCall StartFile(const FileRequest& request);
+nas::Child StartFile(const FileRequest& request);
 
 // The first and last byte that a Range field asks for of a file of `size` bytes. Nothing to ask
 // for (no field, several ranges, or none that is understood) gives the whole file; `satisfiable`

@@ -6,9 +6,9 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "arbory/server/transport/child.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/accounts.h"
+#include "nas/system/child.h"
 
 namespace arbory {
 namespace {
@@ -68,8 +68,8 @@ class Pam {
   int status_ = PAM_ABORT;
 };
 
-ChildHead CheckLogin(const Credentials& credentials, const PamService& service) {
-  const ChildHead refused{kForbidden, kForbidden, {}};
+nas::ReplyHead CheckLogin(const Credentials& credentials, const PamService& service) {
+  const nas::ReplyHead refused{kForbidden, kForbidden, {}};
   Pam pam(credentials, service);
   const int status = pam.Check();
   // Modules tell a wrong password by many codes, some of which are also those of their own trouble,
@@ -86,8 +86,10 @@ ChildHead CheckLogin(const Credentials& credentials, const PamService& service) 
 
 }  // namespace
 
-nas::RunningCall StartLogin(const Credentials& credentials, const PamService& service) {
-  return StartChild([&](int pipe) { SendReply(pipe, CheckLogin(credentials, service), ""); });
+nas::Child StartLogin(const Credentials& credentials, const PamService& service) {
+  return nas::StartChild([&](int pipe) {
+    nas::SendReply(pipe, {CheckLogin(credentials, service), {}});
+  });
 }
 
 }  // namespace arbory

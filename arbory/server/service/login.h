@@ -20,7 +20,7 @@ struct PamService {
 
 // The child's reply has status 200 and the field kLoginUser, the account's name encoded, when PAM
 // lets the user in, and 403 when it does not, for whatever reason: the log says why.
-nas::RunningCall StartLogin(const Credentials& credentials, const PamService& service);
+nas::Child StartLogin(const Credentials& credentials, const PamService& service);
 inline constexpr char kLoginUser[] = "User";
 
 }  // namespace arbory

@@ -8,11 +8,11 @@
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/user_calls.h"
-#include "arbory/server/transport/child.h"
+#include "arbory/server/transport/children.h"
 #include "arbory/server/transport/http_text.h"
-#include "arbory/server/transport/processes.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/system/child.h"
 
 namespace arbory {
 namespace {
@@ -177,13 +177,13 @@ Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
     // The id is the key to the account, which no log line of the module needs to hold whole.
     constexpr size_t kShown = 8;
     return nas::StartCall(*row, {path[3], *params, request.user, session.substr(0, kShown)},
-                          EncodeApiReply);
+                          nas::EncodeJsonReply);
   });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
-    child->make_reply = [make = std::move(child->make_reply)](const ChildHead* head) {
+    child->make_reply = [make = std::move(child->make_reply)](const nas::ReplyHead* head) {
       HttpReply reply = make(head);
       if (head != nullptr) return reply;
-      return JsonReply(kOk, nas::EncodeJsonReply(nas::kCodeUnknownFailure, Json::Value()));
+      return JsonReply(kOk, nas::EncodeJsonReply(nas::kCodeUnknownFailure, Json::Value()).body);
     };
   }
   return answer;

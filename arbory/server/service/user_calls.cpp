@@ -7,7 +7,8 @@
 #include <vector>
 
 #include "arbory/running_search.h"
-#include "arbory/server/transport/child.h"
+#include "arbory/server/transport/http_text.h"
+#include "nas/base/json_text.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -114,24 +115,34 @@ void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   response->SetError(kOk, body);
 }
 
-nas::RunningCall Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
+// The code is the HTTP status and the data its JSON body.
+nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
+  if (!data.isNull()) return {{code, code}, nas::JsonText(data, nas::JsonBytes::kClean)};
+  // The runner answers by itself, without data, when the call could not even begin.
+  return {
+      {kUnavailable, kUnavailable},
+      ErrorReply(kUnavailable, "The user's state folder cannot be used; the system log says why.")
+          .body};
+}
+
+nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
   const NUVA::APIMethod row = {"arbory", 1, "", entry};
   return nas::StartCall(row, {"", params, user, "server"}, EncodeOwnReply);
 }
 
 }  // namespace
 
-nas::RunningCall StartListShares(const std::string& user) {
+nas::Child StartListShares(const std::string& user) {
   return Start(ListSharesEntry, user, Json::Value());
 }
 
-nas::RunningCall StartReadSearch(const std::string& user, const std::string& task_id) {
+nas::Child StartReadSearch(const std::string& user, const std::string& task_id) {
   Json::Value params;
   params[kTaskId] = task_id;
   return Start(ReadSearchEntry, user, params);
 }
 
-nas::RunningCall StartStopSearches(const std::string& user, const NUVA::APIMethod& stop) {
+nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop) {
   g_stop = &stop;
   return Start(StopSearchesEntry, user, Json::Value());
 }

@@ -10,13 +10,13 @@
 namespace arbory {
 
 // {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list.
-nas::RunningCall StartListShares(const std::string& user);
+nas::Child StartListShares(const std::string& user);
 
 // {"taskid","finished","progress","errno","location","walk"} of the user's search; 404 when there
 // is none of that id.
-nas::RunningCall StartReadSearch(const std::string& user, const std::string& task_id);
+nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 
 // Stops the user's running searches by the module's own method "stop". {"stopped":N}.
-nas::RunningCall StartStopSearches(const std::string& user, const NUVA::APIMethod& stop);
+nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop);
 
 }  // namespace arbory

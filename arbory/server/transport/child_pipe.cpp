@@ -16,8 +16,8 @@ constexpr size_t kReadBytes = size_t{64} << 10;
 
 }  // namespace
 
-ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::RunningCall child,
-                     std::shared_ptr<void> token, std::chrono::seconds patience)
+ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::Child child, std::shared_ptr<void> token,
+                     std::chrono::seconds patience)
     : pipe_(loop),
       timer_(loop),
       pid_(child.pid),

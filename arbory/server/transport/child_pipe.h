@@ -20,7 +20,7 @@ namespace arbory {
 class ChildPipe : public std::enable_shared_from_this<ChildPipe> {
  public:
   // Kills the child when it lets `patience` pass without giving or ending anything.
-  ChildPipe(boost::asio::io_context& loop, nas::RunningCall child, std::shared_ptr<void> token,
+  ChildPipe(boost::asio::io_context& loop, nas::Child child, std::shared_ptr<void> token,
             std::chrono::seconds patience);
 
   using Reader = std::function<void(std::string_view bytes)>;

@@ -212,15 +212,15 @@ void Connection::AwaitChild(ChildAnswer answer) {
 }
 
 void Connection::OnChildBytes(std::string_view bytes) {
-  const auto state = bytes.empty() ? HeadReader::State::kBroken : head_reader_->Feed(bytes);
-  if (state == HeadReader::State::kMore) {
+  const auto state = bytes.empty() ? nas::ReplyReader::State::kBroken : head_reader_->Feed(bytes);
+  if (state == nas::ReplyReader::State::kMore) {
     child_->Read([self = shared_from_this()](std::string_view more) { self->OnChildBytes(more); });
   } else {
-    OnChildHead(state == HeadReader::State::kReady ? &head_reader_->head() : nullptr);
+    OnChildHead(state == nas::ReplyReader::State::kReady ? &head_reader_->head() : nullptr);
   }
 }
 
-void Connection::OnChildHead(const ChildHead* head) {
+void Connection::OnChildHead(const nas::ReplyHead* head) {
   const auto make_reply = std::move(make_reply_);
   HttpReply reply = make_reply(head);
   const bool relays = reply.child_follows && head != nullptr && request_.method != "HEAD";

@@ -12,9 +12,9 @@
 #include <optional>
 #include <string>
 
-#include "arbory/server/transport/child.h"
 #include "arbory/server/transport/child_pipe.h"
 #include "arbory/server/transport/http.h"
+#include "nas/system/child.h"
 #include "nas/system/config.h"
 
 namespace arbory {
@@ -61,7 +61,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void SendNow(HttpReply reply);
   void AwaitChild(ChildAnswer answer);
   void OnChildBytes(std::string_view bytes);
-  void OnChildHead(const ChildHead* head);
+  void OnChildHead(const nas::ReplyHead* head);
   void Relay();
   std::string HeadText(const HttpReply& reply, std::uint64_t length) const;
 
@@ -84,8 +84,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
   bool keep_alive_ = false;
 
   std::shared_ptr<ChildPipe> child_;
-  std::function<HttpReply(const ChildHead*)> make_reply_;
-  std::optional<HeadReader> head_reader_;
+  std::function<HttpReply(const nas::ReplyHead*)> make_reply_;
+  std::optional<nas::ReplyReader> head_reader_;
   std::uint64_t body_left_ = 0;  // of what the child still has to send
 
   int status_ = 0;

@@ -71,17 +71,10 @@ struct HttpReply {
   std::optional<Clock::time_point> not_before = {};  // hides how long the answer took to find
 };
 
-// How a child begins its reply; see child.h.
-struct ChildHead {
-  int status = 0;
-  int code = 0;
-  Fields fields;
-};
-
 struct ChildAnswer {
-  nas::RunningCall child;
+  nas::Child child;
   // Turns the head, or null when the child ended or stayed silent without one, into the reply.
-  std::function<HttpReply(const ChildHead* head)> make_reply;
+  std::function<HttpReply(const nas::ReplyHead* head)> make_reply;
   // Lives as long as the child, which may be longer than the exchange.
   std::shared_ptr<void> token;
 };

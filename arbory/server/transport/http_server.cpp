@@ -16,8 +16,8 @@
 #include <unordered_map>
 
 #include "arbory/server/transport/child_pipe.h"
+#include "arbory/server/transport/children.h"
 #include "arbory/server/transport/connection.h"
-#include "arbory/server/transport/processes.h"
 
 namespace arbory {
 namespace {

@@ -1,4 +1,4 @@
-#include "arbory/server/transport/processes.h"
+#include "arbory/server/transport/children.h"
 
 #include <unistd.h>
 
