@@ -112,6 +112,20 @@ TEST(Start, FailuresAnswer401) {
             (Trace{"log S:862 Failed to fork().", "~Task(new)", "reply 401 null"}));
 }
 
+TEST(Start, LeavesNothingBehindHoweverItEnds) {
+  Script refused = StartScript("/a");
+  refused.fail = {"RunIdentity"};
+  refused.wfm_error = 407;
+  EXPECT_EQ(Serve(refused, SearchAPIEntry),
+            (Trace{"WfmLibUmask()", "RunIdentity(null,ann)",
+                   "log webfm_webapi:54 Failed to set UGID, Permission denied", "reply 407 null",
+                   "WfmLibRestoreUmask(18)", "returned"}));
+  Script thrown = StartScript("/a");
+  thrown.Arrange("throw IsShareIndexed");
+  EXPECT_EQ(Keep(Serve(thrown, SearchAPIEntry), {"reply", "~Task", "WfmLibRestore", "threw"}),
+            (Trace{"~Task(new)", "WfmLibRestoreUmask(18)", "threw IsShareIndexed"}));
+}
+
 Script WorkerScript() {
   Script play = StartScript("/photo,/music");
   play.fork_result = 0;

@@ -110,6 +110,8 @@ TEST_F(BadInput, LaterCalls) {
       {"paths as ids", "clean", R"({"taskid": ["../x", "/etc/passwd", ""]})", 0, "{}"},
       {"a method by another spelling", "List", R"({"taskid": "ID"})", 101, nullptr},
       {"an action that is none", "Clean", R"({"action": "everything"})", 101, nullptr},
+      {"an object as action", "Clean", R"({"action": {}})", 101, nullptr},
+      {"an action beside a method of its own", "clean", R"({"action": "cleanall"})", 400, nullptr},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(std::string(row.method) + ": " + row.why);
@@ -154,7 +156,12 @@ TEST_F(BadInput, CommandLine) {
       {{"search", "x", "--share", "home=/etc"}, "home"},
       {{"search", "x", "--config", "/nonexistent/x.toml"}, "/nonexistent/x.toml"},
       {{"search", "x", "--user", "nob0dy"}, "no user 'nob0dy'"},
-      {{"call", "NUVA.Arbory.Search", "3", "start"}, "no method"},
+      {{"call", "NUVA.Arbory.Search", "3", "start"},
+       "no method NUVA.Arbory.Search 3 start; there are NUVA.Arbory.Search 1 start, "
+       "NUVA.Arbory.Search 1 list, NUVA.Arbory.Search 1 stop, NUVA.Arbory.Search 1 clean, "
+       "NUVA.Arbory.Search 2 start, NUVA.Arbory.Search 2 list, NUVA.Arbory.Search 2 stop, "
+       "NUVA.Arbory.Search 2 clean, NUVA.Arbory.Search.History 1 get, "
+       "NUVA.Arbory.Search.History 1 set, NUVA.Arbory.Search.History 1 delete\n"},
       {{"call", "NUVA.Arbory.Search", "2", "start", "[]"}, "object"},
       {{"call", "NUVA.Arbory.Search", "2", "start", "{"}, "not valid JSON"},
       {{"call", "NUVA.Arbory.Search", "2", "start", deep}, "not valid JSON"},

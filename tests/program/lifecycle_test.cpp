@@ -1,13 +1,17 @@
 // The life of a search: killed, stopped, cleaned, interrupted, and what each leaves behind.
 
 #include <signal.h>
+#include <sys/inotify.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <filesystem>
 
 #include "arbory/running_search.h"
+#include "nas/base/unique_fd.h"
 #include "nas/system/user_state.h"
 #include "tests/program/program_test.h"
 
@@ -18,6 +22,8 @@ namespace fs = std::filesystem;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+using testing::Not;
+using testing::UnorderedElementsAreArray;
 
 class Lifecycle : public ProgramTest {
  protected:
@@ -69,6 +75,32 @@ class Lifecycle : public ProgramTest {
   }
 };
 
+// Which files of these folders are removed, in order.
+class Removals {
+ public:
+  explicit Removals(const std::vector<std::string>& folders) {
+    for (const std::string& folder : folders) {
+      EXPECT_GE(inotify_add_watch(events_.get(), folder.c_str(), IN_DELETE), 0) << folder;
+    }
+  }
+  // Of the files named by an id: databases and records, without what lies beside them.
+  std::vector<std::string> Suffixes() const {
+    std::vector<std::string> suffixes;
+    alignas(inotify_event) char bytes[size_t{1} << 14];
+    const ssize_t count = read(events_.get(), bytes, sizeof bytes);
+    for (ssize_t at = 0; at < count;) {
+      const auto* event = reinterpret_cast<const inotify_event*>(bytes + at);
+      const std::string suffix = fs::path(event->name).extension();
+      if (suffix == ".db" || suffix == ".json") suffixes.push_back(suffix);
+      at += static_cast<ssize_t>(sizeof *event + event->len);
+    }
+    return suffixes;
+  }
+
+ private:
+  nas::UniqueFd events_{inotify_init1(IN_NONBLOCK | IN_CLOEXEC)};
+};
+
 TEST_F(Lifecycle, AKilledWorkerLeavesAFinishedSearchThatCanBeCleaned) {
   for (const std::string stage : {"contents", "located", "started"}) {
     SCOPED_TRACE(stage);
@@ -88,17 +120,25 @@ TEST_F(Lifecycle, AKilledWorkerLeavesAFinishedSearchThatCanBeCleaned) {
 }
 
 TEST_F(Lifecycle, StopEndsTheWorkerAndKeepsWhatWasFound) {
+  prctl(PR_SET_CHILD_SUBREAPER, 1);  // the worker becomes this process's child
   const std::string id = StartEndless();
+  prctl(PR_SET_CHILD_SUBREAPER, 0);
   ASSERT_TRUE(Reaches(id, "contents"));
   const pid_t worker = Worker(id);
   const auto begin = std::chrono::steady_clock::now();
   EXPECT_EQ(Call("stop", Id("00000000000000000000000000000000," + id)).code, 0);
-  EXPECT_TRUE(Eventually([&] { return !Lives(worker); }));
+  int status = -1;
+  EXPECT_TRUE(Eventually([&] { return waitpid(worker, &status, WNOHANG) == worker; }));
   EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(2));
+  EXPECT_EQ(status, 0) << "told to stop, it ends by itself";
   const Reply list = ListToEnd(id);
   ASSERT_EQ(list.data["files"].size(), 1U);
   EXPECT_EQ(list.data["files"][0]["name"], "one.txt");
   EXPECT_EQ(TaskProperty(id, "progress"), 0);
+  const char* const failure = "Failed To parse the find parameters";
+  EXPECT_THAT(Logged(), Not(HasSubstr(failure))) << "a search that was stopped has not failed";
+  ListToEnd(Start(Json_(R"({"folder_path": "/spoon", "pattern": "one"})")));
+  EXPECT_THAT(Logged(), HasSubstr(failure));
 }
 
 TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
@@ -107,12 +147,16 @@ TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
   ASSERT_TRUE(Reaches(running, "contents"));
   const std::string kept = StartQuick("two");
   const pid_t worker = Worker(running);
+  Removals removals({nas::TaskFolder(nas_test::Me()),
+                     fs::path(Databases(dir_ + "/volume1", nas_test::Me()).at(0)).parent_path()});
   EXPECT_EQ(Call("clean", Id(first + "," + running)).code, 0);
   EXPECT_TRUE(Eventually([&] {
     return TaskProperty(first, "data") == "gone" && TaskProperty(running, "data") == "gone";
   }));
   EXPECT_TRUE(Eventually([&] { return !Lives(worker); })) << "clean stops what it removes";
   EXPECT_EQ(Databases(dir_ + "/volume1", nas_test::Me()).size(), 1U);
+  // Whoever sees the task can find the database, also when the cleaning is cut short.
+  EXPECT_THAT(removals.Suffixes(), ElementsAre(".db", ".json", ".db", ".json"));
   const Reply gone = Call("list", Id(first));
   EXPECT_EQ(gone.data, Json_(R"({"finished": true})"));
   EXPECT_EQ(ListToEnd(kept).data["total"], 1);
@@ -175,12 +219,64 @@ TEST_F(Lifecycle, HistoryIsWrittenByBothRoads) {
   EXPECT_EQ(CallHistory("set", Json_(R"({"pattern": "x", "search_type": "advance"})")).code, 0);
   EXPECT_EQ(CallHistory("set", Json_(R"({"folder_path": "/share"})")).code, 401);
   EXPECT_THAT(patterns("simple"), ElementsAre("first", "third", "second"));
+  // Neither road makes a second record of a pattern, nor an eleventh of all.
+  EXPECT_EQ(CallHistory("set", Json_(R"({"pattern": "second"})")).code, 0);
+  EXPECT_THAT(patterns("simple"), ElementsAre("second", "first", "third"));
+  for (int number = 0; number < 9; ++number) {
+    Json::Value record;
+    record["pattern"] = "p" + std::to_string(number);
+    EXPECT_EQ(CallHistory("set", record).code, 0);
+  }
+  EXPECT_THAT(patterns("simple"),
+              ElementsAre("p8", "p7", "p6", "p5", "p4", "p3", "p2", "p1", "p0", "second"));
+  StartQuick("third");
+  EXPECT_THAT(patterns("simple"),
+              ElementsAre("third", "p8", "p7", "p6", "p5", "p4", "p3", "p2", "p1", "p0"));
   EXPECT_EQ(CallHistory("delete", Json::Value()).code, 0);
   EXPECT_THAT(patterns("simple"), IsEmpty());
   EXPECT_THAT(patterns("advance"), ElementsAre("x"));
   const Json::Value settings =
       Json_(nas_test::ReadFile(nas::PreferenceFolder(nas_test::Me()) + "/usersettings"));
-  EXPECT_EQ(settings["NUVA.VTX.App.PersonalSettings.Instance"]["search_count"], 3);
+  EXPECT_EQ(settings["NUVA.VTX.App.PersonalSettings.Instance"]["search_count"], 4);
+}
+
+// However the user's home is named, it is searched once and shown under one name.
+TEST_F(Lifecycle, HomesAreSearchedUnderOneName) {
+  const std::string me = nas_test::Me();
+  for (const std::string& folder : {"homes/" + me, "homes/" + me + "/docs", std::string("share")}) {
+    WriteFile(MakeFolder("volume1/" + folder) + "/plan.txt", "x");
+  }
+  const std::vector<std::string> home = {"/home/plan.txt", "/home/docs/plan.txt"};
+  const struct {
+    std::string folders;
+    std::string searched;
+    std::vector<std::string> found;
+  } rows[] = {
+      {"/home", "/homes/" + me, home},
+      {"/home,/homes/" + me, "/homes/" + me, home},
+      {"/homes/" + me + "/docs,/home", "/homes/" + me, home},
+      {"/homes,/home/docs", "/homes", home},
+      {"/home/docs,/share", "/share /homes/" + me + "/docs", {"/share/plan.txt", home[1]}},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.folders);
+    Json::Value params;
+    params["folder_path"] = row.folders;
+    params["pattern"] = "plan";
+    const Reply reply = Call("start", params);
+    EXPECT_EQ(reply.data["has_not_index_share"], true) << "no share has an index";
+    const std::string id = reply.data["taskid"].asString();
+    const Reply list = ListToEnd(id);
+    std::vector<std::string> found;
+    for (const Json::Value& file : list.data["files"]) found.push_back(file["path"].asString());
+    EXPECT_THAT(found, UnorderedElementsAreArray(row.found));
+    const Json::Value data = TaskProperty(id, "data");
+    std::string searched;
+    for (const Json::Value& folder : data["location"]) {
+      searched += (searched.empty() ? "" : " ") + folder.asString();
+    }
+    EXPECT_EQ(searched, row.searched);
+  }
 }
 
 // However the program is made to end, the search it ran is stopped and nothing of it stays.

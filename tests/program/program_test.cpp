@@ -7,13 +7,17 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <cstdarg>
+#include <cstdio>
 #include <filesystem>
 #include <memory>
 #include <thread>
 
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/base/unique_fd.h"
 #include "nas/system/user_state.h"
 #include "platform/task.h"
 
@@ -58,6 +62,17 @@ std::vector<std::string> FilesIn(const std::string& folder) {
   return files;
 }
 
+// Where this process and its calls log.
+std::string g_log;
+
+void LogTo(const std::string& path, const char* format, va_list arguments) {
+  char line[1024];
+  const int length = vsnprintf(line, sizeof line - 1, format, arguments);
+  const nas::UniqueFd file(open(path.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC));
+  const std::string text(line, std::min<size_t>(length, sizeof line - 1));
+  if (!nas::WriteAll(file.get(), text + "\n")) abort();
+}
+
 }  // namespace
 
 bool Eventually(const std::function<bool()>& holds) {
@@ -83,6 +98,9 @@ std::vector<std::string> Pieces(const std::string& text, char end) {
 void ProgramTest::SetUp() {
   LoadedModule();  // what loading opens is not what a test leaves open
   PlatformTest::SetUp();
+  g_log = dir_ + "/log";
+  WriteFile(g_log, "");
+  ASSERT_EQ(chmod(g_log.c_str(), 0666), 0);  // calls log as their users
   share_ = MakeFolder("volume1/share");
   const std::string bin = MakeFolder("bin");
   for (const char* file : {"arbory", "libarbory_nas.so", "NUVA.Arbory.Search.so"}) {
@@ -180,6 +198,8 @@ Json::Value ProgramTest::TaskProperty(const std::string& id, const char* name,
   }
 }
 
+std::string ProgramTest::Logged() const { return nas_test::ReadFile(g_log); }
+
 std::vector<std::string> ProgramTest::Databases(const std::string& volume,
                                                 const std::string& user) {
   std::vector<std::string> databases;
@@ -211,3 +231,20 @@ void ProgramTest::MakeEndlessFile(const std::string& path) {
 }
 
 }  // namespace program_test
+
+// Found before the C library's own by every library that this process loads.
+extern "C" {
+void syslog(int /*priority*/, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  program_test::LogTo(program_test::g_log, format, arguments);
+  va_end(arguments);
+}
+
+void __syslog_chk(int /*priority*/, int /*flag*/, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  program_test::LogTo(program_test::g_log, format, arguments);
+  va_end(arguments);
+}
+}

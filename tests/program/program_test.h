@@ -52,6 +52,9 @@ class ProgramTest : public nas_test::PlatformTest {
   Json::Value TaskProperty(const std::string& id, const char* name,
                            const std::string& user = nas_test::Me());
 
+  // What was written to the system log by the calls above, the program's own left out.
+  std::string Logged() const;
+
   // Where everything that a user's searches leave behind would be.
   std::vector<std::string> Remains(const std::string& user = nas_test::Me());
   std::vector<std::string> Databases(const std::string& volume, const std::string& user);
