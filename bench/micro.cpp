@@ -13,8 +13,7 @@
 namespace {
 
 void MatchName(benchmark::State& state, const char* pattern_text, const char* name) {
-  std::string trouble;
-  const auto pattern = nas::NamePattern::Parse(pattern_text, trouble);
+  const auto pattern = nas::NamePattern::Parse(pattern_text);
   nas::FoldedName folded;
   for (auto _ : state) {
     folded.Set(name);

@@ -43,12 +43,11 @@ std::optional<ContentQuery::Needle> ContentQuery::MakeNeedle(
   // A text may be stored composed or decomposed, so both forms of a literal are looked for.
   const std::string composed = ComposeText(alternative.text);
   const auto kind = alternative.is_literal() ? Regex::Kind::kLiteral : Regex::Kind::kContent;
-  std::string error;
   for (const std::string& form : {composed, Decompose(composed)}) {
     if (form == composed && !needle.expressions.empty()) continue;
-    auto expression = Regex::Compile(form, kind, error);
+    auto expression = Regex::Compile(form, kind);
     if (!expression) return std::nullopt;
-    needle.expressions.push_back(std::move(expression));
+    needle.expressions.push_back(std::move(*expression));
   }
   return needle;
 }

@@ -71,14 +71,12 @@ class Scanner {
 
 }  // namespace
 
-std::optional<NamePattern> NamePattern::Parse(std::string_view text, std::string& error) {
+Result<NamePattern> NamePattern::Parse(std::string_view text) {
   if (text.find('\0') != std::string_view::npos) {
-    error = "a name cannot hold a NUL";
-    return std::nullopt;
+    return Error{kErrorIllegal, EINVAL, "a name cannot hold a NUL"};
   }
   if (text.size() > kMostPatternBytes) {
-    error = "the pattern is longer than 64 KiB";
-    return std::nullopt;
+    return Error{kErrorIllegal, EINVAL, "the pattern is longer than 64 KiB"};
   }
   NamePattern pattern;
   Scanner scanner(text);
@@ -90,8 +88,9 @@ std::optional<NamePattern> NamePattern::Parse(std::string_view text, std::string
     alternative.folded = FoldText(piece.text);
     if (piece.kind == Scanner::Piece::Kind::kRegex) {
       // Names are compared composed, so the expression has to be.
-      alternative.regex = Regex::Compile(ComposeText(piece.text), Regex::Kind::kName, error);
-      if (!alternative.regex) return std::nullopt;
+      auto regex = Regex::Compile(ComposeText(piece.text), Regex::Kind::kName);
+      if (!regex) return regex.error();
+      alternative.regex = std::move(*regex);
     } else if (piece.kind == Scanner::Piece::Kind::kPlain && Glob::HasWildcard(piece.text)) {
       alternative.glob.emplace(alternative.folded);
     }

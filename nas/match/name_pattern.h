@@ -10,6 +10,7 @@
 #include <string_view>
 #include <vector>
 
+#include "nas/base/error.h"
 #include "nas/match/folded_name.h"
 #include "nas/match/glob.h"
 #include "nas/match/literal_finder.h"
@@ -37,8 +38,9 @@ class NamePattern {
   };
   using Term = std::vector<Alternative>;  // either of them
 
-  // Nothing, with `error` saying what is wrong, for a broken regular expression or a NUL.
-  static std::optional<NamePattern> Parse(std::string_view text, std::string& error);
+  // kErrorIllegal for a broken regular expression, a NUL or more than 64 KiB, with what is wrong in
+  // the place of a path.
+  static Result<NamePattern> Parse(std::string_view text);
 
   bool Matches(FoldedName& name) const;
   // All of them must match.

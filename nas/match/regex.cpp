@@ -4,7 +4,9 @@
 #include <pcre2.h>
 
 #include <array>
+#include <cerrno>
 #include <new>
+#include <string>
 
 #include "nas/match/folded_name.h"
 
@@ -18,6 +20,8 @@ constexpr std::uint32_t kMatchLimit = 2'000'000;
 // expressions with many alternatives.
 constexpr size_t kJitStackStart = 32 * 1024;
 constexpr size_t kJitStackMost = 1024 * 1024;
+// Longer ones are cut.
+constexpr size_t kMostMessageBytes = 256;
 
 // What matching needs besides the expression, one for each thread.
 class Scratch {
@@ -73,18 +77,17 @@ pcre2_code* CompileFor(std::string_view pattern, std::uint32_t options, int& num
 
 }  // namespace
 
-std::shared_ptr<const Regex> Regex::Compile(std::string_view pattern, Kind kind,
-                                            std::string& error) {
+Result<std::shared_ptr<const Regex>> Regex::Compile(std::string_view pattern, Kind kind) {
   int number = 0;
   PCRE2_SIZE where = 0;
   const std::uint32_t options = CompileOptions(kind);
   pcre2_code* code = CompileFor(pattern, options, number, where);
   if (code == nullptr) {
-    std::array<PCRE2_UCHAR, 256> text{};
+    std::array<PCRE2_UCHAR, kMostMessageBytes> text{};
     pcre2_get_error_message(number, text.data(), text.size());
-    error = std::string(reinterpret_cast<const char*>(text.data())) + " at character " +
-            std::to_string(where);
-    return nullptr;
+    return Error{kErrorIllegal, EINVAL,
+                 std::string(reinterpret_cast<const char*>(text.data())) + " at character " +
+                     std::to_string(where)};
   }
   constexpr std::uint32_t kUnicode = PCRE2_UTF | PCRE2_UCP | PCRE2_MATCH_INVALID_UTF;
   pcre2_code* ascii_code =

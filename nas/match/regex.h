@@ -4,8 +4,9 @@
 // given up and counts as not matching.
 
 #include <memory>
-#include <string>
 #include <string_view>
+
+#include "nas/base/error.h"
 
 namespace nas {
 
@@ -17,9 +18,8 @@ class Regex {
     kLiteral,  // the pattern is a plain text to be found in content
   };
 
-  // Null, with `error` saying what is wrong and where, for a broken expression.
-  static std::shared_ptr<const Regex> Compile(std::string_view pattern, Kind kind,
-                                              std::string& error);
+  // kErrorIllegal for a broken expression, with what is wrong and where in the place of a path.
+  static Result<std::shared_ptr<const Regex>> Compile(std::string_view pattern, Kind kind);
   ~Regex();
   Regex(const Regex&) = delete;
   Regex& operator=(const Regex&) = delete;

@@ -3,6 +3,7 @@
 #include <syslog.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
 
 #include "nas/base/accounts.h"
@@ -77,34 +78,49 @@ bool GroupComp::match(const FileSearch::WalkEntry& entry) const {
 
 namespace {
 
-// Each makes one comparator, or returns null with the last error set.
-std::unique_ptr<FileSearch::FindComp> MakePattern(const char* text) {
-  std::string trouble;
-  auto pattern = NamePattern::Parse(text, trouble);
-  if (pattern) return std::make_unique<PatternComp>(std::move(*pattern));
-  syslog(LOG_NOTICE, "search pattern refused: %s", trouble.c_str());
-  SetLastError(kErrorIllegal);
-  return nullptr;
+using Made = Result<std::unique_ptr<FileSearch::FindComp>>;
+
+Made MakePattern(const char* text) {
+  auto pattern = NamePattern::Parse(text);
+  if (pattern) return Made(std::make_unique<PatternComp>(std::move(*pattern)));
+  syslog(LOG_NOTICE, "search pattern refused: %s", pattern.error().path.c_str());
+  return pattern.error();
 }
 
-std::unique_ptr<FileSearch::FindComp> MakeKind(const char* word) {
+Made MakeKind(const char* word) {
   auto comp = KindComp::Parse(word);
-  if (!comp) SetLastError(kErrorIllegal);
-  return comp;
+  if (!comp) return Error{kErrorIllegal, EINVAL, word};
+  return Made(std::move(comp));
 }
 
-std::unique_ptr<FileSearch::FindComp> MakeOwner(const char* name) {
+Made MakeOwner(const char* name) {
   const auto user = FindAccount(name);
-  if (user) return std::make_unique<OwnerComp>(user->uid);
-  Report(user.error());
-  return nullptr;
+  if (!user) return user.error();
+  return Made(std::make_unique<OwnerComp>(user->uid));
 }
 
-std::unique_ptr<FileSearch::FindComp> MakeGroup(const char* name) {
+Made MakeGroup(const char* name) {
   const auto group = FindGroup(name);
-  if (group) return std::make_unique<GroupComp>(group->gid);
-  Report(group.error());
-  return nullptr;
+  if (!group) return group.error();
+  return Made(std::make_unique<GroupComp>(group->gid));
+}
+
+Made MakeComp(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const char* text) {
+  using FileSearch::FindFactory;
+  if (text == nullptr) return Error{kErrorIllegal, EINVAL};
+  switch (field) {
+    case FindFactory::FIND_PATTERN:
+      return MakePattern(text);
+    case FindFactory::FIND_FILETYPE:
+      return MakeKind(text);
+    case FindFactory::FIND_EXTENSION:
+      return Made(std::make_unique<ExtensionComp>(text));
+    case FindFactory::FIND_OWNER:
+      return MakeOwner(text);
+    case FindFactory::FIND_GROUP:
+      return MakeGroup(text);
+  }
+  return Error{kErrorIllegal, EINVAL};
 }
 
 }  // namespace
@@ -155,32 +171,13 @@ Refusal FindATimeComp::refusal() const {
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                               std::vector<FindComp*>& comps) {
-  const char* text = field == FIND_FILETYPE ? arg1 : arg2;
-  std::unique_ptr<FindComp> comp;
-  if (text == nullptr) {
-    nas::SetLastError(nas::kErrorIllegal);
+  auto made = nas::MakeComp(field, field == FIND_FILETYPE ? arg1 : arg2);
+  if (!made) {
+    nas::Report(made.error());
     return 0;
   }
-  switch (field) {
-    case FIND_PATTERN:
-      comp = nas::MakePattern(text);
-      break;
-    case FIND_FILETYPE:
-      comp = nas::MakeKind(text);
-      break;
-    case FIND_EXTENSION:
-      comp = std::make_unique<nas::ExtensionComp>(text);
-      break;
-    case FIND_OWNER:
-      comp = nas::MakeOwner(text);
-      break;
-    case FIND_GROUP:
-      comp = nas::MakeGroup(text);
-      break;
-  }
-  if (!comp) return 0;
-  comps.push_back(comp.get());
-  comp.release();
+  comps.push_back(made->get());
+  made->release();
   return 1;
 }
 

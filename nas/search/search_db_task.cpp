@@ -172,10 +172,9 @@ bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
   selection.ascending = ascending == nullptr || *ascending;
   if (type != nullptr && *type != DIR_ENTRY_ALL) selection.directories = *type == DIR_ENTRY_DIR;
   if (pattern != nullptr) {
-    std::string trouble;
-    selection.pattern = nas::NamePattern::Parse(pattern, trouble);
-    if (!selection.pattern) return false;
-    if (selection.pattern->terms().empty()) selection.pattern.reset();
+    auto parsed = nas::NamePattern::Parse(pattern);
+    if (!parsed) return false;
+    if (!parsed->terms().empty()) selection.pattern = std::move(*parsed);
   }
   return impl_->Query(offset, limit, selection, callback, context, total);
 } catch (const std::exception& error) {

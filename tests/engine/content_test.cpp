@@ -24,8 +24,7 @@ class Contents : public testing::Test {
   ~Contents() override { std::filesystem::remove_all(folder_); }
 
   ContentScanner::Outcome Scan(const std::string& pattern_text, const std::string& content) {
-    std::string trouble;
-    const auto query = ContentQuery::From(NamePattern::Parse(pattern_text, trouble).value());
+    const auto query = ContentQuery::From(*NamePattern::Parse(pattern_text));
     EXPECT_TRUE(query) << pattern_text;
     std::ofstream(folder_ + "/file", std::ios::binary) << content;
     return ContentScanner(*query, stop_).Scan(fd_.get(), "file");
@@ -81,8 +80,7 @@ TEST_F(Contents, Table) {
 
 TEST_F(Contents, WhatAsksForNoContents) {
   for (const char* pattern : {"", "*.txt", "a ?b", "!a", "!a !b", "a|!b"}) {
-    std::string trouble;
-    EXPECT_FALSE(ContentQuery::From(NamePattern::Parse(pattern, trouble).value())) << pattern;
+    EXPECT_FALSE(ContentQuery::From(*NamePattern::Parse(pattern))) << pattern;
   }
 }
 
@@ -128,8 +126,7 @@ TEST_F(Contents, StopsAndFails) {
   stop_ = 0;
   std::filesystem::remove(folder_ + "/file");
   std::filesystem::create_symlink("/etc/passwd", folder_ + "/file");
-  std::string trouble;
-  const auto query = ContentQuery::From(NamePattern::Parse("root", trouble).value());
+  const auto query = ContentQuery::From(*NamePattern::Parse("root"));
   EXPECT_EQ(ContentScanner(*query, stop_).Scan(fd_.get(), "file"), ContentScanner::Outcome::kFailed)
       << "links are not followed";
 }

@@ -61,8 +61,7 @@ class Job : public testing::Test {
                              bool content = false) {
     std::vector<Location> locations;
     for (const std::string& text : texts) locations.push_back(std::move(*OpenLocation(text)));
-    std::string trouble;
-    PatternComp pattern(NamePattern::Parse(pattern_text, trouble).value());
+    PatternComp pattern(*NamePattern::Parse(pattern_text));
     const std::string path = ResultPath(base_ + "/results", NewResultId());
     {
       ResultWriter writer(path);

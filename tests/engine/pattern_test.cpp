@@ -19,9 +19,8 @@ namespace {
 using std::string_literals::operator""s;
 
 bool Matches(const std::string& pattern_text, const std::string& name) {
-  std::string trouble;
-  const auto pattern = NamePattern::Parse(pattern_text, trouble);
-  EXPECT_TRUE(pattern) << pattern_text << ": " << trouble;
+  const auto pattern = NamePattern::Parse(pattern_text);
+  EXPECT_TRUE(pattern) << pattern_text;
   FoldedName folded;
   folded.Set(name);
   return pattern && pattern->Matches(folded);
@@ -119,9 +118,10 @@ TEST(NamePattern, Table) {
 TEST(NamePattern, RefusesWhatIsBroken) {
   for (const std::string& pattern :
        {"regex:("s, "regex:[a"s, "a regex:*"s, "nul\0l"s, std::string((64 << 10) + 1, 'a')}) {
-    std::string trouble;
-    EXPECT_FALSE(NamePattern::Parse(pattern, trouble)) << pattern.substr(0, 20);
-    EXPECT_FALSE(trouble.empty()) << pattern.substr(0, 20);
+    const auto parsed = NamePattern::Parse(pattern);
+    ASSERT_FALSE(parsed) << pattern.substr(0, 20);
+    EXPECT_EQ(parsed.error().kind, kErrorIllegal);
+    EXPECT_FALSE(parsed.error().path.empty()) << pattern.substr(0, 20);
   }
 }
 

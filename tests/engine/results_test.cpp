@@ -122,8 +122,7 @@ TEST_F(Results, EveryColumnSorts) {
   files.directories = false;
   EXPECT_EQ(Names(reader, files), (std::vector<std::string>{a, b, d}));
   Selection pngs;
-  std::string trouble;
-  pngs.pattern = NamePattern::Parse("*.png", trouble);
+  pngs.pattern = *NamePattern::Parse("*.png");
   EXPECT_EQ(Names(reader, pngs), (std::vector<std::string>{a, b}));
 }
 
@@ -279,8 +278,7 @@ TEST_F(Results, DamagedFilesAreRefusedInEveryOrder) {
       Selection selection;
       selection.column = static_cast<SortColumn>(column);
       selection.directories = false;
-      std::string trouble;
-      selection.pattern = NamePattern::Parse("a", trouble);
+      selection.pattern = *NamePattern::Parse("a");
       try {
         ResultReader reader(path);
         EXPECT_LE(Names(reader, selection).size(), 2u) << damage;

@@ -87,6 +87,7 @@ class Differential : public ProgramTest {
     EXPECT_TRUE(job.Run(walk, contents));
     const Json::Value seen = search.progress.ToJson();
     EXPECT_EQ(seen["matches"].asUInt64(), rows.paths().size());
+    EXPECT_EQ(seen["skipped"]["other"].asUInt64(), 0) << "something was opened that never is";
     return {rows.paths(), static_cast<size_t>(seen["skipped"]["permission"].asUInt64())};
   }
 
