@@ -3,7 +3,6 @@
 
 #include "arbory/why_command.h"
 
-#include <grp.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -100,16 +99,6 @@ std::string TimeText(std::int64_t seconds) {
   return {text, std::strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S", &local)};
 }
 
-std::string OwnerText(uid_t uid) {
-  const auto account = nas::FindAccount(uid);
-  return account ? account->name : std::to_string(uid);
-}
-
-std::string GroupText(gid_t gid) {
-  const group* found = getgrgid(gid);
-  return found != nullptr ? found->gr_name : std::to_string(gid);
-}
-
 // What the file has instead of what was asked for.
 std::string Fact(Refusal refusal, const nas::FileAttributes& file) {
   switch (refusal) {
@@ -126,9 +115,9 @@ std::string Fact(Refusal refusal, const nas::FileAttributes& file) {
     case Refusal::kReadLater:
       return TimeText(file.atime);
     case Refusal::kOwner:
-      return OwnerText(file.uid);
+      return nas::UserText(file.uid);
     case Refusal::kGroup:
-      return GroupText(file.gid);
+      return nas::GroupText(file.gid);
     default:
       return "";
   }

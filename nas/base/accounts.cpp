@@ -91,6 +91,16 @@ Result<Group> FindGroup(gid_t gid) {
   });
 }
 
+std::string UserText(uid_t uid) {
+  const auto account = FindAccount(uid);
+  return account ? account->name : std::to_string(uid);
+}
+
+std::string GroupText(gid_t gid) {
+  const auto found = FindGroup(gid);
+  return found ? found->name : std::to_string(gid);
+}
+
 void LoadNameService() {
   constexpr char kRoot[] = "root";
   if (geteuid() != 0) return;  // only root's calls look up groups, to become their user

@@ -36,6 +36,10 @@ struct Group {
 Result<Group> FindGroup(const std::string& name);
 Result<Group> FindGroup(gid_t gid);
 
+// For showing: the name, or the number where the machine knows none for it.
+std::string UserText(uid_t uid);
+std::string GroupText(gid_t gid);
+
 // For a process that makes calls: their children would each load the libraries of the name service
 // anew, which is a third of what a short call takes; what this process has loaded they inherit.
 void LoadNameService();

@@ -1,6 +1,7 @@
 #pragma once
 // JSON as text, both ways. JsonCpp's own writer is too slow for replies of a million file objects
 // and has no way to clean what it writes; its reader needs limits to be safe on what others wrote.
+// Any thread may call; nothing is kept.
 
 #include <json/value.h>
 
@@ -14,8 +15,9 @@ enum class JsonBytes {
   kClean,  // strings are made valid UTF-8, for clients
 };
 
-// Appends `value` in one line without spaces. Numbers that JSON cannot hold (NaN, infinities) are
-// written as null.
+// Appends `value` in one line without spaces, members in the order of their names. Numbers that
+// JSON cannot hold (NaN, infinities) are written as null. Recurses for each level of `value`, so it
+// is for values that are not deeper than what ParseJson reads.
 void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out);
 std::string JsonText(const Json::Value& value, JsonBytes bytes);
 
@@ -25,7 +27,8 @@ inline constexpr int kJsonMaxDepth = 200;
 inline constexpr int kRequestMaxDepth = 100;
 
 // Reads one JSON document of any type: no comments, nothing after it, at most `max_depth` levels
-// deep. False, with `out` untouched, for anything else. Strings may hold bytes that are not UTF-8.
+// deep. False, with `out` untouched, for anything else: there is no more to tell, as the texts come
+// from programs. Strings may hold bytes that are not UTF-8. Of members of one name the last counts.
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth = kJsonMaxDepth);
 
 }  // namespace nas

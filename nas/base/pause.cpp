@@ -1,7 +1,7 @@
 #include "nas/base/pause.h"
 
 #include <algorithm>
-#include <cerrno>
+#include <ctime>
 
 namespace nas {
 namespace {

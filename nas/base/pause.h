@@ -1,20 +1,22 @@
 #pragma once
-// Polling without haste: pauses that grow, up to a bound on the whole.
-
-#include <ctime>
+// Polling without haste: pauses that grow from half a millisecond to twenty, up to a bound on the
+// whole. For what nobody announces, such as a change of a file by another process.
 
 namespace nas {
 
+// For one wait of one thread.
 class GrowingPause {
  public:
-  // `tenths` of a second is the most that all pauses together take.
+  // The bound, in tenths of a second, begins now and counts what the caller does between pauses
+  // too. 0 or less: no pause at all.
   explicit GrowingPause(int tenths);
-  // Pauses. False, at once, when the bound has passed.
+  // Sleeps, less long where a signal comes. False, at once, when the bound has passed; the caller
+  // has then looked for the last time.
   bool Wait();
 
  private:
   long long deadline_;  // monotonic, in nanoseconds
-  long long pause_;
+  long long pause_;     // the next one, in nanoseconds
 };
 
 }  // namespace nas

@@ -8,9 +8,12 @@
 #include <chrono>
 #include <thread>
 
+#include "nas/base/system_call.h"
+
 namespace nas {
 namespace {
 
+// Far longer than a rename on the way takes, and far shorter than a person waits.
 constexpr std::chrono::milliseconds kRetryPause(5);
 
 }  // namespace
@@ -28,13 +31,11 @@ UniqueFd OpenAt2(int dir_fd, const char* path, int flags, unsigned long long res
   open_how how{};
   how.flags = static_cast<unsigned long long>(flags | O_CLOEXEC);
   how.resolve = resolve;
-  while (true) {
-    UniqueFd fd(static_cast<int>(syscall(SYS_openat2, dir_fd, path, &how, sizeof how)));
-    if (!fd && errno == EAGAIN) {
-      std::this_thread::sleep_for(kRetryPause);
-    } else if (fd || errno != EINTR) {
-      return fd;
-    }
+  for (;;) {
+    UniqueFd fd(static_cast<int>(
+        Uninterrupted([&] { return syscall(SYS_openat2, dir_fd, path, &how, sizeof how); })));
+    if (fd || errno != EAGAIN) return fd;
+    std::this_thread::sleep_for(kRetryPause);
   }
 }
 

@@ -1,5 +1,6 @@
 #pragma once
-// Owner of one file descriptor, and opening below a folder.
+// Owner of one file descriptor, and opening below a folder. Both are as thin as the system calls
+// they stand for: a descriptor that could not be had is an invalid UniqueFd, with errno set.
 
 #include <unistd.h>
 
@@ -7,6 +8,7 @@
 
 namespace nas {
 
+// Closes its descriptor when it goes. Invalid, with -1 for a descriptor, when it owns none.
 class UniqueFd {
  public:
   UniqueFd() = default;
@@ -20,6 +22,7 @@ class UniqueFd {
 
   int get() const { return fd_; }
   explicit operator bool() const { return fd_ >= 0; }
+  // The descriptor is the caller's from here on.
   int Release() { return std::exchange(fd_, -1); }
   // Closes what it held; errno stays as it was.
   void Reset(int fd = -1);
@@ -30,7 +33,7 @@ class UniqueFd {
 
 // openat2 with O_CLOEXEC; `resolve` is of the RESOLVE_* flags of <linux/openat2.h>. Tried again
 // after a pause where a folder was moved on the way, or where somebody who holds a lease on the
-// file has been told to let go, which the kernel enforces in the end. Invalid with errno set.
+// file has been told to let go, which the kernel enforces in the end.
 UniqueFd OpenAt2(int dir_fd, const char* path, int flags, unsigned long long resolve);
 
 }  // namespace nas

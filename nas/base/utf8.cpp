@@ -1,8 +1,5 @@
 #include "nas/base/utf8.h"
 
-#include <cstdint>
-#include <cstring>
-
 namespace nas {
 namespace {
 
@@ -32,18 +29,6 @@ bool ReadLead(unsigned char byte, Lead* lead) {
   return true;
 }
 
-// Length of the run of ASCII bytes at the front; almost every name is one.
-size_t AsciiRun(std::string_view text) {
-  constexpr std::uint64_t kHighBits = 0x8080808080808080ULL;
-  size_t at = 0;
-  for (std::uint64_t word; at + sizeof word <= text.size(); at += sizeof word) {
-    std::memcpy(&word, text.data() + at, sizeof word);
-    if (word & kHighBits) break;
-  }
-  while (at < text.size() && static_cast<unsigned char>(text[at]) < kContinuationLow) ++at;
-  return at;
-}
-
 }  // namespace
 
 Utf8Step NextUtf8(std::string_view text) {
@@ -59,21 +44,6 @@ Utf8Step NextUtf8(std::string_view text) {
     if (byte < low || byte > high) return {at, false};
   }
   return {lead.following + 1, true};
-}
-
-std::string ToValidUtf8(std::string_view text) {
-  std::string clean;
-  clean.reserve(text.size());
-  while (!text.empty()) {
-    const size_t ascii = AsciiRun(text);
-    clean.append(text.substr(0, ascii));
-    text.remove_prefix(ascii);
-    if (text.empty()) break;
-    const Utf8Step step = NextUtf8(text);
-    clean.append(step.valid ? text.substr(0, step.length) : kReplacementCharacter);
-    text.remove_prefix(step.length);
-  }
-  return clean;
 }
 
 }  // namespace nas

@@ -1,9 +1,9 @@
 #pragma once
-// Cleaning of text for clients. Names on disk are bytes; what is sent to a client is always valid
-// UTF-8, with U+FFFD in the place of what is not.
+// Reading of text as UTF-8. Names on disk are bytes; what is sent to a client is always valid
+// UTF-8, with U+FFFD in the place of what is not (JsonBytes::kClean). Nothing here fails or keeps
+// state.
 
 #include <cstddef>
-#include <string>
 #include <string_view>
 
 namespace nas {
@@ -18,9 +18,6 @@ struct Utf8Step {
 // Surrogates, overlong forms and values beyond U+10FFFF are bad.
 Utf8Step NextUtf8(std::string_view text);
 
-// `text` with each bad sequence replaced by U+FFFD.
-std::string ToValidUtf8(std::string_view text);
-
 // Whether the byte is one of ASCII's control characters.
 constexpr bool IsControl(unsigned char byte) {
   constexpr unsigned char kFirstPrintable = 0x20;
@@ -28,6 +25,7 @@ constexpr bool IsControl(unsigned char byte) {
   return byte < kFirstPrintable || byte == kDelete;
 }
 
+// What stands in the place of a bad sequence.
 inline constexpr std::string_view kReplacementCharacter = "\xEF\xBF\xBD";
 
 }  // namespace nas

@@ -428,19 +428,13 @@ void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {
 
 const std::string& ResultReader::UserName(std::uint32_t uid) {
   const auto [name, added] = user_names_.try_emplace(uid);
-  if (added) {
-    const auto user = FindAccount(uid_t{uid});
-    name->second = user ? user->name : std::to_string(uid);
-  }
+  if (added) name->second = UserText(uid);
   return name->second;
 }
 
 const std::string& ResultReader::GroupName(std::uint32_t gid) {
   const auto [name, added] = group_names_.try_emplace(gid);
-  if (added) {
-    const auto found = FindGroup(gid_t{gid});
-    name->second = found ? found->name : std::to_string(gid);
-  }
+  if (added) name->second = GroupText(gid);
   return name->second;
 }
 

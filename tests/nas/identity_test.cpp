@@ -101,8 +101,10 @@ TEST_F(IdentityTest, AccountsAreFoundByName) {
   NUVAGroupFree(group);
   EXPECT_LT(NUVAUserGet("no-such-user-here", &user), 0);
   EXPECT_EQ(NLIBCErrGet(), 0x1800);
+  EXPECT_EQ(WfmLibGetErr(), 405);
   EXPECT_LT(NUVAGroupGet("no-such-group-here", &group), 0);
   EXPECT_EQ(NLIBCErrGet(), 0x1D00);
+  EXPECT_EQ(WfmLibGetErr(), 405);
   EXPECT_EQ(user, nullptr);
   EXPECT_EQ(group, nullptr);
 }

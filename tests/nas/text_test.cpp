@@ -1,4 +1,4 @@
-// Text of all kinds: UTF-8 cleaning, JSON both ways and in files, parameter splitting, shell words,
+// Text of all kinds: JSON both ways, cleaned and in files, parameter splitting, shell words,
 // file entries.
 
 #include <json/value.h>
@@ -10,7 +10,6 @@
 #include <limits>
 
 #include "nas/base/json_text.h"
-#include "nas/base/utf8.h"
 #include "platform/json_file.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -27,11 +26,11 @@ struct Utf8Row {
   const char* why;
 };
 
-TEST(Utf8, ReplacesEachBadSequenceOnce) {
+TEST(Json, ReplacesEachBadSequenceOnce) {
   const Utf8Row rows[] = {
       {"", "", "empty"},
-      {"plain name.txt", "plain name.txt", "longer than a word of the fast path"},
-      {std::string("a\0b", 3), std::string("a\0b", 3), "NUL is a character"},
+      {"plain name.txt", "plain name.txt", "nothing to do"},
+      {std::string("a\0b", 3), "a\\u0000b", "NUL is a character"},
       {"\xC2\x80 \xDF\xBF", "\xC2\x80 \xDF\xBF", "edges of two bytes"},
       {"\xE0\xA0\x80 \xEF\xBF\xBF", "\xE0\xA0\x80 \xEF\xBF\xBF", "edges of three bytes"},
       {"\xF0\x90\x80\x80 \xF4\x8F\xBF\xBF", "\xF0\x90\x80\x80 \xF4\x8F\xBF\xBF", "of four"},
@@ -44,9 +43,11 @@ TEST(Utf8, ReplacesEachBadSequenceOnce) {
       {"\xE2\x82", BAD, "cut at the end: one character, one replacement"},
       {"\xF0\x9F\x98", BAD, "the same of four"},
       {"\xE2\x82z", BAD "z", "cut by ASCII, which stays"},
-      {"abcdefgh\xFFijklmnop\xC3\xA9", "abcdefgh" BAD "ijklmnop\xC3\xA9", "between fast runs"},
+      {"abcdefgh\xFFijklmnop\xC3\xA9", "abcdefgh" BAD "ijklmnop\xC3\xA9", "between good ones"},
   };
-  for (const Utf8Row& row : rows) EXPECT_EQ(nas::ToValidUtf8(row.text), row.clean) << row.why;
+  for (const Utf8Row& row : rows) {
+    EXPECT_EQ(nas::JsonText(row.text, nas::JsonBytes::kClean), '"' + row.clean + '"') << row.why;
+  }
 }
 
 TEST(Json, WritesWhatItReads) {
@@ -225,17 +226,6 @@ TEST(FileEntries, ShowWhatIsAskedFor) {
     EXPECT_EQ(nas::JsonText(shown, nas::JsonBytes::kRaw),
               "{\"is_dir\":false,\"name\":\"n\xFF\",\"path\":\"/s/n\xFF\"}")
         << row.mask;
-  }
-}
-
-TEST(ErrorCodes, FollowTheirTable) {
-  const struct {
-    int error;
-    int code;
-  } rows[] = {{0x0300, 407}, {0x0600, 408}, {0x1800, 405}, {0x1D00, 405},
-              {0x9A00, 418}, {0x0200, 401}, {0, 401},      {-1, 401}};
-  for (const auto& row : rows) {
-    EXPECT_EQ(WfmParseErrnoToError(row.error, nullptr, "/x"), row.code) << row.error;
   }
 }
 
