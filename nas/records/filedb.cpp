@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <functional>
 
 #include "nas/base/error.h"
@@ -15,9 +16,11 @@
 namespace NUVA::WEBFM {
 namespace {
 
-// The file: one SQLite table, a row per record, the highest position the newest. Bodies are JSON
-// texts, kept as blobs so that bytes that are not UTF-8 come back as they were. A file with another
-// application id, another schema or a newer version is not one of ours and is left alone.
+// The file: one SQLite table, a row per record, the highest position the newest. A history holds
+// ten or so, hence no column but the body is ever searched: whoever looks for records reads them
+// all, and SQLite is there for what happens when the power goes. Bodies are JSON texts, kept as
+// blobs so that bytes that are not UTF-8 come back as they were. A file with another application
+// id, another schema or a newer version is not one of ours and is left alone.
 constexpr char kCreate[] =
     "CREATE TABLE records(position INTEGER PRIMARY KEY AUTOINCREMENT, body BLOB NOT NULL);"
     "PRAGMA application_id=1095909955;"
@@ -29,11 +32,6 @@ constexpr off_t kSmallestDatabaseBytes = 512;
 
 // Others hold the lock for one small transaction; longer means they are stopped.
 constexpr int kBusyMilliseconds = 5000;
-
-std::int64_t Number(const nas::Database& db, const char* sql) {
-  nas::Statement statement(db, sql);
-  return statement.Step() ? statement.Integer(0) : 0;
-}
 
 // The text that values are compared by: strings as they are, others as JSON. False when absent.
 bool TextOf(const Json::Value& record, const std::string& key, std::string* text) {
@@ -58,149 +56,121 @@ bool CreatePrivately(const std::string& path) {
   return fd || errno == EEXIST;
 }
 
+std::int64_t Number(const nas::Database& db, const char* sql) {
+  nas::Statement statement(db, sql);
+  return statement.Step() ? statement.Integer(0) : 0;
+}
+
+bool IsEmpty(const nas::Database& db) {
+  return Number(db, "SELECT count(*) FROM sqlite_schema") == 0;
+}
+
+// Makes the table in an empty file; otherwise tells whether the file is ours and whole.
+bool IsStore(nas::Database& db) {
+  if (IsEmpty(db)) {
+    nas::Transaction transaction(db, nas::Transaction::Kind::kWrite);
+    if (IsEmpty(db)) db.Execute(kCreate);
+    transaction.Commit();
+  }
+  if (Number(db, "PRAGMA application_id") != kApplicationId ||
+      Number(db, "PRAGMA user_version") != kVersion) {
+    return false;
+  }
+  nas::Statement check(db, "PRAGMA quick_check(1)");
+  return check.Step() && check.Bytes(0) == "ok";
+}
+
+struct Row {
+  std::int64_t position;
+  Json::Value record;
+};
+
+// The matching records, newest first. A body that is not readable is passed over: one bad record
+// must not hide the others.
+std::vector<Row> Matching(const nas::Database& db, const FileDB::Condition& condition) {
+  std::vector<Row> found;
+  nas::Statement rows(db, "SELECT position, body FROM records ORDER BY position DESC");
+  while (rows.Step()) {
+    Row row{rows.Integer(0), {}};
+    if (nas::ParseJson(rows.Bytes(1), &row.record) && Matches(row.record, condition)) {
+      found.push_back(std::move(row));
+    }
+  }
+  return found;
+}
+
+void DeleteMatching(nas::Database& db, const FileDB::Condition& condition) {
+  // Whatever cannot be read goes with the others.
+  if (condition.equal.empty()) return db.Execute("DELETE FROM records");
+  nas::Statement remove(db, "DELETE FROM records WHERE position=?1");
+  for (const Row& row : Matching(db, condition)) remove.Bind(1, row.position).Run();
+}
+
 }  // namespace
 
 class FileDB::Store {
  public:
-  explicit Store(const std::string& path) { Open(path); }
+  explicit Store(std::string path) : path_(std::move(path)), opened_(Open()) {}
 
-  int error() const { return error_; }
-  void set_max_records(int count) { max_records_ = count; }
-  void set_primary_key(const std::string& key) { primary_key_ = key; }
+  int max_records = 0;
+  std::string primary_key;
 
-  bool Insert(const Json::Value& record) {
-    if (!record.isObject()) {
-      errno = EINVAL;
-      return false;
-    }
-    return Change([&] {
-      std::string key;
-      if (!primary_key_.empty() && TextOf(record, primary_key_, &key)) {
-        DeleteMatching(Condition().SetCondition(primary_key_, key));
-      }
-      const std::string body = nas::JsonText(record, nas::JsonBytes::kRaw);
-      nas::Statement(*db_, "INSERT INTO records(body) VALUES(?1)").BindBlob(1, body).Run();
-      if (max_records_ > 0) {
-        nas::Statement(*db_,
-                       "DELETE FROM records WHERE position NOT IN"
-                       " (SELECT position FROM records ORDER BY position DESC LIMIT ?1)")
-            .Bind(1, max_records_)
-            .Run();
-      }
-    });
+  bool IsGood() const { return Succeeded(opened_); }
+
+  bool Use(const std::function<void(nas::Database&)>& work) {
+    return Succeeded(db_ ? Guard([&] { work(*db_); }) : opened_);
   }
 
-  bool Delete(const Condition& condition) {
-    return Change([&] { DeleteMatching(condition); });
-  }
-
-  bool Select(const Condition& condition, std::vector<Json::Value>& out) {
-    std::vector<Json::Value> found;
-    const bool done = Use([&] {
-      int skip = std::max(condition.offset, 0);
-      ForEachNewestFirst([&](std::int64_t, Json::Value& record) {
-        if (!Matches(record, condition) || skip-- > 0) return true;
-        found.push_back(std::move(record));
-        return condition.limit <= 0 || found.size() < static_cast<size_t>(condition.limit);
-      });
+  bool Change(const std::function<void(nas::Database&)>& work) {
+    return Use([&](nas::Database& db) {
+      nas::Transaction transaction(db, nas::Transaction::Kind::kWrite);
+      work(db);
+      transaction.Commit();
     });
-    if (done) std::move(found.begin(), found.end(), std::back_inserter(out));
-    return done;
   }
 
  private:
-  void Open(const std::string& path) {
+  // The end of an operation: a failure becomes the platform's last error.
+  static bool Succeeded(const nas::Status& status) {
+    if (!status) nas::Report(status.error());
+    return status.ok();
+  }
+
+  nas::Error Failure(int error_number) const { return {nas::kErrorDatabase, error_number, path_}; }
+
+  nas::Status Open() {
     struct stat info;
-    if (stat(path.c_str(), &info) != 0 && (errno != ENOENT || !CreatePrivately(path))) {
-      return Fail(errno);
+    if (stat(path_.c_str(), &info) != 0 && (errno != ENOENT || !CreatePrivately(path_))) {
+      return Failure(errno);
     }
-    if (stat(path.c_str(), &info) != 0) return Fail(errno);
-    if (S_ISDIR(info.st_mode)) return Fail(EISDIR);
-    if (!S_ISREG(info.st_mode)) return Fail(EINVAL);
+    if (stat(path_.c_str(), &info) != 0) return Failure(errno);
+    if (S_ISDIR(info.st_mode)) return Failure(EISDIR);
+    if (!S_ISREG(info.st_mode)) return Failure(EINVAL);
     // SQLite would take so short a file as empty and write over it.
-    if (info.st_size > 0 && info.st_size < kSmallestDatabaseBytes) return Fail(EBADMSG);
-    Run([&] {
-      db_ = std::make_unique<nas::Database>(path, SQLITE_OPEN_READWRITE, kBusyMilliseconds);
-      Verify();
+    if (info.st_size > 0 && info.st_size < kSmallestDatabaseBytes) return Failure(EBADMSG);
+    bool is_store = false;
+    const nas::Status status = Guard([&] {
+      db_ = std::make_unique<nas::Database>(path_, SQLITE_OPEN_READWRITE, kBusyMilliseconds);
+      is_store = IsStore(*db_);
     });
-    if (error_ != 0) db_.reset();
+    if (status && is_store) return status;
+    db_.reset();
+    return status ? Failure(EBADMSG) : status;
   }
 
-  void Fail(int error_number) {
-    error_ = error_number;
-    nas::SetLastError(nas::kErrorDatabase);
-  }
-
-  // Runs `work`, turning SQLite's errors into error_.
-  void Run(const std::function<void()>& work) {
+  // Here SQLite's exceptions end.
+  nas::Status Guard(const std::function<void()>& work) {
     try {
       work();
+      return {};
     } catch (const nas::SqliteError& error) {
-      Fail(error.error().error_number);
+      return error.error();
     }
   }
 
-  bool Use(const std::function<void()>& work) {
-    if (!db_) {
-      errno = error_;
-      return false;
-    }
-    error_ = 0;
-    Run(work);
-    const int error = std::exchange(error_, 0);
-    if (error != 0) errno = error;
-    return error == 0;
-  }
-
-  bool Change(const std::function<void()>& work) {
-    return Use([&] {
-      nas::Transaction transaction(*db_, nas::Transaction::Kind::kWrite);
-      work();
-      transaction.Commit();
-    });
-  }
-
-  bool IsEmpty() { return Number(*db_, "SELECT count(*) FROM sqlite_schema") == 0; }
-
-  // Makes the table in an empty file; otherwise sees that the file is ours and whole.
-  void Verify() {
-    if (IsEmpty()) {
-      nas::Transaction transaction(*db_, nas::Transaction::Kind::kWrite);
-      if (IsEmpty()) db_->Execute(kCreate);
-      transaction.Commit();
-    }
-    if (Number(*db_, "PRAGMA application_id") != kApplicationId ||
-        Number(*db_, "PRAGMA user_version") != kVersion) {
-      return Fail(EBADMSG);
-    }
-    nas::Statement check(*db_, "PRAGMA quick_check(1)");
-    if (!check.Step() || check.Bytes(0) != "ok") return Fail(EBADMSG);
-  }
-
-  // A body that is not readable is passed over: one bad record must not hide the others.
-  void ForEachNewestFirst(const std::function<bool(std::int64_t, Json::Value&)>& visit) {
-    nas::Statement rows(*db_, "SELECT position, body FROM records ORDER BY position DESC");
-    while (rows.Step()) {
-      Json::Value record;
-      if (nas::ParseJson(rows.Bytes(1), &record) && !visit(rows.Integer(0), record)) return;
-    }
-  }
-
-  void DeleteMatching(const Condition& condition) {
-    if (condition.equal.empty()) return db_->Execute("DELETE FROM records");
-    std::vector<std::int64_t> positions;
-    ForEachNewestFirst([&](std::int64_t position, Json::Value& record) {
-      if (Matches(record, condition)) positions.push_back(position);
-      return true;
-    });
-    nas::Statement remove(*db_, "DELETE FROM records WHERE position=?1");
-    for (const std::int64_t position : positions) remove.Bind(1, position).Run();
-  }
-
-  std::unique_ptr<nas::Database> db_;
-  int error_ = 0;
-  int max_records_ = 0;
-  std::string primary_key_;
+  const std::string path_;
+  std::unique_ptr<nas::Database> db_;  // none where `opened_` is a failure
+  const nas::Status opened_;
 };
 
 FileDB::Condition& FileDB::Condition::SetCondition(const std::string& key,
@@ -209,28 +179,49 @@ FileDB::Condition& FileDB::Condition::SetCondition(const std::string& key,
   return *this;
 }
 
-FileDB::FileDB(const std::string& path) : store_(std::make_unique<Store>(path)) {}
+FileDB::FileDB(const std::string& path) : store_(std::make_unique<Store>(path)) { IsGood(); }
 FileDB::~FileDB() = default;
 
-bool FileDB::IsGood() const {
-  if (store_->error() == 0) return true;
-  errno = store_->error();
-  return false;
+bool FileDB::IsGood() const { return store_->IsGood(); }
+void FileDB::SetMaxRecordNum(int count) { store_->max_records = count; }
+void FileDB::SetPrimaryKey(const std::string& key) { store_->primary_key = key; }
+
+bool FileDB::Insert(const Json::Value& record) {
+  if (!record.isObject()) {
+    errno = EINVAL;
+    return false;
+  }
+  return store_->Change([&](nas::Database& db) {
+    const std::string& key = store_->primary_key;
+    std::string value;
+    if (!key.empty() && TextOf(record, key, &value)) {
+      DeleteMatching(db, Condition().SetCondition(key, value));
+    }
+    const std::string body = nas::JsonText(record, nas::JsonBytes::kRaw);
+    nas::Statement(db, "INSERT INTO records(body) VALUES(?1)").BindBlob(1, body).Run();
+    if (store_->max_records <= 0) return;
+    nas::Statement(db,
+                   "DELETE FROM records WHERE position NOT IN"
+                   " (SELECT position FROM records ORDER BY position DESC LIMIT ?1)")
+        .Bind(1, store_->max_records)
+        .Run();
+  });
 }
 
-void FileDB::SetMaxRecordNum(int count) { store_->set_max_records(count); }
-void FileDB::SetPrimaryKey(const std::string& key) { store_->set_primary_key(key); }
+bool FileDB::UpdateLastByTime(const Json::Value& record, long /*slots*/) { return Insert(record); }
 
-bool FileDB::Insert(const Json::Value& record) { return store_->Insert(record); }
-
-bool FileDB::UpdateLastByTime(const Json::Value& record, long /*slots*/) {
-  return store_->Insert(record);
+bool FileDB::Delete(const Condition& condition) {
+  return store_->Change([&](nas::Database& db) { DeleteMatching(db, condition); });
 }
-
-bool FileDB::Delete(const Condition& condition) { return store_->Delete(condition); }
 
 bool FileDB::Select(const Condition& condition, std::vector<Json::Value>& out) const {
-  return store_->Select(condition, out);
+  return store_->Use([&](nas::Database& db) {
+    int skip = std::max(condition.offset, 0);
+    int left = condition.limit > 0 ? condition.limit : INT_MAX;
+    for (Row& row : Matching(db, condition)) {
+      if (skip-- <= 0 && left-- > 0) out.push_back(std::move(row.record));
+    }
+  });
 }
 
 }  // namespace NUVA::WEBFM

@@ -102,6 +102,22 @@ TEST_F(FileDBTest, ComparesValuesAsText) {
   EXPECT_EQ(Patterns(), "");
 }
 
+TEST_F(FileDBTest, OneUnreadableRecordHidesNoOther) {
+  for (const char* pattern : {"old", "middle", "new"}) ASSERT_TRUE(Insert(Record(pattern)));
+  sqlite3* store = nullptr;
+  ASSERT_EQ(sqlite3_open(path().c_str(), &store), SQLITE_OK);
+  const char* damage = "UPDATE records SET body=x'7b22' WHERE CAST(body AS TEXT) LIKE '%middle%'";
+  ASSERT_EQ(sqlite3_exec(store, damage, nullptr, nullptr, nullptr), SQLITE_OK);
+  ASSERT_EQ(sqlite3_changes(store), 1);
+  sqlite3_close(store);
+  EXPECT_EQ(Patterns(), "new old ");
+  ASSERT_TRUE(Insert(Record("old", 1)));
+  EXPECT_EQ(Patterns(), "old new ");
+  EXPECT_TRUE(FileDB(path()).Delete({}));
+  ASSERT_TRUE(Insert(Record("next")));
+  EXPECT_EQ(Patterns(), "next ");
+}
+
 TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   MakeFolder("directory");
   const std::string garbage(5000, 'g');
