@@ -185,10 +185,23 @@ test('past searches are offered, repeated and cleared', async () => {
   const tab = await openTab();
   const { page } = tab;
   await tab.search('notes');
+  // Inside files, and nothing but text files: the server does not remember the first of these.
+  await page.goto(`${server.origin}/#q=needle&ext=txt&in=/files/docs&contents=1`);
+  await tab.over();
+  assert.deepEqual(await tab.names(), ['notes.txt']);
+  // The key is pressed before the history has come, which waits for it here.
+  let come = () => {};
+  const pressed = new Promise<void>((go) => (come = go));
+  await page.route('**/get', (route) => void pressed.then(() => route.continue()));
   await page.goto(server.origin + '/');
   await page.reload();
   await page.press('#pattern', 'ArrowDown');
+  come();
   await page.getByRole('option', { name: 'notes', exact: true }).waitFor();
+  await page.getByRole('option', { name: /^needle .*also inside files/ }).click();
+  await tab.over();
+  assert.deepEqual(await tab.names(), ['notes.txt']);
+  await page.fill('#pattern', '');
   const advanced = page.getByRole('option', { name: /^plan files/ });
   await advanced.click();
   await tab.over();

@@ -1,11 +1,13 @@
 // The parts of the page that only compute: each table row is a case that once could go wrong.
 import assert from 'node:assert/strict';
+import * as fs from 'node:fs';
+import { join } from 'node:path';
 import { test } from 'node:test';
 import { fromHash, toHash, type Address } from '../src/model/address.ts';
-import { NO_CRITERIA, startParams, CriterionError } from '../src/model/criteria.ts';
+import { criterion, CriterionError, FIELDS, NO_CRITERIA, OTHER_PARAMS, startParams, type Criteria } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
-import { fromRecord } from '../src/model/history.ts';
+import { fromRecord, lookedInside, withInside } from '../src/model/history.ts';
 import { formatSize, parseSize } from '../src/model/size.ts';
 import { pieces, visible } from '../src/model/text.ts';
 import { customValue, timeBounds } from '../src/model/times.ts';
@@ -40,12 +42,17 @@ test('highlighting marks what matched', () => {
   }
 });
 
+// A second of work, where a pattern that runs away takes years.
+const MOST_MICROSECONDS = 1_000_000;
+
 test('highlighting ends soon whatever the pattern', () => {
   const name = 'a'.repeat(255);
   for (const pattern of ['*a'.repeat(120) + 'b', 'a '.repeat(500), '*' + '?*'.repeat(400)]) {
-    const begun = performance.now();
+    // Of the processor: what else the machine does is no fault of the page.
+    const begun = process.cpuUsage();
     new Highlighter(pattern).ranges(name);
-    assert.ok(performance.now() - begun < 500, pattern.slice(0, 20));
+    const { user } = process.cpuUsage(begun);
+    assert.ok(user < MOST_MICROSECONDS, pattern.slice(0, 20));
   }
 });
 
@@ -179,15 +186,58 @@ test('what a search is started with', () => {
   assert.throws(() => startParams(plain, [], now), CriterionError);
 });
 
-test('the history gives back what was searched', () => {
-  const criteria = { ...NO_CRITERIA, pattern: 'x', kind: 'image', extension: 'jpg', sizeFrom: '1500', sizeTo: '2 GB', modified: '2026-01-01..2026-01-31', contents: true };
-  const record = startParams(criteria, ['/a', '/b'], new Date());
-  assert.deepEqual(fromRecord(record, ['/b', '/a']), criteria);
-  assert.deepEqual(fromRecord(record, ['/a'])?.folders, ['/a', '/b']);
-  assert.deepEqual(fromRecord({ pattern: 'x', folder_path: '/a,/c', recursive: false }, [])?.folders, ['/a', '/c']);
-  for (const broken of [{}, { pattern: '' }, { pattern: 3 }, { pattern: 'x', owner: '1026' }]) {
-    assert.equal(fromRecord(broken, []), null, JSON.stringify(broken));
+// What the server remembers of a search that was started with these parameters, as docs/api.md says.
+function remembered(params: Record<string, unknown>): Record<string, unknown> {
+  const { search_content: _c, search_type: _t, ...record } = params;
+  for (const name of ['owner', 'group']) if (record[name]) record[name] = '1026';
+  return record;
+}
+
+test('the history gives back what was searched, or nothing', () => {
+  const now = new Date();
+  const asked: Partial<Criteria>[] = [
+    {},
+    { contents: true },
+    { kind: 'image', contents: true },
+    { kind: 'image' },
+    { extension: 'jpg' },
+    { sizeFrom: '1500', sizeTo: '2 GB' },
+    { modified: '2026-01-01..2026-01-31' },
+    { created: '..2026-01-31' },
+    { accessed: '2026-01-01..' },
+    { subfolders: false },
+    { owner: 'ann' },
+    { group: 'staff' },
+  ];
+  const fields = new Set<string>(asked.flatMap((change) => Object.keys(change)));
+  assert.deepEqual(FIELDS.filter((field) => !fields.has(field)), [], 'every criterion has a row here');
+  for (const change of asked) {
+    const criteria = { ...NO_CRITERIA, pattern: 'x', ...change };
+    const params = startParams(criteria, ['/a', '/b'], now);
+    const kind = params.search_type as 'simple' | 'advance';
+    const patterns = withInside('y', criteria);
+    const repeated = fromRecord(remembered(params), kind, ['/b', '/a'], (one) => lookedInside(patterns, one));
+    const isId = 'owner' in change || 'group' in change;
+    assert.deepEqual(repeated, isId ? null : criteria, JSON.stringify(change));
   }
+  assert.equal(withInside('x\ny', { ...NO_CRITERIA, pattern: 'x', kind: 'file' }), 'y', 'no longer');
+  assert.equal(withInside('x\ny', { ...NO_CRITERIA, pattern: 'x' }), 'x\ny', 'the other history');
+  const never = () => false;
+  const folders = (folder_path: unknown) => fromRecord({ pattern: 'x', folder_path }, 'simple', ['/a'], never)?.folders;
+  assert.deepEqual(folders(['/a', '/b']), ['/a', '/b']);
+  assert.deepEqual(folders('/a,/c'), ['/a', '/c']);
+  for (const broken of [{}, { pattern: '' }, { pattern: 3 }, { pattern: 'x', color: 'red' }, { pattern: 'x', filetype: 'exe' }]) {
+    assert.equal(fromRecord(broken, 'simple', [], never), null, JSON.stringify(broken));
+  }
+});
+
+test('the page sends, and knows from the history, every parameter that the documents name', () => {
+  const api = fs.readFileSync(join(process.cwd(), '../docs/api.md'), 'utf8');
+  const start = /^### start\n([^]*?)^### /m.exec(api)![1]!;
+  const table = /\| parameter \|.*\n\|[-|]+\n((?:\|.*\n)+)/.exec(start)![1]!;
+  const documented = table.trim().split('\n').flatMap((row) => [...row.split('|')[1]!.matchAll(/`(\w+)`/g)].map((m) => m[1]!));
+  const known = [...OTHER_PARAMS, ...FIELDS.flatMap((field) => criterion(field).params)];
+  assert.deepEqual([...known].sort(), [...documented].sort());
 });
 
 test('exports are safe to open', () => {

@@ -1,7 +1,6 @@
 // The search in the address bar. It stands behind the "#", which is never sent to the server, so
 // that what people look for does not end up in the logs of a proxy.
-import { KINDS, NO_CRITERIA, type Criteria } from './criteria.ts';
-import { timeBounds } from './times.ts';
+import { CRITERIA, criterion, FIELDS, NO_CRITERIA, type Criteria } from './criteria.ts';
 
 export const SORT_COLUMNS = ['name', 'path', 'type', 'size', 'mtime'] as const;
 export type SortColumn = (typeof SORT_COLUMNS)[number];
@@ -17,25 +16,14 @@ export interface Address {
   sort: Sort | null;
 }
 
-const TEXTS = [
-  ['type', 'kind'],
-  ['ext', 'extension'],
-  ['min', 'sizeFrom'],
-  ['max', 'sizeTo'],
-  ['modified', 'modified'],
-  ['created', 'created'],
-  ['accessed', 'accessed'],
-  ['owner', 'owner'],
-  ['group', 'group'],
-] as const;
-
 export function toHash({ criteria, sort }: Address): string {
   const query = new URLSearchParams();
   query.set('q', criteria.pattern);
   for (const folder of criteria.folders) query.append('in', folder);
-  for (const [key, field] of TEXTS) if (criteria[field]) query.set(key, criteria[field]);
-  if (criteria.contents) query.set('contents', '1');
-  if (!criteria.subfolders) query.set('subfolders', '0');
+  for (const field of FIELDS) {
+    const value = criteria[field];
+    if (value !== NO_CRITERIA[field]) query.set(CRITERIA[field].key, textOf(value));
+  }
   if (sort) query.set('sort', sortText(sort));
   return '#' + query.toString();
 }
@@ -47,15 +35,19 @@ export function fromHash(hash: string): Address | null {
   if (!query.has('q')) return null;
   const criteria: Criteria = { ...NO_CRITERIA, pattern: query.get('q') ?? '' };
   criteria.folders = query.getAll('in').filter((folder) => /^\/[^/]/.test(folder));
-  for (const [key, field] of TEXTS) criteria[field] = query.get(key) ?? '';
-  if (!KINDS.some(([kind]) => kind === criteria.kind)) criteria.kind = '';
-  const now = new Date();
-  for (const field of ['modified', 'created', 'accessed'] as const) {
-    if (!timeBounds(criteria[field], now)) criteria[field] = '';
+  for (const field of FIELDS) {
+    const { key, none, fits } = criterion(field);
+    const value = valueOf(query.get(key) ?? '', none);
+    if (fits?.(value as string) ?? true) Object.assign(criteria, { [field]: value });
   }
-  criteria.contents = query.get('contents') === '1';
-  criteria.subfolders = query.get('subfolders') !== '0';
   return { criteria, sort: parseSort(query.get('sort')) };
+}
+
+const textOf = (value: string | boolean) => (typeof value === 'string' ? value : value ? '1' : '0');
+// A choice is told only by the value that it does not have by itself.
+function valueOf(text: string, none: string | boolean): string | boolean {
+  if (typeof none === 'string') return text;
+  return text === textOf(!none) ? !none : none;
 }
 
 export function sortText(sort: Sort | null): string {

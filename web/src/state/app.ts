@@ -2,7 +2,7 @@
 // is shown. Views read it and call it; it tells them when to draw again.
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
-import type { FileRow, Session, Share } from '../api/types.ts';
+import type { FileRow, HistoryKind, HistoryRecord, Session, Share } from '../api/types.ts';
 import { fromHash, parseSort, sortText, toHash, type Sort } from '../model/address.ts';
 import {
   CriterionError,
@@ -12,7 +12,7 @@ import {
   startParams,
   type Criteria,
 } from '../model/criteria.ts';
-import { fromRecord } from '../model/history.ts';
+import { fromRecord, lookedInside, withInside } from '../model/history.ts';
 import { recall, remember } from './memory.ts';
 import { Search } from './search.ts';
 
@@ -24,6 +24,8 @@ export interface Remembered {
 }
 
 const NOTICE_MS = 4000;
+// Under which the browser keeps the patterns that were looked for inside files.
+const INSIDE = 'inside';
 
 export class App {
   gate: Gate = 'loading';
@@ -34,6 +36,7 @@ export class App {
   draftError: CriterionError | null = null;
   search: Search | null = null;
   history: Remembered[] = [];
+  historyKnown = false; // until then it may still come
   unfolded = false;
   active = -1; // the row the keyboard is at
   detailed: FileRow | null = null; // the row shown beside the table
@@ -105,6 +108,7 @@ export class App {
     } catch {
       // The session may have ended by itself.
     }
+    remember(INSIDE, '');
     location.hash = '';
     location.reload();
   }
@@ -162,6 +166,7 @@ export class App {
       this.changed();
       return false;
     }
+    remember(INSIDE, withInside(recall(INSIDE), criteria));
     Object.assign(this, { detailed: null, active: -1 });
     this.setTitle();
     void this.search.run().then(() => this.loadHistory());
@@ -189,8 +194,10 @@ export class App {
         client.getHistory('simple'),
         client.getHistory('advance'),
       ]);
-      const past = [...simple.history, ...advanced.history]
-        .map((record) => fromRecord(record, this.everywhere))
+      const inside = (pattern: string) => lookedInside(recall(INSIDE), pattern);
+      const repeated = (records: HistoryRecord[], kind: HistoryKind) =>
+        records.map((record) => fromRecord(record, kind, this.everywhere, inside));
+      const past = [...repeated(simple.history, 'simple'), ...repeated(advanced.history, 'advance')]
         .filter((criteria) => criteria !== null);
       const differs = (one: Criteria, at: number) =>
         past.findIndex((other) => sameCriteria(one, other)) === at;
@@ -201,11 +208,13 @@ export class App {
     } catch {
       // Suggestions are a convenience; their absence is no reason to speak.
     }
+    this.set({ historyKnown: true });
   }
 
   async forgetHistory(): Promise<void> {
     try {
       await Promise.all([client.clearHistory('simple'), client.clearHistory('advance')]);
+      remember(INSIDE, '');
       this.set({ history: [] });
       this.tell('The history is cleared.');
     } catch (error) {

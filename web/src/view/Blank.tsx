@@ -1,6 +1,5 @@
 // In place of the table: how to search, before the first search; what to try, when nothing is found.
-import { hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
-import { describe } from '../model/history.ts';
+import { describe, hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';

@@ -1,7 +1,15 @@
 // The criteria beside the name. Folded away they are shown as tags that can be taken off.
 import { useState } from 'preact/hooks';
-import { hasCriteria, KINDS, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
-import { describe } from '../model/history.ts';
+import {
+  CRITERIA,
+  describe,
+  FIELDS,
+  hasCriteria,
+  KINDS,
+  NO_CRITERIA,
+  type Field,
+  type TextField,
+} from '../model/criteria.ts';
 import { splitCustom, TIME_WORDS } from '../model/times.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
@@ -10,44 +18,22 @@ import { Icon } from './icons.tsx';
 const LAST_DAY = '2038-01-18'; // the last whole day that a search can compare
 const CUSTOM = 'between';
 
+// The two sizes stand side by side; the rest as they come in the table.
+const AFTER_SIZE = FIELDS.slice(FIELDS.indexOf('sizeTo') + 1);
+
 export function CriteriaPanel({ app }: { app: App }) {
   const error = app.draftError;
   return (
     <section class="criteria" id="criteria" aria-label="Criteria">
-      <fieldset class="kinds">
-        <legend>Type</legend>
-        <div class="segments">
-          {KINDS.map(([kind, name]) => (
-            <label key={kind}>
-              <input
-                type="radio"
-                name="kind"
-                checked={app.draft.kind === kind}
-                onChange={() => app.edit({ kind })}
-              />
-              <span>{name}</span>
-            </label>
-          ))}
-        </div>
-      </fieldset>
-      <Text app={app} field="extension" label="Extension" placeholder="jpg, png, tar.gz" />
+      <Input app={app} field="kind" />
+      <Input app={app} field="extension" />
       <div class="pair" role="group" aria-label="Size">
-        <Text app={app} field="sizeFrom" label="Size from" placeholder="10 MB" />
-        <Text app={app} field="sizeTo" label="to" placeholder="2 GB" />
+        <Input app={app} field="sizeFrom" />
+        <Input app={app} field="sizeTo" />
       </div>
-      <Time app={app} field="modified" label="Modified" />
-      <Time app={app} field="created" label="Created" />
-      <Time app={app} field="accessed" label="Last opened" />
-      <Text app={app} field="owner" label="Owner" placeholder="account name" />
-      <Text app={app} field="group" label="Group" placeholder="group name" />
-      <label class="choice contents">
-        <input
-          type="checkbox"
-          checked={app.draft.contents}
-          onChange={(event) => app.edit({ contents: event.currentTarget.checked })}
-        />
-        Also look inside files
-      </label>
+      {AFTER_SIZE.map((field) => (
+        <Input key={field} app={app} field={field} />
+      ))}
       <footer>
         <p class="hint" role="alert">
           {error ? <span class="wrong">{error.message}</span> : 'An owner or group that does not exist restricts nothing.'}
@@ -65,11 +51,53 @@ export function CriteriaPanel({ app }: { app: App }) {
   );
 }
 
-interface TextProps {
-  app: App;
-  field: 'extension' | 'sizeFrom' | 'sizeTo' | 'owner' | 'group';
-  label: string;
-  placeholder: string;
+function Input({ app, field }: { app: App; field: Field }) {
+  switch (CRITERIA[field].input) {
+    case 'kind':
+      return <Kinds app={app} />;
+    case 'text':
+      return <Text app={app} field={field as TextField} />;
+    case 'time':
+      return <Time app={app} field={field as TextField} />;
+    case 'choice':
+      return <Choice app={app} field={field} />;
+    case 'folders':
+      return null;
+  }
+}
+
+function Kinds({ app }: { app: App }) {
+  return (
+    <fieldset class="kinds">
+      <legend>{CRITERIA.kind.label}</legend>
+      <div class="segments">
+        {KINDS.map(([kind, name]) => (
+          <label key={kind}>
+            <input
+              type="radio"
+              name="kind"
+              checked={app.draft.kind === kind}
+              onChange={() => app.edit({ kind })}
+            />
+            <span>{name}</span>
+          </label>
+        ))}
+      </div>
+    </fieldset>
+  );
+}
+
+function Choice({ app, field }: { app: App; field: Field }) {
+  return (
+    <label class={`choice ${field}`}>
+      <input
+        type="checkbox"
+        checked={app.draft[field] === true}
+        onChange={(event) => app.edit({ [field]: event.currentTarget.checked })}
+      />
+      {CRITERIA[field].label}
+    </label>
+  );
 }
 
 function searchOnEnter(app: App): (event: KeyboardEvent) => void {
@@ -78,7 +106,8 @@ function searchOnEnter(app: App): (event: KeyboardEvent) => void {
   };
 }
 
-function Text({ app, field, label, placeholder }: TextProps) {
+function Text({ app, field }: { app: App; field: TextField }) {
+  const { label, placeholder } = CRITERIA[field];
   return (
     <label class={`labelled ${field}`}>
       <span>{label}</span>
@@ -97,7 +126,8 @@ function Text({ app, field, label, placeholder }: TextProps) {
   );
 }
 
-function Time({ app, field, label }: { app: App; field: 'modified' | 'created' | 'accessed'; label: string }) {
+function Time({ app, field }: { app: App; field: TextField }) {
+  const { label } = CRITERIA[field];
   const value = app.draft[field];
   const [from, to] = splitCustom(value);
   const isWord = TIME_WORDS.some(([word]) => word === value);
@@ -151,12 +181,11 @@ function Time({ app, field, label }: { app: App; field: 'modified' | 'created' |
 
 // One tag for each criterion; taking it off searches again when there is a search to repeat.
 export function CriteriaTags({ app }: { app: App }) {
-  const tags = (Object.keys(NO_CRITERIA) as (keyof Criteria)[]).flatMap((field) => {
-    if (field === 'pattern' || field === 'folders') return [];
+  const tags = FIELDS.flatMap((field) => {
     const alone = { ...NO_CRITERIA, [field]: app.draft[field] };
     return describe(alone).map((text) => ({ field, text }));
   });
-  const drop = (field: keyof Criteria) => {
+  const drop = (field: Field) => {
     const change = { [field]: NO_CRITERIA[field] };
     if (app.search) app.submit(change);
     else app.edit(change);

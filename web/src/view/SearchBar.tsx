@@ -1,7 +1,7 @@
 // The one field, with past searches as suggestions: they unfold on a click, on typing or with the
 // arrow key, never by themselves.
 import { useEffect, useMemo, useRef, useState } from 'preact/hooks';
-import { describe } from '../model/history.ts';
+import { describe } from '../model/criteria.ts';
 import { visible } from '../model/text.ts';
 import type { App, Remembered } from '../state/app.ts';
 import { Icon } from './icons.tsx';
@@ -42,11 +42,16 @@ export function SearchBar({ app }: { app: App }) {
     } else if (event.key === 'ArrowDown' || event.key === 'ArrowUp') {
       event.preventDefault();
       const step = event.key === 'ArrowDown' ? 1 : -1;
-      if (!unfolded && step === 1 && (shown.length === 0 || app.search?.pages.total)) {
+      const nothing = app.historyKnown && shown.length === 0;
+      if (!unfolded && step === 1 && (nothing || app.search?.pages.total)) {
         document.querySelector<HTMLElement>('[role=grid]')?.focus();
         return;
       }
       setOpen(true);
+      if (!app.historyKnown) {
+        setAt(0); // they unfold as soon as they have come
+        return;
+      }
       const count = shown.length + 1; // one place is the field itself
       setAt(((at + 1 + step + count) % count) - 1);
     } else if (event.key === 'Escape') {
