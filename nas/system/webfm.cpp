@@ -4,7 +4,10 @@
 
 #include <json/value.h>
 
+#include <algorithm>
+#include <array>
 #include <string_view>
+#include <vector>
 
 #include "nas/base/json_text.h"
 
@@ -66,21 +69,8 @@ int ModeAsDecimal(std::uint32_t mode) {
 // Keys that are neither copied into each object nor with it: a page may hold very many files.
 using Key = Json::StaticString;
 
-// A file's object with the members that most have, to be copied and filled in their order: a large
-// page is made in a twentieth less time than by finding each by its name.
-const Json::Value& FileObject(bool with_real_path) {
-  static const Json::Value kObject = [] {
-    Json::Value object(Json::objectValue);
-    for (const char* name : {"is_dir", "name", "path"}) object[Key(name)];
-    return object;
-  }();
-  static const Json::Value kWithRealPath = [] {
-    Json::Value object = kObject;
-    object[Key("real_path")];
-    return object;
-  }();
-  return with_real_path ? kWithRealPath : kObject;
-}
+enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
+constexpr size_t kAdditionalMasks = 64;
 
 Json::Value OwnerOf(const DIRENTRY_INFO& entry) {
   Json::Value owner(Json::objectValue);
@@ -106,6 +96,56 @@ Json::Value PermissionsOf(const DIRENTRY_INFO& entry) {
   permissions[Key("privilege")] = entry.acl_privilege;
   permissions[Key("acl_mode")] = entry.acl_mode;
   return permissions;
+}
+
+struct Member {
+  const char* name;
+  int asked_by;  // bit of `additional`; 0: always there
+  void (*fill)(const DIRENTRY_INFO& entry, Json::Value& value);
+};
+constexpr Member kMembers[] = {
+    {"name", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.name; }},
+    {"path", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.path; }},
+    {"is_dir", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.is_dir; }},
+    {"real_path", kRealPath,
+     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.real_path; }},
+    {"size", kSize,
+     [](const DIRENTRY_INFO& entry, Json::Value& value) {
+       value = static_cast<Json::UInt64>(entry.size);
+     }},
+    {"owner", kOwner,
+     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = OwnerOf(entry); }},
+    {"time", kTime, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = TimesOf(entry); }},
+    {"perm", kPerm,
+     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = PermissionsOf(entry); }},
+    {"type", kType, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.type; }},
+};
+
+// The object of a file for one choice of attributes, its members not filled yet, and those members
+// in the order in which the object holds them. Copying it and filling the copy from end to end
+// takes less than finding or adding each member by its name.
+struct Shape {
+  Json::Value object;
+  std::vector<const Member*> members;
+};
+
+Shape ShapeFor(int additional) {
+  Shape shape;
+  for (const Member& member : kMembers) {
+    if (member.asked_by == 0 || (additional & member.asked_by)) shape.object[Key(member.name)];
+  }
+  for (auto it = shape.object.begin(); it != shape.object.end(); ++it) {
+    shape.members.push_back(
+        std::ranges::find_if(kMembers, [&](const Member& m) { return it.name() == m.name; }));
+  }
+  return shape;
+}
+
+const Shape& KnownShape(int additional) {
+  thread_local std::array<Shape, kAdditionalMasks> shapes;
+  Shape& shape = shapes[static_cast<size_t>(additional) % kAdditionalMasks];
+  if (shape.members.empty()) shape = ShapeFor(additional);
+  return shape;
 }
 
 }  // namespace
@@ -134,17 +174,8 @@ Json::Value StringExplodeEx(const Json::Value& value, const char* separator, int
 
 void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, int /*reserved1*/,
                   int /*reserved2*/) {
-  using namespace nas;
-  enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
-  out = FileObject((additional & kRealPath) != 0);
-  auto member = out.begin();
-  *member = entry.is_dir;
-  *++member = entry.name;
-  *++member = entry.path;
-  if (additional & kRealPath) *++member = entry.real_path;
-  if (additional & kSize) out[Key("size")] = static_cast<Json::UInt64>(entry.size);
-  if (additional & kOwner) out[Key("owner")] = OwnerOf(entry);
-  if (additional & kTime) out[Key("time")] = TimesOf(entry);
-  if (additional & kPerm) out[Key("perm")] = PermissionsOf(entry);
-  if (additional & kType) out[Key("type")] = entry.type;
+  const nas::Shape& shape = nas::KnownShape(additional);
+  out = shape.object;
+  auto member = shape.members.begin();
+  for (Json::Value& value : out) (*member++)->fill(entry, value);
 }
