@@ -1,9 +1,11 @@
 // Names against patterns, extensions and kinds: what a person types against what is on disk.
 
 #include <gtest/gtest.h>
+#include <json/json.h>
 #include <utf8proc.h>
 
 #include <algorithm>
+#include <fstream>
 #include <memory>
 #include <string>
 
@@ -26,64 +28,24 @@ bool Matches(const std::string& pattern_text, const std::string& name) {
   return pattern && pattern->Matches(folded);
 }
 
+// The cases are the page's too, which marks in a name what the pattern found: one table for both.
 TEST(NamePattern, Table) {
+  std::ifstream file(ARBORY_SOURCE_DIR "/tests/patterns.json");
+  Json::Value rows;
+  file >> rows;
+  EXPECT_GT(rows.size(), 100U);
+  for (const Json::Value& row : rows) {
+    EXPECT_EQ(Matches(row["pattern"].asString(), row["name"].asString()), !row["marks"].isNull())
+        << row;
+  }
+}
+
+TEST(NamePattern, NamesThatAreNotUtf8) {
   const struct Row {
     std::string pattern, name;
     bool matches;
     const char* why;
   } rows[] = {
-      {"", "anything", true, "no term restricts nothing"},
-      {"   ", "anything", true, "spaces are no term"},
-      {"voice", "My INVOICE.pdf", true, "anywhere, ignoring case"},
-      {"voices", "My INVOICE.pdf", false, ""},
-      {"invoice 2024", "2024-Invoice", true, "all terms, any order"},
-      {"invoice 2023", "2024-Invoice", false, "all terms"},
-      {"jpg|png", "a.PNG", true, "either"},
-      {"jpg | png", "a.png", true, "spaces around the bar"},
-      {"jpg|png holiday", "holiday.gif", false, "the bar binds closer than the space"},
-      {"!draft", "final.txt", true, "not"},
-      {"!draft", "Draft.txt", false, ""},
-      {"report !draft", "report draft", false, ""},
-      {"!", "wow!", true, "a lone mark is text"},
-      {"\"a b\"", "xa bx", true, "quotes hold a space"},
-      {"\"a b\"", "a  b", false, ""},
-      {"\"*\"", "a*b", true, "quotes hold a star"},
-      {"\"*\"", "ab", false, ""},
-      {"\"a|b\"", "a|b", true, ""},
-      {"\"open end", "an open end", true, "an unclosed quote runs to the end"},
-      {"\"\"", "x", true, "an empty quote is no term"},
-      {"5\"disk", "5\"disk", true, "a quote inside a word is text"},
-      {"*.conf", "resolv.CONF", true, ""},
-      {"*.conf", "resolv.conf.bak", false, "a glob is about the whole name"},
-      {"re*", "resolv", true, ""},
-      {"re*", "are", false, ""},
-      {"a*b*c", "aXbYbZc", true, ""},
-      {"a*b*c", "aXcYb", false, ""},
-      {"*ab*ab*", "abab", true, ""},
-      {"*ab*ab*", "aba", false, "pieces do not overlap"},
-      {"a?c", "abc", true, ""},
-      {"a?c", "aéc", true, "a character, not a byte"},
-      {"a?c", "ac", false, ""},
-      {"?", "", false, ""},
-      {"[a-c]1", "B1", true, ""},
-      {"[!a-c]1", "b1", false, ""},
-      {"[!a-c]1", "d1", true, ""},
-      {"[]x]1", "]1", true, "a bracket first in a set stands for itself"},
-      {"[draft", "my [draft] 1", true, "an unclosed set is text"},
-      {"[0-9]*[0-9]", "1x2", true, ""},
-      {"*[0-9]", "12", true, "the last set may touch the first"},
-      {"*?", "é", true, ""},
-      {"[α-ω]*", "Λίστα", true, "sets of folded letters"},
-      {"é", "e\u0301", true, "typed composed, stored decomposed"},
-      {"e\u0301", "É", true, "typed decomposed, stored composed"},
-      {"e", "e\u0301", false, "a decomposed letter is not its base"},
-      {"strasse", "STRAßE", true, "full case folding"},
-      {"STRASSE", "straße", true, ""},
-      {"ß", "gross", true, ""},
-      {"k", "\u212a", true, "the Kelvin sign"},
-      {"ffi", "o\ufb03ce", true, "a ligature"},
-      {"office", "o\ufb03ce", true, ""},
-      {"фото", "ФОТО.jpg", true, ""},
       {"x", "\xff\xfex", true, "broken UTF-8 is matched by bytes"},
       {"\xff",
        "a\xff"
@@ -95,19 +57,10 @@ TEST(NamePattern, Table) {
        "a\xff"
        "b",
        true, ""},
-      {"regex:^img_\\d+$", "IMG_0042", true, "regular expressions ignore case too"},
-      {"regex:^img_\\d+$", "IMG_0042.jpg", false, ""},
-      {"regex:a b", "xa bx", true, "a space belongs to the expression"},
-      {"holiday regex:\\.(jpg|png)$", "Holiday.png", true, "after other terms"},
-      {"!regex:^a", "b", true, ""},
-      {"regex:^.$", "\n", true, "a newline is a character of a name"},
-      {"regex:é", "e\u0301", true, "names are composed before"},
       {"regex:x",
        "\xff"
        "x",
        true, "broken UTF-8 around"},
-      {"regex:k", "\u212a", true, "and fold beyond ASCII"},
-      {"regex:", "anything", true, "an empty expression is no term"},
   };
   for (const Row& row : rows) {
     EXPECT_EQ(Matches(row.pattern, row.name), row.matches)
