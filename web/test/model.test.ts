@@ -31,6 +31,8 @@ test('highlighting speaks the language of the engine', () => {
   ] as const) {
     assert.equal(marked(pattern, 'aaa'), 'aaa', why);
   }
+  const line = new Highlighter('regex:^b.*', 'contents').ranges('a\nbc\nd');
+  assert.deepEqual(line, [[2, 4]], 'contents have lines');
 });
 
 function marked(pattern: string, name: string): string {

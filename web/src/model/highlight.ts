@@ -17,12 +17,13 @@ export class Highlighter {
   private readonly terms: Term[];
   private readonly regexes: RegExp[];
 
-  constructor(pattern: string) {
+  // As the server does, a name is taken as one text, and contents line by line.
+  constructor(pattern: string, where: 'name' | 'contents' = 'name') {
     const terms = parse(pattern);
     this.terms = terms
       .filter((term) => term.kind !== 'regex')
       .map((term) => ({ ...term, text: fold(term.text).text }));
-    this.regexes = terms.flatMap((term) => (term.kind === 'regex' ? compile(term.text) : []));
+    this.regexes = terms.flatMap((term) => (term.kind === 'regex' ? compile(term.text, where) : []));
   }
 
   // Ordered, not overlapping.
@@ -57,10 +58,10 @@ function parse(pattern: string): Term[] {
   return terms;
 }
 
-function compile(source: string): RegExp[] {
+function compile(source: string, where: 'name' | 'contents'): RegExp[] {
   if (NOT_TRIED.test(source)) return [];
   try {
-    return [new RegExp(source.normalize('NFC'), 'gisu')];
+    return [new RegExp(source.normalize('NFC'), where === 'name' ? 'gisu' : 'gimu')];
   } catch {
     return [];
   }

@@ -128,7 +128,7 @@ function TextPreview({ address, pattern, fail }: { address: string; pattern: str
   const box = useRef<HTMLDivElement>(null);
   useEffect(() => {
     const abort = new AbortController();
-    readStart(address, new Highlighter(pattern), abort.signal).then(setStart, () => {
+    readStart(address, new Highlighter(pattern, 'contents'), abort.signal).then(setStart, () => {
       if (!abort.signal.aborted) fail();
     });
     return () => abort.abort();
