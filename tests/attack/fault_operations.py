@@ -1,0 +1,315 @@
+"""The operations that the fault campaign attacks, and what each promises when a call of the system
+fails in it."""
+
+import json
+import os
+
+from house import (FOUND, HISTORY, Hang, House, QUERY, SEARCH, Server, Tree, children, eventually)
+from injector import Faults
+
+CODES = {0, 100, 101, 400, 401, 405, 407, 408, 418, 600}
+STATUSES = {200, 400, 401, 403, 404, 408, 429, 503}
+OLD_HISTORY = ["one", "older"]
+
+
+class Broken(Exception):
+    pass
+
+
+def demand(holds, what):
+    if not holds:
+        raise Broken(what)
+
+
+class Attack:
+    """One house, in which every fault begins from the same state."""
+
+    def __init__(self, bin_dir):
+        self.house = House(bin_dir, self.login_lines())
+        self.faults = Faults(self.house)
+        self.make_pam()
+        os.makedirs(self.house.dir + "/volume1/endless")
+        with open(self.house.dir + "/volume1/endless/one.log", "w") as file:
+            file.write("a" * (1 << 18))
+            file.truncate(1 << 42)
+        self.checker = Server(self.house, "checker")
+        self.victim = self.logins = None
+        self.call(HISTORY + "set", {"pattern": "older"})
+        self.found = self.search("one")
+        self.tree = Tree(self.house.state, self.house.dir + "/volume1/@tmp")
+
+    def login_lines(self):
+        return 'logins_per_minute = 1000000\npam_dir = "PAM"\n'
+
+    def make_pam(self):
+        folder = self.house.dir + "/pam"
+        os.mkdir(folder)
+        with open(folder + "/check", "w") as file:
+            file.write('#!/bin/sh\nread -r given || :\n[ "$given" = right ]\n')
+        os.chmod(folder + "/check", 0o755)
+        with open(folder + "/arbory", "w") as file:
+            file.write(f"auth required pam_exec.so quiet expose_authtok {folder}/check\n"
+                       "account required pam_permit.so\n")
+        with open(self.house.config) as file:
+            text = file.read()
+        with open(self.house.config, "w") as file:
+            file.write(text.replace('"PAM"', f'"{folder}"'))
+
+    def call(self, method, params):
+        return self.checker.call(method, params)
+
+    def start(self, pattern, location="/share", contents=False):
+        reply = self.call(SEARCH + "start", {"folder_path": location, "pattern": pattern,
+                                             "search_content": contents})
+        demand(reply["code"] == 0, f"a start without faults: {reply}")
+        return reply["data"]["taskid"]
+
+    def list_to_end(self, task):
+        def ended():
+            reply = self.call(SEARCH + "list", {"taskid": task})
+            return reply if reply["code"] != 0 or reply["data"]["finished"] else None
+        reply = eventually(ended)
+        demand(reply, "a search without a worker never finishes")
+        return reply
+
+    def search(self, pattern):
+        task = self.start(pattern)
+        demand(paths(self.list_to_end(task)) == FOUND, "a search without faults finds too little")
+        return task
+
+    def restart(self):
+        self.tree.put_back()
+
+    def server(self, logins):
+        """The one whose calls fail."""
+        name = "logins" if logins else "victim"
+        server = getattr(self, name)
+        if server is None or not server.lives():
+            self.faults.disarm()
+            server = Server(self.house, name, self.faults.environment, logins)
+            server.ask("GET", "/health")
+            server.quiet = server.settled_descriptors()
+            setattr(self, name, server)
+        return server
+
+    def forget_servers(self):
+        """One that broke a promise may have more to break."""
+        for server in (self.victim, self.logins):
+            if server and server.lives():
+                server.kill()
+        self.victim = self.logins = None
+        self.house.kill_the_unknown()
+
+    def close(self):
+        self.house.remove()
+
+
+def paths(reply):
+    data = reply.get("data") or {}
+    return sorted(file["path"] for file in data.get("files", []))
+
+
+def check_reply(reply):
+    demand(set(reply) == {"code", "data"} and reply["code"] in CODES, f"an unknown reply: {reply}")
+    demand(reply["code"] == 0 or reply["data"] is None, f"an error with data: {reply}")
+    return reply
+
+
+class Call:
+    """An operation of `arbory call`. `histories` are those that may stand afterwards."""
+
+    def __init__(self, method, params=None, histories=(OLD_HISTORY,), keeps_results=True,
+                 adds_search=False):
+        self.method = method
+        self.params = params
+        self.histories = histories
+        self.keeps_results = keeps_results
+        self.adds_search = adds_search
+
+    def prepare(self, attack):
+        self.running = None
+
+    def run(self, attack):
+        return attack.house.run(attack.house.call_words(self.method, self.made(attack)),
+                                attack.faults.environment)
+
+    def made(self, attack):
+        names = {"FOUND": attack.found, "RUNNING": self.running}
+        return {key: names.get(value, value) if isinstance(value, str) else value
+                for key, value in (self.params or {}).items()}
+
+    def check(self, attack, result, harmless):
+        status, out, err = result
+        demand(status in (0, 1, 2), f"exit status {status}: {err}")
+        if status == 2:
+            mute = attack.faults.wants("write") and not err  # standard error is written as well
+            demand(not out and (err.startswith("arbory: ") or mute) and not harmless,
+                   f"an error without a word: {out}{err}")
+            return
+        lines = out.splitlines()
+        demand(len(lines) == 1, f"not one reply: {out}{err}")
+        reply = check_reply(json.loads(lines[0]))
+        demand(status == (reply["code"] != 0), f"status {status} for {reply}")
+        self.check_content(attack, reply, harmless)
+
+    def check_content(self, attack, reply, harmless):
+        if harmless:
+            demand(reply["code"] == 0, f"what is no failure made one: {reply}")
+        # A search whose record cannot be read is one that was cleaned, as far as a listing can tell.
+        cleaned = not harmless and reply["data"] == {"finished": True}
+        if self.method == SEARCH + "list" and reply["code"] == 0 and not cleaned:
+            demand(paths(reply) == FOUND, f"a listing that lost files: {paths(reply)}")
+        if self.method == HISTORY + "get" and reply["code"] == 0 and harmless:
+            demand(patterns(reply) == OLD_HISTORY, f"a history that lost entries: {reply}")
+        if self.method == SEARCH + "start" and reply["code"] == 0:
+            check_search(attack, reply["data"]["taskid"], harmless)
+
+
+def patterns(reply):
+    return [entry.get("pattern") for entry in reply["data"]["history"]]
+
+
+def check_search(attack, task, harmless):
+    """A search that calls itself complete is; every other one says that it is not."""
+    reply = attack.list_to_end(task)
+    try:
+        with open(f"{attack.house.tasks}/{task}.json") as file:
+            properties = json.load(file)["properties"]
+    except FileNotFoundError:
+        raise Broken("a search that was started has no record") from None
+    skipped = (properties.get("walk") or {}).get("skipped", {})
+    complete = properties.get("progress") == 1 and not any(skipped.values())
+    demand(complete or not harmless, f"what is no failure made one: {properties}")
+    if complete:
+        demand(paths(reply) == FOUND, f"a complete search lost files: {paths(reply)} {reply['code']}")
+
+
+class Stop(Call):
+    def prepare(self, attack):
+        self.running = attack.start("one", "/endless", contents=True)
+        demand(eventually(lambda: self.walks(attack)), "a search without faults does not walk")
+
+    def walks(self, attack):
+        with open(f"{attack.house.tasks}/{self.running}.json") as file:
+            return "sdbid" in json.load(file)["properties"].get("data", {})
+
+    def check(self, attack, result, harmless):
+        super().check(attack, result, harmless)
+        # What a fault has kept alive, one without faults ends.
+        if not harmless:
+            attack.call(SEARCH + "stop", {"taskid": self.running})
+        demand(eventually(lambda: not children(attack.checker.process)), "a stopped worker lives on")
+
+
+class Terminal:
+    histories = (OLD_HISTORY, ["on", *OLD_HISTORY])
+    keeps_results = True
+    adds_search = False
+
+    def prepare(self, attack):
+        pass
+
+    def run(self, attack):
+        return attack.house.run(attack.house.words("search", "on", attack.house.share),
+                                attack.faults.environment)
+
+    def check(self, attack, result, harmless):
+        status, out, err = result
+        expected = {attack.house.dir + "/volume1" + path for path in FOUND}
+        lines = out.splitlines()
+        demand(status in (0, 1, 2), f"exit status {status}: {err}")
+        demand(len(lines) == len(set(lines)) and set(lines) <= expected,
+               f"lines that are no results: {out}")
+        if status == 2 or len(lines) < len(expected):
+            mute = attack.faults.wants("write") and status == 2
+            demand(err.startswith("arbory: ") or mute, f"status {status} without a word: {out}")
+        demand(not harmless or (status == 0 and not err), f"what is no failure made one: {err}")
+
+
+class Http(Call):
+    """The same by way of a server whose calls fail."""
+
+    logins = False
+
+    def run(self, attack):
+        return self.ask(attack, "POST", "/api/" + self.method, self.made(attack))
+
+    def ask(self, attack, *request):
+        try:
+            reply = attack.server(self.logins).ask(*request)
+            return reply.status, reply.content
+        except TimeoutError:
+            raise Hang() from None
+        except OSError as error:
+            return 0, str(error)
+        except Exception as error:  # a reply that broke off
+            return 0, repr(error)
+
+    def check(self, attack, result, harmless):
+        server = attack.logins if self.logins else attack.victim
+        demand(server.lives(), "the server died")
+        demand(eventually(lambda: not children(server.process)), "the server keeps a child")
+        demand(eventually(lambda: server.descriptors() == server.quiet, 5),
+               f"the server keeps descriptors: {server.quiet} became {server.descriptors()}")
+        demand(server.ask("GET", "/health").status == 200, "the server is not well")
+        status, content = result
+        lost = attack.faults.wants("socket")
+        demand(status in STATUSES or (status == 0 and lost), f"status {status}: {content}")
+        if harmless:
+            demand(status == 200, f"what is no failure made one: {status} {content}")
+        if status == 200:
+            self.check_body(attack, content, harmless)
+
+    def check_body(self, attack, content, harmless):
+        self.check_content(attack, check_reply(json.loads(content)), harmless)
+
+
+class Download(Http):
+    def run(self, attack):
+        return self.ask(attack, "GET", "/files/share/one.txt")
+
+    def check_body(self, attack, content, harmless):
+        demand(content == b"one\n", f"another file: {content}")
+
+
+class Login(Http):
+    logins = True
+
+    def __init__(self, password):
+        super().__init__("login")
+        self.password = password
+
+    def run(self, attack):
+        return self.ask(attack, "POST", "/login",
+                        {"user": attack.house.user, "password": self.password})
+
+    def check(self, attack, result, harmless):
+        if self.password != "right":
+            demand(result[0] != 200, "a wrong password opened the door")
+            harmless = False
+        super().check(attack, result, harmless)
+
+    def check_body(self, attack, content, harmless):
+        demand(json.loads(content)["user"] == attack.house.user, f"somebody else: {content}")
+
+
+def operations():
+    start = {**QUERY, "pattern": "on", "extension": "txt,jpg", "size_to": 100}
+    after_start = (OLD_HISTORY, ["on", *OLD_HISTORY])
+    listed = {"taskid": "FOUND", "sort_by": "name", "additional": "real_path,size,owner,time,perm"}
+    return {
+        "start": Call(SEARCH + "start", start, after_start, adds_search=True),
+        "list": Call(SEARCH + "list", listed),
+        "stop": Stop(SEARCH + "stop", {"taskid": "RUNNING"}),
+        "clean": Call(SEARCH + "clean", {"taskid": "FOUND"}, keeps_results=False),
+        "clean-all": Call(SEARCH + "Clean", {"action": "cleanall"}, keeps_results=False),
+        "get": Call(HISTORY + "get", {}),
+        "set": Call(HISTORY + "set", {"pattern": "new"}, (OLD_HISTORY, ["new", *OLD_HISTORY])),
+        "delete": Call(HISTORY + "delete", {}, (OLD_HISTORY, [])),
+        "search": Terminal(),
+        "http-start": Http(SEARCH + "start", start, after_start,
+                           adds_search=True),
+        "http-list": Http(SEARCH + "list", listed),
+        "download": Download("download"),
+        **({"login": Login("right"), "refusal": Login("wrong")} if os.geteuid() == 0 else {}),
+    }
