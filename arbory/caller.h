@@ -16,13 +16,14 @@ namespace arbory {
 inline constexpr char kSearchApi[] = "NUVA.Arbory.Search";
 inline constexpr int kSearchVersion = 2;
 
+// For one thread. Calls run in children of this process, forked by each.
 class Caller {
  public:
   // Reads the configuration and makes it the process's. Throws UsageError or nas::ConfigError, also
   // for a user that the caller may not act for.
   explicit Caller(const CommonOptions& options);
 
-  // Offers more shares, for this run.
+  // Offers more shares, for this run; calls begun before do not know them.
   void AddShares(const std::vector<nas::ShareSetting>& shares);
 
   const std::string& user() const { return user_; }

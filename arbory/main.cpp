@@ -1,7 +1,5 @@
 // The `arbory` program: reads its command line and hands each command its options.
 
-#include <unistd.h>
-
 #include <CLI/CLI.hpp>
 #include <exception>
 #include <memory>
@@ -198,7 +196,7 @@ int main(int argc, char** argv) {
   try {
     return arbory::Run(argc, argv);
   } catch (const std::exception& error) {
-    arbory::WriteOut(STDERR_FILENO, "arbory: " + arbory::Escaped(error.what()) + "\n");
+    arbory::Complain(error.what());
     return arbory::kExitError;
   }
 }

@@ -43,10 +43,6 @@ constexpr std::chrono::milliseconds kLately{300};
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
-void Complain(const std::string& sentence) {
-  WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
-}
-
 class Search {
  public:
   Search(Caller* caller, const SearchOptions& options)

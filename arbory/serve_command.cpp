@@ -17,7 +17,6 @@ namespace arbory {
 namespace {
 
 void Say(const std::string& line) { WriteOut(STDOUT_FILENO, line + "\n"); }
-void Warn(const std::string& line) { WriteOut(STDERR_FILENO, "arbory: " + line + "\n"); }
 
 nas::ServerSettings SettingsOf(const ServeOptions& options) {
   nas::ServerSettings settings = nas::CurrentConfig().server;
@@ -32,7 +31,7 @@ void OfferSample(Caller* caller) {
   if (!nas::ListShares().empty() || !nas::CurrentConfig().shares.empty()) return;
   const auto folder = MakeSampleShare(nas::CurrentConfig().state_dir);
   if (!folder) {
-    Warn(
+    Complain(
         "no share is configured, and the sample share's files are not installed; give a folder "
         "with --share NAME=DIR");
     return;
@@ -62,7 +61,7 @@ Service::Setup SetupOf(const ServeOptions& options, const nas::ServerSettings& s
 void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& settings,
                      const HttpServer& server) {
   if (!server.on_loopback() && !settings.behind_tls) {
-    Warn(
+    Complain(
         "listening beyond this machine without TLS: passwords and files can be read on the way; "
         "put a proxy with TLS in front and set behind_tls");
   }
@@ -70,8 +69,8 @@ void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& set
   const bool found = settings.pam_dir.empty() ? access(("/etc/pam.d" + service).c_str(), R_OK) == 0
                                               : access(service.c_str(), R_OK) == 0;
   if (HasLogins(options) && !found) {
-    Warn("there is no PAM service file " + settings.pam_service +
-         ", so every login will be refused; see packaging/pam/arbory");
+    Complain("there is no PAM service file " + settings.pam_service +
+             ", so every login will be refused; see packaging/pam/arbory");
   }
 }
 

@@ -69,6 +69,10 @@ bool WriteOut(int fd, std::string_view bytes) {
   return true;
 }
 
+void Complain(std::string_view sentence) {
+  WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
+}
+
 ProgressLine::ProgressLine() : enabled_(isatty(STDERR_FILENO)), due_(Clock::now() + kFirstLine) {}
 
 bool ProgressLine::Due() const { return enabled_ && Clock::now() >= due_; }

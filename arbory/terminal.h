@@ -15,6 +15,9 @@ std::string Escaped(std::string_view text);
 // Writes all of it. False with errno set, or when interrupted half-way.
 bool WriteOut(int fd, std::string_view bytes);
 
+// "arbory: SENTENCE" on standard error, escaped: sentences quote names.
+void Complain(std::string_view sentence);
+
 // One line on standard error that is drawn over and over. Does nothing where that is no terminal.
 class ProgressLine {
  public:
