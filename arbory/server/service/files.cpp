@@ -14,9 +14,9 @@
 #include "nas/base/file_io.h"
 #include "nas/base/system_call.h"
 #include "nas/system/child.h"
+#include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
-#include "platform/webfm.h"
 
 namespace arbory {
 namespace {
@@ -34,37 +34,54 @@ constexpr char kPdfPolicy[] =
 constexpr char kPdf[] = "application/pdf";
 
 // The identity for good: nothing in this child needs to be root again.
-bool BecomeForGood(const std::string& user) {
-  if (WfmLibUGIDSet(nullptr, user.c_str()) < 0) return false;
-  const uid_t uid = geteuid();
-  return setresuid(uid, uid, uid) == 0;
+nas::Status BecomeForGood(const std::string& user) {
+  const auto account = nas::BecomeUser(user);
+  if (!account) return account.error();
+  if (setresuid(account->uid, account->uid, account->uid) != 0) return nas::ErrnoError();
+  return {};
 }
 
-// The folder that stands for the share; invalid with errno set.
-nas::UniqueFd OpenRoot(const FileRequest& request) {
-  constexpr int kFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
+nas::Result<nas::UniqueFd> OpenFolder(const std::string& path, int more_flags) {
+  nas::UniqueFd folder(open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC | more_flags));
+  if (!folder) return nas::ErrnoError(path);
+  return folder;
+}
+
+// The folder that stands for the share.
+nas::Result<nas::UniqueFd> OpenRoot(const FileRequest& request) {
   if (request.share == kHome) {
     char home[PATH_MAX];
     if (NUVAServiceHomePathGet(request.user.c_str(), home, sizeof home) != 0) {
-      return nas::UniqueFd();
+      return nas::ErrnoError(kHome);
     }
     // The home must be the user's folder itself, so that no link stands for it.
-    return nas::UniqueFd(open(home, kFlags | O_NOFOLLOW));
+    return OpenFolder(home, O_NOFOLLOW);
   }
   const auto share = nas::FindShare(request.share);
-  if (!share) {
-    errno = ENOENT;
-    return nas::UniqueFd();
-  }
-  return nas::UniqueFd(open(share->root.empty() ? "/" : share->root.c_str(), kFlags));
+  if (!share) return nas::ErrnoError(ENOENT, request.share);
+  return OpenFolder(share->root.empty() ? "/" : share->root, 0);
 }
 
-nas::UniqueFd OpenBeneath(int root, const std::vector<std::string>& path) {
+struct RegularFile {
+  nas::UniqueFd fd;
+  struct stat info = {};
+};
+
+// ENOENT for what is no file.
+nas::Result<RegularFile> OpenFile(const FileRequest& request) {
+  const auto root = OpenRoot(request);
+  if (!root) return root.error();
   std::string below;
-  for (const std::string& segment : path) below += (below.empty() ? "" : "/") + segment;
+  for (const std::string& segment : request.path) below += (below.empty() ? "" : "/") + segment;
+  RegularFile file;
   // Without O_NONBLOCK a pipe would be waited for; a terminal must not become this process's.
-  return nas::OpenAt2(root, below.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY,
-                      RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
+  file.fd = nas::OpenAt2(root->get(), below.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY,
+                         RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS);
+  if (!file.fd) return nas::ErrnoError(below);
+  if (fstat(file.fd.get(), &file.info) != 0 || !S_ISREG(file.info.st_mode)) {
+    return nas::ErrnoError(ENOENT, below);
+  }
+  return file;
 }
 
 void SendError(int pipe, int status, const char* sentence) {
@@ -83,20 +100,12 @@ void SendOpenError(int pipe, int error) {
   }
 }
 
-std::string HttpDate(time_t time) {
-  constexpr size_t kRoom = 64;
-  char text[kRoom];
-  tm parts;
-  gmtime_r(&time, &parts);
-  return {text, strftime(text, sizeof text, "%a, %d %b %Y %H:%M:%S GMT", &parts)};
-}
-
 nas::ReplyHead HeadOf(const FileRequest& request, const struct stat& info, const ByteRange& range) {
   const std::string& name = request.path.back();
-  const std::string type = request.preview ? PreviewType(name) : std::string();
+  const auto type = request.preview ? PreviewType(name) : std::nullopt;
   nas::ReplyHead head{range.partial ? kPartial : kOk, 0, {}};
-  head.fields = {{"Content-Type", type.empty() ? "application/octet-stream" : type},
-                 {"Content-Disposition", ContentDisposition(!type.empty(), name)},
+  head.fields = {{"Content-Type", type.value_or("application/octet-stream")},
+                 {"Content-Disposition", ContentDisposition(type.has_value(), name)},
                  {"Content-Security-Policy", type == kPdf ? kPdfPolicy : kPreviewPolicy},
                  {"Last-Modified", HttpDate(info.st_mtime)},
                  {"Accept-Ranges", "bytes"},
@@ -127,13 +136,9 @@ void ServeFile(const FileRequest& request, int pipe) {
   if (!BecomeForGood(request.user)) {
     return SendError(pipe, kUnavailable, "The server cannot act as this user.");
   }
-  const nas::UniqueFd root = OpenRoot(request);
-  if (!root) return SendOpenError(pipe, errno);
-  const nas::UniqueFd file = OpenBeneath(root.get(), request.path);
-  if (!file) return SendOpenError(pipe, errno);
-  struct stat info;
-  if (fstat(file.get(), &info) != 0 || !S_ISREG(info.st_mode)) return SendOpenError(pipe, ENOENT);
-  const auto size = static_cast<std::uint64_t>(info.st_size);
+  const auto file = OpenFile(request);
+  if (!file) return SendOpenError(pipe, file.error().error_number);
+  const auto size = static_cast<std::uint64_t>(file->info.st_size);
   const ByteRange range = ParseRange(request.range, size);
   if (!range.satisfiable) {
     const HttpReply reply = ErrorReply(kNotSatisfiable, "The file has none of these bytes.");
@@ -142,8 +147,9 @@ void ServeFile(const FileRequest& request, int pipe) {
     nas::SendReply(pipe, {head, reply.body});
     return;
   }
-  if (!nas::SendHead(pipe, HeadOf(request, info, range), range.count) || request.head_only) return;
-  SendBytes(pipe, file.get(), range);
+  if (!nas::SendHead(pipe, HeadOf(request, file->info, range), range.count) || request.head_only)
+    return;
+  SendBytes(pipe, file->fd.get(), range);
 }
 
 bool ParseNumber(std::string_view text, std::uint64_t* number) {
@@ -157,11 +163,11 @@ nas::Child StartFile(const FileRequest& request) {
   return nas::StartChild([&](int pipe) { ServeFile(request, pipe); });
 }
 
-ByteRange ParseRange(const std::string& field, std::uint64_t size) {
+ByteRange ParseRange(const std::optional<std::string>& field, std::uint64_t size) {
   constexpr std::string_view kUnit = "bytes=";
   const ByteRange whole{0, size, false, true};
-  if (!field.starts_with(kUnit)) return whole;
-  const std::string_view range = std::string_view(field).substr(kUnit.size());
+  if (!field || !field->starts_with(kUnit)) return whole;
+  const std::string_view range = std::string_view(*field).substr(kUnit.size());
   const size_t dash = range.find('-');
   if (dash == std::string_view::npos) return whole;
   const std::string_view from = range.substr(0, dash);
@@ -182,7 +188,7 @@ ByteRange ParseRange(const std::string& field, std::uint64_t size) {
   return {first, last - first + 1, true, true};
 }
 
-std::string PreviewType(const std::string& name) {
+std::optional<std::string> PreviewType(const std::string& name) {
   static constexpr std::pair<std::string_view, std::string_view> kTypes[] = {
       {"png", "image/png"},   {"jpg", "image/jpeg"},  {"jpeg", "image/jpeg"}, {"gif", "image/gif"},
       {"webp", "image/webp"}, {"avif", "image/avif"}, {"pdf", kPdf},
@@ -192,13 +198,15 @@ std::string PreviewType(const std::string& name) {
       "txt", "md", "log", "csv", "tsv", "json", "xml", "yaml", "yml", "ini", "conf", "cfg", "toml",
       "c",   "h",  "cpp", "hpp", "cc",  "py",   "js",  "ts",   "go",  "rs",  "java", "sh",  "sql"};
   const size_t dot = name.rfind('.');
-  if (dot == std::string::npos) return {};
+  if (dot == std::string::npos) return std::nullopt;
   const std::string extension = LowerCase(std::string_view(name).substr(dot + 1));
   for (const auto& [known, type] : kTypes) {
     if (extension == known) return std::string(type);
   }
-  const bool text = std::find(std::begin(kTexts), std::end(kTexts), extension) != std::end(kTexts);
-  return text ? "text/plain; charset=utf-8" : std::string();
+  if (std::find(std::begin(kTexts), std::end(kTexts), extension) == std::end(kTexts)) {
+    return std::nullopt;
+  }
+  return "text/plain; charset=utf-8";
 }
 
 }  // namespace arbory

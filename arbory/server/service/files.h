@@ -12,29 +12,31 @@ namespace arbory {
 
 struct FileRequest {
   std::string user;
-  std::string share;              // "home": the user's own folder in the share "homes"
-  std::vector<std::string> path;  // below the share
-  bool preview = false;           // shown by the browser instead of saved, where that is safe
-  std::string range;              // the Range field; empty: the whole file
+  std::string share;                 // "home": the user's own folder in the share "homes"
+  std::vector<std::string> path;     // below the share
+  bool preview = false;              // shown by the browser instead of saved, where that is safe
+  std::optional<std::string> range;  // the Range field
   bool head_only = false;
 };
 
-// Replies 200, 206 or 416 with the file's fields and bytes, or an error's status and JSON.
+// Forks the child, which replies 200, 206 or 416 with the file's fields and bytes, or an error's
+// status and JSON; one whose file became shorter meanwhile ends in the midst of it. The pid is -1
+// when nothing can be forked.
 nas::Child StartFile(const FileRequest& request);
 
-// The first and last byte that a Range field asks for of a file of `size` bytes. Nothing to ask
-// for (no field, several ranges, or none that is understood) gives the whole file; `satisfiable`
-// tells whether the file has any of the bytes.
+// The bytes that a Range field asks for of a file of `size` bytes. Nothing to ask for (no field,
+// several ranges, or none that is understood) gives the whole file; `satisfiable` tells whether the
+// file has any of the bytes.
 struct ByteRange {
   std::uint64_t first = 0;
   std::uint64_t count = 0;
   bool partial = false;
   bool satisfiable = true;
 };
-ByteRange ParseRange(const std::string& field, std::uint64_t size);
+ByteRange ParseRange(const std::optional<std::string>& field, std::uint64_t size);
 
-// What a browser may show of a file by its name's extension: types that carry no scripts. Empty
+// What a browser may show of a file by its name's extension: types that carry no scripts. Nothing
 // for all others, which are only ever saved.
-std::string PreviewType(const std::string& name);
+std::optional<std::string> PreviewType(const std::string& name);
 
 }  // namespace arbory

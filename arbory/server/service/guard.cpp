@@ -18,8 +18,9 @@ std::string HostName(const std::string& host) {
 }
 
 std::string AfterScheme(const std::string& origin) {
-  const size_t slashes = origin.find("://");
-  return slashes == std::string::npos ? std::string() : origin.substr(slashes + 3);
+  constexpr std::string_view kMark = "://";
+  const size_t mark = origin.find(kMark);
+  return mark == std::string::npos ? std::string() : origin.substr(mark + kMark.size());
 }
 
 bool IsLoopbackName(const std::string& name) {

@@ -1,6 +1,7 @@
 #pragma once
 // Whether a request comes from where it may come from. Browsers carry a user's cookie into requests
-// that other sites' pages cause; these rules tell such requests apart.
+// that other sites' pages cause; these rules tell such requests apart. Functions of the
+// request alone.
 
 #include <string>
 #include <vector>

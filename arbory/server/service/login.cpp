@@ -3,6 +3,7 @@
 #include <security/pam_appl.h>
 #include <syslog.h>
 
+#include <cerrno>
 #include <cstdlib>
 #include <cstring>
 
@@ -55,11 +56,13 @@ class Pam {
     return status_;
   }
 
-  // Modules may map the name given to another one.
-  std::string User() const {
+  // After a check that let the user in. Modules may map the name given to another one.
+  nas::Result<nas::Account> Account() const {
     const void* name = nullptr;
-    if (pam_get_item(handle_, PAM_USER, &name) != PAM_SUCCESS || name == nullptr) return {};
-    return static_cast<const char*>(name);
+    if (pam_get_item(handle_, PAM_USER, &name) != PAM_SUCCESS || name == nullptr) {
+      return nas::Error{nas::kErrorUnknownUser, ENOENT};
+    }
+    return nas::FindAccount(static_cast<const char*>(name));
   }
 
  private:
@@ -79,8 +82,12 @@ nas::ReplyHead CheckLogin(const Credentials& credentials, const PamService& serv
            pam_strerror(nullptr, status));
     return refused;
   }
-  const auto account = nas::FindAccount(pam.User());
-  if (!account) return refused;
+  const auto account = pam.Account();
+  if (!account) {
+    syslog(LOG_NOTICE, "login refused, as there is no such account: %s",
+           account.error().Text().c_str());
+    return refused;
+  }
   return {kOk, 0, {{kLoginUser, PercentEncoded(account->name)}}};
 }
 

@@ -18,8 +18,9 @@ struct PamService {
   std::string folder;  // of its file; empty: the system's
 };
 
-// The child's reply has status 200 and the field kLoginUser, the account's name encoded, when PAM
-// lets the user in, and 403 when it does not, for whatever reason: the log says why.
+// Forks the child; the pid is -1 when that fails. Its reply has status 200 and the field
+// kLoginUser, the account's name encoded, when PAM lets the user in, and 403 when it does not, for
+// whatever reason: the log says why.
 nas::Child StartLogin(const Credentials& credentials, const PamService& service);
 inline constexpr char kLoginUser[] = "User";
 

@@ -1,5 +1,6 @@
 #pragma once
-// Counts for monitoring, in the Prometheus text format, and the access log.
+// Counts for monitoring, in the Prometheus text format, and the access log. Of the loop's thread
+// alone; the counts begin with the process.
 
 #include <array>
 #include <cstdint>
@@ -12,7 +13,8 @@ namespace arbory {
 
 class Metrics {
  public:
-  // `method` names a row of the API or a route of the server's own; never what a client made up.
+  // `code` is the API's, or the HTTP status of a route of the server's own. `method` names a row of
+  // the API or a route of the server's own; never what a client made up.
   void CountCall(const std::string& method, int code, double seconds);
   void CountReply(int status, std::uint64_t bytes);
   void CountRefusedLogin() { ++refused_logins_; }
@@ -39,7 +41,8 @@ class Metrics {
   std::uint64_t refused_logins_ = 0;
 };
 
-// One line of JSON, without what a query holds.
+// One line of JSON, with its newline, without what a query holds; no byte of it can be a command to
+// a terminal.
 std::string AccessLine(const HttpRequest& request, int status, std::uint64_t bytes);
 
 }  // namespace arbory

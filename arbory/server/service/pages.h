@@ -9,7 +9,8 @@
 
 namespace arbory {
 
-// The folder in use: the configured one, or the first there is of the installed and the built one.
+// The folder in use: the configured one, or the first there is of the installed and the built one;
+// where the built one would be when there is none.
 std::string FindWebFolder(const std::string& configured);
 
 // The file at this path below the folder, "index.html" for none; 404 when there is none, and a text

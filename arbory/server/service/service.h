@@ -1,6 +1,6 @@
 #pragma once
 // What requests mean: who may ask, what is answered at once, and which child answers the rest. The
-// routes and their bodies are documented in docs/http.md.
+// routes and their bodies are documented in docs/http.md. Of the loop's thread alone.
 
 #include <functional>
 #include <optional>
@@ -26,8 +26,9 @@ class Service : public HttpService {
     std::string cookie;       // its name
     SiteRules site;
     std::string web_dir;
-    std::function<ServerCounts()> counts;
+    std::function<ServerCounts()> counts;  // of the server it answers for
   };
+  // The module must outlive it.
   Service(Setup setup, const nas::Module& module);
 
   // See Entrance::NewToken.

@@ -1,6 +1,6 @@
 #pragma once
 // Who is logged in. Sessions live in this process's memory: they end with it, and nobody can read
-// them from a disk.
+// them from a disk. Of the loop's thread alone; `now` is given so that time can be tested.
 
 #include <chrono>
 #include <ctime>

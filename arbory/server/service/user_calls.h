@@ -1,7 +1,8 @@
 #pragma once
 // What the server itself looks up for a user, as rows like the module's: they run in a request
 // child under the user's identity, and their reply is the JSON of an HTTP answer (EncodeOwnReply),
-// whose status is the reply's code.
+// whose status is the reply's code: 503 when the server cannot act as the user. The pid is -1, with
+// errno set, when nothing can be forked. Of the loop's thread alone.
 
 #include <string>
 

@@ -6,6 +6,7 @@
 #include <boost/asio/buffer.hpp>
 #include <boost/beast/http/error.hpp>
 #include <boost/beast/http/read.hpp>
+#include <boost/beast/http/status.hpp>
 #include <ctime>
 #include <exception>
 
@@ -37,19 +38,19 @@ constexpr char kEveryReply[] =
     "Referrer-Policy: no-referrer\r\n"
     "Cross-Origin-Resource-Policy: same-origin\r\n";
 
-std::string DateNow() {
+// Made anew once a second, not for each reply.
+const std::string& DateNow() {
   static std::time_t last = 0;
   static std::string text;
   const std::time_t now = std::time(nullptr);
-  if (now != last) {
-    constexpr size_t kRoom = 64;
-    char buffer[kRoom];
-    std::tm parts;
-    gmtime_r(&now, &parts);
-    text.assign(buffer, std::strftime(buffer, sizeof buffer, "%a, %d %b %Y %H:%M:%S GMT", &parts));
-    last = now;
-  }
+  if (now != last) text = HttpDate(last = now);
   return text;
+}
+
+std::string_view ReasonPhrase(int status) {
+  if (status == kTooLarge) return "Content Too Large";  // the library has its former name
+  const auto phrase = http::obsolete_reason(http::int_to_status(status));
+  return {phrase.data(), phrase.size()};
 }
 
 // The parser takes a body in any other transfer encoding for none, or for one of Content-Length

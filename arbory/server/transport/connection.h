@@ -1,6 +1,7 @@
 #pragma once
-// One client's connection: reads a request, has it answered, writes the reply, and so on. Included
-// only where the network library is.
+// One client's connection: reads a request, has it answered, writes the reply, and so on. It keeps
+// itself alive by what it waits for and ends by itself; every wait has a bound, which the settings
+// give. Of the loop's thread alone. Included only where the network library is.
 
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/ip/tcp.hpp>
@@ -21,7 +22,7 @@ namespace arbory {
 
 class Connection;
 
-// What connections need of the server they belong to.
+// What connections need of the server they belong to, which outlives them.
 class ConnectionHost {
  public:
   virtual ~ConnectionHost() = default;
@@ -29,7 +30,9 @@ class ConnectionHost {
   virtual const nas::ServerSettings& settings() const = 0;
   virtual HttpService& service() = 0;
   virtual bool stopping() const = 0;
+  // Takes the child and its token over: it is reaped there, and killed when it stays silent.
   virtual std::shared_ptr<ChildPipe> Adopt(ChildAnswer* answer) = 0;
+  // Called by the connection's destructor.
   virtual void Closed(Connection* connection) = 0;
 };
 
@@ -37,9 +40,11 @@ class Connection : public std::enable_shared_from_this<Connection> {
  public:
   Connection(ConnectionHost* host, boost::asio::ip::tcp::socket socket);
   ~Connection();
+  // Begins to read; the caller may let go of it then.
   void Start();
   // Ends it now when it is between requests; otherwise after the reply.
   void Stop();
+  // Ends it now, and kills the child that answers.
   void Abort();
 
  private:

@@ -63,9 +63,11 @@ struct HttpRequest {
   std::string_view query() const;
 };
 
+// What is sent, but for the fields that every reply has (connection.cpp): Date, Content-Length, the
+// policies against other sites.
 struct HttpReply {
   int status = kOk;
-  Fields fields;  // beside those every reply has
+  Fields fields;
   std::string body;
   bool child_follows = false;  // the body is what the child sends after its head
   std::optional<Clock::time_point> not_before = {};  // hides how long the answer took to find
@@ -73,7 +75,8 @@ struct HttpReply {
 
 struct ChildAnswer {
   nas::Child child;
-  // Turns the head, or null when the child ended or stayed silent without one, into the reply.
+  // Turns the head, or null when the child ended or stayed silent without one, into the reply. In
+  // the loop, once; not at all when the client went away before.
   std::function<HttpReply(const nas::ReplyHead* head)> make_reply;
   // Lives as long as the child, which may be longer than the exchange.
   std::shared_ptr<void> token;
@@ -84,8 +87,11 @@ using Answer = std::variant<HttpReply, ChildAnswer>;
 class HttpService {
  public:
   virtual ~HttpService() = default;
+  // In the loop, so it must not wait. The request is the caller's, and whole. What it throws is
+  // answered with 503.
   virtual Answer Handle(HttpRequest* request) = 0;
-  // The reply went out, or the client went away in the midst of it.
+  // The reply went out, or the client went away in the midst of it. Once for each request that was
+  // answered, those that were refused before Handle among them.
   virtual void Finished(const HttpRequest& request, int status, std::uint64_t bytes) = 0;
 };
 

@@ -26,13 +26,12 @@ namespace asio = boost::asio;
 using asio::ip::tcp;
 using Error = boost::system::error_code;
 
-// Long enough for pages and short transfers to end; an administrator's restart waits for it.
-constexpr std::chrono::seconds kFinishTime{5};
-// A worker that is told to stop does so within 100 ms, then writes its record.
-constexpr std::chrono::seconds kStopTime{5};
+// Between two looks at who is left.
 constexpr std::chrono::milliseconds kStopPause{20};
 // After a failed accept, when the machine is short of descriptors or memory.
 constexpr std::chrono::milliseconds kAcceptPause{100};
+
+constexpr int kThreads = 1;  // a process of several could not fork safely
 
 tcp::endpoint ParseAddress(const std::string& text) {
   const size_t colon = text.rfind(':');
@@ -63,7 +62,7 @@ class HttpServer::Loop : public ConnectionHost {
  public:
   explicit Loop(const nas::ServerSettings& settings)
       : settings_(settings),
-        loop_(1),
+        loop_(kThreads),
         acceptor_(loop_),
         accept_pause_(loop_),
         stop_timer_(loop_),

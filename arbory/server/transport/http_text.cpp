@@ -11,6 +11,7 @@ namespace {
 constexpr char kHexDigits[] = "0123456789ABCDEF";
 constexpr int kBitsPerDigit = 4;
 constexpr int kDigitMask = 0xF;
+constexpr size_t kEscapeBytes = 3;  // "%2F"
 
 bool IsUnreserved(char byte) {
   return (byte >= 'a' && byte <= 'z') || (byte >= 'A' && byte <= 'Z') ||
@@ -37,7 +38,7 @@ std::optional<std::string> Decoded(std::string_view text) {
     const int low = text.size() > 2 ? HexDigit(text[2]) : -1;
     if (high < 0 || low < 0) return std::nullopt;
     out += static_cast<char>((high << kBitsPerDigit) | low);
-    text.remove_prefix(3);
+    text.remove_prefix(kEscapeBytes);
   }
   return out;
 }
@@ -49,26 +50,6 @@ bool IsPlainSegment(const std::string& segment) {
 }
 
 }  // namespace
-
-const std::string* HttpRequest::Field(std::string_view name) const {
-  const auto found =
-      std::find_if(fields.begin(), fields.end(), [&](const auto& f) { return f.first == name; });
-  return found == fields.end() ? nullptr : &found->second;
-}
-
-size_t HttpRequest::CountOf(std::string_view name) const {
-  return std::count_if(fields.begin(), fields.end(),
-                       [&](const auto& f) { return f.first == name; });
-}
-
-std::string_view HttpRequest::path() const {
-  return std::string_view(target).substr(0, target.find('?'));
-}
-
-std::string_view HttpRequest::query() const {
-  const size_t mark = target.find('?');
-  return mark == std::string::npos ? std::string_view() : std::string_view(target).substr(mark + 1);
-}
 
 std::optional<std::vector<std::string>> SplitPath(std::string_view path) {
   std::vector<std::string> segments;
@@ -136,28 +117,12 @@ std::string ContentDisposition(bool inline_shown, const std::string& name) {
          "\"; filename*=UTF-8''" + PercentEncoded(name);
 }
 
-std::string_view ReasonPhrase(int status) {
-  static constexpr std::pair<int, std::string_view> kPhrases[] = {
-      {kOk, "OK"},
-      {kPartial, "Partial Content"},
-      {kSeeOther, "See Other"},
-      {kBadRequest, "Bad Request"},
-      {kUnauthorized, "Unauthorized"},
-      {kForbidden, "Forbidden"},
-      {kNotFound, "Not Found"},
-      {kNotAllowed, "Method Not Allowed"},
-      {kTimeout, "Request Timeout"},
-      {kTooLarge, "Content Too Large"},
-      {kNotJson, "Unsupported Media Type"},
-      {kNotSatisfiable, "Range Not Satisfiable"},
-      {kTooMany, "Too Many Requests"},
-      {kHeaderTooLarge, "Request Header Fields Too Large"},
-      {kUnavailable, "Service Unavailable"},
-  };
-  for (const auto& [number, phrase] : kPhrases) {
-    if (number == status) return phrase;
-  }
-  return "Unknown";
+std::string HttpDate(std::time_t time) {
+  constexpr size_t kRoom = 64;
+  char text[kRoom];
+  std::tm parts;
+  gmtime_r(&time, &parts);
+  return {text, std::strftime(text, sizeof text, "%a, %d %b %Y %H:%M:%S GMT", &parts)};
 }
 
 std::string LowerCase(std::string_view text) {

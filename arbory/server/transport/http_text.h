@@ -1,8 +1,12 @@
 #pragma once
-// The texts of HTTP: targets, cookies, headers and error bodies.
+// The texts of HTTP: targets, cookies, fields and the bodies of errors. Functions of their
+// arguments alone, for the loop and for children alike; none throws but for want of memory. Nothing
+// here needs the network library, which has fields and reason phrases (connection.cpp uses them)
+// but neither cookies, targets nor ranges.
 
 #include <json/value.h>
 
+#include <ctime>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -22,13 +26,15 @@ std::optional<std::string> QueryValue(std::string_view query, std::string_view n
 // Encodes all but letters, digits and "-._~".
 std::string PercentEncoded(std::string_view text);
 
-// The value of a cookie in the request; empty when it is not there.
+// The value of the first cookie of that name, as it stands; empty when it is not there.
 std::string Cookie(const HttpRequest& request, std::string_view name);
 
-// An attachment or inline header with the name in both forms, the plain one for old clients.
+// The field Content-Disposition with the name in both forms, the plain one for old clients.
 std::string ContentDisposition(bool inline_shown, const std::string& name);
 
-std::string_view ReasonPhrase(int status);
+// "Sat, 21 Nov 2026 22:28:36 GMT".
+std::string HttpDate(std::time_t time);
+// Of ASCII letters; other bytes stay.
 std::string LowerCase(std::string_view text);
 
 // The parameters in a request's body, a JSON object; an empty one for an empty body, and nothing
@@ -36,11 +42,14 @@ std::string LowerCase(std::string_view text);
 std::optional<Json::Value> JsonBody(const HttpRequest& request);
 HttpReply BadBodyReply();
 
+// `body` is JSON already. Never kept by a cache.
 HttpReply JsonReply(int status, std::string body);
 // {"code":STATUS,"error":SENTENCE}, or with a code of its own.
 HttpReply ErrorReply(int status, std::string_view sentence);
 HttpReply ErrorReply(int status, int code, std::string_view sentence);
+// 405, with the methods as the field Allow has them.
 HttpReply NotAllowedReply(const std::string& allowed_methods);
+// With Retry-After.
 HttpReply BusyReply(int status, std::string_view sentence, const std::string& retry_seconds);
 
 }  // namespace arbory
