@@ -21,9 +21,9 @@
 #include "arbory/search_request.h"
 #include "arbory/search_text.h"
 #include "arbory/terminal.h"
-#include "nas/base/accounts.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
+#include "nas/webapi/runner.h"
 
 namespace arbory {
 namespace {
@@ -228,7 +228,7 @@ class Search {
 int RunSearchCommand(const SearchOptions& options) {
   WatchForInterrupt();
   Caller caller(options.common);
-  nas::LoadNameService();
+  nas::PrepareForCalls();
   const Json::Value params = PrepareSearch(options.query, &caller);
   // From here on the program follows what the user's own processes write.
   caller.module();

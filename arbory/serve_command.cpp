@@ -10,8 +10,8 @@
 #include "arbory/server/service/service.h"
 #include "arbory/server/transport/http_server.h"
 #include "arbory/terminal.h"
-#include "nas/base/accounts.h"
 #include "nas/system/shares.h"
+#include "nas/webapi/runner.h"
 
 namespace arbory {
 namespace {
@@ -83,7 +83,7 @@ int RunServeCommand(const ServeOptions& options) {
   HttpServer server(settings);
   Service service(SetupOf(options, settings, caller, server), caller.module());
   WarnOfOpenDoors(options, settings, server);
-  nas::LoadNameService();
+  nas::PrepareForCalls();
   const std::string base = "http://" + server.address() + "/";
   if (HasLogins(options)) {
     Say("Open " + base);

@@ -102,6 +102,26 @@ std::string_view Statement::Bytes(int column) const {
   return {static_cast<const char*>(bytes), static_cast<size_t>(count)};
 }
 
+Blob::Blob(const Database& db, const char* table, const char* column, std::int64_t row)
+    : db_(db.handle()) {
+  constexpr int kReadOnly = 0;
+  if (sqlite3_blob_open(db_, "main", table, column, row, kReadOnly, &blob_) != SQLITE_OK) {
+    throw SqliteError(db_, table);
+  }
+}
+
+void Blob::MoveTo(std::int64_t row) {
+  if (sqlite3_blob_reopen(blob_, row) != SQLITE_OK) throw SqliteError(db_, "a row's blob");
+}
+
+void Blob::Read(size_t offset, size_t count, void* out) const {
+  const int result =
+      sqlite3_blob_read(blob_, out, static_cast<int>(count), static_cast<int>(offset));
+  if (result != SQLITE_OK) throw SqliteError(db_, "a blob");
+}
+
+void LoadSqlite() { sqlite3_initialize(); }
+
 Transaction::Transaction(Database& db, Kind kind) : db_(db) {
   db_.Execute(kind == Kind::kWrite ? "BEGIN IMMEDIATE" : "BEGIN");
 }

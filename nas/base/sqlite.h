@@ -77,6 +77,31 @@ class Statement {
   sqlite3_stmt* statement_ = nullptr;
 };
 
+// A blob in a row of a table with an integer key, read in pieces: of a long one, only what is asked
+// for is fetched. While open it keeps the transaction open that it was opened in. Throws
+// SqliteError. The database must outlive it.
+class Blob {
+ public:
+  Blob(const Database& db, const char* table, const char* column, std::int64_t row);
+  ~Blob() { sqlite3_blob_close(blob_); }
+  Blob(const Blob&) = delete;
+  Blob& operator=(const Blob&) = delete;
+
+  // Goes on to the same column of another row.
+  void MoveTo(std::int64_t row);
+  size_t size() const { return static_cast<size_t>(sqlite3_blob_bytes(blob_)); }
+  // The part must lie within the blob.
+  void Read(size_t offset, size_t count, void* out) const;
+
+ private:
+  sqlite3* db_;
+  sqlite3_blob* blob_ = nullptr;
+};
+
+// For a process that forks others which use databases: what SQLite sets up once, they inherit. No
+// database is opened.
+void LoadSqlite();
+
 // Rolls back on destruction unless committed. The database must outlive it.
 class Transaction {
  public:

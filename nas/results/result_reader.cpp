@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <limits>
 #include <memory>
 #include <unordered_map>
 
@@ -17,6 +18,8 @@ namespace {
 
 // Blocks held at a time, some 150 KB each: enough for a page of rows from all over the file.
 constexpr size_t kMostBlocks = 256;
+// A page of the usual length, in one or two steps; 3.5 KB.
+constexpr size_t kPieceRows = 64;
 // Orderings of fewer rows are quicker made than kept.
 constexpr std::uint64_t kWorthKeeping = 10'000;
 // Orderings number rows in 32 bits.
@@ -84,6 +87,7 @@ std::optional<SortColumn> ParseSortColumn(std::string_view word) {
 ResultReader::ResultReader(const std::string& path) : path_(path), db_(OpenResultFile(path)) {}
 
 void ResultReader::Begin() {
+  attributes_.reset();
   transaction_.emplace(db_, Transaction::Kind::kRead);
   blocks_.clear();
   Statement last(db_, "SELECT first + count FROM names ORDER BY first DESC LIMIT 1");
@@ -99,6 +103,7 @@ void ResultReader::Begin() {
 }
 
 void ResultReader::End() {
+  attributes_.reset();
   transaction_->Commit();
   transaction_.reset();
 }
@@ -122,19 +127,26 @@ void ResultReader::TakeApart(std::string_view folders, std::string_view names, N
     at += folder.path.size() + 1;
     out.folders.push_back(folder);
   }
-  for (at = folders.size(); at < bytes.size();) {
-    const std::string_view name = bytes.substr(at, bytes.find('\0', at) - at);
-    out.names.push_back(name);
-    at += name.size() + 1;
+  out.rest = folders.size();
+}
+
+// Makes the first `count` names known, or all there are.
+void ResultReader::ParseNames(Names& names, size_t count) {
+  const std::string_view bytes = names.bytes;
+  while (names.names.size() < count && names.rest < bytes.size()) {
+    const std::string_view name =
+        bytes.substr(names.rest, bytes.find('\0', names.rest) - names.rest);
+    names.names.push_back(name);
+    names.rest += name.size() + 1;
   }
 }
 
-const ResultReader::Block& ResultReader::BlockOf(std::uint32_t number, std::uint64_t& first) {
+ResultReader::Block& ResultReader::BlockOf(std::uint32_t number, std::uint64_t& first) {
   auto after = blocks_.upper_bound(number);
   if (after != blocks_.begin()) {
-    const auto& [known_first, block] = *std::prev(after);
+    auto& [known_first, block] = *std::prev(after);
     first = known_first;
-    if (number - known_first < block.attributes.size()) return block;
+    if (number - known_first < block.rows) return block;
   }
   if (blocks_.size() >= kMostBlocks) blocks_.clear();
   Statement names(db_,
@@ -144,21 +156,41 @@ const ResultReader::Block& ResultReader::BlockOf(std::uint32_t number, std::uint
   first = static_cast<std::uint64_t>(names.Integer(0));
   Block& block = blocks_[first];
   TakeApart(names.Bytes(1), names.Bytes(2), block.names);
-  Statement attributes(db_, "SELECT data FROM attributes WHERE first = ?");
-  if (attributes.Bind(1, names.Integer(0)).Step()) {
-    const std::string_view data = attributes.Bytes(0);
-    block.attributes.resize(data.size() / sizeof(FileAttributes));
-    std::memcpy(block.attributes.data(), data.data(),
-                block.attributes.size() * sizeof(FileAttributes));
-  }
+  OpenAttributes(names.Integer(0));
+  block.rows = attributes_->size() / sizeof(FileAttributes);
   return block;
+}
+
+void ResultReader::OpenAttributes(std::int64_t first) {
+  if (attributes_ && attributes_of_ == first) return;
+  if (attributes_) {
+    attributes_->MoveTo(first);
+  } else {
+    attributes_.emplace(db_, "attributes", "data", first);
+  }
+  attributes_of_ = first;
+}
+
+const FileAttributes& ResultReader::AttributesIn(Block& block, std::uint64_t first, size_t index) {
+  Check(index < block.rows);
+  const size_t begin = index - index % kPieceRows;
+  std::vector<FileAttributes>& piece = block.pieces[begin];
+  if (piece.empty()) {
+    OpenAttributes(static_cast<std::int64_t>(first));
+    std::vector<FileAttributes> rows(std::min(kPieceRows, block.rows - begin));
+    attributes_->Read(begin * sizeof(FileAttributes), rows.size() * sizeof(FileAttributes),
+                      rows.data());
+    piece = std::move(rows);
+  }
+  return piece[index - begin];
 }
 
 ResultRow ResultReader::Row(std::uint32_t number) {
   std::uint64_t first = 0;
-  const Block& block = BlockOf(number, first);
+  Block& block = BlockOf(number, first);
   const size_t index = number - first;
-  const FileAttributes& attributes = block.attributes.at(index);
+  const FileAttributes& attributes = AttributesIn(block, first, index);
+  ParseNames(block.names, index + 1);
   const Folder& folder = block.names.folders.at(attributes.folder);
   const Location& location = locations_.at(folder.location);
   return {location.share_name, location.share_root, folder.path, block.names.names.at(index),
@@ -176,6 +208,7 @@ void ResultReader::ForEachNames(Visitor visit) {
     names.folders.clear();
     names.names.clear();
     TakeApart(blocks.Bytes(1), blocks.Bytes(2), names);
+    ParseNames(names, std::numeric_limits<size_t>::max());
     Check(static_cast<std::uint64_t>(blocks.Integer(0)) == next &&
           names.names.size() <= rows_ - next);
     visit(next, names);

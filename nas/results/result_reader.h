@@ -96,16 +96,23 @@ class ResultReader {
   struct Names {
     std::string bytes;
     std::vector<Folder> folders;
-    std::vector<std::string_view> names;
+    std::vector<std::string_view> names;  // those asked for so far
+    size_t rest = 0;                      // where in `bytes` the others begin
   };
+  // The attributes are read in pieces of kPieceRows rows, each when one of its rows is asked for: a
+  // short page needs few of a block's, and to copy them all would be most of its making.
   struct Block {
     Names names;
-    std::vector<FileAttributes> attributes;
+    size_t rows = 0;
+    std::map<size_t, std::vector<FileAttributes>> pieces;  // by first row in the block
   };
 
   static void TakeApart(std::string_view folders, std::string_view names, Names& out);
   void ReadPurged();
-  const Block& BlockOf(std::uint32_t number, std::uint64_t& first);
+  static void ParseNames(Names& names, size_t count);
+  Block& BlockOf(std::uint32_t number, std::uint64_t& first);
+  void OpenAttributes(std::int64_t first);
+  const FileAttributes& AttributesIn(Block& block, std::uint64_t first, size_t index);
   template <typename Visitor>
   void ForEachNames(Visitor visit);
   template <typename Visitor>
@@ -129,6 +136,9 @@ class ResultReader {
   std::map<std::uint16_t, Location> locations_;
   std::unordered_set<std::uint32_t> purged_;
   std::map<std::uint64_t, Block> blocks_;  // by first row
+  // Of the block read last. Open only between Begin and End, as it holds their transaction.
+  std::optional<Blob> attributes_;
+  std::int64_t attributes_of_ = 0;
   std::map<std::uint32_t, std::string> user_names_;
   std::map<std::uint32_t, std::string> group_names_;
 };

@@ -12,7 +12,9 @@
 #include <string_view>
 #include <utility>
 
+#include "nas/base/accounts.h"
 #include "nas/base/json_text.h"
+#include "nas/base/sqlite.h"
 #include "nas/base/system_call.h"
 #include "nas/webapi/request_child.h"
 
@@ -92,6 +94,11 @@ Reply EncodeJsonReply(int code, const Json::Value& data) {
   AppendJson(data, JsonBytes::kClean, &reply.body);
   reply.body += '}';
   return reply;
+}
+
+void PrepareForCalls() {
+  LoadNameService();
+  LoadSqlite();
 }
 
 Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {

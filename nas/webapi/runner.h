@@ -46,6 +46,10 @@ Reply EncodeJsonReply(int code, const Json::Value& data);
 
 constexpr int kCodeUnknownFailure = 100;  // an exception or a death inside the call
 
+// For a process that makes calls, before the first one: loads what each of their children would
+// load anew (the name service's libraries, SQLite's tables) and now inherits.
+void PrepareForCalls();
+
 // Forks the request child. Its pid is -1 with errno set when that fails.
 Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
