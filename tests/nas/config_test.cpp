@@ -316,5 +316,25 @@ TEST_F(ResultFolderTest, IsMadeByRootForTheUser) {
   }));
 }
 
+// What the user cannot reach must not be found by going back to root.
+TEST_F(ResultFolderTest, IsLookedAtAsTheUser) {
+  SKIP_UNLESS_ROOT();
+  const std::string volume = MakeFolder("volume1");
+  const auto refused = [](const auto& result) {
+    return !result && result.error().error_number == EACCES;
+  };
+  EXPECT_TRUE(InChild([&] {
+    ASSERT_TRUE(nas::EnterUserState(kOtherUser));
+    ASSERT_TRUE(nas::MakeResultFolder(volume, kOtherUser));
+  }));
+  ASSERT_EQ(chmod(volume.c_str(), 0700), 0);
+  EXPECT_TRUE(InChild([&] {
+    ASSERT_TRUE(nas::EnterUserState(kOtherUser));
+    EXPECT_TRUE(refused(nas::ResultFolder(volume, kOtherUser)));
+  }));
+  ASSERT_EQ(chmod(state_.c_str(), 0700), 0);
+  EXPECT_TRUE(InChild([&] { EXPECT_TRUE(refused(nas::EnterUserState(kOtherUser))); }));
+}
+
 }  // namespace
 }  // namespace nas_test
