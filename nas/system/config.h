@@ -1,6 +1,7 @@
 #pragma once
 // Configuration: where state is kept, which directories are volumes, and what is shared. Nothing
-// outside nas/system reads a configuration file or an environment variable.
+// outside nas/system reads a configuration file or an environment variable; within it, child.h's
+// children alone look at one that is no configuration (for tests).
 
 #include <stdexcept>
 #include <string>
@@ -59,10 +60,12 @@ Config LoadConfig(const std::string& path);
 // The configuration without any file.
 Config DefaultConfig();
 
-// Makes `config` the configuration of this process and of every process forked from it. To be
-// called once, before any platform operation, while there is one thread. Throws ConfigError when a
-// share cannot be offered (see shares.h) or a path is not absolute. A share's directory given
-// relative to the current one becomes absolute; one that does not exist yet is no error.
+// Makes `config` the configuration of this process and of every process forked from it, in the
+// place of the one before. Call it while there is one thread and before whatever goes by it; a
+// program may call it again, as when it adds a share to those configured. Throws ConfigError, with
+// the configuration as it was, when a share cannot be offered (see share_names.h) or a path is not
+// absolute. A share's directory given relative to the current one becomes absolute; one that does
+// not exist yet is no error.
 void Configure(Config config);
 const Config& CurrentConfig();
 

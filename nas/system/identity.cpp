@@ -119,22 +119,6 @@ ScopedRoot::~ScopedRoot() {
   errno = saved;
 }
 
-ScopedUser::ScopedUser(const std::string& user) {
-  const Ids ids = CurrentIds();
-  std::copy(std::begin(ids.user), std::end(ids.user), users_);
-  std::copy(std::begin(ids.group), std::end(ids.group), group_ids_);
-  groups_ = CurrentGroups();
-  if (const auto account = BecomeUser(user); !account) status_ = account.error();
-}
-
-ScopedUser::~ScopedUser() {
-  if (!status_ || !CanBeRoot()) return;
-  const int saved = errno;
-  Restore(users_, group_ids_, groups_);
-  g_self.reset();
-  errno = saved;
-}
-
 ScopedUmask::ScopedUmask(mode_t mask) : before_(umask(mask)) {}
 ScopedUmask::~ScopedUmask() { umask(before_); }
 

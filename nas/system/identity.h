@@ -41,24 +41,6 @@ class ScopedRoot {
   bool raised_ = false;
 };
 
-// A user's identity for a time, then the one before it with its groups. A process that cannot
-// return aborts.
-class ScopedUser {
- public:
-  explicit ScopedUser(const std::string& user);
-  ~ScopedUser();
-  ScopedUser(const ScopedUser&) = delete;
-  ScopedUser& operator=(const ScopedUser&) = delete;
-  // A failure leaves the identity unchanged.
-  const Status& status() const { return status_; }
-
- private:
-  uid_t users_[3];
-  gid_t group_ids_[3];
-  std::vector<gid_t> groups_;
-  Status status_;
-};
-
 // Sets the umask for a time, where the exact mode of what is made matters.
 class ScopedUmask {
  public:
