@@ -7,7 +7,8 @@
 
 namespace nas {
 
-// Opens `name` in the folder `dir`; EXDEV where it is a mount point.
+// Opens `name` in the folder `dir`, close-on-exec. Invalid with errno set: EXDEV where it is a
+// mount point. Asked for every folder of a walk, so it carries no Error.
 UniqueFd OpenOnSameMount(int dir, const char* name, int flags);
 
 // Opens the folder at `path` below `root` (empty: `root` itself) without following any symbolic

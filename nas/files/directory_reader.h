@@ -10,6 +10,7 @@
 
 namespace nas {
 
+// For one thread at a time. Allocates its buffer (128 KiB) once and nothing for an entry.
 class DirectoryReader {
  public:
   struct Entry {

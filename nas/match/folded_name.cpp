@@ -12,7 +12,8 @@ namespace {
 // Decomposes `text` into a buffer of the calling thread and composes it again under `options`.
 // False where it is not valid UTF-8; `out` is then untouched.
 bool Normalise(std::string_view text, utf8proc_option_t options, std::string& out) {
-  thread_local std::vector<utf8proc_int32_t> points(512);
+  constexpr size_t kUsualPoints = 512;  // most names once taken apart; longer ones make it grow
+  thread_local std::vector<utf8proc_int32_t> points(kUsualPoints);
   const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
   const auto count = static_cast<utf8proc_ssize_t>(text.size());
   utf8proc_ssize_t needed;

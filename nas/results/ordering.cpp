@@ -19,11 +19,14 @@ using KeyedRows = std::vector<KeyedRow>;
 // byte a pass; passes in which all keys agree are left out, so that sizes and times of a few years
 // take three or four of the eight. `spare` is as long as `rows`.
 void RadixSort(KeyedRows& rows, size_t begin, size_t end, KeyedRows& spare) {
-  constexpr int kDigits = 8;
-  std::array<std::array<std::uint32_t, 256>, kDigits> counts{};
+  constexpr int kDigits = sizeof(KeyedRow::key);
+  constexpr int kDigitBits = 8;
+  constexpr unsigned kDigitValues = 1U << kDigitBits;
+  constexpr unsigned kDigitMask = kDigitValues - 1;
+  std::array<std::array<std::uint32_t, kDigitValues>, kDigits> counts{};
   for (size_t i = begin; i < end; ++i) {
     for (int digit = 0; digit < kDigits; ++digit) {
-      ++counts[digit][(rows[i].key >> (8 * digit)) & 255];
+      ++counts[digit][(rows[i].key >> (kDigitBits * digit)) & kDigitMask];
     }
   }
   KeyedRow* from = rows.data() + begin;
@@ -31,10 +34,11 @@ void RadixSort(KeyedRows& rows, size_t begin, size_t end, KeyedRows& spare) {
   const size_t size = end - begin;
   for (int digit = 0; digit < kDigits; ++digit) {
     auto& count = counts[digit];
-    if (count[(from->key >> (8 * digit)) & 255] == size) continue;
+    if (count[(from->key >> (kDigitBits * digit)) & kDigitMask] == size) continue;
     std::uint32_t before = 0;
     for (std::uint32_t& c : count) before += std::exchange(c, before);
-    for (size_t i = 0; i < size; ++i) to[count[(from[i].key >> (8 * digit)) & 255]++] = from[i];
+    for (size_t i = 0; i < size; ++i)
+      to[count[(from[i].key >> (kDigitBits * digit)) & kDigitMask]++] = from[i];
     std::swap(from, to);
   }
   if (from != rows.data() + begin) std::copy_n(from, size, rows.data() + begin);

@@ -22,6 +22,8 @@ constexpr size_t kMostBlocks = 256;
 constexpr size_t kPieceRows = 64;
 // Orderings of fewer rows are quicker made than kept.
 constexpr std::uint64_t kWorthKeeping = 10'000;
+// Of a mode; the others are the file's type.
+constexpr std::uint32_t kPermissionBits = 07777;
 // Orderings number rows in 32 bits.
 constexpr std::uint64_t kMostRows = std::uint64_t{1} << 32;
 
@@ -61,7 +63,7 @@ std::uint64_t NumberKey(SortColumn column, const FileAttributes& file) {
     case SortColumn::kSize:
       return file.size;
     case SortColumn::kMode:
-      return file.mode & 07777;
+      return file.mode & kPermissionBits;
     case SortColumn::kAtime:
       return UnsignedKey(file.atime);
     case SortColumn::kMtime:
