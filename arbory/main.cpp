@@ -194,9 +194,14 @@ int Run(int argc, char** argv) {
 
 int main(int argc, char** argv) {
   try {
-    return arbory::Run(argc, argv);
-  } catch (const std::exception& error) {
-    arbory::Complain(error.what());
-    return arbory::kExitError;
+    try {
+      return arbory::Run(argc, argv);
+    } catch (const std::exception& error) {
+      arbory::Complain(error.what());
+    }
+  } catch (...) {
+    // There was no memory even for that sentence.
+    arbory::WriteOut(STDERR_FILENO, "arbory: out of memory\n");
   }
+  return arbory::kExitError;
 }

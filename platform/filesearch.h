@@ -189,7 +189,8 @@ class WfmSearchDBTask {
 class WfmSearchDBTaskMgr {
  public:
   explicit WfmSearchDBTaskMgr(const char* user);
-  // The result database, owned by the caller, or null when there is none by that name.
+  // The result database, owned by the caller, or null when there is none by that name. One that
+  // cannot be read fails its queries, and can be removed.
   WfmSearchDBTask* getDBTask(const char* volume, const char* id) const;
 
  private:

@@ -18,7 +18,8 @@ namespace {
 
 constexpr std::string_view kSuffix = ".db";
 constexpr char kLogSuffix[] = "-wal";
-constexpr std::array<const char*, 3> kCompanions = {"", kLogSuffix, "-shm"};
+// The journal is what a file has until it gets its log.
+constexpr std::array<const char*, 4> kCompanions = {"", kLogSuffix, "-shm", "-journal"};
 constexpr time_t kKeepSeconds = 24 * 60 * 60;
 
 // When the result file or its log was last written; 0 when neither is there.

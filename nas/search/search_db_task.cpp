@@ -2,10 +2,12 @@
 
 #include <sys/stat.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <memory>
+#include <optional>
 
 #include "nas/base/error.h"
 #include "nas/match/file_kinds.h"
@@ -87,7 +89,7 @@ class Lender {
 
 class WfmSearchDBTask::Impl {
  public:
-  explicit Impl(const std::string& path) : path_(path), reader_(path) {}
+  explicit Impl(const std::string& path) : path_(path) {}
 
   bool Query(unsigned long offset, unsigned long limit, const nas::Selection& selection,
              SelectCallback callback, void* context, unsigned long long* total);
@@ -97,8 +99,14 @@ class WfmSearchDBTask::Impl {
  private:
   void FlushPurges();
 
+  // Opened when it is first read: what cannot be read can still be removed.
+  nas::ResultReader& Reader() {
+    if (!reader_) reader_.emplace(path_);
+    return *reader_;
+  }
+
   const std::string path_;
-  nas::ResultReader reader_;
+  std::optional<nas::ResultReader> reader_;
   // Purges asked for by a running selection wait for its end: it reads one state of the file. Once
   // storing them has failed (a full disk), further ones are refused, so that the caller does not
   // ask for ever.
@@ -110,16 +118,17 @@ class WfmSearchDBTask::Impl {
 bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
                                   const nas::Selection& selection, SelectCallback callback,
                                   void* context, unsigned long long* total) {
-  reader_.Begin();
-  const nas::ResultReader::Page page = reader_.Select(selection, offset, limit);
+  nas::ResultReader& reader = Reader();
+  reader.Begin();
+  const nas::ResultReader::Page page = reader.Select(selection, offset, limit);
   *total = page.total;
-  Lender lender(reader_, callback, context);
+  Lender lender(reader, callback, context);
   for (const std::uint32_t number : page.numbers) {
     current_ = number;
-    if (lender.Lend(reader_.Row(number)) == 0) break;
+    if (lender.Lend(reader.Row(number)) == 0) break;
   }
   current_.reset();
-  reader_.End();
+  reader.End();
   FlushPurges();
   return true;
 }
@@ -127,7 +136,7 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
 void WfmSearchDBTask::Impl::FlushPurges() {
   if (purges_.empty()) return;
   try {
-    reader_.Purge(purges_);
+    Reader().Purge(purges_);
   } catch (const nas::SqliteError& error) {
     syslog(LOG_ERR, "search results: %s", error.what());
     purging_fails_ = true;
@@ -137,19 +146,20 @@ void WfmSearchDBTask::Impl::FlushPurges() {
 
 bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::string& real_path) {
   if (purging_fails_) return false;
+  nas::ResultReader& reader = Reader();
   const auto is_the_file = [&](const nas::ResultRow& row) {
     return row.share_name == share_name && RealPath(row) == real_path;
   };
   if (current_) {
-    if (!is_the_file(reader_.Row(*current_)) || !HasVanished(real_path)) return false;
+    if (!is_the_file(reader.Row(*current_)) || !HasVanished(real_path)) return false;
     purges_.push_back(*current_);
     return true;
   }
-  reader_.Begin();
-  for (std::uint32_t row = 0; row < reader_.rows(); ++row) {
-    if (!reader_.purged(row) && is_the_file(reader_.Row(row))) purges_.push_back(row);
+  reader.Begin();
+  for (std::uint32_t row = 0; row < reader.rows(); ++row) {
+    if (!reader.purged(row) && is_the_file(reader.Row(row))) purges_.push_back(row);
   }
-  reader_.End();
+  reader.End();
   const bool found = !purges_.empty();
   FlushPurges();
   return found && !purging_fails_;
@@ -200,7 +210,9 @@ WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* i
     nas::Report(folder.error());
     return nullptr;
   }
-  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(nas::ResultPath(*folder, id)));
+  const std::string path = nas::ResultPath(*folder, id);
+  if (access(path.c_str(), F_OK) != 0) return nullptr;
+  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(path));
 } catch (const std::exception& error) {
   syslog(LOG_ERR, "search results: %s", error.what());
   return nullptr;

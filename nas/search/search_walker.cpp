@@ -95,6 +95,7 @@ class WfmSearchWalker::Impl {
  public:
   Impl(const char* user, OKT::Task* task, const int* stop_flag)
       : user_(user), task_(task), stop_flag_(*stop_flag) {}
+  ~Impl();
 
   bool Init(const std::vector<std::string>& texts, const std::vector<FindComp*>& comps);
   bool Walk(const Json::Value& options);
@@ -118,10 +119,18 @@ class WfmSearchWalker::Impl {
   std::string folder_;
   std::string id_;
   std::unique_ptr<nas::ResultWriter> writer_;
+  bool walked_ = false;
   bool current_only_ = false;
   bool told_ready_ = false;
   Clock::time_point reported_;
 };
+
+// Without a walk, the file was not made whole or could not be named in the task's record: nobody
+// would ever find it.
+WfmSearchWalker::Impl::~Impl() {
+  writer_.reset();
+  if (!walked_ && !id_.empty()) nas::RemoveResultFile(nas::ResultPath(folder_, id_));
+}
 
 // Fails, with what is wrong with the first, where none can be opened.
 nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>& texts) {
@@ -157,20 +166,11 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
   folder_ = nas::ResultFolderPath(volume_, user_);
   nas::SweepResultFolder(folder_);
   id_ = nas::NewResultId();
-  // Where the file cannot be made whole nobody will ever know its name.
-  struct Cleanup {
-    const std::string path;
-    bool keep = false;
-    ~Cleanup() {
-      if (!keep) nas::RemoveResultFile(path);
-    }
-  } file{nas::ResultPath(folder_, id_)};
-  writer_ = std::make_unique<nas::ResultWriter>(file.path);
+  writer_ = std::make_unique<nas::ResultWriter>(nas::ResultPath(folder_, id_));
   for (size_t i = 0; i < locations_.size(); ++i) {
     writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
                          locations_[i].share.root);
   }
-  file.keep = true;
   return true;
 } catch (...) {
   SetErrorFromException();
@@ -178,6 +178,7 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
 }
 
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
+  walked_ = true;
   nas::SharedSearch search(comps_, *writer_, stop_flag_);
   for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
   if (options.get("search_content", false).asBool()) search.SearchContents(folder_);

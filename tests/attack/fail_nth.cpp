@@ -20,6 +20,7 @@
 #include <string.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -51,6 +52,7 @@ enum Class : uint32_t {
   kWait,
   kOwner,
   kSocket,
+  kWatch,
   kClasses
 };
 constexpr int32_t kShortTransfer = -1;
@@ -211,7 +213,6 @@ HOOK(kFork, pid_t, fork, (), (), "", -1)
 HOOK(kThread, int, pthread_create, (void* id, const void* how, void* (*body)(void*), void* with),
      (id, how, body, with), "", errno)
 HOOK(kKill, int, kill, (pid_t process, int number), (process, number), "", -1)
-HOOK(kWait, pid_t, waitpid, (pid_t process, int* status, int how), (process, status, how), "", -1)
 
 HOOK(kMap, void*, mmap, (void* at, size_t size, int how, int flags, int fd, off_t from),
      (at, size, how, flags, fd, from), "", MAP_FAILED)
@@ -226,8 +227,7 @@ HOOK(kPoll, int, poll, (void* watched, unsigned long count, int time), (watched,
      -1)
 HOOK(kPoll, int, epoll_wait, (int fd, void* events, int most, int time), (fd, events, most, time),
      "", -1)
-HOOK(kSocket, int, epoll_ctl, (int fd, int what, int of, void* event), (fd, what, of, event), "",
-     -1)
+HOOK(kWatch, int, epoll_ctl, (int fd, int what, int of, void* event), (fd, what, of, event), "", -1)
 HOOK(kPoll, int, nanosleep, (const void* length, void* left), (length, left), "", -1)
 
 HOOK(kDescriptor, int, dup2, (int from, int to), (from, to), "", -1)
@@ -303,6 +303,14 @@ int Control_(const char* name, int fd, int command, void* argument, const void* 
 }
 
 }  // namespace
+
+extern "C" __attribute__((used)) pid_t Hook_waitpid(pid_t, int*, int) __asm__("waitpid");
+pid_t Hook_waitpid(pid_t process, int* status, int how) {
+  static auto* const real = Real<pid_t(pid_t, int*, int)>("waitpid");
+  const bool waits = (how & WNOHANG) == 0;  // nothing else can be interrupted
+  if (waits && Fails(kWait, "waitpid", "", __builtin_return_address(0))) return -1;
+  return real(process, status, how);
+}
 
 extern "C" __attribute__((used)) int Hook_fcntl(int, int, void*) __asm__("fcntl");
 int Hook_fcntl(int fd, int command, void* argument) {

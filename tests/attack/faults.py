@@ -9,6 +9,7 @@ program works, and looks after each fault whether everything still holds:
   a search without faults works afterwards, and everything can be cleaned
 """
 
+import glob
 import json
 import multiprocessing
 import os
@@ -33,29 +34,34 @@ NO_LIMIT = 1 << 30
 SHORT_KINDS = 6  # of an operation's, in the short form
 TASK_FILES = r"lock|[0-9a-f]{32}\.(json|lock)"
 RESULT_FILES = r"[0-9a-f]{32}\.db(-wal|-shm|-journal)?"
+TEMPORARY = ".arbory-new-"
+DAY = 24 * 60 * 60
 PREFERENCE_FILES = r"usersettings|(adv_)?search_history\.db(-wal|-shm|-journal)?"
 
 
-def check_files(attack, kind):
-    """What lies on disk once everything has ended. A file that could not be removed may stay."""
+def check_files(attack):
+    """What lies on disk once everything has ended: the files that the day's sweep will have to take."""
     house = attack.house
+    left = []
     owner = os.stat(f"{house.state}/users/{house.user}").st_uid
     for folder, allowed in ((house.tasks, TASK_FILES), (house.results, RESULT_FILES),
                             (house.preference, PREFERENCE_FILES)):
         for name in list_folder(folder):
             info = os.lstat(f"{folder}/{name}")
             demand(info.st_uid == owner and info.st_mode & 0o77 == 0, f"{name} is open to others")
-            demand(re.fullmatch(allowed, name) or kind == "unlink", f"{name} is left behind")
-    if kind == "unlink":
-        return
-    locks = {name[:32] for name in list_folder(house.tasks) if name.endswith(".lock")} - {"lock"}
-    demand(locks == house.task_ids(), "a record without its lock file, or the other way round")
+            if not re.fullmatch(allowed, name):
+                demand(name.startswith(TEMPORARY), f"{name} is left behind")
+                left.append(f"{folder}/{name}")
+    locks = {name[:32] for name in list_folder(house.tasks) if re.fullmatch(r"\w{32}\.lock", name)}
+    left += [f"{house.tasks}/{task}.lock" for task in locks - house.task_ids()]
+    left += [f"{house.tasks}/{task}.json" for task in house.task_ids() - locks]
     named = set()
     for task in house.task_ids():
         with open(f"{house.tasks}/{task}.json") as file:
             data = json.load(file)["properties"].get("data") or {}
             named.add(data.get("sdbid"))
-    demand(house.result_ids() <= named, "a result file that no search names")
+    return left + [f"{house.results}/{name}" for name in list_folder(house.results)
+                   if name[:32] not in named]
 
 
 def check_stores(attack, operation):
@@ -78,11 +84,18 @@ def check_stores(attack, operation):
         demand(paths(listed) == FOUND, f"older results are lost: {listed}")
 
 
-def check_goes_on(attack, kind):
+def check_goes_on(attack, left):
+    # A look at a database leaves a companion of it, so all that begins alike is made old.
+    old = (time.time() - 2 * DAY,) * 2
+    for path in left:
+        for beside in glob.glob(path.partition(".db")[0] + "*"):
+            os.utime(beside, old)
     attack.search("one")
+    for path in left:
+        demand(not os.path.exists(path), f"the day's sweep leaves {os.path.basename(path)}")
     tasks = sorted(attack.house.task_ids())
     attack.call(SEARCH + "clean", {"taskid": tasks})
-    gone = lambda: not attack.house.task_ids() and (kind == "unlink" or not attack.house.result_ids())
+    gone = lambda: not attack.house.task_ids() and not attack.house.result_ids()
     demand(eventually(gone), "a clean without faults leaves something")
     demand(eventually(lambda: not children(attack.checker.process)), "a process is left")
 
@@ -107,9 +120,10 @@ def one_fault(attack, operation, kind, way, nth):
         attack.faults.disarm()
     harmless = attack.faults.control.failed == 0 or way in HARMLESS
     operation.check(attack, result, harmless)
-    check_files(attack, kind)
+    left = check_files(attack)
+    attack.left += len(left) > 0
     check_stores(attack, operation)
-    check_goes_on(attack, kind)
+    check_goes_on(attack, left)
     return attack.faults.seen(kind) >= nth
 
 
@@ -173,7 +187,7 @@ def attack_operation(name, options, bin_dir):
     become_subreaper()
     random.seed(f"{options.seed} {name}")
     outcome = Outcome()
-    outcome.counts = {"faults injected": 0, "of them in SQLite": 0}
+    outcome.counts = {"faults injected": 0, "of them in SQLite": 0, "left something to the sweep": 0}
     attack = Attack(bin_dir)
     campaign = Campaign(attack, outcome, options)
     _, _, rest = options.only.partition(":")
@@ -184,6 +198,7 @@ def attack_operation(name, options, bin_dir):
             print(attack.faults.control.what.decode())
         else:
             campaign.over(name, operations()[name])
+        outcome.count("left something to the sweep", attack.left)
     finally:
         attack.close()
     return outcome

@@ -16,6 +16,7 @@ CLASSES = {
     "poll": ["EINTR", "ENOMEM"], "lock": ["EIO", "ENOLCK"], "descriptor": ["EMFILE"],
     "stat": ["EIO", "ENOMEM"], "identity": ["EPERM"], "wait": ["EINTR"], "owner": ["EPERM"],
     "socket": ["ECONNRESET", "EMFILE", "EINTR", "short"],
+    "watch": ["ENOMEM", "ENOSPC"],
 }
 HARMLESS = ("EINTR", "short")
 SHORT_TRANSFER = -1

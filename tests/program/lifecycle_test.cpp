@@ -162,6 +162,15 @@ TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
   EXPECT_EQ(ListToEnd(kept).data["total"], 1);
 }
 
+TEST_F(Lifecycle, WhatCannotBeReadCanBeCleaned) {
+  const std::string id = StartQuick("one");
+  const std::string results = Databases(dir_ + "/volume1", nas_test::Me()).at(0);
+  WriteFile(results, "no database");
+  EXPECT_EQ(Call("list", Id(id)).code, 600);
+  EXPECT_EQ(Call("clean", Id(id)).code, 0);
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
+}
+
 TEST_F(Lifecycle, CleanAllRemovesTheUsersResultFoldersAndNothingElse) {
   if (system("bwrap --unshare-all --ro-bind / / true 2>/dev/null") != 0) {
     GTEST_SKIP() << "bubblewrap cannot run here, so no shell command does";

@@ -24,7 +24,8 @@ ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::Child child, std::share
       token_(std::move(token)),
       patience_(patience),
       buffer_(kReadBytes) {
-  pipe_.assign(child.fd.Release());
+  pipe_.assign(child.fd.get());
+  child.fd.Release();  // only now: what cannot be watched is still to be closed
   pipe_.native_non_blocking(true);
 }
 

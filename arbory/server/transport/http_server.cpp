@@ -4,6 +4,7 @@
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <boost/asio/io_context.hpp>
@@ -84,9 +85,7 @@ class HttpServer::Loop : public ConnectionHost {
     stop_signals_.async_wait([this](Error error, int) {
       if (!error) BeginStop();
     });
-    AwaitChildren();
-    Accept();
-    loop_.run();
+    RunLoop();
     StopWorkers();
   }
 
@@ -138,8 +137,27 @@ class HttpServer::Loop : public ConnectionHost {
     address_ = AddressText(endpoint_);
   }
 
+  // What a request throws, for want of memory or of a place to watch its socket, ends that request
+  // with its connection. The server goes on once it can wait for clients and children again.
+  void RunLoop() {
+    for (;;) {
+      try {
+        if (!awaiting_children_) AwaitChildren();
+        Reap();  // also those whose signal came to nothing
+        if (!accepting_ && !stopping_) Accept();
+        loop_.run();
+        return;
+      } catch (const std::exception& error) {
+        syslog(LOG_ERR, "a request was dropped: %s", error.what());
+        usleep(std::chrono::microseconds(kAcceptPause).count());
+      }
+    }
+  }
+
   void Accept() {
+    accepting_ = false;
     acceptor_.async_accept([this](Error error, tcp::socket socket) {
+      accepting_ = false;
       if (stopping_) return;
       if (error) return AcceptLater();
       // One client more than allowed finds its connection closed, as by a machine that is full.
@@ -150,21 +168,26 @@ class HttpServer::Loop : public ConnectionHost {
       }
       Accept();
     });
+    accepting_ = true;
   }
 
   void AcceptLater() {
     accept_pause_.expires_after(kAcceptPause);
     accept_pause_.async_wait([this](Error error) {
+      accepting_ = false;
       if (!error && !stopping_) Accept();
     });
+    accepting_ = true;
   }
 
   void AwaitChildren() {
     child_signals_.async_wait([this](Error error, int) {
+      awaiting_children_ = false;
       if (error) return;
       Reap();
       AwaitChildren();
     });
+    awaiting_children_ = true;
   }
 
   void Reap() {
@@ -249,6 +272,8 @@ class HttpServer::Loop : public ConnectionHost {
   HttpService* service_ = nullptr;
   bool stopping_ = false;
   bool ended_ = false;
+  bool accepting_ = false;  // or pausing before it does
+  bool awaiting_children_ = false;
   std::function<void()> on_hangup_;
   tcp::endpoint endpoint_;
   std::string address_;
