@@ -25,7 +25,7 @@ arbory                   : nas platform arbory/server <CLI>
 arbory/server/transport  : nas platform <boost>
 arbory/server/service    : nas platform arbory arbory/server/transport <security>
 bench                    : nas platform <benchmark>
-tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h>
+tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h> <boost>
 '
 cd "$1"
 find . -path './build*' -prune -o -name node_modules -prune -o \( -name '*.h' -o -name '*.cpp' \) -print |
