@@ -4,43 +4,25 @@ fails in it."""
 import json
 import os
 
-from house import (FOUND, HISTORY, Hang, House, QUERY, SEARCH, Server, Tree, children, eventually)
+from house import FOUND, HISTORY, Hang, QUERY, SEARCH, Server, children, eventually
 from injector import Faults
+from scene import OLD_HISTORY, Broken, Scene, check_reply, demand, paths, patterns
 
-CODES = {0, 100, 101, 400, 401, 405, 407, 408, 418, 600}
+NO_LIMIT = 1 << 30
+MOST_REFUSALS = 2  # each takes two seconds
 STATUSES = {200, 400, 401, 403, 404, 408, 429, 503}
-OLD_HISTORY = ["one", "older"]
 
 
-class Broken(Exception):
-    pass
+class Attack(Scene):
+    """A scene whose calls go through `faults`."""
 
-
-def demand(holds, what):
-    if not holds:
-        raise Broken(what)
-
-
-class Attack:
-    """One house, in which every fault begins from the same state."""
-
-    def __init__(self, bin_dir):
-        self.house = House(bin_dir, self.login_lines())
-        self.faults = Faults(self.house)
+    def __init__(self, bin_dir, faults=Faults):
+        super().__init__(bin_dir, 'logins_per_minute = 1000000\npam_dir = "PAM"\n')
+        self.faults = faults(self.house)
         self.make_pam()
-        os.makedirs(self.house.dir + "/volume1/endless")
-        with open(self.house.dir + "/volume1/endless/one.log", "w") as file:
-            file.write("a" * (1 << 18))
-            file.truncate(1 << 42)
-        self.checker = Server(self.house, "checker")
         self.victim = self.logins = None
         self.left = 0  # runs that left a file to the sweep
-        self.call(HISTORY + "set", {"pattern": "older"})
-        self.found = self.search("one")
-        self.tree = Tree(self.house.state, self.house.dir + "/volume1/@tmp")
-
-    def login_lines(self):
-        return 'logins_per_minute = 1000000\npam_dir = "PAM"\n'
+        self.furnish()
 
     def make_pam(self):
         folder = self.house.dir + "/pam"
@@ -55,31 +37,6 @@ class Attack:
             text = file.read()
         with open(self.house.config, "w") as file:
             file.write(text.replace('"PAM"', f'"{folder}"'))
-
-    def call(self, method, params):
-        return self.checker.call(method, params)
-
-    def start(self, pattern, location="/share", contents=False):
-        reply = self.call(SEARCH + "start", {"folder_path": location, "pattern": pattern,
-                                             "search_content": contents})
-        demand(reply["code"] == 0, f"a start without faults: {reply}")
-        return reply["data"]["taskid"]
-
-    def list_to_end(self, task):
-        def ended():
-            reply = self.call(SEARCH + "list", {"taskid": task})
-            return reply if reply["code"] != 0 or reply["data"]["finished"] else None
-        reply = eventually(ended)
-        demand(reply, "a search without a worker never finishes")
-        return reply
-
-    def search(self, pattern):
-        task = self.start(pattern)
-        demand(paths(self.list_to_end(task)) == FOUND, "a search without faults finds too little")
-        return task
-
-    def restart(self):
-        self.tree.put_back()
 
     def server(self, logins):
         """The one whose calls fail."""
@@ -101,23 +58,11 @@ class Attack:
         self.victim = self.logins = None
         self.house.kill_the_unknown()
 
-    def close(self):
-        self.house.remove()
-
-
-def paths(reply):
-    data = reply.get("data") or {}
-    return sorted(file["path"] for file in data.get("files", []))
-
-
-def check_reply(reply):
-    demand(set(reply) == {"code", "data"} and reply["code"] in CODES, f"an unknown reply: {reply}")
-    demand(reply["code"] == 0 or reply["data"] is None, f"an error with data: {reply}")
-    return reply
-
 
 class Call:
     """An operation of `arbory call`. `histories` are those that may stand afterwards."""
+
+    most = NO_LIMIT  # faults of one kind
 
     def __init__(self, method, params=None, histories=(OLD_HISTORY,), keeps_results=True,
                  adds_search=False):
@@ -166,10 +111,6 @@ class Call:
             check_search(attack, reply["data"]["taskid"], harmless)
 
 
-def patterns(reply):
-    return [entry.get("pattern") for entry in reply["data"]["history"]]
-
-
 def check_search(attack, task, harmless):
     """A search that calls itself complete is; every other one says that it is not."""
     reply = attack.list_to_end(task)
@@ -203,6 +144,7 @@ class Stop(Call):
 
 
 class Terminal:
+    most = NO_LIMIT
     histories = (OLD_HISTORY, ["on", *OLD_HISTORY])
     keeps_results = True
     adds_search = False
@@ -280,6 +222,8 @@ class Login(Http):
     def __init__(self, password):
         super().__init__("login")
         self.password = password
+        if password != "right":
+            self.most = MOST_REFUSALS
 
     def run(self, attack):
         return self.ask(attack, "POST", "/login",

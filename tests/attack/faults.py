@@ -4,12 +4,11 @@ program works, and looks after each fault whether everything still holds:
   one reply, with a documented code and exit status, within 20 seconds
   nothing found is lost without a word
   no process and no descriptor left over
-  no temporary file, no result file that no search names, nothing of another user's
+  what is left on disk is the user's own, and swept when it is a day old
   searches, histories and settings read as they were or as they were to become
   a search without faults works afterwards, and everything can be cleaned
 """
 
-import glob
 import json
 import multiprocessing
 import os
@@ -19,10 +18,11 @@ import sqlite3
 import time
 
 from attack import Outcome
-from fault_operations import Attack, Broken, Http, OLD_HISTORY, demand, operations, paths, patterns
+from fault_operations import Attack, Http, operations
 from house import (DEADLINE, FOUND, HISTORY, Hang, SEARCH, become_subreaper, children, eventually,
                    list_folder)
 from injector import CLASSES, HARMLESS
+from scene import Broken, check_files, check_goes_on, demand, paths, patterns
 
 PROMISE = ("A call of the system that fails anywhere costs one clear error: nothing hangs, is lost, "
            "or is left over")
@@ -30,38 +30,7 @@ ATTACK = "each call of the C library fails once, over every operation"
 
 # Of the thousands of allocations only some are failed, spread over all of them.
 MOST_OF_A_KIND = {"alloc": 60}
-NO_LIMIT = 1 << 30
 SHORT_KINDS = 6  # of an operation's, in the short form
-TASK_FILES = r"lock|[0-9a-f]{32}\.(json|lock)"
-RESULT_FILES = r"[0-9a-f]{32}\.db(-wal|-shm|-journal)?"
-TEMPORARY = ".arbory-new-"
-DAY = 24 * 60 * 60
-PREFERENCE_FILES = r"usersettings|(adv_)?search_history\.db(-wal|-shm|-journal)?"
-
-
-def check_files(attack):
-    """What lies on disk once everything has ended: the files that the day's sweep will have to take."""
-    house = attack.house
-    left = []
-    owner = os.stat(f"{house.state}/users/{house.user}").st_uid
-    for folder, allowed in ((house.tasks, TASK_FILES), (house.results, RESULT_FILES),
-                            (house.preference, PREFERENCE_FILES)):
-        for name in list_folder(folder):
-            info = os.lstat(f"{folder}/{name}")
-            demand(info.st_uid == owner and info.st_mode & 0o77 == 0, f"{name} is open to others")
-            if not re.fullmatch(allowed, name):
-                demand(name.startswith(TEMPORARY), f"{name} is left behind")
-                left.append(f"{folder}/{name}")
-    locks = {name[:32] for name in list_folder(house.tasks) if re.fullmatch(r"\w{32}\.lock", name)}
-    left += [f"{house.tasks}/{task}.lock" for task in locks - house.task_ids()]
-    left += [f"{house.tasks}/{task}.json" for task in house.task_ids() - locks]
-    named = set()
-    for task in house.task_ids():
-        with open(f"{house.tasks}/{task}.json") as file:
-            data = json.load(file)["properties"].get("data") or {}
-            named.add(data.get("sdbid"))
-    return left + [f"{house.results}/{name}" for name in list_folder(house.results)
-                   if name[:32] not in named]
 
 
 def check_stores(attack, operation):
@@ -82,22 +51,6 @@ def check_stores(attack, operation):
     listed = attack.call(SEARCH + "list", {"taskid": attack.found})
     if operation.keeps_results:
         demand(paths(listed) == FOUND, f"older results are lost: {listed}")
-
-
-def check_goes_on(attack, left):
-    # A look at a database leaves a companion of it, so all that begins alike is made old.
-    old = (time.time() - 2 * DAY,) * 2
-    for path in left:
-        for beside in glob.glob(path.partition(".db")[0] + "*"):
-            os.utime(beside, old)
-    attack.search("one")
-    for path in left:
-        demand(not os.path.exists(path), f"the day's sweep leaves {os.path.basename(path)}")
-    tasks = sorted(attack.house.task_ids())
-    attack.call(SEARCH + "clean", {"taskid": tasks})
-    gone = lambda: not attack.house.task_ids() and not attack.house.result_ids()
-    demand(eventually(gone), "a clean without faults leaves something")
-    demand(eventually(lambda: not children(attack.checker.process)), "a process is left")
 
 
 def one_fault(attack, operation, kind, way, nth):
@@ -152,7 +105,7 @@ class Campaign:
         one_fault(self.attack, operation, "open", "EIO", 0)
         seen = {kind: self.attack.faults.seen(kind) for kind in CLASSES}
         for kind, way in self.chosen(seen):
-            most = self.options.most or MOST_OF_A_KIND.get(kind, NO_LIMIT)
+            most = self.options.most or MOST_OF_A_KIND.get(kind, operation.most)
             for nth in spread(seen[kind], most):
                 self.try_one(name, operation, kind, way, nth)
             nth = seen[kind] + 1

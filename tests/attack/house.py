@@ -9,6 +9,7 @@ import json
 import os
 import pwd
 import re
+import resource
 import shutil
 import signal
 import stat
@@ -74,7 +75,7 @@ class Tree:
             shutil.rmtree(root, ignore_errors=True)
         for path, info, content in self.entries:
             if content is None:
-                os.makedirs(path)
+                os.makedirs(path, exist_ok=True)
             else:
                 with open(path, "wb") as file:
                     file.write(content)
@@ -189,12 +190,18 @@ def list_folder(path):
 class Server:
     """`arbory serve` for the house's user, or for all who log in. `name` is that of its output."""
 
-    def __init__(self, house, name="server", environment=None, logins=False):
+    def __init__(self, house, name="server", environment=None, logins=False, memory=None):
+        """`memory` bounds what each of its children, and itself, may map."""
         self.house = house
         self.cookie = None
         words = [house.program, "serve", "--config", house.config]
-        self.process = house.spawn(words if logins else house.words("serve"), environment, name)
+        # A campaign that is killed leaves no server behind.
+        mortal = ["/usr/bin/setpriv", "--pdeathsig", "KILL"]
+        self.process = house.spawn(mortal + (words if logins else house.words("serve")),
+                                   environment, name)
         house.known.add(self.process)
+        if memory:
+            resource.prlimit(self.process, resource.RLIMIT_AS, (memory, memory))
         pattern = r"http://127\.0\.0\.1:(\d+)(/open\?token=\w+|/)\n"
         match = eventually(lambda: re.search(pattern, "".join(house.output(name))))
         if not match:
