@@ -72,8 +72,10 @@ struct Control {
 };
 
 Control* control = nullptr;
+int (*program_main)(int, char**, char**) = nullptr;
 
-__attribute__((constructor)) void Attach() {
+// What comes before is the loader's and the libraries' own, where a failure ends any program.
+void Attach() {
   const char* path = getenv("ARBORY_FAIL_NTH");
   if (path == nullptr || strcmp(program_invocation_short_name, "arbory") != 0) return;
   const long fd = syscall(SYS_openat, AT_FDCWD, path, O_RDWR | O_CLOEXEC);
@@ -84,15 +86,15 @@ __attribute__((constructor)) void Attach() {
   if (at != -1) control = reinterpret_cast<Control*>(at);
 }
 
-// Counts the failure and tells of the first one. False when the caller is a PAM module: those are
-// the machine's.
+// Counts the failure and tells of the first one. False when the caller is a PAM module or one of
+// their libraries: those are the machine's.
 bool Count(const char* function, const char* path, const void* caller) {
   Dl_info from = {};
   dladdr(caller, &from);
   const char* file = from.dli_fname == nullptr ? "?" : from.dli_fname;
   if (const char* slash = strrchr(file, '/')) file = slash + 1;
   const auto begins = [file](const char* name) { return strncmp(file, name, strlen(name)) == 0; };
-  if (begins("pam_") || begins("libpam")) return false;
+  if (begins("pam_") || begins("libpam") || begins("libaudit")) return false;
   if (begins("libsqlite3")) ++control->in_sqlite;
   if (++control->failed > 1) return true;
   snprintf(control->what, kWhatBytes, "%s(%.80s) by %s+%#zx in process %d", function,
@@ -274,6 +276,25 @@ HOOK(kSocket, ssize_t, sendmsg, (int fd, const void* message, int flags), (fd, m
 HOOK_TRANSFER(kSocket, recv, (int fd, void* to, size_t count, int flags), (fd, to, count, flags))
 HOOK_TRANSFER(kSocket, send, (int fd, const void* from, size_t count, int flags),
               (fd, from, count, flags))
+
+namespace {
+
+int MainOfAttacked(int argc, char** argv, char** environment) {
+  Attach();
+  return program_main(argc, argv, environment);
+}
+
+}  // namespace
+
+using Main = int(int, char**, char**);
+using StartMain = int(Main*, int, char**, void (*)(), void (*)(), void (*)(), void*);
+extern "C" __attribute__((used)) StartMain Hook_start_main __asm__("__libc_start_main");
+int Hook_start_main(Main* main, int argc, char** argv, void (*init)(), void (*fini)(),
+                    void (*rtld_fini)(), void* stack_end) {
+  program_main = main;
+  return Real<StartMain>("__libc_start_main")(MainOfAttacked, argc, argv, init, fini, rtld_fini,
+                                              stack_end);
+}
 
 // What looking a function up may itself need.
 extern "C" void* __libc_malloc(size_t);
