@@ -12,6 +12,8 @@
 namespace arbory {
 namespace {
 
+constexpr int kCodeNoListing = 600;  // the API's for results that cannot be listed
+
 std::string_view TextOf(const Json::Value& value) {
   const char* begin = nullptr;
   const char* end = nullptr;
@@ -123,9 +125,11 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
     const Json::Value& files = listed ? data["files"] : Json::Value::nullSingleton();
     const bool finished = listed && data["finished"].asBool();
     const Json::Value& total = listed ? data["total"] : Json::Value::nullSingleton();
-    nas::Reply reply{{.code = code},
+    // Without a total it is that of a search whose record is gone, or could not be read this time.
+    const bool gone = code == 0 && !total.isNumeric();
+    nas::Reply reply{{.code = gone ? kCodeNoListing : code},
                      (finished ? "1 " : "0 ") + std::to_string(files.size()) + " " +
-                         std::to_string(total.asUInt()) + "\n"};
+                         std::to_string(gone ? 0 : total.asUInt()) + "\n"};
     constexpr size_t kUsualRowBytes = 128;
     reply.body.reserve(reply.body.size() + files.size() * kUsualRowBytes);
     for (const Json::Value& file : files) AppendRow(file, format, &reply.body);

@@ -109,7 +109,7 @@ class Search {
       }
       if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
       if (!pages.caught_up()) continue;
-      if (page.finished() || walked) return Ending::kComplete;
+      if (page.code() == 0 && (page.finished() || walked)) return Ending::kComplete;
       if (page.rows() >= kManyRows) busy_ = Clock::now();
       Wait();
     }
