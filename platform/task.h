@@ -45,6 +45,9 @@ class Task {
   // Whether the task had finished when this object last read the record: opened it, reloaded it or
   // waited on it. So what a caller reads after that and before asking is complete if this is true.
   bool isFinished() const;
+  // Whether no process worked on the task any more then. One that is told to stop is marked as
+  // finished first and ends later; until it has, the record may still change.
+  bool isAbandoned() const;
 
   // Deletes the record. Objects that still hold the task cannot write it any more.
   bool remove();
@@ -70,6 +73,7 @@ class TaskMgr {
 
 // Wait until the task shows property `name` (or member `member` of the object property `name`), at
 // most `bound` tenths of a second. Return 1 when it is there and 0 when the wait gave up: the bound
-// passed, the task finished without it, or the task is gone. The task object is reloaded.
+// passed, the last process that worked on the task ended without it, or the task is gone. The task
+// object is reloaded.
 int WaitForTaskDataReady(OKT::Task* task, const char* name, int bound);
 int WaitForTaskDataKeyReady(OKT::Task* task, const char* name, const char* member, int bound);

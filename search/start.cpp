@@ -3,11 +3,12 @@
 //
 // Protocol of the fork: the parent writes the task record once; the worker waits for that write
 // before it touches the record, and is its only writer from then on. The parent never waits for
-// the worker. The worker holds no lock and no database handle of the parent's. It ends with
-// _exit(0), so that none of the server's exit handlers run in it, with one exception: when the
-// record is gone there is nothing to write the outcome to, and it returns through the handler as
-// the request process would, replying through its own copy of the response. No exception leaves
-// the worker.
+// the worker. SIGTERM is held back over the fork until the worker has its handler: a stop may come
+// as soon as the parent has written, and must find a worker that ends in order. The worker holds no
+// lock and no database handle of the parent's. It ends with _exit(0), so that none of the server's
+// exit handlers run in it, with one exception: when the record is gone there is nothing to write
+// the outcome to, and it returns through the handler as the request process would, replying through
+// its own copy of the response. No exception leaves the worker.
 
 #include <syslog.h>
 #include <unistd.h>
@@ -38,6 +39,23 @@ bool HasUnindexedShare(const Json::Value& locations) {
   }
   return false;
 }
+
+// Holds SIGTERM back while it lives.
+class HeldStop {
+ public:
+  HeldStop() {
+    sigset_t stop;
+    sigemptyset(&stop);
+    sigaddset(&stop, SIGTERM);
+    sigprocmask(SIG_BLOCK, &stop, &before_);
+  }
+  ~HeldStop() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
+  HeldStop(const HeldStop&) = delete;
+  HeldStop& operator=(const HeldStop&) = delete;
+
+ private:
+  sigset_t before_;
+};
 
 // Ends a worker that has no outcome to record: nobody may take the search for a running one.
 [[noreturn]] void FinishAndExit() noexcept {
@@ -70,7 +88,12 @@ bool ArboryFindHandler::WebFMFindHandler() {
     SetError(kCodeFailed);
     return false;
   }
-  const pid_t pid = NLIBCProcFork();
+  pid_t pid = 0;
+  {
+    const HeldStop held;
+    pid = NLIBCProcFork();
+    if (pid == 0) std::signal(SIGTERM, DelSigHandler);
+  }
   if (pid < 0) {
     syslog(LOG_ERR, "%s:%d Failed to fork().", kLogSource, log_line::kStartFork);
     SetError(kCodeFailed);
@@ -102,7 +125,6 @@ bool ArboryFindHandler::RunWorker(const Json::Value& locations) {
   bool succeeded = false;
   bool as_user = true;
   try {
-    std::signal(SIGTERM, DelSigHandler);
     WaitForTaskDataReady(pTask, task_record::kData, kFirstWriteBound);
     const std::string session = request()->GetSessionID();
     std::vector<std::string> folders;

@@ -44,7 +44,7 @@ class Task::Record {
     auto state = files_.Load(id_);
     if (!state) return false;
     Take(std::move(*state));
-    finished_ = finished_ || !alive;
+    abandoned_ = abandoned_ || !alive;
     return true;
   }
 
@@ -68,7 +68,8 @@ class Task::Record {
     return collected != pending.end() ? collected->second : properties_.get(name, Json::Value());
   }
 
-  bool finished() const { return finished_; }
+  bool finished() const { return finished_ || abandoned_; }
+  bool abandoned() const { return abandoned_; }
   bool Remove() { return files_.Remove(id_).ok(); }
 
   mutable std::mutex mutex;
@@ -85,7 +86,9 @@ class Task::Record {
   nas::UniqueFd life_;  // inherited by forks; the task lives while one of them has it open
   std::string id_;
   Json::Value properties_{Json::objectValue};
-  bool finished_ = false;  // never taken back, as neither a mark nor a death is
+  // Neither is taken back, as neither a mark nor a death is.
+  bool finished_ = false;
+  bool abandoned_ = false;
 };
 
 Task::Task(const char* owner, const char* id) : record_(std::make_unique<Record>(owner, id)) {}
@@ -131,6 +134,11 @@ bool Task::isFinished() const {
   return record_->finished();
 }
 
+bool Task::isAbandoned() const {
+  const std::lock_guard guard(record_->mutex);
+  return record_->abandoned();
+}
+
 bool Task::remove() {
   const std::lock_guard guard(record_->mutex);
   return record_->Remove();
@@ -147,6 +155,8 @@ Task* TaskMgr::getTaskWithThrow(const char* id) const {
 
 namespace {
 
+// A finished mark ends no wait: whoever stops a task sets it while the worker still has to write
+// down what others must know to list and clean it.
 template <typename Shown>
 int WaitFor(OKT::Task* task, int bound, Shown shown) {
   if (task == nullptr) return 0;
@@ -154,7 +164,7 @@ int WaitFor(OKT::Task* task, int bound, Shown shown) {
   for (;;) {
     if (!task->reload()) return 0;
     if (shown()) return 1;
-    if (task->isFinished() || !pause.Wait()) return 0;
+    if (task->isAbandoned() || !pause.Wait()) return 0;
   }
 }
 

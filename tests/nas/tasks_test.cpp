@@ -329,5 +329,38 @@ TEST_F(TasksTest, WaitsEndAsSoonAsTheyCan) {
   }
 }
 
+// A worker that is stopped has not ended yet: what it writes down last is still waited for, and
+// once it has ended nothing is.
+TEST_F(TasksTest, AWaitLastsAsLongAsSomebodyWorks) {
+  const auto task = New();
+  const auto reader = Open(task->getTaskId());
+  EXPECT_TRUE(reader->finish(false));
+  std::thread worker([&] {
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    task->setProperty("late", 1);
+  });
+  EXPECT_EQ(WaitForTaskDataReady(reader.get(), "late", 600), 1);
+  worker.join();
+}
+
+// Whoever finds a task finished has read the last that was written of it. A record that takes a
+// while to read makes room for a worker to write and end meanwhile.
+TEST_F(TasksTest, AFinishedTaskHasNothingMoreToTell) {
+  constexpr int kRounds = 40;
+  const std::string slow(size_t{300} << 10, 'x');
+  for (int round = 0; round < kRounds; ++round) {
+    auto task = New();
+    const auto reader = Open(task->getTaskId());
+    ASSERT_TRUE(task->setProperty("slow", slow));
+    std::thread worker([&] {
+      ASSERT_TRUE(task->setProperty("last", 1));
+      task.reset();
+    });
+    while (!reader->isFinished()) ASSERT_TRUE(reader->reload());
+    ASSERT_EQ(reader->getProperty("last"), 1) << "of round " << round;
+    worker.join();
+  }
+}
+
 }  // namespace
 }  // namespace nas_test

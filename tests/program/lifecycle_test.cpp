@@ -141,6 +141,30 @@ TEST_F(Lifecycle, StopEndsTheWorkerAndKeepsWhatWasFound) {
   EXPECT_THAT(Logged(), HasSubstr(failure));
 }
 
+// Stopped before its worker has come to anything, a search still tells where its results are: it
+// can be listed, and cleaning it leaves nothing.
+TEST_F(Lifecycle, AStopRightAfterTheStartLosesNothing) {
+  constexpr int kRounds = 20;
+  std::string ids;
+  MakeEndlessFile(share_ + "/endless.log");
+  const Json::Value search =
+      Json_(R"({"folder_path": "/share", "pattern": "one", "search_content": true})");
+  for (int round = 0; round < kRounds; ++round) {
+    const std::string id = Start(search);
+    EXPECT_EQ(Call("stop", Id(id)).code, 0);
+    EXPECT_EQ(Call("list", Id(id)).code, 0) << "of round " << round;
+    ids += id + ",";
+  }
+  EXPECT_EQ(Call("clean", Id(ids)).code, 0);
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
+
+  const std::string id = Start(search);
+  EXPECT_EQ(Call("stop", Id(id)).code, 0);
+  EXPECT_EQ(Call("clean", Id(id)).code, 0);
+  EXPECT_TRUE(Eventually([&] { return TaskProperty(id, "data") == "gone"; }));
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); })) << "of one never listed";
+}
+
 TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
   const std::string first = StartQuick("one");
   const std::string running = StartEndless();
