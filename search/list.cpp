@@ -28,6 +28,9 @@ constexpr AttributeName kAttributeNames[] = {
     {"time", kTime},          {"perm", kPerm}, {"type", kType},
 };
 
+// Of a record that was tampered with: nothing that names a database.
+std::string TextOf(const Json::Value& value) { return value.isString() ? value.asString() : ""; }
+
 bool SameIgnoringCase(const std::string& text, const char* word) {
   return strcasecmp(text.c_str(), word) == 0;
 }
@@ -87,8 +90,8 @@ bool ArboryFindHandler::AnswerPage(int additional, const std::string& task_id) {
   if (task_data.isMember(task_record::kDatabaseId) &&
       task_data.isMember(task_record::kDatabaseVolume)) {
     const std::string pattern = request()->GetParam("pattern", "").asString();
-    const std::string volume = task_data[task_record::kDatabaseVolume].asString();
-    const std::string database = task_data[task_record::kDatabaseId].asString();
+    const std::string volume = TextOf(task_data[task_record::kDatabaseVolume]);
+    const std::string database = TextOf(task_data[task_record::kDatabaseId]);
     if (!WebFMQueryResult(additional, volume.c_str(), database.c_str(), response, task_data,
                           sort_by.empty() ? nullptr : sort_by.c_str(), &ascending, &type,
                           pattern.c_str())) {

@@ -63,7 +63,7 @@ Json::Value WaitForData(OKT::Task* task, const char* member, int not_ready_line,
 
 void StopWorker(const OKT::Task& task, const Json::Value& data) {
   if (task.isFinished()) return;
-  // A record that was tampered with must not keep the others from being stopped or cleaned.
+  // A record that was tampered with must not keep the others from being stopped.
   const Json::Value& pid = data[task_record::kPid];
   KillSearchWorker(pid.isInt() ? pid.asInt() : 0);
 }
@@ -167,11 +167,16 @@ bool ArboryFindHandler::WebFMFindCleanHandler() {
   _exit(0);
 }
 
-// The database goes first: while the task is there, the database can be found again.
+// The database goes first: while the task is there, the database can be found again. A record that
+// was tampered with goes too, and keeps no other from being cleaned.
 void ArboryFindHandler::CleanSearches(const Json::Value& ids, OKT::TaskMgr& tasks,
                                       const FileSearch::WfmSearchDBTaskMgr& databases) {
   for (const Json::Value& id : ids) {
-    OpenSearch(id, tasks, databases);
+    try {
+      OpenSearch(id, tasks, databases);
+    } catch (...) {
+      // It names no database that could be opened.
+    }
     RemoveAndForget(dbTask);
     RemoveAndForget(pTask);
   }

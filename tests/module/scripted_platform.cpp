@@ -157,7 +157,7 @@ void Script::Arrange(const std::string& words) {
     if (verb == "fail") fail.insert(what);
     if (verb == "throw") at[what] = [what] { throw std::runtime_error(what); };
     if (verb == "stop") at[what] = [] { raise(SIGTERM); };
-    if (verb == "spoil") properties["data"][what] = "x";
+    if (verb == "spoil") properties["data"][what] = Json::Value(Json::objectValue);
     if (verb == "lose") at[what] = [] { script.properties.clear(); };
     if (verb != "no") continue;
     if (what == "tasks") tasks.clear();

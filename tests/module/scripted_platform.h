@@ -34,8 +34,9 @@ struct Script {
 
   // Takes what happens in words, separated by ", ": "child" (forks are seen from the child),
   // "finished" (so are the tasks), "error N" (WfmLibGetErr), "no KEY" (of what there is), "text
-  // KEY" (as a parameter's value); and in operation OP "fail OP", "throw OP", "stop OP" (SIGTERM
-  // comes), "lose OP" (the tasks' properties are gone).
+  // KEY" (as a parameter's value), "spoil KEY" (of the task's data, an object now); and in
+  // operation OP "fail OP", "throw OP", "stop OP" (SIGTERM comes), "lose OP" (the tasks' properties
+  // are gone).
   void Arrange(const std::string& words);
 
   std::map<std::string, unsigned> accounts;  // users and groups

@@ -119,8 +119,14 @@ TEST(Clean, RemovesTheDatabaseBeforeTheTask) {
        join({open, {"kill(77,15)", database[0]}, task})},
       {"no child: the request process does the work and ends", R"("t1")", "fail NLIBCProcFork",
        join({{"log S:668 Failed to fork()."}, open, {"kill(77,15)"}, database, task})},
-      {"an exception ends the child", R"("t1")", "child, throw getDBTask",
-       join({open, {"kill(77,15)", database[0], "_exit(0)"}})},
+      {"a record with an object for its database: the next one is cleaned all the same",
+       R"("t1,t2")", "child, spoil sdbvol",
+       join(
+           {open,
+            {"kill(77,15)", "Task.remove(t1)", "~Task(t1)", "Task(ann,t2)", open[1], "kill(77,15)"},
+            {"Task.remove(t2)", "~Task(t2)", "_exit(0)"}})},
+      {"an exception ends no more than its search", R"("t1")", "child, throw getDBTask",
+       join({open, {"kill(77,15)", database[0]}, task})},
   };
   for (const auto& row : rows) {
     Script play = EndScript("clean", row.ids);
