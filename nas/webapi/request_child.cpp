@@ -2,9 +2,11 @@
 
 #include <syslog.h>
 
+#include <cerrno>
 #include <exception>
 #include <optional>
 
+#include "nas/base/error.h"
 #include "nas/system/user_state.h"
 #include "platform/webfm.h"
 
@@ -52,6 +54,9 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
     Report(entered.error());
     return encode(WfmLibGetErr(), Json::Value());
   }
+  // What failed before is not this call's, whose failures may have no number of their own.
+  SetLastError(kErrorNone);
+  errno = 0;
   Request request(row, call);
   Response response(encode);
   try {

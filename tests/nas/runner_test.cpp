@@ -126,6 +126,15 @@ TEST_F(RunnerTest, OneReplyComesWhateverTheEntryDoes) {
   }
 }
 
+// A call whose failure has no number of its own is not answered with that of an earlier one.
+TEST_F(RunnerTest, ACallKnowsNothingOfItsCallersFailures) {
+  EXPECT_LT(WfmLibUGIDSet(nullptr, "no-such-user-here"), 0);
+  ASSERT_EQ(WfmLibGetErr(), 405);
+  const std::string reply =
+      Run([](APIRequest*, APIResponse* r) { r->SetError(WfmLibGetErr(), NLIBCErrGet()); });
+  EXPECT_EQ(reply, R"({"code":401,"data":0})");
+}
+
 TEST_F(RunnerTest, AReplyOfManyMegabytesComesWhole) {
   constexpr size_t kBytes = 12 << 20;
   const std::string reply =
