@@ -2,6 +2,8 @@
 
 #include <syslog.h>
 
+#include <algorithm>
+#include <limits>
 #include <string>
 #include <vector>
 
@@ -10,6 +12,13 @@
 #include "history/history_store.h"
 
 namespace {
+
+// A count as the client meant it, as far as there are counts that large; 0 for what is no number.
+int CountOf(const Json::Value& value) {
+  using Limits = std::numeric_limits<int>;
+  if (!value.isNumeric()) return value == true ? 1 : 0;
+  return static_cast<int>(std::clamp<double>(value.asDouble(), Limits::min(), Limits::max()));
+}
 
 // Right after the store's own test: %m is the reason that the store left.
 void LogUnusable(const std::string& path, int line) {
@@ -20,8 +29,8 @@ void LogUnusable(const std::string& path, int line) {
 
 void SearchHistortGet::Process() {
   NUVA::WEBFM::FileDB::Condition all;
-  all.offset = request()->GetParam("offset", 0).asInt();
-  all.limit = request()->GetParam("limit", 0).asInt();
+  all.offset = CountOf(request()->GetParam("offset", 0));
+  all.limit = CountOf(request()->GetParam("limit", 0));
   const std::string path = HistoryDBPath(*request());
   Json::Value reply;
   Json::Value& history = reply["history"] = Json::Value(Json::arrayValue);
@@ -39,7 +48,7 @@ void SearchHistortGet::Process() {
 }
 
 void SearchHistortSet::Process() {
-  const std::string pattern = request()->GetParam("pattern", "").asString();
+  const std::string pattern = TextOf(request()->GetParam("pattern", ""));
   const std::string path = HistoryDBPath(*request());
   if (pattern.empty()) {
     SetError(kCodeFailed);

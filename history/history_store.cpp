@@ -14,8 +14,12 @@ std::string HistoryDBFileName(const std::string& kind) {
   return kind == kAdvancedKind ? kAdvancedFile : kSimpleFile;
 }
 
+std::string TextOf(const Json::Value& value) {
+  return value.isArray() || value.isObject() ? std::string() : value.asString();
+}
+
 std::string HistoryDBPath(const NUVA::APIRequest& request) {
-  const std::string kind = request.GetParam("search_type", "simple").asString();
+  const std::string kind = TextOf(request.GetParam("search_type", "simple"));
   return request.GetPreferenceDir() + "/" + HistoryDBFileName(kind);
 }
 

@@ -3,10 +3,15 @@
 // directory. A store is opened, used and closed within one operation of one process. No directory
 // is ever made here.
 
+#include <json/value.h>
+
 #include <string>
 
 #include "platform/filedb.h"
 #include "platform/webapi.h"
+
+// A parameter as text; empty for an array or object, which have none.
+std::string TextOf(const Json::Value& value);
 
 // The store of a kind of search: "advance" has its own, every other kind shares the simple one.
 std::string HistoryDBFileName(const std::string& kind);

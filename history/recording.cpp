@@ -18,7 +18,7 @@ constexpr long kRecentSlots = 3;  // how far back a store that sorts by time loo
 // The old record is found by the request's pattern; the new one carries that of the criteria.
 void WriteRecord(const NUVA::APIRequest& request, const Json::Value& criteria) {
   NUVA::WEBFM::FileDB store(HistoryDBPath(request));
-  const std::string pattern = request.GetParam("pattern", "").asString();
+  const std::string pattern = TextOf(request.GetParam("pattern", ""));
   if (!store.IsGood() || pattern.empty()) return;
   ConfigureForWriting(store);
   Json::Value record = criteria;
@@ -51,7 +51,7 @@ void RecordSearch(const NUVA::APIRequest& request, const Json::Value& criteria) 
   try {
     WriteRecord(request, criteria);
   } catch (...) {
-    // A parameter of a type that names no history.
+    // No memory for it.
   }
 }
 

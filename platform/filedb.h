@@ -1,7 +1,8 @@
 #pragma once
 // The small keyed record store behind the search histories: one file, a few JSON records, the
 // newest first. Each object is for one operation of one process: open it, use it, destroy it. Any
-// number of processes may have the same file open; each write is one transaction.
+// number of processes may have the same file open; each write is one transaction, which survives a
+// power cut once it has returned.
 
 #include <json/value.h>
 
@@ -43,7 +44,8 @@ class FileDB {
   // Records are unique by their text value under `key`.
   void SetPrimaryKey(const std::string& key);
 
-  // Adds `record` as the newest, replacing the record with the same primary key.
+  // Adds `record` as the newest, replacing the record with the same primary key. False for what
+  // could not be read again: no object, or one nested too deep. Records that were damaged go.
   bool Insert(const Json::Value& record);
   // As Insert. `slots` is how many of the newest records a store that sorts by time need look at;
   // this one keeps its order by itself.

@@ -56,11 +56,16 @@ Status FillNew(int dir_fd, const std::string& name, std::string_view bytes, mode
   return {};
 }
 
+// With a final "/"; empty for a name without a folder.
+std::string_view FolderPart(std::string_view name) { return name.substr(0, name.rfind('/') + 1); }
+
+std::string FolderOf(std::string_view name) {
+  const std::string_view folder = FolderPart(name);
+  return folder.empty() ? "." : std::string(folder);
+}
+
 std::string NameBeside(std::string_view name) {
-  const size_t slash = name.rfind('/');
-  std::string fresh(name.substr(0, slash == std::string_view::npos ? 0 : slash + 1));
-  fresh += kTemporaryPrefix;
-  return fresh + RandomName();
+  return std::string(FolderPart(name)).append(kTemporaryPrefix) + RandomName();
 }
 
 }  // namespace
@@ -89,18 +94,25 @@ Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, 
   const std::string fresh = NameBeside(name);
   Status done = FillNew(dir_fd, fresh, bytes, mode, durable);
   if (done && renameat(dir_fd, fresh.c_str(), dir_fd, name.c_str()) != 0) done = ErrnoError();
+  if (!done) unlinkat(dir_fd, fresh.c_str(), 0);
+  if (done && durable) done = SyncFolder(dir_fd, FolderOf(name));
   if (done) return done;
-  unlinkat(dir_fd, fresh.c_str(), 0);
   return done.error().Of(name);
 }
 
 Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode) {
   const std::string fresh = NameBeside(name);
-  Status done = FillNew(dir_fd, fresh, bytes, mode, /*durable=*/false);
+  Status done = FillNew(dir_fd, fresh, bytes, mode, /*durable=*/true);
   if (done && linkat(dir_fd, fresh.c_str(), dir_fd, name.c_str(), 0) != 0) done = ErrnoError();
   unlinkat(dir_fd, fresh.c_str(), 0);
+  if (done) done = SyncFolder(dir_fd, FolderOf(name));
   if (done) return done;
   return done.error().Of(name);
+}
+
+Status SyncFolder(int dir_fd, const std::string& name) {
+  const UniqueFd folder(openat(dir_fd, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return folder && fsync(folder.get()) == 0 ? Status() : ErrnoError(name);
 }
 
 }  // namespace nas

@@ -24,13 +24,17 @@ Result<std::string> ReadWholeFile(int dir_fd, const std::string& name, size_t ma
 // Puts a file with this content and mode in the place of `name`, at once: a reader finds the old
 // one or the new one, whole; after a failure it is the old one. The new content is first written to
 // a file of another name beside it, which a process killed meanwhile leaves behind
-// (kTemporaryPrefix tells it). A symbolic link is replaced, not followed. Not synced to the disk
-// unless `durable`.
+// (kTemporaryPrefix tells it). A symbolic link is replaced, not followed. With `durable` it
+// survives a power cut once this returns: the file is synced to the disk and then its folder, and
+// only where that last step fails is the new one in place after a failure.
 Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
                    bool durable);
 
-// The same for a file that must not exist yet: EEXIST where it does.
+// The same for a file that must not exist yet, always durable: EEXIST where it does.
 Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode);
+
+// Syncs the folder `name` itself to the disk: what was made, renamed or removed in it.
+Status SyncFolder(int dir_fd, const std::string& name);
 
 inline constexpr std::string_view kTemporaryPrefix = ".arbory-new-";
 

@@ -56,6 +56,10 @@ bool CreatePrivately(const std::string& path) {
   return fd || errno == EEXIST;
 }
 
+// Committing ends with the removal of SQLite's journal: what was answered for is kept only once the
+// folder has reached the disk as well. The first commit brings the file's own name with it.
+constexpr char kDurable[] = "PRAGMA synchronous=EXTRA";
+
 std::int64_t Number(const nas::Database& db, const char* sql) {
   nas::Statement statement(db, sql);
   return statement.Step() ? statement.Integer(0) : 0;
@@ -85,6 +89,10 @@ struct Row {
   Json::Value record;
 };
 
+bool ReadRecord(std::string_view body, Json::Value* record) {
+  return nas::ParseJson(body, record) && record->isObject();
+}
+
 // The matching records, newest first. A body that is not readable is passed over: one bad record
 // must not hide the others.
 std::vector<Row> Matching(const nas::Database& db, const FileDB::Condition& condition) {
@@ -92,7 +100,7 @@ std::vector<Row> Matching(const nas::Database& db, const FileDB::Condition& cond
   nas::Statement rows(db, "SELECT position, body FROM records ORDER BY position DESC");
   while (rows.Step()) {
     Row row{rows.Integer(0), {}};
-    if (nas::ParseJson(rows.Bytes(1), &row.record) && Matches(row.record, condition)) {
+    if (ReadRecord(rows.Bytes(1), &row.record) && Matches(row.record, condition)) {
       found.push_back(std::move(row));
     }
   }
@@ -104,6 +112,18 @@ void DeleteMatching(nas::Database& db, const FileDB::Condition& condition) {
   if (condition.equal.empty()) return db.Execute("DELETE FROM records");
   nas::Statement remove(db, "DELETE FROM records WHERE position=?1");
   for (const Row& row : Matching(db, condition)) remove.Bind(1, row.position).Run();
+}
+
+// Nor may one take a place among those that are kept.
+void DeleteUnreadable(nas::Database& db) {
+  nas::Statement rows(db, "SELECT position, body FROM records");
+  std::vector<std::int64_t> unreadable;
+  Json::Value record;
+  while (rows.Step()) {
+    if (!ReadRecord(rows.Bytes(1), &record)) unreadable.push_back(rows.Integer(0));
+  }
+  nas::Statement remove(db, "DELETE FROM records WHERE position=?1");
+  for (const std::int64_t position : unreadable) remove.Bind(1, position).Run();
 }
 
 }  // namespace
@@ -151,6 +171,7 @@ class FileDB::Store {
     bool is_store = false;
     const nas::Status status = Guard([&] {
       db_ = std::make_unique<nas::Database>(path_, SQLITE_OPEN_READWRITE, kBusyMilliseconds);
+      db_->Execute(kDurable);
       is_store = IsStore(*db_);
     });
     if (status && is_store) return status;
@@ -187,7 +208,9 @@ void FileDB::SetMaxRecordNum(int count) { store_->max_records = count; }
 void FileDB::SetPrimaryKey(const std::string& key) { store_->primary_key = key; }
 
 bool FileDB::Insert(const Json::Value& record) {
-  if (!record.isObject()) {
+  const std::string body = nas::JsonText(record, nas::JsonBytes::kRaw);
+  Json::Value again;
+  if (!ReadRecord(body, &again)) {  // no object, or too deep
     errno = EINVAL;
     return false;
   }
@@ -197,7 +220,7 @@ bool FileDB::Insert(const Json::Value& record) {
     if (!key.empty() && TextOf(record, key, &value)) {
       DeleteMatching(db, Condition().SetCondition(key, value));
     }
-    const std::string body = nas::JsonText(record, nas::JsonBytes::kRaw);
+    DeleteUnreadable(db);
     nas::Statement(db, "INSERT INTO records(body) VALUES(?1)").BindBlob(1, body).Run();
     if (store_->max_records <= 0) return;
     nas::Statement(db,

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 
+#include "nas/base/file_io.h"
 #include "nas/system/identity.h"
 
 namespace nas {
@@ -24,7 +25,10 @@ Result<UniqueFd> OpenOrMakeFolder(int dir_fd, const std::string& name, mode_t mo
   Result<UniqueFd> folder = OpenFolder(dir_fd, name);
   if (folder || folder.error().error_number != ENOENT) return folder;
   const ScopedUmask exact(0);
-  if (mkdirat(dir_fd, name.c_str(), mode) != 0 && errno != EEXIST) return ErrnoError(name);
+  const bool made = mkdirat(dir_fd, name.c_str(), mode) == 0;
+  if (!made && errno != EEXIST) return ErrnoError(name);
+  // What is kept in a folder survives no power cut that the folder does not.
+  if (made) (void)SyncFolder(dir_fd, ".");
   return OpenFolder(dir_fd, name);
 }
 
@@ -38,7 +42,9 @@ Status MakeFolders(const std::string& path, mode_t mode) {
   const ScopedUmask exact(0);
   for (size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
-    if (mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
+    if (mkdir(part.c_str(), mode) == 0) {
+      (void)SyncFolder(AT_FDCWD, part + "/..");
+    } else if (errno != EEXIST) {
       // A folder on the way may refuse with another error though it exists.
       struct stat info;
       if (stat(part.c_str(), &info) != 0) return ErrnoError(part);

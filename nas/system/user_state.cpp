@@ -48,10 +48,6 @@ Status CheckFolders(const Account& account, uid_t maker) {
   if (good) {
     good = Enter(OpenFolder(folder.get(), kPreference), CheckPrivateTo, account.uid, &below);
   }
-  struct stat info;
-  if (good && fstatat(below.get(), kUserSettings, &info, AT_SYMLINK_NOFOLLOW) != 0) {
-    return ErrnoError(kUserSettings);
-  }
   return good;
 }
 
@@ -85,13 +81,16 @@ Status MakeFoldersOf(const Account& account, uid_t maker) {
   if (!folder) return folder.error();
   const Status good = CheckPrivateTo(folder->get(), account.uid);
   if (!good) return good;
-  const Result<UniqueFd> tasks = OpenOrMakeFolder(folder->get(), kTasks, kPrivateMode);
-  if (!tasks) return tasks.error();
   const Result<UniqueFd> preference = OpenOrMakeFolder(folder->get(), kPreference, kPrivateMode);
   if (!preference) return preference.error();
-  const Status made = CreateFile(preference->get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR);
-  if (!made && made.error().error_number != EEXIST) return made.error();
-  return {};
+  // The folder of tasks comes last: as long as it is missing this is the user's first call.
+  // Settings that are gone later are the user's to miss.
+  if (!OpenFolder(folder->get(), kTasks)) {
+    const Status made = CreateFile(preference->get(), kUserSettings, "{}\n", S_IRUSR | S_IWUSR);
+    if (!made && made.error().error_number != EEXIST) return made.error();
+  }
+  const Result<UniqueFd> tasks = OpenOrMakeFolder(folder->get(), kTasks, kPrivateMode);
+  return tasks ? Status() : tasks.error();
 }
 
 }  // namespace

@@ -47,6 +47,16 @@ TEST(History, Get) {
        "",
        {kAdvanced, "FileDB.IsGood()", "FileDB.Select(-2,3)", "~FileDB",
         R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
+      {"what is no number counts nothing, and what is no text names no other history",
+       R"({"offset":"x","limit":[1],"search_type":{}})",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Select(0,0)", "~FileDB",
+        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
+      {"counts beyond all",
+       R"({"offset":1e10,"limit":-99999999999})",
+       "",
+       {kSimple, "FileDB.IsGood()", "FileDB.Select(2147483647,-2147483648)", "~FileDB",
+        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
       {"an unusable store is empty",
        "{}",
        "FileDB.IsGood",
@@ -72,6 +82,7 @@ TEST(History, Set) {
         R"(FileDB.Insert({"folder_path":["/a"],"pattern":"5","recursive":"yes"}))", "~FileDB",
         "reply 0 null"}},
       {"no pattern: the store is not opened", R"({"folder_path":"/a"})", "", {"reply 401 null"}},
+      {"nor for one that is no text", R"({"pattern":{"a":1}})", "", {"reply 401 null"}},
       {"store",
        R"({"pattern":"x","search_type":"advance"})",
        "FileDB.IsGood",
@@ -121,7 +132,7 @@ TEST(Recording, WritesTheCriteriaUnderTheRequestsPattern) {
         "~FileDB"}},
       {"no pattern", "{}", "", opened},
       {"unusable store: not a word", R"({"pattern":"p"})", "FileDB.IsGood", opened},
-      {"a kind that is none", R"({"pattern":"p","search_type":{}})", "", {}},
+      {"a pattern that is no text", R"({"pattern":["p"],"search_type":{}})", "", opened},
   };
   for (const Row& row : rows) {
     Script play;

@@ -60,7 +60,19 @@ TEST_F(RunnerTest, TheRequestIsWhatTheClientSent) {
   for (const Json::Value& none : {Json::Value(), Json::Value("a"), Json::Value(Json::arrayValue)}) {
     EXPECT_EQ(Run(Echo, none), head + "\"fallback\",\"b\":\"fallback\",\"has\":false" + tail);
   }
-  EXPECT_EQ(ReadFile(nas::PreferenceFolder(Me()) + "/usersettings"), "{}\n");
+}
+
+TEST_F(RunnerTest, SettingsAreMadeByAUsersFirstCallAlone) {
+  const std::string settings = nas::PreferenceFolder(Me()) + "/usersettings";
+  Run(Echo);
+  EXPECT_EQ(ReadFile(settings), "{}\n");
+  EXPECT_EQ(ModeOf(settings), 0600U);
+  ASSERT_EQ(unlink(settings.c_str()), 0);
+  Run(Echo);
+  EXPECT_EQ(ReadFile(settings), "(none)");
+  std::filesystem::remove_all(nas::TaskFolder(Me()));  // as a first call that was cut short
+  Run(Echo);
+  EXPECT_EQ(ReadFile(settings), "{}\n");
 }
 
 void ForkWorker(APIResponse* response, void (*work)(APIResponse*)) {

@@ -1,0 +1,107 @@
+// What must survive a power cut: that everything is brought to the disk before a call returns, the
+// folders that hold the names last. Whether the disk keeps its word is not ours.
+
+#include <fcntl.h>
+#include <limits.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <functional>
+
+#include "nas/base/file_io.h"
+#include "nas/base/paths.h"
+#include "nas/system/user_state.h"
+#include "platform/filedb.h"
+#include "platform/json_file.h"
+#include "tests/nas/fixture.h"
+
+namespace nas_test {
+namespace {
+
+using NUVA::WEBFM::FileDB;
+
+// The names, in order, of what this process brought to the disk.
+std::vector<std::string> g_synced;
+
+void NoteSync(int fd) {
+  char path[PATH_MAX];
+  const std::string link = "/proc/self/fd/" + std::to_string(fd);
+  const ssize_t length = readlink(link.c_str(), path, sizeof path);
+  if (length > 0) g_synced.emplace_back(path, static_cast<size_t>(length));
+}
+
+class DurableTest : public PlatformTest {};
+
+Json::Value Record(const char* pattern) {
+  Json::Value record;
+  record["pattern"] = pattern;
+  return record;
+}
+
+TEST_F(DurableTest, WhatIsAnsweredForHasReachedTheDisk) {
+  const std::string history = dir_ + "/history.db";
+  const std::string settings = dir_ + "/usersettings";
+  const struct {
+    const char* why;
+    std::function<bool()> write;
+    std::string file;
+  } rows[] = {
+      {"a new history", [&] { return FileDB(history).Insert(Record("a")); }, history},
+      {"another record", [&] { return FileDB(history).Insert(Record("b")); }, history},
+      {"no records", [&] { return FileDB(history).Delete({}); }, history},
+      {"new settings", [&] { return Json::toFile(settings, Json::Value(1)); }, ""},
+      {"settings replaced", [&] { return Json::toFile(settings, Json::Value(2)); }, ""},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.why);
+    g_synced.clear();
+    ASSERT_TRUE(row.write());
+    ASSERT_FALSE(g_synced.empty());
+    EXPECT_EQ(g_synced.back(), dir_);
+    // Of what is replaced, a file of another name was synced before it took this one.
+    const bool known = std::any_of(g_synced.begin(), g_synced.end(), [&](const std::string& name) {
+      return row.file.empty() ? name.find(nas::kTemporaryPrefix) != std::string::npos
+                              : name == row.file;
+    });
+    EXPECT_TRUE(known) << "the file itself was not synced";
+  }
+}
+
+TEST_F(DurableTest, SoHaveTheFoldersItStandsIn) {
+  ASSERT_TRUE(nas::EnterUserState(Me()));
+  const std::string preference = nas::PreferenceFolder(Me());
+  for (std::string folder = preference; folder.size() >= dir_.size();
+       folder.resize(folder.rfind('/'))) {
+    EXPECT_NE(std::find(g_synced.begin(), g_synced.end(), folder), g_synced.end()) << folder;
+  }
+}
+
+// A replacement that fails leaves what was there, and nothing beside it.
+TEST_F(DurableTest, AFailedReplacementLeavesNothing) {
+  const std::string folder = MakeFolder("in");
+  MakeFolder("in/taken");
+  const auto replace = [&](const char* name) {
+    return nas::ReplaceFile(AT_FDCWD, folder + "/" + name, "x", 0600, /*durable=*/true);
+  };
+  EXPECT_EQ(replace("taken").error().error_number, EISDIR);
+  EXPECT_EQ(nas::CreateFile(AT_FDCWD, folder + "/taken", "x", 0600).error().error_number, EEXIST);
+  EXPECT_EQ(nas::NamesIn(AT_FDCWD, folder).value_or({}), std::vector<std::string>{"taken"});
+}
+
+}  // namespace
+}  // namespace nas_test
+
+// Found before the C library's own by every library that this process loads.
+extern "C" {
+int fsync(int fd) {
+  nas_test::NoteSync(fd);
+  return static_cast<int>(syscall(SYS_fsync, fd));
+}
+
+int fdatasync(int fd) {
+  nas_test::NoteSync(fd);
+  return static_cast<int>(syscall(SYS_fdatasync, fd));
+}
+}
