@@ -147,6 +147,16 @@ TEST_F(RunnerTest, ACallKnowsNothingOfItsCallersFailures) {
   EXPECT_EQ(reply, R"({"code":401,"data":0})");
 }
 
+// What the module makes while it serves a call is its user's alone.
+TEST_F(RunnerTest, TheFileManagersUmaskClosesFiles) {
+  umask(0);
+  EXPECT_EQ(WfmLibUmask(), 0U);
+  WriteFile(dir_ + "/made", "");
+  EXPECT_EQ(ModeOf(dir_ + "/made"), 0600U);
+  WfmLibRestoreUmask(027);
+  EXPECT_EQ(umask(022), 027U);
+}
+
 TEST_F(RunnerTest, AReplyOfManyMegabytesComesWhole) {
   constexpr size_t kBytes = 12 << 20;
   const std::string reply =
