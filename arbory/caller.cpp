@@ -64,7 +64,7 @@ nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
 nas::Child Caller::Begin(const NUVA::APIMethod& row, const std::string& method,
                          const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
-  return nas::StartCall(row, {method, params, user_, "terminal"}, encode);
+  return nas::StartCall(row, {method, params, user_, "terminal", leased_}, encode);
 }
 
 }  // namespace arbory

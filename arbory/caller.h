@@ -38,6 +38,9 @@ class Caller {
   // std::runtime_error.
   void BecomeUser() const;
 
+  // Searches begun from here on end when this program is gone (nas::ApiCall::leased).
+  void LeaseSearches() { leased_ = true; }
+
   // Makes one call as this user; see nas::RunCall.
   nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
                   const nas::ReplyEncoder& encode) const;
@@ -48,6 +51,7 @@ class Caller {
  private:
   nas::Config config_;
   std::string user_;
+  bool leased_ = false;
   std::unique_ptr<nas::Module> module_;
 };
 

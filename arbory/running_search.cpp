@@ -62,6 +62,11 @@ RunningSearch ReadSearch(const std::string& user, const std::string& task_id) {
   return search;
 }
 
+nas::UniqueFd AskAfter(const std::string& user, const std::string& task_id) {
+  const auto tasks = nas::TaskFiles::Open(user.c_str());
+  return tasks ? tasks->Ask(task_id) : nas::UniqueFd();
+}
+
 std::vector<std::string> UnfinishedSearches(const std::string& user) {
   std::vector<std::string> unfinished;
   const auto tasks = nas::TaskFiles::Open(user.c_str());

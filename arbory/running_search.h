@@ -9,6 +9,8 @@
 #include <string>
 #include <vector>
 
+#include "nas/base/unique_fd.h"
+
 namespace arbory {
 
 // Values of a wrong type read as absent ones: a record is no better than its last writer.
@@ -34,6 +36,10 @@ struct RunningSearch {
 
 // Throws nothing: a record that cannot be read is that of a search that does not exist.
 RunningSearch ReadSearch(const std::string& user, const std::string& task_id);
+
+// Tells the search that its results are wanted, for as long as the descriptor is open. Invalid
+// where that cannot be had: then only looking at it does.
+nas::UniqueFd AskAfter(const std::string& user, const std::string& task_id);
 
 // The ids of the user's searches that have not finished; none where they cannot be looked up.
 std::vector<std::string> UnfinishedSearches(const std::string& user);

@@ -1,5 +1,6 @@
 // The search itself runs in a worker process that outlives every call, so whatever happens here,
-// the worker is stopped and what it stored removed before the program ends.
+// the worker is stopped and what it stored removed before the program ends. A program that is
+// killed can do neither: its search has a lease, and ends by itself.
 
 #include "arbory/search_command.h"
 
@@ -81,6 +82,7 @@ class Search {
     const nas::Reply reply = Call("start", params, encode);
     if (reply.head.code == 0) {
       task_id_ = reply.body;
+      asking_ = AskAfter(caller_.user(), task_id_);
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
@@ -215,6 +217,7 @@ class Search {
   RowFormat format_;
   ProgressLine progress_;
   std::string task_id_;
+  nas::UniqueFd asking_;  // by it the search knows that this program lives
   nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
   std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows
@@ -233,6 +236,7 @@ int RunSearchCommand(const SearchOptions& options) {
   // From here on the program follows what the user's own processes write.
   caller.module();
   caller.BecomeUser();
+  caller.LeaseSearches();
   return Search(&caller, options).Run(params);
 }
 

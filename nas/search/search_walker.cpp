@@ -108,6 +108,7 @@ class WfmSearchWalker::Impl {
   void Report(const nas::WalkProgress& progress, bool last);
   void WaitForSorting(pid_t child) const;
   [[noreturn]] void EndWorker();
+  void Vanish();
 
   const std::string user_;
   OKT::Task* const task_;
@@ -122,6 +123,7 @@ class WfmSearchWalker::Impl {
   bool walked_ = false;
   bool current_only_ = false;
   bool told_ready_ = false;
+  bool forsaken_ = false;
   Clock::time_point reported_;
 };
 
@@ -187,6 +189,10 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
   nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },
                               .stuck = [this] { EndWorker(); }});
   const bool completed = job.Run(walk, contents);
+  if (forsaken_) {
+    Vanish();
+    return false;
+  }
   writer_->Complete();
   Report(search.progress, true);
   if (writer_->rows() >= kWorthSorting) {
@@ -217,6 +223,7 @@ void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
 // A thread cannot be ended, but a process can: this is how a stopped search's worker ends, only
 // without waiting for the walk to return.
 void WfmSearchWalker::Impl::EndWorker() {
+  if (forsaken_) Vanish();
   task_->finish(false);
   _exit(0);
 }
@@ -231,6 +238,18 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   // A task that was removed meanwhile has nobody left to tell.
   task_->endUpdate();
   told_ready_ = true;
+  // Ends the way a search does that is told to stop.
+  if (!last && !forsaken_ && task_->isForsaken()) {
+    forsaken_ = true;
+    raise(SIGTERM);
+  }
+}
+
+// What nobody asks after leaves nothing. The database goes first, as when it is cleaned.
+void WfmSearchWalker::Impl::Vanish() {
+  writer_.reset();
+  nas::RemoveResultFile(nas::ResultPath(folder_, id_));
+  task_->remove();
 }
 
 WfmSearchWalker::WfmSearchWalker(const char* user, const char* /*session*/, OKT::Task* task,

@@ -45,6 +45,9 @@ struct Config {
   // A user's searches at once: enough for several open windows, and a bound on what one user can
   // take from the machine.
   int searches_per_user = 8;
+  // How long a search goes on whose asker is gone without a word, for those made with a lease. A
+  // browser looks after a hidden page once a minute.
+  int lease_seconds = 150;
   ServerSettings server;
 };
 

@@ -82,6 +82,7 @@ class Reader {
         {"shares", [&](const toml::node& node) { config->shares = Shares(node); }},
         {"searches_per_user",
          [&](const toml::node& node) { config->searches_per_user = Limit(node); }},
+        {"lease_seconds", [&](const toml::node& node) { config->lease_seconds = Limit(node); }},
         {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
     };
     ReadTable(document, keys);

@@ -2,10 +2,13 @@
 
 #include <map>
 #include <mutex>
+#include <optional>
 #include <stdexcept>
 
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"
+#include "nas/system/config.h"
+#include "nas/system/lease.h"
 #include "nas/tasks/task_files.h"
 
 namespace OKT {
@@ -29,11 +32,13 @@ class Task::Record {
       auto task = OrThrow(files_.Create());
       id_ = std::move(task.id);
       life_ = std::move(task.life);
+      if (nas::NewTasksAreLeased()) lease_.emplace(nas::CurrentConfig().lease_seconds);
       return;
     }
     if (!nas::IsRandomName(id)) throw std::runtime_error("not a task id");
     id_ = id;
     if (!Read()) throw std::runtime_error("no such task: " + id_);
+    files_.Touch(id_);
   }
 
   const std::string& id() const { return id_; }
@@ -70,6 +75,7 @@ class Task::Record {
 
   bool finished() const { return finished_ || abandoned_; }
   bool abandoned() const { return abandoned_; }
+  bool LeaseIsOver() { return lease_ && lease_->IsOver(life_.get()); }
   bool Remove() { return files_.Remove(id_).ok(); }
 
   mutable std::mutex mutex;
@@ -84,6 +90,7 @@ class Task::Record {
 
   const nas::TaskFiles files_;
   nas::UniqueFd life_;  // inherited by forks; the task lives while one of them has it open
+  std::optional<nas::LeaseWatch> lease_;
   std::string id_;
   Json::Value properties_{Json::objectValue};
   // Neither is taken back, as neither a mark nor a death is.
@@ -137,6 +144,11 @@ bool Task::isFinished() const {
 bool Task::isAbandoned() const {
   const std::lock_guard guard(record_->mutex);
   return record_->abandoned();
+}
+
+bool Task::isForsaken() {
+  const std::lock_guard guard(record_->mutex);
+  return record_->LeaseIsOver();
 }
 
 bool Task::remove() {

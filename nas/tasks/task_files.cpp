@@ -21,6 +21,7 @@ namespace {
 
 constexpr off_t kLifeByte = 0;
 constexpr off_t kWriteByte = 1;
+constexpr off_t kAskerByte = 2;
 constexpr off_t kFolderByte = 0;
 constexpr char kFolderLock[] = "lock";
 constexpr std::string_view kRecordSuffix = ".json";
@@ -161,6 +162,31 @@ Status TaskFiles::Store(const std::string& id, const TaskState& state) const {
   const Status stored = replace();
   const bool full = !stored && stored.error().kind == kErrorNoSpace;
   return full && FreeReserve(id) ? replace() : stored;
+}
+
+void TaskFiles::Touch(const std::string& id) const {
+  // Where it cannot be set the task's own end comes sooner, which is no failure of the asker's.
+  (void)utimensat(folder_.get(), LockName(id).c_str(), nullptr, AT_SYMLINK_NOFOLLOW);
+}
+
+// Several may ask: the lock is a shared one.
+UniqueFd TaskFiles::Ask(const std::string& id) const {
+  UniqueFd fd = OpenLock(id, 0);
+  struct flock lock = WriteLockOn(kAskerByte);
+  lock.l_type = F_RDLCK;
+  if (fd && fcntl(fd.get(), F_OFD_SETLK, &lock) != 0) fd.Reset();
+  return fd;
+}
+
+bool LeaseWatch::IsOver(int lock_fd) {
+  const auto now = std::chrono::steady_clock::now();
+  struct flock lock = WriteLockOn(kAskerByte);
+  struct stat info;
+  if (fstat(lock_fd, &info) != 0 || fcntl(lock_fd, F_OFD_GETLK, &lock) != 0) return false;
+  const Stamp stamp = {info.st_ctim.tv_sec, info.st_ctim.tv_nsec};
+  if (stamp != seen_ || lock.l_type != F_UNLCK) asked_ = now;
+  seen_ = stamp;
+  return now - asked_ > std::chrono::seconds(seconds_);
 }
 
 bool TaskFiles::FreeReserve(const std::string& id) const {

@@ -9,6 +9,9 @@
 //             byte 0, life: held by the process that made the task and by what it forked, as they
 //                     share one open file description. Nobody holds it: nobody works on the task.
 //             byte 1, write: held for each read-merge-write of ID.json
+//             byte 2, asker: held by a program for as long as it wants the task's results
+//             and its time: set by whoever opens the task, so that a task with a lease can tell
+//             when nobody does any more
 //   lock      byte 0 is held while tasks are counted and one is made
 //
 // Who wins: the last writer of a property, property by property; the finished mark and the removal
@@ -20,6 +23,8 @@
 
 #include <json/value.h>
 
+#include <chrono>
+#include <cstdint>
 #include <ctime>
 #include <string>
 #include <vector>
@@ -65,6 +70,12 @@ class TaskFiles {
   // To be called with the write lock held. After a failure the old record is whole. EFBIG beyond
   // what Load takes; where the disk is full, the task's reserve of space is used up first.
   Status Store(const std::string& id, const TaskState& state) const;
+  // Says that somebody asks after the task: once, or for as long as the descriptor is open, which
+  // is invalid where that cannot be had. A program that is stopped, or waits for its reader, still
+  // asks.
+  void Touch(const std::string& id) const;
+  UniqueFd Ask(const std::string& id) const;
+
   // Takes the write lock itself. ENOENT when there was no task.
   Status Remove(const std::string& id) const;
 
@@ -77,6 +88,25 @@ class TaskFiles {
   bool IsUntouched(const std::string& name, time_t now) const;
 
   UniqueFd folder_;
+};
+
+// Tells a leased task's worker when the lease is over. Goes by changes alone, not by what the clock
+// of the day says of them.
+class LeaseWatch {
+ public:
+  explicit LeaseWatch(int seconds) : seconds_(seconds) {}
+  // `lock_fd` is the task's lock file. To be asked a few times in a lease.
+  bool IsOver(int lock_fd);
+
+ private:
+  struct Stamp {
+    std::int64_t seconds = 0;
+    std::int64_t nanoseconds = 0;
+    bool operator==(const Stamp&) const = default;
+  };
+  const int seconds_;
+  Stamp seen_;
+  std::chrono::steady_clock::time_point asked_ = std::chrono::steady_clock::now();
 };
 
 // A lock is held for the time of one small write; a holder that is stopped must not stop others.

@@ -7,6 +7,7 @@
 #include <optional>
 
 #include "nas/base/error.h"
+#include "nas/system/lease.h"
 #include "nas/system/user_state.h"
 #include "platform/webfm.h"
 
@@ -57,6 +58,7 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   // What failed before is not this call's, whose failures may have no number of their own.
   SetLastError(kErrorNone);
   errno = 0;
+  if (call.leased) LeaseNewTasks();
   Request request(row, call);
   Response response(encode);
   try {

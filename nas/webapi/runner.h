@@ -35,6 +35,9 @@ struct ApiCall {
   Json::Value params;  // an object, or null for none
   std::string user;
   std::string session;
+  // A search that the call begins ends when nobody has asked after it for Config::lease_seconds,
+  // and its results go with it.
+  bool leased = false;
 };
 
 // Turns the entry function's reply into what is sent. Runs in the request child, so that a caller

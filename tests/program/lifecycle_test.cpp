@@ -327,6 +327,22 @@ TEST_F(Lifecycle, AnInterruptedProgramCleansUp) {
   }
 }
 
+// Killed, the program can clean nothing up; its search notices. As long as it lives, even stopped
+// as by Ctrl-Z or while its reader takes nothing, its search goes on.
+TEST_F(Lifecycle, ASearchWhoseProgramWasKilledEndsAndLeavesNothing) {
+  const std::string config = dir_ + "/as-" + nas_test::Me() + "/arbory.toml";
+  WriteFile(config, "lease_seconds = 1\n" + nas_test::ReadFile(config));
+  MakeEndlessFile(share_ + "/endless.log");
+  const pid_t program = Launch({"search", "one", "--content"});
+  const pid_t worker = Worker(OneThatWalks(nas_test::Me()));
+  kill(program, SIGSTOP);
+  usleep(2'500'000);  // more than twice the lease
+  EXPECT_TRUE(Lives(worker));
+  kill(program, SIGKILL);
+  EXPECT_EQ(Finish(program).exit_code, -SIGKILL);
+  EXPECT_TRUE(Eventually([&] { return !Lives(worker) && Remains().empty(); }));
+}
+
 // Root's program for a user follows records that the user can write, and looks where they point: it
 // must not see more there than the user, nor with root's groups.
 TEST_F(Lifecycle, RootsProgramForAUserIsTheUser) {

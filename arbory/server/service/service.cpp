@@ -176,7 +176,8 @@ Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
   Answer answer = calls_.Run(request.user, std::string(row->api) + "/" + row->method, [&] {
     // The id is the key to the account, which no log line of the module needs to hold whole.
     constexpr size_t kShown = 8;
-    return nas::StartCall(*row, {path[3], *params, request.user, session.substr(0, kShown)},
+    const bool leased = request.Field("arbory-lease") != nullptr;
+    return nas::StartCall(*row, {path[3], *params, request.user, session.substr(0, kShown), leased},
                           nas::EncodeJsonReply);
   });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
