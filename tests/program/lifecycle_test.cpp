@@ -232,6 +232,20 @@ TEST_F(Lifecycle, FilesThatVanishedLeaveTheListing) {
   EXPECT_EQ(ListToEnd(id).data["total"], 20);
 }
 
+// A file that merely cannot be reached for a while, here behind a loop of links, is listed again
+// once it can.
+TEST_F(Lifecycle, FilesOutOfReachStayInTheResults) {
+  const std::string folder = MakeFolder("volume1/share/away");
+  WriteFile(folder + "/distant.dat", "x");
+  const std::string id = StartQuick("distant");
+  fs::rename(folder, share_ + "/elsewhere");
+  fs::create_symlink("away", folder);
+  Call("list", Id(id));
+  fs::remove(folder);
+  fs::rename(share_ + "/elsewhere", folder);
+  EXPECT_EQ(ListToEnd(id).data["total"], 1);
+}
+
 TEST_F(Lifecycle, HistoryIsWrittenByBothRoads) {
   const auto patterns = [&](const char* kind) {
     Json::Value params;
