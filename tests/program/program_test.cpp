@@ -49,8 +49,9 @@ Reply MakeCall(const std::string& api, int version, const std::string& method,
                const Json::Value& params, const std::string& user) {
   const NUVA::APIMethod* row = LoadedModule().Find(api, version, method);
   if (row == nullptr) return {};
-  const std::string text =
-      nas::RunCall(*row, {method, params, user, "test"}, nas::EncodeJsonReply).body;
+  // With a lease, so that a test run that is killed leaves no search behind.
+  const nas::ApiCall call = {method, params, user, "test", /*leased=*/true};
+  const std::string text = nas::RunCall(*row, call, nas::EncodeJsonReply).body;
   const Json::Value reply = Json_(text);
   return {reply["code"].asInt(), reply["data"]};
 }

@@ -224,6 +224,38 @@ TEST_F(CallTest, TermEndsItWithAllThatItStarted) {
   for (const pid_t worker : workers) EXPECT_FALSE(IsRunning(worker));
 }
 
+TEST_F(CallTest, ASearchWithALeaseEndsWhenNobodyAsksAfterIt) {
+  const std::string endless = share_ + "/endless.log";
+  WriteFile(endless, std::string(size_t{1} << 18, 'a'));
+  ASSERT_EQ(truncate(endless.c_str(), off_t{1} << 42), 0);
+  Server server = Start("", "lease_seconds = 2\n");
+  server.Open();
+  const auto start = [&](const std::string& fields) {
+    const Reply reply = server.Ask(
+        "POST", "/api/NUVA.Arbory.Search/2/start",
+        R"({"folder_path":["/photo"],"pattern":"b","search_content":true})", kJson + fields);
+    EXPECT_EQ(reply.code(), 0);
+    return "/searches/" + reply.json()["data"]["taskid"].asString();
+  };
+  const std::string without = start("");
+  const std::string with = start("Arbory-Lease: 1\r\n");
+  const std::string asked = start("Arbory-Lease: 1\r\n");
+  for (int look = 0; look < 50; ++look) {  // for more than twice the lease
+    ASSERT_EQ(server.Get(asked).json()["finished"], false);
+    std::this_thread::sleep_for(milliseconds(100));
+  }
+  const std::string tasks = state_ + "/users/" + User() + "/tasks";
+  EXPECT_TRUE(Eventually([&] {
+    size_t records = 0;
+    for (const auto& entry : fs::directory_iterator(tasks)) {
+      records += entry.path().extension() == ".json" ? 1 : 0;
+    }
+    return records == 1;
+  }));
+  for (const std::string& gone : {with, asked}) EXPECT_EQ(server.Get(gone).status, 404);
+  EXPECT_EQ(server.Get(without).json()["finished"], false) << "nobody asked after it either";
+}
+
 TEST_F(CallTest, StoppingLeavesSearchesWhole) {
   // Contents that take a while: an expression that fails late, at many places of every line.
   const std::string line = "c" + std::string(200, 'a');
