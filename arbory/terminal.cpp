@@ -6,6 +6,7 @@
 #include <cerrno>
 
 #include "arbory/interrupt.h"
+#include "nas/base/hex.h"
 #include "nas/base/utf8.h"
 
 namespace arbory {
@@ -32,9 +33,6 @@ bool IsTrick(std::string_view sequence) {
 }  // namespace
 
 void AppendEscaped(std::string_view text, std::string* out) {
-  constexpr char kDigits[] = "0123456789ABCDEF";
-  constexpr unsigned kDigitBits = 4;
-  constexpr unsigned kDigitMask = 15;
   while (!text.empty()) {
     const nas::Utf8Step step = nas::NextUtf8(text);
     const std::string_view sequence = text.substr(0, step.length);
@@ -47,8 +45,7 @@ void AppendEscaped(std::string_view text, std::string* out) {
     }
     for (const unsigned char byte : sequence) {
       *out += "\\x";
-      *out += kDigits[byte >> kDigitBits];
-      *out += kDigits[byte & kDigitMask];
+      nas::AppendHex(byte, nas::kUpperHex, out);
     }
   }
 }

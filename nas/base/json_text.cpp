@@ -7,6 +7,7 @@
 #include <cmath>
 #include <memory>
 
+#include "nas/base/hex.h"
 #include "nas/base/utf8.h"
 
 namespace nas {
@@ -39,12 +40,9 @@ void AppendEscaped(unsigned char byte, std::string* out) {
     case '\t':
       *out += "\\t";
       return;
-    default: {
-      constexpr char kDigits[] = "0123456789abcdef";
+    default:
       *out += "\\u00";
-      *out += kDigits[byte >> 4];
-      *out += kDigits[byte & 0xF];
-    }
+      AppendHex(byte, kLowerHex, out);
   }
 }
 

@@ -4,13 +4,12 @@
 
 #include <stdexcept>
 
+#include "nas/base/hex.h"
+
 namespace nas {
 namespace {
 
 constexpr size_t kRandomBytes = 16;  // 128 bits: no two meet, and nobody guesses one
-constexpr std::string_view kDigits = "0123456789abcdef";
-constexpr unsigned kBitsPerDigit = 4;
-constexpr unsigned kDigitMask = 0xF;
 
 }  // namespace
 
@@ -20,16 +19,13 @@ std::string RandomName() {
     throw std::runtime_error("no random bytes from the system");
   }
   std::string name;
-  for (const unsigned char byte : random) {
-    name += kDigits[byte >> kBitsPerDigit];
-    name += kDigits[byte & kDigitMask];
-  }
+  for (const unsigned char byte : random) AppendHex(byte, kLowerHex, &name);
   return name;
 }
 
 bool IsRandomName(std::string_view name) {
   return name.size() == 2 * kRandomBytes &&
-         name.find_first_not_of(kDigits) == std::string_view::npos;
+         name.find_first_not_of(kLowerHex) == std::string_view::npos;
 }
 
 }  // namespace nas

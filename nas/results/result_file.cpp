@@ -10,6 +10,7 @@
 #include <ctime>
 #include <utility>
 
+#include "nas/base/keeping.h"
 #include "nas/base/paths.h"
 #include "nas/base/random_name.h"
 
@@ -20,7 +21,6 @@ constexpr std::string_view kSuffix = ".db";
 constexpr char kLogSuffix[] = "-wal";
 // The journal is what a file has until it gets its log.
 constexpr std::array<const char*, 4> kCompanions = {"", kLogSuffix, "-shm", "-journal"};
-constexpr time_t kKeepSeconds = 24 * 60 * 60;
 
 // When the result file or its log was last written; 0 when neither is there.
 time_t LastWritten(const std::string& path) {

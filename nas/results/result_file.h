@@ -71,7 +71,7 @@ bool IsResultId(std::string_view id);
 std::string ResultPath(const std::string& folder, const std::string& id);
 // Deletes the file and its companions; true if the file itself was there and is gone.
 bool RemoveResultFile(const std::string& path);
-// Deletes result files in `folder` that nobody wrote for 24 hours.
+// Deletes result files in `folder` that nobody wrote for kKeepSeconds.
 void SweepResultFolder(const std::string& folder);
 
 }  // namespace nas

@@ -10,6 +10,7 @@
 #include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/base/keeping.h"
 #include "nas/base/paths.h"
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"

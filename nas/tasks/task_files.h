@@ -111,7 +111,5 @@ class LeaseWatch {
 
 // A lock is held for the time of one small write; a holder that is stopped must not stop others.
 inline constexpr int kLockTenths = 50;
-// Tasks of clients that never cleaned up go after this long.
-inline constexpr long kKeepSeconds = 24L * 60 * 60;
 
 }  // namespace nas

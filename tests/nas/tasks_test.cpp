@@ -14,6 +14,7 @@
 #include <thread>
 
 #include "nas/base/file_io.h"
+#include "nas/base/keeping.h"
 #include "nas/base/random_name.h"
 #include "nas/system/user_state.h"
 #include "nas/tasks/task_files.h"

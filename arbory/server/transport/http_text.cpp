@@ -2,28 +2,19 @@
 
 #include <algorithm>
 
+#include "nas/base/hex.h"
 #include "nas/base/json_text.h"
 #include "nas/base/utf8.h"
 
 namespace arbory {
 namespace {
 
-constexpr char kHexDigits[] = "0123456789ABCDEF";
 constexpr int kBitsPerDigit = 4;
-constexpr int kDigitMask = 0xF;
 constexpr size_t kEscapeBytes = 3;  // "%2F"
 
 bool IsUnreserved(char byte) {
   return (byte >= 'a' && byte <= 'z') || (byte >= 'A' && byte <= 'Z') ||
          (byte >= '0' && byte <= '9') || byte == '-' || byte == '.' || byte == '_' || byte == '~';
-}
-
-int HexDigit(char digit) {
-  constexpr int kTen = 10;
-  if (digit >= '0' && digit <= '9') return digit - '0';
-  if (digit >= 'a' && digit <= 'f') return digit - 'a' + kTen;
-  if (digit >= 'A' && digit <= 'F') return digit - 'A' + kTen;
-  return -1;
 }
 
 std::optional<std::string> Decoded(std::string_view text) {
@@ -34,8 +25,8 @@ std::optional<std::string> Decoded(std::string_view text) {
       text.remove_prefix(1);
       continue;
     }
-    const int high = text.size() > 1 ? HexDigit(text[1]) : -1;
-    const int low = text.size() > 2 ? HexDigit(text[2]) : -1;
+    const int high = text.size() > 1 ? nas::HexValue(text[1]) : -1;
+    const int low = text.size() > 2 ? nas::HexValue(text[2]) : -1;
     if (high < 0 || low < 0) return std::nullopt;
     out += static_cast<char>((high << kBitsPerDigit) | low);
     text.remove_prefix(kEscapeBytes);
@@ -83,8 +74,8 @@ std::string PercentEncoded(std::string_view text) {
     if (IsUnreserved(byte)) {
       out += byte;
     } else {
-      const auto value = static_cast<unsigned char>(byte);
-      out += {'%', kHexDigits[value >> kBitsPerDigit], kHexDigits[value & kDigitMask]};
+      out += '%';
+      nas::AppendHex(static_cast<unsigned char>(byte), nas::kUpperHex, &out);
     }
   }
   return out;
