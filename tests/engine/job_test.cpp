@@ -220,8 +220,8 @@ TEST_F(Job, TheStopFlagEndsIt) {
   std::fstream big(tree_ + "/big");
   big << std::string(64 * 1024, 'x');
   big.close();
-  std::jthread stopper([this] {
-    while (reports_ < 2) std::this_thread::yield();
+  std::jthread stopper([this](const std::stop_token& over) {
+    while (reports_ < 2 && !over.stop_requested()) std::this_thread::yield();
     __atomic_store_n(&stop_, 1, __ATOMIC_RELAXED);
   });
   EXPECT_TRUE(Find("needle", {"/tree"}, true).empty());
@@ -235,8 +235,8 @@ TEST_F(Job, TellsOfThreadsThatDoNotStop) {
   std::string lines;
   while (lines.size() < 20'000) lines += std::string(26, 'a') + "b\n";
   Touch("bomb", lines + "c");
-  std::jthread stopper([this] {
-    while (reports_ < 4) std::this_thread::yield();
+  std::jthread stopper([this](const std::stop_token& over) {
+    while (reports_ < 4 && !over.stop_requested()) std::this_thread::yield();
     __atomic_store_n(&stop_, 1, __ATOMIC_RELAXED);
   });
   EXPECT_TRUE(Find("regex:(a|aa)+$c", {"/tree"}, true).empty());
