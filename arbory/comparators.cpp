@@ -10,6 +10,13 @@ namespace arbory {
 
 using FileSearch::FindFactory;
 
+bool AppendComparator(FindFactory::_tag_FIND_FIELD_ field, const std::string& text,
+                      std::vector<FileSearch::FindComp*>* comps) {
+  const bool is_type = field == FindFactory::FIND_FILETYPE;
+  return FindFactory::createFindOp(field, is_type ? text.c_str() : nullptr,
+                                   is_type ? nullptr : text.c_str(), *comps) != 0;
+}
+
 Comparators::Comparators(const Json::Value& params) {
   AddText(params, "pattern", FindFactory::FIND_PATTERN);
   AddText(params, "filetype", FindFactory::FIND_FILETYPE);
@@ -31,9 +38,7 @@ void Comparators::AddText(const Json::Value& params, const char* name,
                           FindFactory::_tag_FIND_FIELD_ field) {
   if (!params.isMember(name)) return;
   const std::string text = params[name].asString();
-  const bool first = field == FindFactory::FIND_FILETYPE;
-  if (FindFactory::createFindOp(field, first ? text.c_str() : nullptr,
-                                first ? nullptr : text.c_str(), comps_) == 0) {
+  if (!AppendComparator(field, text, &comps_)) {
     throw UsageError("'" + text + "' cannot be searched for");
   }
 }

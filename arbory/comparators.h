@@ -10,6 +10,11 @@
 
 namespace arbory {
 
+// Appends the engine's comparator of a criterion that is given as text; false for a text that is
+// none, which the engine also says of an owner or group that does not exist.
+bool AppendComparator(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const std::string& text,
+                      std::vector<FileSearch::FindComp*>* comps);
+
 // Owns the comparators that the module makes of the same parameters (search_request.h).
 class Comparators {
  public:

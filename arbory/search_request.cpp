@@ -1,5 +1,6 @@
 #include "arbory/search_request.h"
 
+#include "arbory/comparators.h"
 #include "arbory/locate.h"
 #include "arbory/parse.h"
 #include "nas/base/accounts.h"
@@ -20,12 +21,10 @@ void CheckGroup(const std::string& name) {
 // Asks the engine itself, so that what is refused here and there is the same.
 void CheckText(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const std::string& text,
                const char* what) {
-  const bool is_type = field == FileSearch::FindFactory::FIND_FILETYPE;
   std::vector<FileSearch::FindComp*> comps;
-  const int made = FileSearch::FindFactory::createFindOp(field, is_type ? text.c_str() : nullptr,
-                                                         is_type ? nullptr : text.c_str(), comps);
+  const bool made = AppendComparator(field, text, &comps);
   for (const FileSearch::FindComp* comp : comps) delete comp;
-  if (made == 0) throw UsageError("'" + text + "' is no " + what);
+  if (!made) throw UsageError("'" + text + "' is no " + what);
 }
 
 void SetTimes(const TimeRange& range, const std::string& name, std::time_t now,
