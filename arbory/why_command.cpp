@@ -127,6 +127,7 @@ std::string Reason(const nas::Explanation& found) {
   const Refusal refusal = found.refusal;
   const std::string words = nas::Words(refusal);
   if (found.error_number != 0) return words + " (" + std::strerror(found.error_number) + ")";
+  if (refusal == Refusal::kNotRecursive) return words + " (--no-recursive)";
   if (!found.attributes) return words;
   const nas::FileAttributes& file = *found.attributes;
   const bool of_size = refusal == Refusal::kTooSmall || refusal == Refusal::kTooLarge;

@@ -53,7 +53,7 @@ const char* Words(Refusal refusal) {
     case Refusal::kOtherLocation:
       return "is one of the folders to search, and is not searched a second time by this way";
     case Refusal::kNotRecursive:
-      return "is a folder in the one to search, and such are not entered (--no-recursive)";
+      return "is a folder in the one to search, and such are not entered";
     case Refusal::kSymbolicLink:
       return "is a symbolic link, which can be found but is not followed";
     case Refusal::kNoFolder:

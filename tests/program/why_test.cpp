@@ -75,7 +75,7 @@ TEST_F(Why, EachRule) {
       {{"plan.txt", "hay", "--content"}, 1, "neither by its name nor by its contents"},
       {{"binary.dat", "needle", "--content"}, 1, "is binary"},
       {{"docs", "needle", "--content"}, 1, "name that does not match"},
-      {{"docs/deep/x", "", "docs", "--no-recursive"}, 1, "/docs/deep is a folder in the one"},
+      {{"docs/deep/x", "", "docs", "--no-recursive"}, 1, "are not entered (--no-recursive)"},
       {{"docs/deep", "", "docs", "--no-recursive"}, 0, "matches"},
       {{outside, "", dir_ + "/volume1"}, 1, "/volume1/@tmp is the temporary folder of a volume"},
       {{"plan.txt", "", "docs"}, 1, "in none of the folders"},
