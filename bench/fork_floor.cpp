@@ -22,20 +22,25 @@
 #include <cstring>
 #include <map>
 #include <string>
+#include <string_view>
 
 namespace {
 
 constexpr int kEvents = 64;
+constexpr int kBacklog = 512;  // more than any load generator opens at once
 constexpr size_t kReadBytes = 16 << 10;
 
 // The bytes of the first whole request in `text`; 0 when it is not whole yet.
 size_t WholeRequest(const std::string& text) {
-  const size_t end = text.find("\r\n\r\n");
+  constexpr char kLength[] = "\r\ncontent-length:";
+  constexpr std::string_view kEnd = "\r\n\r\n";
+  const size_t end = text.find(kEnd);
   if (end == std::string::npos) return 0;
-  const char* field = strcasestr(text.c_str(), "\r\ncontent-length:");
-  const size_t body =
-      field == nullptr || field > text.c_str() + end ? 0 : std::strtoul(field + 17, nullptr, 10);
-  const size_t whole = end + 4 + body;
+  const char* field = strcasestr(text.c_str(), kLength);
+  const size_t body = field == nullptr || field > text.c_str() + end
+                          ? 0
+                          : std::strtoul(field + sizeof kLength - 1, nullptr, 10);
+  const size_t whole = end + kEnd.size() + body;
   return text.size() >= whole ? whole : 0;
 }
 
@@ -48,7 +53,7 @@ int Listen(int port) {
   address.sin_port = htons(static_cast<uint16_t>(port));
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
   if (bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0 ||
-      listen(fd, 512) != 0) {
+      listen(fd, kBacklog) != 0) {
     perror("listen");
     exit(1);
   }

@@ -5,6 +5,7 @@
 
 #include <random>
 #include <string>
+#include <string_view>
 
 #include "nas/match/literal_finder.h"
 #include "nas/match/name_pattern.h"
@@ -29,9 +30,11 @@ BENCHMARK_CAPTURE(MatchName, glob_miss, "*.conf", "holiday_photo-123456.jpg");
 BENCHMARK_CAPTURE(MatchName, regex_miss, "regex:^img_\\d+$", "holiday_photo-123456.jpg");
 
 void FindLiteral(benchmark::State& state) {
+  constexpr std::string_view kLetters = " etaoinsrh\n";  // the usual ones of a text
+  constexpr size_t kBufferBytes = 256 * 1024;            // stays in the processor's cache
   std::mt19937 random(1);
   std::string buffer;
-  while (buffer.size() < 256 * 1024) buffer.push_back(" etaoinsrh\n"[random() % 11]);
+  while (buffer.size() < kBufferBytes) buffer.push_back(kLetters[random() % kLetters.size()]);
   const nas::LiteralFinder finder("spinlock_irqsave");
   for (auto _ : state) benchmark::DoNotOptimize(finder.Finds(buffer));
   state.SetBytesProcessed(static_cast<std::int64_t>(state.iterations() * buffer.size()));
@@ -39,11 +42,12 @@ void FindLiteral(benchmark::State& state) {
 BENCHMARK(FindLiteral);
 
 constexpr int kRows = 1'000'000;
+constexpr std::uint64_t kMostBytes = 4'000'000'000;  // sizes of films and below
 
 void OrderNumbers(benchmark::State& state) {
   std::mt19937_64 random(1);
   std::vector<std::uint64_t> keys(kRows);
-  for (auto& key : keys) key = random() % 4'000'000'000;
+  for (auto& key : keys) key = random() % kMostBytes;
   for (auto _ : state) benchmark::DoNotOptimize(nas::OrderByNumber(keys));
 }
 BENCHMARK(OrderNumbers)->Unit(benchmark::kMillisecond);

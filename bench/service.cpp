@@ -26,6 +26,7 @@
 #include "nas/system/config.h"
 #include "nas/webapi/runner.h"
 #include "platform/task.h"
+#include "platform/task_record.h"
 
 namespace {
 
@@ -34,6 +35,10 @@ using Clock = std::chrono::steady_clock;
 constexpr int kRounds = 5;
 constexpr int kPageRows = 100;
 constexpr unsigned kLargePageRows = 10'000;
+// Between two looks of a client that shows how a search goes on.
+constexpr std::chrono::milliseconds kListPause(20);
+// Into a search before it is stopped: every thread is at work then.
+constexpr std::chrono::milliseconds kStopAfter(100);
 
 double Milliseconds(Clock::duration d) {
   return std::chrono::duration<double, std::milli>(d).count();
@@ -109,7 +114,7 @@ class Client {
   Json::Value Data() const {
     const std::unique_ptr<OKT::Task> task(
         OKT::TaskMgr(user_.c_str()).getTaskWithThrow(id_.c_str()));
-    return task->getProperty("data");
+    return task->getProperty(task_record::kData);
   }
 
  private:
@@ -138,7 +143,7 @@ void MeasureRunning(Client& client) {
   while (page.rows == 0 && page.finished == 0) page = client.List(0, kPageRows);
   Print("first page with rows, from start", Milliseconds(Clock::now() - begun), "ms");
 
-  const int pid = client.Data()["pid"].asInt();
+  const int pid = client.Data()[task_record::kPid].asInt();
   std::uint64_t offset = page.rows;
   double slowest = 0;
   double peak = 0;
@@ -149,7 +154,7 @@ void MeasureRunning(Client& client) {
     slowest = std::max(slowest, page.milliseconds);
     offset += page.rows;
     peak = std::max(peak, PeakMegabytes(pid));
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    std::this_thread::sleep_for(kListPause);
   }
   std::ranges::sort(pages);
   Print("search of everything, listed meanwhile", Milliseconds(Clock::now() - begun), "ms");
@@ -190,9 +195,10 @@ void MeasureSorted(Client& client) {
 
 void MeasureStop(Client& client) {
   client.Start("/tree");
-  std::this_thread::sleep_for(std::chrono::milliseconds(100));
-  pollfd worker{static_cast<int>(syscall(SYS_pidfd_open, client.Data()["pid"].asInt(), 0)), POLLIN,
-                0};
+  std::this_thread::sleep_for(kStopAfter);
+  pollfd worker{
+      static_cast<int>(syscall(SYS_pidfd_open, client.Data()[task_record::kPid].asInt(), 0)),
+      POLLIN, 0};
   const Clock::time_point begun = Clock::now();
   client.Finish("stop");
   poll(&worker, 1, -1);
