@@ -20,8 +20,8 @@ struct RunningSearch {
   int progress = 0;  // 1: complete, -1: failed with `error`, 0: running, or ended before its end
   int error = 0;     // web API code
   int pid = 0;       // of the worker, which may have ended
-  std::string
-      results;  // path of the result file, empty until there is one; nobody has looked there
+  // Path of the result file, empty until there is one. Nobody has looked there.
+  std::string results;
   Json::Value location;  // the folders, as they were normalised at the start
 
   Json::Value walk;  // as the walk reports it to clients, null until it has begun; below, its parts

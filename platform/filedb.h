@@ -2,7 +2,8 @@
 // The small keyed record store behind the search histories: one file, a few JSON records, the
 // newest first. Each object is for one operation of one process: open it, use it, destroy it. Any
 // number of processes may have the same file open; each write is one transaction, which survives a
-// power cut once it has returned.
+// power cut once it has returned. What fails is false with errno and the last error (system.h) set,
+// and leaves the store as it was; a write waits up to five seconds for another process's.
 
 #include <json/value.h>
 
@@ -52,7 +53,7 @@ class FileDB {
   bool UpdateLastByTime(const Json::Value& record, long slots);
   // Removes every record that matches; true also when none did.
   bool Delete(const Condition& condition);
-  // Appends the matching records to `out`, newest first.
+  // Appends the matching records to `out`, newest first. One that cannot be read is passed over.
   bool Select(const Condition& condition, std::vector<Json::Value>& out) const;
 
  private:

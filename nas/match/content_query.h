@@ -16,6 +16,7 @@
 
 namespace nas {
 
+// Does not change once made: any thread may ask.
 class ContentQuery {
  public:
   // The same expression over contents: every term must be found, either of its alternatives will
@@ -41,7 +42,8 @@ class ContentQuery {
   size_t overlap_ = 0;     // bytes of the longest literal, so none is cut in two
 };
 
-// Reads files for one thread.
+// Reads files for one thread. Query and flag are borrowed. Its buffer (256 KiB, more for a very
+// long text) is made once.
 class ContentScanner {
  public:
   explicit ContentScanner(const ContentQuery& query, const int& stop_flag);

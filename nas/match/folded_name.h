@@ -1,7 +1,8 @@
 #pragma once
 // File names as they are compared: NFC-normalised and fully case-folded, so that a name written by
 // a client that decomposes its letters, or in other case, is the same name. A name that is not
-// valid UTF-8 is compared byte by byte, with only its ASCII letters folded.
+// valid UTF-8 is compared byte by byte, with only its ASCII letters folded. Nothing here fails, and
+// any thread may call.
 
 #include <string>
 #include <string_view>
@@ -23,7 +24,7 @@ std::string ComposeText(std::string_view text);
 // thread, so that a walk over ASCII names allocates nothing.
 class FoldedName {
  public:
-  // `name` must outlive the use of this object for it.
+  // `name` must outlive the use of this object for it; what folded() gave of the last one ends.
   void Set(std::string_view name) {
     name_ = name;
     state_ = State::kUnknown;

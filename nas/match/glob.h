@@ -2,7 +2,8 @@
 // Shell-style wildcards over a whole text: "*" any run, "?" one character, "[a-z]" and "[!a-z]" one
 // character of a set. A "[" that no "]" closes stands for itself. Texts and pattern are expected in
 // the form in which they are compared (folded_name.h). Bytes that are not UTF-8 count as one
-// character each. Matching takes at most text length x pattern length steps, whatever the pattern.
+// character each. Every text is a pattern. Matching takes at most text length x pattern length
+// steps, whatever the pattern, and any thread may ask.
 
 #include <cstddef>
 #include <string>

@@ -2,7 +2,8 @@
 // Finds a plain ASCII text in a large buffer, ignoring the case of letters.
 //
 // Two bytes of the text, the rarest in common files, are compared with 16 places of the buffer at
-// once; only where both fit is the whole text compared.
+// once; only where both fit is the whole text compared. Does not change once made: any thread may
+// ask.
 
 #include <cstddef>
 #include <string>

@@ -2,7 +2,8 @@
 // The language of name patterns. Terms separated by spaces must all match; "a|b" is either; "!a" is
 // not; double quotes make one literal term of what they hold; "regex:" makes the rest of the
 // pattern one regular expression. A term without wildcards matches anywhere in the name; with one
-// it is a glob (glob.h) over the whole name. A pattern without terms restricts nothing.
+// it is a glob (glob.h) over the whole name. A pattern without terms restricts nothing. Patterns do
+// not change once made: any thread may ask, with a FoldedName of its own.
 
 #include <memory>
 #include <optional>

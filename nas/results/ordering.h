@@ -1,6 +1,7 @@
 #pragma once
 // Sorting many rows by one column. Rows are numbers 0..n-1; an ordering lists them ascending, equal
-// ones in the order of their numbers.
+// ones in the order of their numbers. There are fewer than 2^32. Pure functions of what they are
+// given: any thread may call.
 
 #include <cstdint>
 #include <string>
@@ -31,6 +32,7 @@ class TextKeys {
     const size_t begin = row == 0 ? 0 : ends_[row - 1];
     return std::string_view(bytes_).substr(begin, ends_[row] - begin);
   }
+  // Of all rows appended so far.
   Ordering Order() const;
 
  private:

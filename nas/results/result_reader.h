@@ -1,8 +1,10 @@
 #pragma once
 // The reading end of a result database: rows by number, orderings, selections and purging.
 //
-// A reader belongs to one process. Between Begin and End it sees one state of the file, whatever a
-// worker appends meanwhile.
+// A reader belongs to one thread of one process. Between Begin and End it sees one state of the
+// file, whatever a worker appends meanwhile. Whatever asks the file throws SqliteError where it
+// cannot be read, and std::runtime_error or std::out_of_range where it is damaged; Begin may be
+// called again after that.
 
 #include <cstdint>
 #include <map>
@@ -31,6 +33,8 @@ class ResultReader {
   // Throws SqliteError, or std::runtime_error for a file of another version.
   explicit ResultReader(const std::string& path);
 
+  // Begin throws SqliteError too where another holds the file for longer than
+  // kResultBusyMilliseconds. What lies in between is asked only between the two.
   void Begin();
   void End();
 
@@ -39,9 +43,12 @@ class ResultReader {
     std::vector<std::uint32_t> numbers;  // for Row
     std::uint64_t total = 0;
   };
+  // `limit` rows at most, from the one at `offset` on. With a column that has no kept ordering it
+  // sorts all rows, which takes some 100 bytes of memory a row.
   Page Select(const Selection& selection, std::uint64_t offset, std::uint64_t limit);
+  // Whether the row was marked when Begin looked.
   bool purged(std::uint32_t row) const { return purged_.contains(row); }
-  // How many rows there are, purged ones included.
+  // How many rows there are, purged ones included; they are numbered from 0.
   std::uint64_t rows() const { return blocks_.rows(); }
   ResultRow Row(std::uint32_t number) { return blocks_.Row(number); }
 

@@ -1,5 +1,6 @@
 #pragma once
-// A block of result rows on its way into a result database.
+// A block of result rows on its way into a result database, in the layout of result_file.h. For one
+// thread at a time.
 
 #include <cstdint>
 #include <string>
@@ -18,12 +19,15 @@ class RowBlock {
 
   // Says where the rows that follow lie: `path` below the share's root of location `location`.
   void SetFolder(std::uint16_t location, std::string_view path);
+  // Copies what it is given; the copy's `folder` is set here. Names, as paths, hold no NUL.
   void Add(std::string_view name, const FileAttributes& attributes);
 
   size_t size() const { return attributes_.size(); }
   bool full() const { return size() >= kMostRows; }
+  // Drops the rows; the folder set last holds for those that follow.
   void Clear();
 
+  // The three sides as they are stored; valid until the block changes.
   std::string_view folders() const { return folders_; }
   std::string_view names() const { return names_; }
   std::string_view attributes() const {

@@ -2,7 +2,8 @@
 // Runs one API call as the web API server does: finds the table row, forks a request child
 // (nas/system/child.h), becomes the user there, calls the row's entry function and receives one
 // reply. A search worker that the call forks lives on after the child; what it leaves in its copy
-// of the response, when it falls back into the request's path, is dropped.
+// of the response, when it falls back into the request's path, is dropped. For a process of one
+// thread, as every fork is.
 
 #include <functional>
 #include <string>
