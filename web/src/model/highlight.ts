@@ -1,7 +1,8 @@
 // Which part of a name a pattern matched. The server decides what matches; this only finds where, by
 // the same language: terms separated by spaces, "a|b", "!a", "quoted text", globs and "regex:". The
-// cases of tests/patterns.json are asked of both. What it cannot find is simply not highlighted. Takes at most name length x pattern length steps, save
-// for regular expressions, where only those are tried that cannot run away.
+// cases of tests/patterns.json are asked of both. What it cannot find is simply not highlighted.
+// Takes at most name length x pattern length steps, save for regular expressions, where only those
+// are tried that cannot run away.
 import type { Range } from './text.ts';
 
 interface Term {
