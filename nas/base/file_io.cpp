@@ -14,7 +14,8 @@
 namespace nas {
 namespace {
 
-constexpr size_t kReadBytes = size_t{64} << 10;
+// Room to look for an end that should have come: small, as what is made room for is also cleared.
+constexpr size_t kLeastRoom = 512;
 constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
 
 // The size of what may be read, or errno of why it may not.
@@ -41,7 +42,7 @@ Result<std::string> ReadToEnd(int fd, size_t max_bytes) {
     content.resize(used + static_cast<size_t>(count));
     if (count == 0) return content;
     if (content.size() > max_bytes) return ErrnoError(EFBIG);
-    room = kReadBytes;
+    room = std::max(kLeastRoom, content.size());
   }
 }
 

@@ -14,16 +14,15 @@ namespace {
 // What a pipe holds; more would never come at once.
 constexpr size_t kReadBytes = size_t{64} << 10;
 
+// One for all, as the loop has one thread and readers take what they want at once: room for each
+// call would be cleared, and given back to the system, for each call.
+char g_buffer[kReadBytes];
+
 }  // namespace
 
 ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::Child child, std::shared_ptr<void> token,
                      std::chrono::seconds patience)
-    : pipe_(loop),
-      timer_(loop),
-      pid_(child.pid),
-      token_(std::move(token)),
-      patience_(patience),
-      buffer_(kReadBytes) {
+    : pipe_(loop), timer_(loop), pid_(child.pid), token_(std::move(token)), patience_(patience) {
   pipe_.assign(child.fd.get());
   child.fd.Release();  // only now: what cannot be watched is still to be closed
   pipe_.native_non_blocking(true);
@@ -49,13 +48,13 @@ void ChildPipe::Wait() {
 
 void ChildPipe::Deliver(bool may_wait) {
   if (!reader_ || !pipe_.is_open()) return;
-  const ssize_t count = nas::Uninterrupted(
-      [this] { return read(pipe_.native_handle(), buffer_.data(), buffer_.size()); });
+  const ssize_t count =
+      nas::Uninterrupted([this] { return read(pipe_.native_handle(), g_buffer, sizeof g_buffer); });
   if (count < 0 && errno == EAGAIN && may_wait) return Wait();
   timer_.cancel();  // from here on it is the client who is waited for
   const Reader reader = std::move(reader_);
   reader_ = nullptr;
-  reader(std::string_view(buffer_.data(), count > 0 ? static_cast<size_t>(count) : 0));
+  reader(std::string_view(g_buffer, count > 0 ? static_cast<size_t>(count) : 0));
 }
 
 void ChildPipe::Watch() {

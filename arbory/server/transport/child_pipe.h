@@ -11,7 +11,6 @@
 #include <functional>
 #include <memory>
 #include <string_view>
-#include <vector>
 
 #include "arbory/server/transport/http.h"
 
@@ -24,7 +23,7 @@ class ChildPipe : public std::enable_shared_from_this<ChildPipe> {
             std::chrono::seconds patience);
 
   using Reader = std::function<void(std::string_view bytes)>;
-  // Calls `reader`, not from within, with bytes that stay valid until the next call, or without
+  // Calls `reader`, not from within, with bytes that are valid until it returns, or without
   // any when no more will come. One at a time.
   void Read(Reader reader);
   // Nobody wants the rest: the child finds its pipe closed when it writes.
@@ -45,7 +44,6 @@ class ChildPipe : public std::enable_shared_from_this<ChildPipe> {
   bool exited_ = false;
   std::shared_ptr<void> token_;
   std::chrono::seconds patience_;
-  std::vector<char> buffer_;
   Reader reader_;
 };
 
