@@ -1,6 +1,8 @@
 #include "nas/base/sqlite.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <limits>
 
 namespace nas {
 
@@ -57,6 +59,11 @@ void Database::Execute(const char* sql) {
 
 void Database::EmptyLog() {
   sqlite3_wal_checkpoint_v2(db_, nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
+}
+
+void Database::BoundValues(std::uint64_t bytes) {
+  constexpr std::uint64_t kMost = std::numeric_limits<int>::max();
+  sqlite3_limit(db_, SQLITE_LIMIT_LENGTH, static_cast<int>(std::min(bytes, kMost)));
 }
 
 Statement::Statement(const Database& db, const char* sql) : db_(db.handle()) {

@@ -43,6 +43,9 @@ class Database {
   // empty the log as well, but keep everybody else from opening the file meanwhile. What cannot be
   // moved now, such as on a full disk, stays in the log, where it is as readable.
   void EmptyLog();
+  // No value longer than this is read or written from now on, whatever a damaged file claims to
+  // hold: asking for one fails with a SqliteError.
+  void BoundValues(std::uint64_t bytes);
   sqlite3* handle() const { return db_; }
 
  private:

@@ -13,11 +13,12 @@
 
 #include "nas/base/sqlite.h"
 #include "nas/results/result_file.h"
+#include "nas/results/row_block.h"
 
 namespace nas {
 
 // The file is its user's own to write to, while the process that reads it may be able to become
-// root: numbers in it are checked before anything is indexed by them.
+// root: numbers in it are checked before anything is indexed by them or memory is taken for them.
 inline void CheckResultFile(bool sound) {
   if (!sound) throw std::runtime_error("a damaged result file");
 }
@@ -32,7 +33,8 @@ struct ResultRow {
 };
 
 // Belongs to one thread. What reads throws SqliteError where the file cannot be read, and
-// std::runtime_error or std::out_of_range where it is damaged.
+// std::runtime_error or std::out_of_range where it is damaged. Whatever a file claims, no more is
+// read of it than it is long, and memory is a small multiple of that.
 class BlockReader {
  public:
   struct Location {
@@ -51,8 +53,8 @@ class BlockReader {
     size_t rest = 0;                      // where in `bytes` the others begin
   };
 
-  // Borrows the database.
-  explicit BlockReader(Database& db) : db_(db) {}
+  // Borrows both; `path` is the database's.
+  BlockReader(Database& db, const std::string& path) : db_(db), path_(path) {}
 
   // Looks what there is. Everything below is allowed between Open and Close, inside one transaction
   // of the database.
@@ -82,6 +84,22 @@ class BlockReader {
     std::map<size_t, std::vector<FileAttributes>> pieces;  // by first row in the block
   };
 
+  // What one pass over the file may read. Parts of a damaged file can lie in the same place, so
+  // that together they seem longer than the file.
+  class Budget {
+   public:
+    explicit Budget(std::uint64_t bytes) : left_(bytes) {}
+    void Spend(std::string_view bytes) {
+      CheckResultFile(bytes.size() <= left_);
+      left_ -= bytes.size();
+    }
+
+   private:
+    std::uint64_t left_;
+  };
+
+  std::uint64_t ReadRowCount();
+  void ReadLocations();
   static void TakeApart(std::string_view folders, std::string_view names, Names& out);
   static void ParseNames(Names& names, size_t count);
   Block& BlockOf(std::uint32_t number, std::uint64_t& first);
@@ -89,9 +107,12 @@ class BlockReader {
   const FileAttributes& AttributesIn(Block& block, std::uint64_t first, size_t index);
 
   Database& db_;
+  const std::string& path_;
+  std::uint64_t file_bytes_ = 0;  // its log included
   std::uint64_t rows_ = 0;
   std::map<std::uint16_t, Location> locations_;
   std::map<std::uint64_t, Block> blocks_;  // by first row
+  size_t held_bytes_ = 0;                  // of the names in them
   // Of the block read last. It holds the database's transaction.
   std::optional<Blob> attributes_;
   std::int64_t attributes_of_ = 0;
@@ -100,14 +121,19 @@ class BlockReader {
 template <typename Visitor>
 void BlockReader::ForEachNames(Visitor visit) {
   std::uint64_t next = 0;
+  Budget budget(file_bytes_);
   Statement blocks(db_, "SELECT first, folders, names FROM names ORDER BY first");
   Names names;
   while (blocks.Step()) {
     names.folders.clear();
     names.names.clear();
+    budget.Spend(blocks.Bytes(1));
+    budget.Spend(blocks.Bytes(2));
     TakeApart(blocks.Bytes(1), blocks.Bytes(2), names);
-    ParseNames(names, names.bytes.size());
+    ParseNames(names, RowBlock::kMostRows);
     CheckResultFile(static_cast<std::uint64_t>(blocks.Integer(0)) == next &&
+                    names.rest >= names.bytes.size() && !names.names.empty() &&
+                    names.folders.size() <= names.names.size() &&
                     names.names.size() <= rows_ - next);
     visit(next, names);
     next += names.names.size();
@@ -120,10 +146,12 @@ void BlockReader::ForEachAttributes(Visitor visit) {
   Statement blocks(db_, "SELECT first, data FROM attributes ORDER BY first");
   FileAttributes row;
   std::uint64_t next = 0;
+  Budget budget(file_bytes_);
   while (blocks.Step()) {
     const std::string_view data = blocks.Bytes(1);
+    budget.Spend(data);
     CheckResultFile(static_cast<std::uint64_t>(blocks.Integer(0)) == next &&
-                    data.size() / sizeof(row) <= rows_ - next);
+                    data.size() >= sizeof(row) && data.size() / sizeof(row) <= rows_ - next);
     for (size_t at = 0; at + sizeof(row) <= data.size(); at += sizeof(row)) {
       std::memcpy(&row, data.data() + at, sizeof(row));
       visit(static_cast<std::uint32_t>(next++), row);

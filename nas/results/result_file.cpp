@@ -55,6 +55,15 @@ std::string ResultPath(const std::string& folder, const std::string& id) {
   return folder + "/" + id + std::string(kSuffix);
 }
 
+std::uint64_t ResultFileBytes(const std::string& path) {
+  std::uint64_t bytes = 0;
+  for (const std::string& part : {path, path + kLogSuffix}) {
+    struct stat status;
+    if (stat(part.c_str(), &status) == 0) bytes += static_cast<std::uint64_t>(status.st_size);
+  }
+  return bytes;
+}
+
 bool RemoveResultFile(const std::string& path) {
   const bool removed = unlink(path.c_str()) == 0;
   for (const char* companion : kCompanions) unlink((path + companion).c_str());

@@ -69,6 +69,8 @@ class ResultWatch {
 std::string NewResultId();
 bool IsResultId(std::string_view id);
 std::string ResultPath(const std::string& folder, const std::string& id);
+// How long the file and its log are; 0 where there is none.
+std::uint64_t ResultFileBytes(const std::string& path);
 // Deletes the file and its companions; true if the file itself was there and is gone.
 bool RemoveResultFile(const std::string& path);
 // Deletes result files in `folder` that nobody wrote for kKeepSeconds.

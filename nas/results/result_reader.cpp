@@ -13,6 +13,7 @@ namespace {
 
 Database OpenResultFile(const std::string& path) {
   Database db(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_EXRESCODE, kResultBusyMilliseconds);
+  db.BoundValues(ResultFileBytes(path));
   db.Execute("PRAGMA synchronous=OFF; PRAGMA cache_size=-16384");
   Statement version(db, "PRAGMA user_version");
   if (!version.Step() || version.Integer(0) != kResultVersion) {
@@ -40,8 +41,14 @@ void ResultReader::End() {
 
 void ResultReader::ReadPurged() {
   purged_.clear();
-  Statement purged(db_, "SELECT row FROM purged");
-  while (purged.Step()) purged_.insert(static_cast<std::uint32_t>(purged.Integer(0)));
+  std::int64_t next = 0;
+  Statement purged(db_, "SELECT row FROM purged ORDER BY row");
+  while (purged.Step()) {
+    const std::int64_t row = purged.Integer(0);
+    CheckResultFile(row >= next && static_cast<std::uint64_t>(row) < rows());
+    next = row + 1;
+    purged_.insert(static_cast<std::uint32_t>(row));
+  }
 }
 
 ResultReader::Page ResultReader::Select(const Selection& selection, std::uint64_t offset,

@@ -70,7 +70,7 @@ class ResultReader {
   const std::string path_;
   Database db_;
   std::optional<Transaction> transaction_;
-  BlockReader blocks_{db_};
+  BlockReader blocks_{db_, path_};
   RowSorter sorter_{db_, blocks_};
   std::unordered_set<std::uint32_t> purged_;
   std::map<std::uint32_t, std::string> user_names_;

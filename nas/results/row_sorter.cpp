@@ -58,13 +58,14 @@ bool RowSorter::ReadKept(SortColumn column, std::uint64_t offset, std::uint64_t 
     return true;
   }
   out.reserve(limit);
-  Statement pieces(db_, "SELECT data FROM ordering WHERE id BETWEEN ? AND ? ORDER BY id");
-  pieces.Bind(1, OrderingId(column, offset / kOrderingPiece))
-      .Bind(2, OrderingId(column, (offset + limit) / kOrderingPiece));
+  Statement pieces(db_, "SELECT id, data FROM ordering WHERE id BETWEEN ? AND ? ORDER BY id");
+  std::int64_t next = OrderingId(column, offset / kOrderingPiece);
+  pieces.Bind(1, next).Bind(2, OrderingId(column, (offset + limit) / kOrderingPiece));
   std::uint64_t skip = offset % kOrderingPiece;
   while (out.size() < limit && pieces.Step()) {
-    const std::string_view data = pieces.Bytes(0);
+    const std::string_view data = pieces.Bytes(1);
     const std::uint64_t there = data.size() / sizeof(std::uint32_t);
+    CheckResultFile(pieces.Integer(0) == next++ && there > 0);
     const std::uint64_t count = std::min(there - std::min(there, skip), limit - out.size());
     const size_t before = out.size();
     out.resize(before + count);

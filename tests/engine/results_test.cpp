@@ -244,50 +244,6 @@ TEST_F(Results, FilesThatAreNone) {
   }
 }
 
-// A user can write to their own result file, and the process that reads it could become root: what
-// stands in the file must not be believed.
-TEST_F(Results, DamagedFilesAreRefusedInEveryOrder) {
-  const char* const damages[] = {
-      "UPDATE attributes SET first=1000000",
-      "UPDATE attributes SET first=-1",
-      "UPDATE attributes SET data=zeroblob(1000000)",
-      "UPDATE attributes SET data=x'00'",
-      "UPDATE names SET first=1000000",
-      "UPDATE names SET count=1",
-      "UPDATE names SET count=-1",
-      "UPDATE names SET count=1<<40",
-      "UPDATE names SET names=x''",
-      "UPDATE names SET folders=x''",
-      "UPDATE names SET names=zeroblob(1000000)",
-      "DELETE FROM names",
-      "DELETE FROM attributes",
-      "INSERT INTO ordering VALUES((1<<32),x'ffffff7fffffff7f'),((6<<32),x'ffffff7fffffff7f')",
-  };
-  for (const char* damage : damages) {
-    const std::string path = ResultPath(folder_, NewResultId());
-    {
-      ResultWriter writer(path);
-      writer.AddLocation(0, "share", "/s");
-      RowBlock block;
-      block.SetFolder(0, "folder");
-      for (const char* name : {"a", "b"}) block.Add(name, {.mode = S_IFREG});
-      writer.Append(block);
-    }
-    Database(path, SQLITE_OPEN_READWRITE, 0).Execute(damage);
-    for (int column = 1; column <= static_cast<int>(SortColumn::kCrtime); ++column) {
-      Selection selection;
-      selection.column = static_cast<SortColumn>(column);
-      selection.directories = false;
-      selection.pattern = *NamePattern::Parse("a");
-      try {
-        ResultReader reader(path);
-        EXPECT_LE(Names(reader, selection).size(), 2u) << damage;
-      } catch (const std::exception&) {
-      }
-    }
-  }
-}
-
 TEST_F(Results, SweepKeepsWhatIsInUse) {
   const std::string fresh = ResultPath(folder_, NewResultId());
   const std::string stale = ResultPath(folder_, NewResultId());
