@@ -172,9 +172,13 @@ class WfmSearchDBTask {
   bool queryResult(unsigned long offset, unsigned long limit, const char* sort_by,
                    const bool* ascending, const _tag_dir_entry_type_* type, const char* pattern,
                    SelectCallback callback, void* context, unsigned long long* total) const;
-  // Deletes the rows of that file; false when there was none or they could not be deleted. May be
-  // called from within a queryResult callback, where it does not disturb the running selection; it
-  // then deletes nothing, and is false, for a file that is still there (a dangling symbolic link).
+  // Deletes the rows of that file; false when there was none or they could not be deleted.
+  //
+  // May be called from within a queryResult callback for the row lent to it, where it does not
+  // disturb the running selection. It then deletes nothing for a file that is still there (a
+  // dangling symbolic link, a folder closed meanwhile), and tells of the page so far: true when it
+  // holds a file that is gone, so that the page has to be asked for again. This object's selections
+  // leave such a file out from then on, also where its rows could not be deleted (a full disk).
   bool delRecs(std::string share_name, std::string real_path);
   // Deletes the database.
   bool remove();

@@ -40,7 +40,7 @@ void ResultReader::End() {
 }
 
 void ResultReader::ReadPurged() {
-  purged_.clear();
+  purged_ = purged_here_;
   std::int64_t next = 0;
   Statement purged(db_, "SELECT row FROM purged ORDER BY row");
   while (purged.Step()) {
@@ -116,6 +116,7 @@ void ResultReader::KeepAllOrderings() {
 }
 
 void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {
+  purged_here_.insert(numbers.begin(), numbers.end());
   Transaction transaction(db_, Transaction::Kind::kWrite);
   Statement insert(db_, "INSERT OR IGNORE INTO purged VALUES(?)");
   for (const std::uint32_t number : numbers) insert.Bind(1, number).Run();

@@ -56,7 +56,8 @@ class ResultReader {
   // Stops between columns where a file is not complete or has been deleted.
   void KeepAllOrderings();
 
-  // Marks rows as purged, outside Begin and End. Throws SqliteError.
+  // Marks rows as purged, outside Begin and End. Throws SqliteError where that cannot be stored;
+  // this reader leaves them out from now on all the same.
   void Purge(const std::vector<std::uint32_t>& numbers);
 
   // The owners' names, or the number in decimal where there is none.
@@ -73,6 +74,7 @@ class ResultReader {
   BlockReader blocks_{db_, path_};
   RowSorter sorter_{db_, blocks_};
   std::unordered_set<std::uint32_t> purged_;
+  std::unordered_set<std::uint32_t> purged_here_;  // by this reader, stored or not
   std::map<std::uint32_t, std::string> user_names_;
   std::map<std::uint32_t, std::string> group_names_;
 };

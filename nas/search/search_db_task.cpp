@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <memory>
 #include <optional>
+#include <utility>
 
 #include "nas/base/error.h"
 #include "nas/match/file_kinds.h"
@@ -97,7 +98,7 @@ class WfmSearchDBTask::Impl {
   bool Remove() { return nas::RemoveResultFile(path_); }
 
  private:
-  void FlushPurges();
+  bool FlushPurges();
 
   // Opened when it is first read: what cannot be read can still be removed.
   nas::ResultReader& Reader() {
@@ -107,12 +108,9 @@ class WfmSearchDBTask::Impl {
 
   const std::string path_;
   std::optional<nas::ResultReader> reader_;
-  // Purges asked for by a running selection wait for its end: it reads one state of the file. Once
-  // storing them has failed (a full disk), further ones are refused, so that the caller does not
-  // ask for ever.
+  // Purges asked for by a running selection wait for its end: it reads one state of the file.
   std::optional<std::uint32_t> current_;  // the row lent to the callback
   std::vector<std::uint32_t> purges_;
-  bool purging_fails_ = false;
 };
 
 bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
@@ -123,37 +121,43 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
   const nas::ResultReader::Page page = reader.Select(selection, offset, limit);
   *total = page.total;
   Lender lender(reader, callback, context);
+  purges_.clear();
+  const struct Selecting {
+    std::optional<std::uint32_t>& current;
+    ~Selecting() { current.reset(); }
+  } selecting{current_};
   for (const std::uint32_t number : page.numbers) {
     current_ = number;
     if (lender.Lend(reader.Row(number)) == 0) break;
   }
-  current_.reset();
   reader.End();
   FlushPurges();
   return true;
 }
 
-void WfmSearchDBTask::Impl::FlushPurges() {
-  if (purges_.empty()) return;
+// False where they could not be stored (a full disk).
+bool WfmSearchDBTask::Impl::FlushPurges() {
+  const std::vector<std::uint32_t> purges = std::exchange(purges_, {});
+  if (purges.empty()) return true;
   try {
-    Reader().Purge(purges_);
+    Reader().Purge(purges);
+    return true;
   } catch (const nas::SqliteError& error) {
     syslog(LOG_ERR, "search results: %s", error.what());
-    purging_fails_ = true;
+    return false;
   }
-  purges_.clear();
 }
 
 bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::string& real_path) {
-  if (purging_fails_) return false;
   nas::ResultReader& reader = Reader();
   const auto is_the_file = [&](const nas::ResultRow& row) {
     return row.share_name == share_name && RealPath(row) == real_path;
   };
   if (current_) {
-    if (!is_the_file(reader.Row(*current_)) || !HasVanished(real_path)) return false;
-    purges_.push_back(*current_);
-    return true;
+    if (is_the_file(reader.Row(*current_)) && HasVanished(real_path)) purges_.push_back(*current_);
+    // Who lists takes the answer about the last row for one about the page: a link that stays must
+    // not make a page good that holds a file which is gone.
+    return !purges_.empty();
   }
   reader.Begin();
   for (std::uint32_t row = 0; row < reader.rows(); ++row) {
@@ -161,8 +165,7 @@ bool WfmSearchDBTask::Impl::Delete(const std::string& share_name, const std::str
   }
   reader.End();
   const bool found = !purges_.empty();
-  FlushPurges();
-  return found && !purging_fails_;
+  return FlushPurges() && found;
 }
 
 WfmSearchDBTask::WfmSearchDBTask(std::unique_ptr<Impl> impl) : impl_(std::move(impl)) {}
