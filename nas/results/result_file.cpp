@@ -8,6 +8,7 @@
 #include <array>
 #include <cerrno>
 #include <ctime>
+#include <system_error>
 #include <utility>
 
 #include "nas/base/keeping.h"
@@ -32,7 +33,36 @@ time_t LastWritten(const std::string& path) {
   return newest;
 }
 
+// Beyond every byte of a database, those that SQLite locks among them.
+constexpr off_t kClaimByte = off_t{1} << 60;
+
+struct flock ClaimLock() {
+  struct flock lock = {};
+  lock.l_type = F_WRLCK;
+  lock.l_whence = SEEK_SET;
+  lock.l_start = kClaimByte;
+  lock.l_len = 1;
+  return lock;
+}
+
+// What cannot be asked counts as claimed.
+bool IsClaimed(const std::string& path) {
+  const UniqueFd file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (!file) return errno != ENOENT;
+  struct flock lock = ClaimLock();
+  return fcntl(file.get(), F_OFD_GETLK, &lock) != 0 || lock.l_type != F_UNLCK;
+}
+
 }  // namespace
+
+ResultClaim::ResultClaim(const std::string& path)
+    : file_(open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
+                 S_IRUSR | S_IWUSR)) {
+  struct flock lock = ClaimLock();
+  if (!file_ || fcntl(file_.get(), F_OFD_SETLK, &lock) != 0) {
+    throw std::system_error(errno, std::generic_category(), path);
+  }
+}
 
 ResultWatch::ResultWatch(const std::string& path) : log_(path + kLogSuffix), seen_(Look()) {}
 
@@ -82,7 +112,7 @@ void SweepResultFolder(const std::string& folder) {
       continue;
     }
     const std::string path = folder + "/" + std::string(name);
-    if (LastWritten(path) < oldest_kept) RemoveResultFile(path);
+    if (LastWritten(path) < oldest_kept && !IsClaimed(path)) RemoveResultFile(path);
   }
 }
 

@@ -29,6 +29,7 @@
 #include <string>
 #include <string_view>
 
+#include "nas/base/unique_fd.h"
 #include "nas/files/attributes.h"
 
 namespace nas {
@@ -65,6 +66,20 @@ class ResultWatch {
   Stamp seen_;
 };
 
+// Makes a result file, still empty, and says for as long as it lives that a search works on it: it
+// is never swept, however long ago the last row came and whatever became of the clock. A process
+// that is killed says so no longer. The claim is a lock on a byte of the file that SQLite does not
+// know. It must outlive every database open on the file in this process, as closing any descriptor
+// of a file lets go of SQLite's own locks on it.
+class ResultClaim {
+ public:
+  // The file must not exist. Throws std::system_error.
+  explicit ResultClaim(const std::string& path);
+
+ private:
+  UniqueFd file_;
+};
+
 // Of the form of random_name.h.
 std::string NewResultId();
 bool IsResultId(std::string_view id);
@@ -73,7 +88,8 @@ std::string ResultPath(const std::string& folder, const std::string& id);
 std::uint64_t ResultFileBytes(const std::string& path);
 // Deletes the file and its companions; true if the file itself was there and is gone.
 bool RemoveResultFile(const std::string& path);
-// Deletes result files in `folder` that nobody wrote for kKeepSeconds.
+// Deletes result files in `folder` that nobody wrote for kKeepSeconds and no search works on. No
+// database in it may be open in this process.
 void SweepResultFolder(const std::string& folder);
 
 }  // namespace nas

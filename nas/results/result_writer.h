@@ -12,7 +12,7 @@ namespace nas {
 
 class ResultWriter : public RowSink {
  public:
-  // Makes the file, which must not exist. Throws SqliteError.
+  // Makes the file, which must not exist or be empty. Throws SqliteError.
   explicit ResultWriter(const std::string& path);
 
   // Registers where rows lie; to be called before any block that names it. Throws SqliteError.

@@ -96,6 +96,8 @@ class WfmSearchWalker::Impl {
   Impl(const char* user, OKT::Task* task, const int* stop_flag)
       : user_(user), task_(task), stop_flag_(*stop_flag) {}
   ~Impl();
+  Impl(const Impl&) = delete;
+  Impl& operator=(const Impl&) = delete;
 
   bool Init(const std::vector<std::string>& texts, const std::vector<FindComp*>& comps);
   bool Walk(const Json::Value& options);
@@ -106,6 +108,9 @@ class WfmSearchWalker::Impl {
  private:
   nas::Status OpenLocations(const std::vector<std::string>& texts);
   void Report(const nas::WalkProgress& progress, bool last);
+  bool RunJob(const Json::Value& options, nas::SharedSearch& search);
+  bool IsNamedInTask();
+  bool stopped() const { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; }
   void WaitForSorting(pid_t child) const;
   [[noreturn]] void EndWorker();
   void Vanish();
@@ -119,6 +124,7 @@ class WfmSearchWalker::Impl {
   std::string volume_;
   std::string folder_;
   std::string id_;
+  std::optional<nas::ResultClaim> claim_;  // before the writer, which it has to outlive
   std::unique_ptr<nas::ResultWriter> writer_;
   bool walked_ = false;
   bool current_only_ = false;
@@ -127,17 +133,27 @@ class WfmSearchWalker::Impl {
   Clock::time_point reported_;
 };
 
-// Without a walk, the file was not made whole or could not be named in the task's record: nobody
-// would ever find it.
+// What was never walked and stands in no task, nobody can ask for or clean.
 WfmSearchWalker::Impl::~Impl() {
   writer_.reset();
-  if (!walked_ && !id_.empty()) nas::RemoveResultFile(nas::ResultPath(folder_, id_));
+  if (id_.empty() || walked_ || IsNamedInTask()) return;
+  nas::RemoveResultFile(nas::ResultPath(folder_, id_));
 }
 
-// Fails, with what is wrong with the first, where none can be opened.
+bool WfmSearchWalker::Impl::IsNamedInTask() try {
+  if (!task_->reload()) return false;
+  const Json::Value data = task_->getProperty(task_record::kData);
+  return data.isObject() && data[task_record::kDatabaseId] == id_;
+} catch (const std::exception&) {
+  return true;  // for want of memory; what is kept can be cleaned
+}
+
+// Fails, with what is wrong with the first, where none can be opened, and where the search is
+// stopped meanwhile: each may wait for a disk.
 nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>& texts) {
   std::optional<nas::Error> first;
   for (const std::string& text : texts) {
+    if (stopped()) return nas::Error{nas::kErrorOther, ECANCELED, text};
     nas::Result<nas::Location> location = nas::Error{nas::kErrorOther, E2BIG, text};
     if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
     if (location) {
@@ -168,7 +184,9 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
   folder_ = nas::ResultFolderPath(volume_, user_);
   nas::SweepResultFolder(folder_);
   id_ = nas::NewResultId();
-  writer_ = std::make_unique<nas::ResultWriter>(nas::ResultPath(folder_, id_));
+  const std::string path = nas::ResultPath(folder_, id_);
+  claim_.emplace(path);
+  writer_ = std::make_unique<nas::ResultWriter>(path);
   for (size_t i = 0; i < locations_.size(); ++i) {
     writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
                          locations_[i].share.root);
@@ -179,9 +197,20 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
   return false;
 }
 
-bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
+bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
   walked_ = true;
   nas::SharedSearch search(comps_, *writer_, stop_flag_);
+  try {
+    return RunJob(options, search);
+  } catch (...) {
+    SetErrorFromException();
+  }
+  // How far it came, on a full disk too: a task keeps space for that.
+  Report(search.progress, true);
+  return false;
+}
+
+bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch& search) {
   for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
   if (options.get("search_content", false).asBool()) search.SearchContents(folder_);
   nas::FolderWalk walk(locations_, !current_only_, search);
@@ -200,13 +229,9 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) try {
     WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
   }
   return completed;
-} catch (...) {
-  SetErrorFromException();
-  return false;
 }
 
 void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
-  const auto stopped = [this] { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; };
   // What a stopped search has found is sorted without anybody waiting for it.
   if (child < 0 || stopped()) return;
   const Clock::time_point end = Clock::now() + kSortingPatience;
