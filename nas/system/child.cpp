@@ -35,6 +35,7 @@ void ResetSignals() {
     signal(signal_number, SIG_DFL);
   }
   signal(SIGPIPE, SIG_IGN);
+  signal(SIGXFSZ, SIG_IGN);
   sigset_t none;
   sigemptyset(&none);
   sigprocmask(SIG_SETMASK, &none, nullptr);

@@ -6,8 +6,8 @@
 //
 //   - has only the standard streams (/dev/null) and its pipe open: no client's connection, no
 //     listening socket, no other child's pipe;
-//   - has default signal handlers, none masked, SIGPIPE ignored, so that a caller that has gone
-//     shows as a failed write and does not end a worker;
+//   - has default signal handlers, none masked, SIGPIPE and SIGXFSZ ignored, so that a caller that
+//     has gone and a file that may not grow show as a failed write and do not end a worker;
 //   - has a process group of its own: a terminal's interrupt must not cut down a call that is about
 //     to tell a search's id;
 //   - never returns into its parent's code, whatever is thrown: it ends by _exit, since exit
