@@ -34,7 +34,8 @@ int WfmParseErrnoToError(int error, const char* path, const char* other_path);
 // string is split at `separator`; a backslash before a separator keeps that separator as part of
 // the piece. From API version 2 on, a string that is the text of a JSON array stands for that
 // array. `drop_empty` leaves out the empty pieces of a string. An empty string gives an empty
-// array, as does any other type of value.
+// array, as does any other type of value. Throws for a list of more than 4,096 values, which the
+// caller lets pass: the request is answered as a bad one.
 Json::Value StringExplodeEx(const Json::Value& value, const char* separator, int api_version,
                             bool drop_empty);
 

@@ -6,19 +6,28 @@
 
 #include <algorithm>
 #include <array>
+#include <string>
 #include <string_view>
 #include <vector>
 
 #include "nas/base/json_text.h"
+#include "nas/system/request_bounds.h"
 
 namespace nas {
 namespace {
 
 constexpr int kFirstVersionWithJsonText = 2;
 
+void CheckPieces(size_t count) {
+  if (count > kMostPieces) {
+    throw TooManyPieces("more than " + std::to_string(kMostPieces) + " values in one parameter");
+  }
+}
+
 // Elements that have no text (objects, arrays, null) are left out, so that nobody stumbles over
 // them later.
 Json::Value StringsOf(const Json::Value& array) {
+  CheckPieces(array.size());
   Json::Value strings(Json::arrayValue);
   for (const Json::Value& item : array) {
     if (item.isString()) {
@@ -35,6 +44,7 @@ Json::Value Split(std::string_view text, std::string_view separator, bool drop_e
   std::string piece;
   const auto finish = [&] {
     if (!drop_empty || !piece.empty()) pieces.append(piece);
+    CheckPieces(pieces.size());
     piece.clear();
   };
   while (!text.empty()) {

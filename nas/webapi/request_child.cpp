@@ -8,6 +8,7 @@
 
 #include "nas/base/error.h"
 #include "nas/system/lease.h"
+#include "nas/system/request_bounds.h"
 #include "nas/system/user_state.h"
 #include "platform/webfm.h"
 
@@ -65,6 +66,9 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
     row.entry(&request, &response);
     if (response.reply()) return *response.reply();
     syslog(LOG_ERR, "%s %s gave no reply", row.api, row.method);
+  } catch (const TooManyPieces& error) {
+    syslog(LOG_ERR, "%s %s refused: %s", row.api, row.method, error.what());
+    return encode(kCodeBadRequest, Json::Value());
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s %s failed: %s", row.api, row.method, error.what());
   } catch (...) {

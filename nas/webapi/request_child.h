@@ -6,9 +6,9 @@
 namespace nas {
 
 // Becomes the call's user for the rest of the process and calls the row's entry function. The code
-// of a failure to become the user, with null data, where that fails; kCodeUnknownFailure where the
-// entry function throws or gives no reply. Throws what `encode` does. A worker that the entry
-// function forked may come back from here too.
+// of a failure to become the user, with null data, where that fails; kCodeBadRequest where a
+// parameter lists too much; kCodeUnknownFailure where the entry function throws or gives no reply.
+// Throws what `encode` does. A worker that the entry function forked may come back from here too.
 Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
 }  // namespace nas

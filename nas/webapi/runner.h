@@ -48,6 +48,7 @@ using ReplyEncoder = std::function<Reply(int code, const Json::Value& data)>;
 // Status 200 and the body {"code":N,"data":...}, one line of valid UTF-8 without a newline.
 Reply EncodeJsonReply(int code, const Json::Value& data);
 
+constexpr int kCodeBadRequest = 400;      // a parameter that asks for too much
 constexpr int kCodeUnknownFailure = 100;  // an exception or a death inside the call
 
 // For a process that makes calls, before the first one: loads what each of their children would

@@ -10,6 +10,7 @@
 #include <limits>
 
 #include "nas/base/json_text.h"
+#include "nas/system/request_bounds.h"
 #include "platform/json_file.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -171,6 +172,23 @@ TEST(Splitting, FollowsItsTable) {
     ASSERT_TRUE(nas::ParseJson(row.value, &value)) << row.value;
     const Json::Value pieces = StringExplodeEx(value, ",", row.version, row.drop);
     EXPECT_EQ(nas::JsonText(pieces, nas::JsonBytes::kRaw), row.pieces) << row.value;
+  }
+}
+
+TEST(Splitting, HasABound) {
+  for (const size_t count : {nas::kMostPieces, nas::kMostPieces + 1}) {
+    std::string text = "x";
+    for (size_t i = 1; i < count; ++i) text += ",x";
+    Json::Value array(Json::arrayValue);
+    for (size_t i = 0; i < count; ++i) array.append("x");
+    const std::string json = nas::JsonText(array, nas::JsonBytes::kRaw);
+    for (const Json::Value& value : {Json::Value(text), array, Json::Value(json)}) {
+      if (count > nas::kMostPieces) {
+        EXPECT_THROW(StringExplodeEx(value, ",", 2, false), nas::TooManyPieces);
+      } else {
+        EXPECT_EQ(StringExplodeEx(value, ",", 2, false).size(), count);
+      }
+    }
   }
 }
 

@@ -3,6 +3,7 @@
 #include <signal.h>
 #include <sys/inotify.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -210,6 +211,29 @@ TEST_F(Lifecycle, CleanAllRemovesTheUsersResultFoldersAndNothingElse) {
   EXPECT_TRUE(Eventually([&] { return !fs::exists(temporary + nas_test::Me()); }));
   EXPECT_EQ(nas_test::ReadFile(temporary + "somebody/results"), "theirs");
   EXPECT_EQ(nas_test::ReadFile(share_ + "/results"), "a file");
+}
+
+TEST_F(Lifecycle, TooManyFoldersAreABadRequest) {
+  Json::Value params = Json_(R"({"pattern": "one"})");
+  for (int number = 0; number < 5000; ++number) params["folder_path"].append("/home/x");
+  EXPECT_EQ(Call("start", params).code, 400);
+  params["taskid"].swap(params["folder_path"]);
+  EXPECT_EQ(Call("stop", params).code, 400);
+}
+
+// Not killed for it, or the search would look like a stopped one.
+TEST_F(Lifecycle, AWorkerThatMayNotWriteSaysThatItFailed) {
+  rlimit before = {};
+  ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &before), 0);
+  rlimit small = before;
+  small.rlim_cur = 64 * 1024;  // enough for a task record, not for results
+  ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &small), 0);
+  const std::string id = Start(Json_(R"({"folder_path": "/share", "pattern": "one"})"));
+  ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &before), 0);
+  ListToEnd(id);
+  EXPECT_EQ(TaskProperty(id, "progress"), -1);
+  EXPECT_EQ(TaskProperty(id, "data")["errno"], 401);
+  EXPECT_TRUE(Databases(dir_ + "/volume1", nas_test::Me()).empty());
 }
 
 TEST_F(Lifecycle, FilesThatVanishedLeaveTheListing) {
