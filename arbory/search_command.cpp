@@ -88,6 +88,9 @@ class Search {
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
       return;
     }
+    if (reply.head.code == nas::kCodeBadRequest) {
+      throw std::runtime_error("too many folders for one search");
+    }
     const std::string why = WhyNoSearch(caller_);
     throw std::runtime_error("the search cannot be started: " +
                              (why.empty() ? "code " + std::to_string(reply.head.code) : why));
