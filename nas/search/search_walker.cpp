@@ -148,12 +148,13 @@ bool WfmSearchWalker::Impl::IsNamedInTask() try {
   return true;  // for want of memory; what is kept can be cleaned
 }
 
-// Fails, with what is wrong with the first, where none can be opened, and where the search is
-// stopped meanwhile: each may wait for a disk.
+// Fails, with what is wrong with the first, where none can be opened. A search that is stopped
+// meanwhile opens no further one, as each may wait for a disk, but goes on with what it has:
+// whoever stops a search may still ask for its results.
 nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>& texts) {
   std::optional<nas::Error> first;
   for (const std::string& text : texts) {
-    if (stopped()) return nas::Error{nas::kErrorOther, ECANCELED, text};
+    if (stopped() && (first || !locations_.empty())) break;
     nas::Result<nas::Location> location = nas::Error{nas::kErrorOther, E2BIG, text};
     if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
     if (location) {

@@ -219,9 +219,10 @@ TEST_F(Walker, AFailedWalkTellsHowFarItCame) {
 }
 
 TEST_F(Walker, AStopEndsTheOpeningOfLocations) {
+  EXPECT_TRUE(NewWalker()->init({"/nowhere", "/share"}, {}));
   stop_ = 1;
-  EXPECT_FALSE(NewWalker()->init({"/share", "/share"}, {}));
-  EXPECT_EQ(ResultFiles(), 0u);
+  EXPECT_FALSE(NewWalker()->init({"/nowhere", "/share"}, {})) << "the second is not looked at";
+  EXPECT_TRUE(NewWalker()->init({"/share", "/nowhere"}, {})) << "there is something to list";
 }
 
 }  // namespace
