@@ -42,9 +42,10 @@ int FILEIDXIsShareIndexed(const char* share);
 // parent.
 pid_t NLIBCProcFork();
 
-// Makes the effective identity the only one, then runs `program` with up to three arguments (null
-// ends them early) and waits for it. The program sees the system's folders read-only; of every
-// volume it may write the temporary folder @tmp and nothing else. `flags` is reserved (0).
+// Runs `program` with up to three arguments (null ends them early) under the effective identity
+// alone and waits for it. Result folders of the user that it has left empty are then removed, which
+// the user cannot do where root made them. The program sees the system's folders read-only; of
+// every volume it may write the temporary folder @tmp and nothing else. `flags` is reserved (0).
 // Returns its exit status, or -1 when it could not be run confined. Not undone: the calling
 // process has only its effective identity from then on.
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3, int flags);

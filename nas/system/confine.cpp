@@ -23,6 +23,7 @@
 #include "nas/base/json_text.h"
 #include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
+#include "nas/system/identity.h"
 #include "nas/system/volumes.h"
 #include "platform/system.h"
 
@@ -113,6 +114,7 @@ Result<int> RunConfined(const std::vector<const char*>& command) {
   const pid_t child = fork();
   if (child < 0) return ErrnoError();
   if (child == 0) {
+    GiveUpRoot();
     // Kept open for bubblewrap alone, which closes it before it runs the command.
     if (fcntl(status.get(), F_SETFD, 0) == 0) execv(kBubblewrap, words.data());
     _exit(EXIT_FAILURE);
@@ -128,11 +130,12 @@ Result<int> RunConfined(const std::vector<const char*>& command) {
 }
 
 Result<int> RunForGood(const char* program, const std::vector<const char*>& command) {
-  const gid_t group = getegid();
-  const uid_t user = geteuid();
-  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) return ErrnoError();
-  if (program == nullptr || access(program, X_OK) != 0) return ErrnoError();
-  return RunConfined(command);
+  const bool there = program != nullptr && access(program, X_OK) == 0;
+  Result<int> status = there ? RunConfined(command) : ErrnoError();
+  // A folder that root made is the user's to empty, yet only root can take it away.
+  if (CanBeRoot() && !ActingUser().empty()) RemoveEmptyResultFolders(ActingUser());
+  GiveUpRoot();
+  return status;
 }
 
 }  // namespace

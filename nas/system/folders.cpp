@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 
@@ -30,6 +31,18 @@ Result<UniqueFd> OpenOrMakeFolder(int dir_fd, const std::string& name, mode_t mo
   // What is kept in a folder survives no power cut that the folder does not.
   if (made) (void)SyncFolder(dir_fd, ".");
   return OpenFolder(dir_fd, name);
+}
+
+Result<UniqueFd> OpenOrMakeFolderFor(uid_t user, gid_t group, int dir_fd, const std::string& name,
+                                     mode_t mode) {
+  Result<UniqueFd> folder = OpenOrMakeFolder(dir_fd, name, mode);
+  if (!folder || geteuid() != 0 || user == 0) return folder;
+  struct stat info;
+  if (fstat(folder->get(), &info) != 0) return ErrnoError(name);
+  if (info.st_uid == 0 && fchownat(folder->get(), "", user, group, AT_EMPTY_PATH) != 0) {
+    return ErrnoError(name);
+  }
+  return folder;
 }
 
 Result<UniqueFd> OpenTopFolder(const std::string& path) {

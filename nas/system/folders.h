@@ -16,6 +16,10 @@ namespace nas {
 Result<UniqueFd> OpenFolder(int dir_fd, const std::string& name);
 // The same, made with exactly `mode` where it is missing. For one thread: it sets the umask.
 Result<UniqueFd> OpenOrMakeFolder(int dir_fd, const std::string& name, mode_t mode);
+// The same, for `user` when root calls: what is made is handed over to them, and so is a folder of
+// root's, which is one that another call makes just now. Only where none but root can put anything.
+Result<UniqueFd> OpenOrMakeFolderFor(uid_t user, gid_t group, int dir_fd, const std::string& name,
+                                     mode_t mode);
 // Opens the folder at an absolute path, from which the administrator's links lead where they will.
 Result<UniqueFd> OpenTopFolder(const std::string& path);
 

@@ -106,6 +106,14 @@ Status CheckActsAs(const std::string& user) {
   return account->uid == geteuid() ? Status() : ErrnoError(EPERM, user);
 }
 
+std::string ActingUser() { return g_self ? g_self->name : std::string(); }
+
+void GiveUpRoot() {
+  const gid_t group = getegid();
+  const uid_t user = geteuid();
+  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) std::abort();
+}
+
 ScopedRoot::ScopedRoot() : user_(geteuid()), group_(getegid()) {
   if (user_ == kRoot || !CanBeRoot() || seteuid(kRoot) != 0) return;
   raised_ = true;

@@ -26,6 +26,14 @@ Result<Account> BecomeUser(const std::string& user);
 // EPERM unless the process acts as `user` now; kErrorUnknownUser when there is none.
 Status CheckActsAs(const std::string& user);
 
+// Whom BecomeUser has made the process; empty for nobody yet.
+std::string ActingUser();
+
+// Gives up for good the root that the process could go back to. For whoever is about to read what
+// the user can write, once no folder is left to be made. A process that cannot aborts; one whose
+// user is root stays root.
+void GiveUpRoot();
+
 // Root for the time of a few system calls, then the identity before it. Does nothing where root
 // was never there. A process that cannot step down again aborts.
 class ScopedRoot {

@@ -64,16 +64,7 @@ Result<UniqueFd> MakeUserFolder(const Account& account, uid_t maker) {
     good = Enter(OpenOrMakeFolder(above.get(), kUsers, kOpenMode), CheckSafeFrom, maker, &above);
   }
   if (!good) return good.error();
-  Result<UniqueFd> folder = OpenOrMakeFolder(above.get(), account.name, kPrivateMode);
-  struct stat info;
-  if (!folder) return folder;
-  if (fstat(folder->get(), &info) != 0) return ErrnoError(account.name);
-  // Nobody but root can put anything here, so a folder of root's is one just being made.
-  if (maker == 0 && info.st_uid == 0 && account.uid != 0 &&
-      fchownat(folder->get(), "", account.uid, account.gid, AT_EMPTY_PATH) != 0) {
-    return ErrnoError(account.name);
-  }
-  return folder;
+  return OpenOrMakeFolderFor(account.uid, account.gid, above.get(), account.name, kPrivateMode);
 }
 
 Status MakeFoldersOf(const Account& account, uid_t maker) {

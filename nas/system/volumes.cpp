@@ -1,5 +1,6 @@
 #include "nas/system/volumes.h"
 
+#include <fcntl.h>
 #include <fnmatch.h>
 #include <glob.h>
 #include <sys/stat.h>
@@ -10,6 +11,7 @@
 #include <set>
 #include <utility>
 
+#include "nas/base/random_name.h"
 #include "nas/system/config.h"
 #include "nas/system/folders.h"
 #include "nas/system/identity.h"
@@ -18,17 +20,20 @@ namespace nas {
 namespace {
 
 constexpr char kScratchFolder[] = "volume0";
+constexpr char kAsidePrefix[] = ".aside-";
 constexpr mode_t kPassMode = 0755;
-// Sticky: each user makes and removes their own folder, and no other's.
+// Without root. Sticky: each user makes and removes their own folder, and no other's.
 constexpr mode_t kSharedMode = 01777;
 constexpr mode_t kPrivateMode = 0700;
 
 struct Step {
   const char* name;
   mode_t mode;
+  mode_t mode_of_root;
 };
-constexpr Step kResultRoad[] = {
-    {kTemporaryFolder, kPassMode}, {"webfm", kPassMode}, {"FBSearch", kSharedMode}};
+constexpr Step kResultRoad[] = {{kTemporaryFolder, kPassMode, kPassMode},
+                                {"webfm", kPassMode, kPassMode},
+                                {"FBSearch", kSharedMode, kPassMode}};
 
 bool IsDirectory(const std::string& path) {
   struct stat info;
@@ -71,7 +76,8 @@ Result<UniqueFd> TakeRoad(const std::string& volume, uid_t user, Opener open_ste
   if (!folder) return folder;
   if (const Status safe = CheckSafeFrom(folder->get(), user); !safe) return safe.error();
   for (const Step& step : kResultRoad) {
-    Result<UniqueFd> next = open_step(folder->get(), step.name, step.mode);
+    Result<UniqueFd> next =
+        open_step(folder->get(), step.name, geteuid() == 0 ? step.mode_of_root : step.mode);
     if (!next) return next;
     if (const Status safe = CheckSafeFrom(next->get(), user); !safe) return safe.error();
     folder = std::move(next);
@@ -79,10 +85,9 @@ Result<UniqueFd> TakeRoad(const std::string& volume, uid_t user, Opener open_ste
   return folder;
 }
 
-Result<std::string> OpenOwnFolder(const Result<UniqueFd>& road, const std::string& volume,
-                                  const std::string& user, Opener open_step) {
-  if (!road) return road.error();
-  const Result<UniqueFd> folder = open_step(road->get(), user, kPrivateMode);
+// The path of the user's folder, once it has been opened.
+Result<std::string> PathOfOwn(const Result<UniqueFd>& folder, const std::string& volume,
+                              const std::string& user) {
   if (!folder) {
     // Something else in its place was put there by somebody: not a missing folder.
     const int cause = folder.error().error_number;
@@ -105,14 +110,52 @@ bool IsSeenByVolumePattern(const std::string& volume) {
   return volume.starts_with("/volume") && volume.find('/', 1) == std::string::npos;
 }
 
-Result<UniqueFd> MakeRoad(const std::string& volume) {
-  const uid_t user = geteuid();
+bool IsOpenToAll(const struct stat& folder) {
+  return folder.st_uid == 0 && (folder.st_mode & (S_IWGRP | S_IWOTH)) != 0;
+}
+
+// Whether root has yet to close the folder of users' folders, which it made for all to write in.
+bool IsToBeClosed(int road) {
+  struct stat info;
+  return CanBeRoot() && fstat(road, &info) == 0 && IsOpenToAll(info);
+}
+
+Status CloseRoad(int road) {
+  struct stat info;
+  if (fstat(road, &info) != 0) return ErrnoError();
+  if (!IsOpenToAll(info)) return {};
+  const UniqueFd folder(openat(road, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return folder && fchmod(folder.get(), kPassMode) == 0 ? Status() : ErrnoError();
+}
+
+// What somebody put in the user's place while everybody could. Only its name is touched: what it
+// holds, or leads to, is of that somebody's making.
+Status MoveStrangerAside(int road, const std::string& user, uid_t owner) {
+  struct stat info;
+  if (fstatat(road, user.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
+    return errno == ENOENT ? Status() : ErrnoError(user);
+  }
+  if (info.st_uid == owner || info.st_uid == 0) return {};
+  const std::string aside = kAsidePrefix + RandomName();
+  return renameat(road, user.c_str(), road, aside.c_str()) == 0 ? Status() : ErrnoError(user);
+}
+
+Result<UniqueFd> MakeOwnFolder(const std::string& volume, const std::string& user) {
+  const uid_t owner = geteuid();
+  const gid_t group = getegid();
   const ScopedRoot root;
+  const bool as_root = geteuid() == 0;
   if (volume == ScratchVolume()) {
-    const Status made = MakeFolders(volume, geteuid() == 0 ? kPassMode : kPrivateMode);
+    const Status made = MakeFolders(volume, as_root ? kPassMode : kPrivateMode);
     if (!made) return made.error();
   }
-  return TakeRoad(volume, user, OpenOrMakeFolder);
+  Result<UniqueFd> road = TakeRoad(volume, owner, OpenOrMakeFolder);
+  if (!road) return road;
+  Status ready;
+  if (as_root) ready = CloseRoad(road->get());
+  if (as_root && ready) ready = MoveStrangerAside(road->get(), user, owner);
+  if (!ready) return ready.error();
+  return OpenOrMakeFolderFor(owner, group, road->get(), user, kPrivateMode);
 }
 
 }  // namespace
@@ -168,15 +211,39 @@ std::string ResultFolderPath(const std::string& volume, const std::string& user)
 Result<std::string> ResultFolder(const std::string& volume, const std::string& user) {
   const Status good = CheckResultPlace(volume, user);
   if (!good) return good.error();
-  return OpenOwnFolder(TakeRoad(volume, geteuid(), OpenOnly), volume, user, OpenOnly);
+  const Result<UniqueFd> road = TakeRoad(volume, geteuid(), OpenOnly);
+  if (!road) return road.error();
+  return PathOfOwn(OpenFolder(road->get(), user), volume, user);
 }
 
 Result<std::string> MakeResultFolder(const std::string& volume, const std::string& user) {
-  Result<std::string> found = ResultFolder(volume, user);
-  if (found || found.error().error_number != ENOENT) return found;
   const Status good = CheckResultPlace(volume, user);
   if (!good) return good.error();
-  return OpenOwnFolder(MakeRoad(volume), volume, user, OpenOrMakeFolder);
+  const Result<UniqueFd> road = TakeRoad(volume, geteuid(), OpenOnly);
+  if (!road && road.error().error_number != ENOENT) return road.error();
+  if (road && !IsToBeClosed(road->get())) {
+    Result<std::string> found = PathOfOwn(OpenFolder(road->get(), user), volume, user);
+    // Not the user's own is also the folder that another call is just about to hand over.
+    const int cause = found ? 0 : found.error().error_number;
+    if (cause != ENOENT && cause != EPERM) return found;
+  }
+  return PathOfOwn(MakeOwnFolder(volume, user), volume, user);
+}
+
+void MakeResultFolders(const std::string& user) {
+  for (const std::string& volume : ListVolumes()) (void)MakeResultFolder(volume, user);
+  (void)MakeResultFolder(ScratchVolume(), user);
+}
+
+void RemoveEmptyResultFolders(const std::string& user) {
+  std::vector<std::string> volumes = ListVolumes();
+  volumes.push_back(ScratchVolume());
+  for (const std::string& volume : volumes) {
+    if (!ResultFolder(volume, user)) continue;
+    const Result<UniqueFd> road = TakeRoad(volume, geteuid(), OpenOnly);
+    const ScopedRoot root;
+    if (road) unlinkat(road->get(), user.c_str(), AT_REMOVEDIR);
+  }
 }
 
 Result<std::string> ResultVolume(const std::string& own_volume, const std::string& user) {

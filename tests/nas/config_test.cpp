@@ -253,7 +253,7 @@ TEST_F(ResultFolderTest, LiesOnTheVolumeOrInTheScratchVolume) {
   EXPECT_EQ(*nas::ResultVolume(nas::FindShare("far")->volume, Me()), nas::ScratchVolume());
   for (const std::string& on : {volume, nas::ScratchVolume()}) {
     EXPECT_EQ(*nas::ResultFolder(on, Me()), on + "/@tmp/webfm/FBSearch/" + Me());
-    EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch"), 01777U);
+    EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch"), AmRoot() ? 0755U : 01777U);
     EXPECT_EQ(ModeOf(on + "/@tmp/webfm/FBSearch/" + Me()), 0700U);
   }
   for (const std::string& other : {dir_ + "/far", std::string("/"), volume + "/photo", volume + "/",
@@ -314,6 +314,49 @@ TEST_F(ResultFolderTest, IsMadeByRootForTheUser) {
     EXPECT_NE(geteuid(), 0U) << "stepped down again";
     EXPECT_TRUE(nas::MakeResultFolder(nas::ScratchVolume(), kOtherUser));
   }));
+}
+
+// Where the folder of folders was made for all to write in, somebody could be first.
+TEST_F(ResultFolderTest, IsNotBlockedByWhatAnotherUserPutThere) {
+  SKIP_UNLESS_ROOT();
+  constexpr uid_t kStranger = 2;
+  const std::string volume = MakeFolder("volume1");
+  const std::string trap = MakeFolder("trap", 0700);
+  WriteFile(trap + "/kept", "kept");
+  const std::string all = MakeFolder("volume1/@tmp/webfm/FBSearch", 01777);
+  const std::string place = all + "/" + kOtherUser;
+  const struct {
+    const char* why;
+    std::function<int()> plant;
+    uid_t owner;
+  } rows[] = {
+      {"nothing", [] { return 0; }, kStranger},
+      {"a folder", [&] { return mkdir(place.c_str(), 0777); }, kStranger},
+      {"a folder with something in it",
+       [&] { return mkdir(place.c_str(), 0777) + mkdir((place + "/x").c_str(), 0777); }, kStranger},
+      {"a link", [&] { return symlink(trap.c_str(), place.c_str()); }, kStranger},
+      {"a file", [&] { return mkfifo(place.c_str(), 0666); }, kStranger},
+      {"root's own, just being made", [&] { return mkdir(place.c_str(), 0700); }, 0},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.why);
+    std::filesystem::remove_all(place);
+    ASSERT_EQ(chmod(all.c_str(), 01777), 0);
+    ASSERT_EQ(row.plant(), 0);
+    (void)lchown(place.c_str(), row.owner, row.owner);
+    EXPECT_TRUE(InChild([&] {
+      ASSERT_TRUE(nas::EnterUserState(kOtherUser));
+      const auto folder = nas::MakeResultFolder(volume, kOtherUser);
+      ASSERT_TRUE(folder) << folder.error().Text();
+      WriteFile(*folder + "/results", "mine");
+      EXPECT_EQ(mkdir((all + "/somebody").c_str(), 0700), -1) << "only root makes folders there";
+      EXPECT_EQ(rmdir(place.c_str()), -1);
+    }));
+    EXPECT_EQ(ReadFile(place + "/results"), "mine");
+    EXPECT_EQ(ModeOf(place), 0700U);
+    EXPECT_EQ(ModeOf(all), 0755U);
+    EXPECT_EQ(ReadFile(trap + "/results"), "(none)");
+  }
 }
 
 // What the user cannot reach must not be found by going back to root.

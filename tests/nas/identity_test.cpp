@@ -210,6 +210,38 @@ TEST_F(ConfineTest, CleanAllRemovesPreciselyTheUsersResults) {
   EXPECT_NE(expected, before);
 }
 
+// The user can empty the folder that root made, but not remove it.
+TEST_F(ConfineTest, WhatACommandHasEmptiedIsRemoved) {
+  SKIP_UNLESS_ROOT();
+  MakeFolder("volume1");
+  const std::string all = dir_ + "/volume1/@tmp/webfm/FBSearch/";
+  const struct {
+    const char* command;
+    bool there;
+  } rows[] = {
+      {"rm -rf /volume*/@tmp/webfm/FBSearch/nobody", false},
+      {"true", true},
+      {"rm -rf /volume*/@tmp/webfm/FBSearch/nobody/a*", true},
+  };
+  for (const auto& row : rows) {
+    EXPECT_TRUE(InChild([&] {
+      ASSERT_TRUE(nas::EnterUserState(kOtherUser));
+      for (const std::string& volume : {dir_ + "/volume1", nas::ScratchVolume()}) {
+        const auto folder = nas::MakeResultFolder(volume, kOtherUser);
+        ASSERT_TRUE(folder);
+        WriteFile(*folder + "/a.db", "x");
+        WriteFile(*folder + "/b.db", "x");
+      }
+      NLIBCExec("/bin/sh", "-c", row.command, nullptr, 0);
+      const uid_t uid = geteuid();
+      ExpectIds(uid, uid, uid, getegid());
+    }));
+    for (const std::string& place : {all, nas::ScratchVolume() + "/@tmp/webfm/FBSearch/"}) {
+      EXPECT_EQ(std::filesystem::exists(place + kOtherUser), row.there) << row.command;
+    }
+  }
+}
+
 TEST_F(ConfineTest, ACommandSeesAndWritesNothingElse) {
   MakeResults("ann");
   const struct {
