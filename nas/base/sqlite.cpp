@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <limits>
+#include <utility>
 
 namespace nas {
 
@@ -36,6 +37,29 @@ Error ErrorOf(sqlite3* db, const std::string& what) {
   return {error_number == ENOSPC ? kErrorNoSpace : kErrorDatabase, error_number, what};
 }
 
+// What a file that a user can write may make SQLite do. The bounds are far above what our own files
+// and statements need: a block of results is some megabytes, a statement some hundred bytes.
+void Harden(sqlite3* db) {
+  constexpr std::pair<int, int> kSettings[] = {{SQLITE_DBCONFIG_DEFENSIVE, 1},
+                                               {SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0},
+                                               {SQLITE_DBCONFIG_ENABLE_TRIGGER, 0},
+                                               {SQLITE_DBCONFIG_ENABLE_VIEW, 0}};
+  for (const auto& [setting, value] : kSettings) sqlite3_db_config(db, setting, value, nullptr);
+  constexpr int kValueBytes = 64 << 20;
+  constexpr std::pair<int, int> kLimits[] = {{SQLITE_LIMIT_LENGTH, kValueBytes},
+                                             {SQLITE_LIMIT_SQL_LENGTH, 10'000},
+                                             {SQLITE_LIMIT_COLUMN, 100},
+                                             {SQLITE_LIMIT_EXPR_DEPTH, 20},
+                                             {SQLITE_LIMIT_COMPOUND_SELECT, 3},
+                                             {SQLITE_LIMIT_VDBE_OP, 25'000},
+                                             {SQLITE_LIMIT_FUNCTION_ARG, 8},
+                                             {SQLITE_LIMIT_ATTACHED, 0},
+                                             {SQLITE_LIMIT_LIKE_PATTERN_LENGTH, 50},
+                                             {SQLITE_LIMIT_VARIABLE_NUMBER, 10},
+                                             {SQLITE_LIMIT_TRIGGER_DEPTH, 1}};
+  for (const auto& [limit, value] : kLimits) sqlite3_limit(db, limit, value);
+}
+
 }  // namespace
 
 SqliteError::SqliteError(sqlite3* db, const std::string& what)
@@ -49,6 +73,7 @@ Database::Database(const std::string& path, int flags, int busy_milliseconds) {
     throw error;
   }
   sqlite3_busy_timeout(db_, busy_milliseconds);
+  Harden(db_);
 }
 
 Database::~Database() { sqlite3_close(db_); }
@@ -129,12 +154,15 @@ void Blob::Read(size_t offset, size_t count, void* out) const {
 
 void LoadSqlite() { sqlite3_initialize(); }
 
-Transaction::Transaction(Database& db, Kind kind) : db_(db) {
-  db_.Execute(kind == Kind::kWrite ? "BEGIN IMMEDIATE" : "BEGIN");
+Transaction::Transaction(Database& db, Kind kind) : db_(db), kind_(kind) {
+  db_.Execute(kind == Kind::kWrite ? "BEGIN IMMEDIATE" : "PRAGMA query_only=1;BEGIN");
 }
 
 Transaction::~Transaction() {
   if (open_) sqlite3_exec(db_.handle(), "ROLLBACK", nullptr, nullptr, nullptr);
+  if (kind_ == Kind::kRead) {
+    sqlite3_exec(db_.handle(), "PRAGMA query_only=0", nullptr, nullptr, nullptr);
+  }
 }
 
 void Transaction::Commit() {

@@ -31,7 +31,9 @@ class SqliteError : public std::runtime_error {
 class Database {
  public:
   // Opens `path`; `flags` are those of sqlite3_open_v2. A write that finds the file locked waits up
-  // to `busy_milliseconds`. Throws SqliteError.
+  // to `busy_milliseconds`. The file may be of anybody's making: its schema runs no views, triggers
+  // or functions with effects, and what one value, statement or table may take is bounded. Throws
+  // SqliteError.
   Database(const std::string& path, int flags, int busy_milliseconds);
   ~Database();
   Database(Database&& other) noexcept : db_(std::exchange(other.db_, nullptr)) {}
@@ -109,7 +111,8 @@ void LoadSqlite();
 class Transaction {
  public:
   // A writer takes the database's one write lock at once, so that it cannot fail half-way for
-  // another writer; a reader sees the database as it is at its first row.
+  // another writer; a reader sees the database as it is at its first row, and nothing is written
+  // through it meanwhile.
   enum class Kind { kRead, kWrite };
   // Both throw SqliteError.
   Transaction(Database& db, Kind kind);
@@ -120,6 +123,7 @@ class Transaction {
 
  private:
   Database& db_;
+  const Kind kind_;
   bool open_ = true;
 };
 

@@ -12,6 +12,7 @@
 #include "nas/base/json_text.h"
 #include "nas/base/sqlite.h"
 #include "nas/base/unique_fd.h"
+#include "nas/system/identity.h"
 
 namespace NUVA::WEBFM {
 namespace {
@@ -159,6 +160,8 @@ class FileDB::Store {
   nas::Error Failure(int error_number) const { return {nas::kErrorDatabase, error_number, path_}; }
 
   nas::Status Open() {
+    // SQLite is not to read a user's file in a process that could be root again.
+    nas::GiveUpRoot();
     struct stat info;
     if (stat(path_.c_str(), &info) != 0 && (errno != ENOENT || !CreatePrivately(path_))) {
       return Failure(errno);
@@ -241,6 +244,7 @@ bool FileDB::Select(const Condition& condition, std::vector<Json::Value>& out) c
   return store_->Use([&](nas::Database& db) {
     int skip = std::max(condition.offset, 0);
     int left = condition.limit > 0 ? condition.limit : INT_MAX;
+    const nas::Transaction reading(db, nas::Transaction::Kind::kRead);
     for (Row& row : Matching(db, condition)) {
       if (skip-- <= 0 && left-- > 0) out.push_back(std::move(row.record));
     }

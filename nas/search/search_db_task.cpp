@@ -14,6 +14,7 @@
 #include "nas/match/file_kinds.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
+#include "nas/system/identity.h"
 #include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 
@@ -213,6 +214,8 @@ WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* i
     nas::Report(folder.error());
     return nullptr;
   }
+  // SQLite is not to read a user's file in a process that could be root again.
+  nas::GiveUpRoot();
   const std::string path = nas::ResultPath(*folder, id);
   if (access(path.c_str(), F_OK) != 0) return nullptr;
   return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(path));

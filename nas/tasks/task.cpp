@@ -1,5 +1,7 @@
 #include "platform/task.h"
 
+#include <unistd.h>
+
 #include <map>
 #include <mutex>
 #include <optional>
@@ -8,7 +10,9 @@
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"
 #include "nas/system/config.h"
+#include "nas/system/identity.h"
 #include "nas/system/lease.h"
+#include "nas/system/volumes.h"
 #include "nas/tasks/task_files.h"
 
 namespace OKT {
@@ -22,6 +26,15 @@ T OrThrow(nas::Result<T> result) {
   throw std::runtime_error(result.error().Text());
 }
 
+// A new task is a search that begins: making the folders for its results is the last that needs
+// root. The worker, which inherits what the process is, reads what the user can write: histories,
+// settings, the task's own record.
+void LeaveRoot(const std::string& owner) {
+  if (geteuid() == 0 || !nas::CanBeRoot()) return;
+  nas::MakeResultFolders(owner);
+  nas::GiveUpRoot();
+}
+
 }  // namespace
 
 // Guard: every member below `mutex` is used with it held.
@@ -33,6 +46,7 @@ class Task::Record {
       id_ = std::move(task.id);
       life_ = std::move(task.life);
       if (nas::NewTasksAreLeased()) lease_.emplace(nas::CurrentConfig().lease_seconds);
+      LeaveRoot(owner);
       return;
     }
     if (!nas::IsRandomName(id)) throw std::runtime_error("not a task id");

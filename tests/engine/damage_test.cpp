@@ -155,8 +155,11 @@ TEST_F(Damage, ValuesThatCannotBe) {
 // Of a file of small pages, so that every byte has its turn.
 TEST_F(Damage, EveryCutAndEveryByte) {
   const std::string path = MakeFile();
-  Database(path, SQLITE_OPEN_READWRITE, 0)
-      .Execute("PRAGMA journal_mode=DELETE; PRAGMA page_size=512; VACUUM");
+  {
+    Database file(path, SQLITE_OPEN_READWRITE, 0);
+    sqlite3_limit(file.handle(), SQLITE_LIMIT_ATTACHED, 1);  // which VACUUM needs
+    file.Execute("PRAGMA journal_mode=DELETE; PRAGMA page_size=512; VACUUM");
+  }
   std::ifstream file(path, std::ios::binary);
   const std::string whole{std::istreambuf_iterator<char>(file), {}};
   ASSERT_LT(whole.size(), 20'000u);

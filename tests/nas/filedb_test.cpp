@@ -124,6 +124,39 @@ TEST_F(FileDBTest, OneUnreadableRecordHidesNoOther) {
   EXPECT_EQ(Patterns(), "next ");
 }
 
+// The file lies where its user can write: nothing that it brings along is run.
+TEST_F(FileDBTest, RunsNothingThatAFileBringsAlong) {
+  const struct {
+    const char* why;
+    const char* schema;
+    bool inserts;
+    const char* patterns;
+  } rows[] = {
+      {"a view in the table's place",
+       "ALTER TABLE records RENAME TO kept;"
+       "CREATE VIEW records AS SELECT 1 AS position, CAST('{\"pattern\":\"v\"}' AS BLOB) AS body",
+       false, ""},
+      {"a trigger",
+       "CREATE TRIGGER t AFTER INSERT ON records BEGIN DELETE FROM records WHERE position=1; END",
+       true, "new old "},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.why);
+    unlink(path().c_str());
+    ASSERT_TRUE(Insert(Record("old")));
+    sqlite3* store = nullptr;
+    ASSERT_EQ(sqlite3_open(path().c_str(), &store), SQLITE_OK);
+    ASSERT_EQ(sqlite3_exec(store, row.schema, nullptr, nullptr, nullptr), SQLITE_OK);
+    sqlite3_close(store);
+    EXPECT_EQ(Insert(Record("new")), row.inserts);
+    std::vector<Json::Value> records;
+    EXPECT_EQ(FileDB(path()).Select({}, records), row.inserts);
+    std::string patterns;
+    for (const Json::Value& record : records) patterns += record["pattern"].asString() + " ";
+    EXPECT_EQ(patterns, row.patterns);
+  }
+}
+
 TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   MakeFolder("directory");
   const std::string garbage(5000, 'g');

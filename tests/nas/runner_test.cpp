@@ -14,8 +14,12 @@
 
 #include "nas/base/json_text.h"
 #include "nas/system/user_state.h"
+#include "nas/system/volumes.h"
 #include "nas/webapi/runner.h"
+#include "platform/filedb.h"
+#include "platform/filesearch.h"
 #include "platform/system.h"
+#include "platform/task.h"
 #include "platform/webfm.h"
 #include "tests/nas/fixture.h"
 
@@ -249,6 +253,56 @@ TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
       },
       Json::Value(), kOtherUser);
   EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":65534,"wrote":true}})");
+}
+
+// The real, effective, saved and file system's user ids of this process.
+std::string UserIds() {
+  const std::string status = ReadFile("/proc/self/status");
+  const size_t at = status.find("Uid:");
+  return status.substr(at, status.find('\n', at) - at);
+}
+
+// From where a call reads what its user can write, nothing leads back to root.
+TEST_F(RunnerTest, RootsCallsGiveRootUpBeforeTheyReadWhatTheUserWrote) {
+  SKIP_UNLESS_ROOT();
+  MakeFolder("volume1");
+  const struct {
+    const char* why;
+    NUVA::APIEntry entry;
+  } rows[] = {
+      {"a history",
+       [](APIRequest* request, APIResponse* r) {
+         const NUVA::WEBFM::FileDB store(request->GetPreferenceDir() + "/search_history.db");
+         r->SetError(0, UserIds());
+       }},
+      {"a result database",
+       [](APIRequest* request, APIResponse* r) {
+         const std::string user = request->GetLoginUserName();
+         const std::string volume = nas::ListVolumes().at(0);
+         if (!nas::MakeResultFolder(volume, user)) return;
+         const FileSearch::WfmSearchDBTaskMgr databases(user.c_str());
+         delete databases.getDBTask(volume.c_str(), std::string(32, 'a').c_str());
+         r->SetError(0, UserIds());
+       }},
+      {"a search that begins, with the folders for its results there",
+       [](APIRequest* request, APIResponse* r) {
+         const std::string user = request->GetLoginUserName();
+         OKT::Task task(user.c_str(), nullptr);
+         const bool has = nas::ResultVolume(nas::ListVolumes().at(0), user).ok();
+         r->SetError(0, has ? UserIds() : "no folder");
+         task.remove();
+       }},
+      {"a command",
+       [](APIRequest*, APIResponse* r) {
+         NLIBCExec("/bin/true", nullptr, nullptr, nullptr, 0);
+         r->SetError(0, UserIds());
+       }},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(Run(row.entry, Json::Value(), kOtherUser),
+              R"({"code":0,"data":"Uid:\t65534\t65534\t65534\t65534"})")
+        << row.why;
+  }
 }
 
 std::string Frame(const std::string& text) {

@@ -15,6 +15,7 @@
 namespace server_test {
 namespace {
 
+using nas_test::ReadFile;
 using nas_test::WriteFile;
 using std::chrono::milliseconds;
 using std::chrono::seconds;
@@ -208,6 +209,24 @@ TEST_F(LoginTest, NobodyTakesAllCallsFromTheOthers) {
   const auto third = sleep(bob);
   ASSERT_TRUE(running(3));
   EXPECT_EQ(bob.Get("/shares").status, 503) << "bob has less than his, but that is all there is";
+}
+
+// What a user may have written, a child reads in which nothing leads back to root.
+TEST_F(LoginTest, ADownloadsChildIsItsUserForGood) {
+  SKIP_UNLESS_ROOT();
+  WriteFile(share_ + "/large", std::string(8 << 20, 'x'));
+  Server ann = StartWithLogins();
+  ASSERT_TRUE(ann.LogIn(kAnn, "right"));
+  Client client(ann.port);
+  ASSERT_TRUE(client.Send(ann.RequestText("GET", "/files/photo/large", "", "")));
+  const std::string server = std::to_string(ann.pid);
+  const passwd* account = getpwnam(kAnn);
+  const std::string uid = "\t" + std::to_string(account->pw_uid);
+  EXPECT_TRUE(Eventually([&] {
+    const std::string child = ReadFile("/proc/" + server + "/task/" + server + "/children");
+    const std::string status = ReadFile("/proc/" + child.substr(0, child.find(' ')) + "/status");
+    return status.find("Uid:" + uid + uid + uid + uid + "\n") != std::string::npos;
+  }));
 }
 
 TEST_F(LoginTest, EachUserSeesTheirOwn) {

@@ -37,7 +37,7 @@ constexpr char kPdf[] = "application/pdf";
 nas::Status BecomeForGood(const std::string& user) {
   const auto account = nas::BecomeUser(user);
   if (!account) return account.error();
-  if (setresuid(account->uid, account->uid, account->uid) != 0) return nas::ErrnoError();
+  nas::GiveUpRoot();
   return {};
 }
 

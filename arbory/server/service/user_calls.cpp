@@ -9,6 +9,7 @@
 #include "arbory/running_search.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
+#include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
 #include "platform/webfm.h"
@@ -25,9 +26,12 @@ Json::Value Error(int status, const char* sentence) {
   return body;
 }
 
-// Steps down to the user; answers itself when that fails.
+// Steps down to the user for good, as these calls make no folders; answers itself when that fails.
 bool Become(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) >= 0) return true;
+  if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) >= 0) {
+    nas::GiveUpRoot();
+    return true;
+  }
   response->SetError(kUnavailable, Error(kUnavailable, "The server cannot act as this user."));
   return false;
 }
