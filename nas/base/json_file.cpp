@@ -12,7 +12,7 @@ namespace Json {
 namespace {
 
 // Settings are kilobytes; anything beyond this is not such a file and would only cost memory.
-constexpr size_t kMaxFileBytes = size_t{256} << 20;
+constexpr size_t kMaxFileBytes = size_t{16} << 20;
 constexpr mode_t kNewFileMode = S_IRUSR | S_IWUSR;
 constexpr mode_t kModeBits = 07777;
 

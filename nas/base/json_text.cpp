@@ -126,14 +126,20 @@ void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
 }
 
 // JsonCpp's reader passes over comments inside arrays and objects even when told not to allow them.
-bool HasComment(std::string_view text) {
+// Each value but the first follows a bracket or a comma.
+bool HasCommentOrTooMany(std::string_view text) {
   bool in_string = false;
+  size_t values = 1;
   for (size_t at = 0; at < text.size(); ++at) {
-    if (text[at] == '/' && !in_string) return true;
-    if (text[at] == '\\')
+    const char byte = text[at];
+    if (byte == '\\') {
       ++at;
-    else if (text[at] == '"')
+    } else if (byte == '"') {
       in_string = !in_string;
+    } else if (!in_string) {
+      if (byte == '/') return true;
+      if ((byte == ',' || byte == '[' || byte == '{') && ++values > kJsonMaxValues) return true;
+    }
   }
   return false;
 }
@@ -170,7 +176,7 @@ std::string JsonText(const Json::Value& value, JsonBytes bytes) {
 }
 
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
-  if (HasComment(text)) return false;
+  if (HasCommentOrTooMany(text)) return false;
   Json::CharReaderBuilder settings;
   settings["collectComments"] = false;
   settings["allowComments"] = false;

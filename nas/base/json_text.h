@@ -26,9 +26,15 @@ inline constexpr int kJsonMaxDepth = 200;
 // Of a request, so that a record that holds parts of it can be read again.
 inline constexpr int kRequestMaxDepth = 100;
 
+// Of one document: far above what a request or record holds, the longest list of locations among
+// it. An empty array takes three bytes of text and a hundred of memory, so a bound on bytes alone
+// would not do.
+inline constexpr size_t kJsonMaxValues = 200'000;
+
 // Reads one JSON document of any type: no comments, nothing after it, at most `max_depth` levels
-// deep. False, with `out` untouched, for anything else: there is no more to tell, as the texts come
-// from programs. Strings may hold bytes that are not UTF-8. Of members of one name the last counts.
+// deep and at most kJsonMaxValues values, which are counted before any is made. False, with `out`
+// untouched, for anything else: there is no more to tell, as the texts come from programs. Strings
+// may hold bytes that are not UTF-8. Of members of one name the last counts.
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth = kJsonMaxDepth);
 
 }  // namespace nas

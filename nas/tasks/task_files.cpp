@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <string_view>
 
 #include "nas/base/accounts.h"
@@ -28,8 +29,14 @@ constexpr char kFolderLock[] = "lock";
 constexpr std::string_view kRecordSuffix = ".json";
 constexpr std::string_view kLockSuffix = ".lock";
 constexpr mode_t kPrivateMode = S_IRUSR | S_IWUSR;
-// A record holds a request's parameters and little more.
-constexpr size_t kMaxRecordBytes = size_t{16} << 20;
+// A record holds the locations of a request, which is a megabyte, and little more; the location of
+// a home is longer in the record than in the request.
+constexpr size_t kMaxRecordBytes = size_t{4} << 20;
+// Names in a task folder that one new task looks at, and records of living tasks that it reads: the
+// folder is the user's, who may fill it. What is over is looked at when these have been swept, and
+// counts as running.
+constexpr int kMostNames = 10'000;
+constexpr int kMostRecords = 100;
 // Kept in the lock file for the day the disk is full: a search that ends for want of space must
 // still be able to say so. Two blocks, as a directory may need one besides the record.
 constexpr off_t kReserveBytes = 8 * 1024;
@@ -222,13 +229,17 @@ void TaskFiles::SweepRecord(const std::string& name, time_t now) const {
 
 int TaskFiles::CountRunningAndSweep() const {
   int running = 0;
+  int read = 0;
+  int looked = 0;
   const time_t now = time(nullptr);
   for (const std::string& name : NamesIn(folder_.get(), ".").value_or({})) {
+    if (++looked > kMostNames) break;
     // Each task has a lock file from its first moment to its last.
     const std::string id = IdOf(name, kLockSuffix);
     if (id.empty()) {
       SweepRecord(name, now);
     } else if (IsAlive(id)) {
+      if (++read > kMostRecords) return INT_MAX;
       const auto state = Load(id);
       if (state && !state->finished) ++running;
     } else if (IsUntouched(name, now) && (IsUntouched(RecordName(id), now) || !Load(id))) {

@@ -80,6 +80,14 @@ TEST(Json, WritesWhatItReads) {
 }
 
 TEST(Json, RefusesWhatIsNotOneDocument) {
+  const auto list_of = [](size_t values) {  // the list itself counts as one
+    std::string text = "[\",,[{\"";
+    for (size_t count = 2; count < values; ++count) text += ",1";
+    return text + "]";
+  };
+  Json::Value list;
+  EXPECT_TRUE(nas::ParseJson(list_of(nas::kJsonMaxValues), &list));
+  EXPECT_FALSE(nas::ParseJson(list_of(nas::kJsonMaxValues + 1), &list)) << "too many values";
   const std::string deep(nas::kJsonMaxDepth + 1, '[');
   const std::string rows[] = {"",    " ",    "{",       "[1,]",     "{\"a\":1,}",
                               "1 2", "[1]x", "// c\n1", "[1/*c*/]", "'a'",
