@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <memory>
+#include <new>
 #include <optional>
 #include <utility>
 
@@ -15,11 +16,17 @@
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
 #include "nas/system/identity.h"
+#include "nas/system/memory.h"
 #include "nas/system/volumes.h"
 #include "platform/filesearch.h"
 
 namespace FileSearch {
 namespace {
+
+// Some kilobytes of memory a row, as the caller shapes it: from here on a page needs a permit ...
+constexpr std::uint64_t kLargePage = 20'000;
+// ... and so does any page of results that may have to be sorted first, at 100 bytes a row.
+constexpr std::uint64_t kManyRows = 500'000;
 
 std::string RelativePath(const nas::ResultRow& row) {
   std::string path(row.folder);
@@ -91,7 +98,7 @@ class Lender {
 
 class WfmSearchDBTask::Impl {
  public:
-  explicit Impl(const std::string& path) : path_(path) {}
+  Impl(const std::string& path, const std::string& user) : path_(path), user_(user) {}
 
   bool Query(unsigned long offset, unsigned long limit, const nas::Selection& selection,
              SelectCallback callback, void* context, unsigned long long* total);
@@ -99,6 +106,8 @@ class WfmSearchDBTask::Impl {
   bool Remove() { return nas::RemoveResultFile(path_); }
 
  private:
+  // For a page of so many rows of all.
+  nas::Status Permit(std::uint64_t page, std::uint64_t rows) const;
   bool FlushPurges();
 
   // Opened when it is first read: what cannot be read can still be removed.
@@ -108,6 +117,7 @@ class WfmSearchDBTask::Impl {
   }
 
   const std::string path_;
+  const std::string user_;
   std::optional<nas::ResultReader> reader_;
   // Purges asked for by a running selection wait for its end: it reads one state of the file.
   std::optional<std::uint32_t> current_;  // the row lent to the callback
@@ -119,6 +129,12 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
                                   void* context, unsigned long long* total) {
   nas::ResultReader& reader = Reader();
   reader.Begin();
+  const nas::Status permitted =
+      Permit(std::min<std::uint64_t>(limit, reader.rows()), reader.rows());
+  if (!permitted) {
+    nas::Report(permitted.error());
+    return false;
+  }
   const nas::ResultReader::Page page = reader.Select(selection, offset, limit);
   *total = page.total;
   Lender lender(reader, callback, context);
@@ -134,6 +150,11 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
   reader.End();
   FlushPurges();
   return true;
+}
+
+nas::Status WfmSearchDBTask::Impl::Permit(std::uint64_t page, std::uint64_t rows) const {
+  if (page < kLargePage && rows < kManyRows) return {};
+  return nas::TakeLargePermit(user_);
 }
 
 // False where they could not be stored (a full disk).
@@ -191,6 +212,8 @@ bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
     if (!parsed->terms().empty()) selection.pattern = std::move(*parsed);
   }
   return impl_->Query(offset, limit, selection, callback, context, total);
+} catch (const std::bad_alloc&) {
+  throw;  // the page is too large for the call, which says so
 } catch (const std::exception& error) {
   syslog(LOG_ERR, "search results: %s", error.what());
   return false;
@@ -218,7 +241,7 @@ WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* i
   nas::GiveUpRoot();
   const std::string path = nas::ResultPath(*folder, id);
   if (access(path.c_str(), F_OK) != 0) return nullptr;
-  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(path));
+  return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(path, user_));
 } catch (const std::exception& error) {
   syslog(LOG_ERR, "search results: %s", error.what());
   return nullptr;

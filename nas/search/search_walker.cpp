@@ -81,9 +81,6 @@ pid_t StartSorting(const std::string& path) {
   // Where no process can be had, listings sort for themselves.
   return nas::StartChild([&](int /*pipe*/) {
            if (nice(kSortingNiceness) == -1) errno = 0;
-           // Where memory runs out, this is what the machine can best do without.
-           const nas::UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC));
-           if (score) (void)nas::WriteAll(score.get(), "1000");
            nas::ResultReader(path).KeepAllOrderings();
          })
       .pid;

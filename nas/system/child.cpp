@@ -12,6 +12,7 @@
 
 #include "nas/base/error.h"
 #include "nas/base/file_io.h"
+#include "nas/system/memory.h"
 #include "platform/system.h"
 
 namespace nas {
@@ -20,6 +21,10 @@ namespace {
 constexpr int kFirstFreeFd = 3;
 // Set in tests, whose sanitizers report there what goes wrong in a child.
 constexpr char kKeepStandardError[] = "ARBORY_CHILD_STDERR";
+
+// Half of what makes a process the first to be killed. A sorter has the same as the worker that it
+// belongs to, but several times its memory.
+constexpr char kChildScore[] = "500";
 
 constexpr size_t kLengthBytes = sizeof(std::uint64_t);
 // Far above what a head holds: a file's name in two encodings and a few short fields.
@@ -62,10 +67,20 @@ int KeepOnly(int pipe_fd) {
   return close_range(above, ~0U, 0) == 0 ? pipe : -1;
 }
 
-[[noreturn]] void RunChild(const std::function<void(int pipe)>& body, int pipe_fd) {
+// To be called before the child becomes a user, who may not write this of a process that was root.
+void OfferToOutOfMemoryKiller() {
+  const UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC));
+  if (score) (void)WriteAll(score.get(), kChildScore);
+}
+
+[[noreturn]] void RunChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes,
+                           int pipe_fd) {
   setpgid(0, 0);  // before the parent's signal handlers go
   ResetSignals();
   const int pipe = KeepOnly(pipe_fd);
+  OfferToOutOfMemoryKiller();
+  if (memory_bytes > 0) LimitMemory(memory_bytes);
+  SetLastError(kErrorNone);
   try {
     if (pipe >= 0) body(pipe);
   } catch (...) {
@@ -92,14 +107,14 @@ bool ParseNumbers(std::string_view line, ReplyHead* head) {
 
 }  // namespace
 
-Child StartChild(const std::function<void(int pipe)>& body) {
+Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes) {
   Child child;
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) return child;
   child.fd = UniqueFd(ends[0]);
   const UniqueFd writable(ends[1]);
   child.pid = fork();
-  if (child.pid == 0) RunChild(body, writable.get());
+  if (child.pid == 0) RunChild(body, memory_bytes, writable.get());
   if (child.pid < 0) child.fd.Reset();
   return child;
 }
@@ -159,6 +174,11 @@ ReplyReader::State ReplyReader::Parse() {
 pid_t NLIBCProcFork() {
   const pid_t pid = fork();
   if (pid < 0) nas::SetLastError(nas::kErrorOther);
-  if (pid == 0) setsid();
+  if (pid == 0) {
+    setsid();
+    nas::SetLastError(nas::kErrorNone);
+    // A worker's threads have stacks, and a search may need more than a reply.
+    nas::LiftMemoryLimit();
+  }
   return pid;
 }

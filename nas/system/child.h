@@ -10,6 +10,8 @@
 //     has gone and a file that may not grow show as a failed write and do not end a worker;
 //   - has a process group of its own: a terminal's interrupt must not cut down a call that is about
 //     to tell a search's id;
+//   - is among the first to go where the machine runs out of memory, and so is what it forks;
+//   - has seen no failure: the last platform error is none;
 //   - never returns into its parent's code, whatever is thrown: it ends by _exit, since exit
 //     handlers and buffered output are the parent's.
 //
@@ -60,8 +62,10 @@ struct Child {
   UniqueFd fd;     // readable end of the pipe, O_NONBLOCK not set
 };
 
-// Forks a child that runs `body` and ends. `pipe` is the writable end. For a process of one thread.
-Child StartChild(const std::function<void(int pipe)>& body);
+// Forks a child that runs `body` and ends. `pipe` is the writable end. With `memory_bytes` the
+// child cannot take more memory of its own than that (LimitMemory); 0: no bound. For a process of
+// one thread.
+Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes = 0);
 
 // For the child. False when the parent has gone, which nobody needs to be told.
 bool SendReply(int pipe, const Reply& reply);

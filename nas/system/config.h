@@ -3,6 +3,7 @@
 // outside nas/system reads a configuration file or an environment variable; within it, child.h's
 // children alone look at one that is no configuration (for tests).
 
+#include <cstdint>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -48,6 +49,14 @@ struct Config {
   // How long a search goes on whose asker is gone without a word, for those made with a lease. A
   // browser looks after a hidden page once a minute.
   int lease_seconds = 150;
+  // Memory of one call. What is over is for listings of very many rows, of which one user has a few
+  // at once.
+  int call_memory_mb = 256;
+  int large_call_memory_mb = 2048;
+  int large_calls_per_user = 2;
+  std::uint64_t call_memory_bytes() const { return Megabytes(call_memory_mb); }
+  std::uint64_t large_call_memory_bytes() const { return Megabytes(large_call_memory_mb); }
+  static std::uint64_t Megabytes(int count) { return static_cast<std::uint64_t>(count) << 20; }
   ServerSettings server;
 };
 

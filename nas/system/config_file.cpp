@@ -83,6 +83,11 @@ class Reader {
         {"searches_per_user",
          [&](const toml::node& node) { config->searches_per_user = Limit(node); }},
         {"lease_seconds", [&](const toml::node& node) { config->lease_seconds = Limit(node); }},
+        {"call_memory_mb", [&](const toml::node& node) { config->call_memory_mb = Limit(node); }},
+        {"large_call_memory_mb",
+         [&](const toml::node& node) { config->large_call_memory_mb = Limit(node); }},
+        {"large_calls_per_user",
+         [&](const toml::node& node) { config->large_calls_per_user = Limit(node); }},
         {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
     };
     ReadTable(document, keys);

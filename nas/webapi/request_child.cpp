@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <exception>
+#include <new>
 #include <optional>
 
 #include "nas/base/error.h"
@@ -69,6 +70,12 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   } catch (const TooManyPieces& error) {
     syslog(LOG_ERR, "%s %s refused: %s", row.api, row.method, error.what());
     return encode(kCodeBadRequest, Json::Value());
+  } catch (const std::bad_alloc&) {
+    // What the entry function held is free again.
+    syslog(LOG_ERR, "%s %s ran out of the memory of a call", row.api, row.method);
+    Json::Value data;
+    data["error"] = "The reply takes more memory than a call may have; ask for fewer rows.";
+    return encode(kCodeUnknownFailure, data);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s %s failed: %s", row.api, row.method, error.what());
   } catch (...) {

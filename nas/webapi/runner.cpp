@@ -16,6 +16,7 @@
 #include "nas/base/json_text.h"
 #include "nas/base/sqlite.h"
 #include "nas/base/system_call.h"
+#include "nas/system/config.h"
 #include "nas/webapi/request_child.h"
 
 namespace nas {
@@ -102,11 +103,13 @@ void PrepareForCalls() {
 }
 
 Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
-  return StartChild([&](int pipe) {
-    const pid_t self = getpid();
-    const Reply reply = ServeCall(row, call, encode);
-    if (getpid() == self) SendReply(pipe, reply);
-  });
+  return StartChild(
+      [&](int pipe) {
+        const pid_t self = getpid();
+        const Reply reply = ServeCall(row, call, encode);
+        if (getpid() == self) SendReply(pipe, reply);
+      },
+      CurrentConfig().call_memory_bytes());
 }
 
 Reply FinishCall(Child child, const ReplyEncoder& encode, const std::function<bool()>& go_on) {

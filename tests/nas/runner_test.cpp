@@ -13,6 +13,7 @@
 #include <stdexcept>
 
 #include "nas/base/json_text.h"
+#include "nas/system/memory.h"
 #include "nas/system/user_state.h"
 #include "nas/system/volumes.h"
 #include "nas/webapi/runner.h"
@@ -302,6 +303,115 @@ TEST_F(RunnerTest, RootsCallsGiveRootUpBeforeTheyReadWhatTheUserWrote) {
     EXPECT_EQ(Run(row.entry, Json::Value(), kOtherUser),
               R"({"code":0,"data":"Uid:\t65534\t65534\t65534\t65534"})")
         << row.why;
+  }
+}
+
+TEST_F(RunnerTest, ACallMayNotTakeAllMemory) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "sanitizers map more than they use";
+#endif
+  nas::Config config = nas::CurrentConfig();
+  config.call_memory_mb = 64;
+  config.large_call_memory_mb = 256;
+  config.large_calls_per_user = 1;
+  nas::Configure(config);
+  const std::string too_large =
+      R"({"code":100,"data":{"error":)"
+      R"("The reply takes more memory than a call may have; ask for fewer rows."}})";
+  const struct {
+    const char* why;
+    NUVA::APIEntry entry;
+    std::string reply;
+  } rows[] = {
+      {"within the bound",
+       [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(30 << 20, 'x').size() > 0); },
+       R"({"code":0,"data":true})"},
+      {"beyond it",
+       [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(100 << 20, 'x').size() > 0); },
+       too_large},
+      {"its reply is beyond it",
+       [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(30 << 20, '\n')); }, too_large},
+      {"with a permit",
+       [](APIRequest* request, APIResponse* r) {
+         const auto permit = nas::TakeLargePermit(request->GetLoginUserName());
+         r->SetError(0, permit && std::string(100 << 20, 'x').size() > 0);
+       },
+       R"({"code":0,"data":true})"},
+      {"beyond what a permit gives",
+       [](APIRequest* request, APIResponse* r) {
+         const auto permit = nas::TakeLargePermit(request->GetLoginUserName());
+         r->SetError(0, permit && std::string(300 << 20, 'x').size() > 0);
+       },
+       too_large},
+      {"in a worker there is no bound",
+       [](APIRequest*, APIResponse* r) {
+         const pid_t worker = NLIBCProcFork();
+         if (worker == 0) _exit(std::string(100 << 20, 'x').size() > 0 ? 0 : 1);
+         int status = -1;
+         waitpid(worker, &status, 0);
+         r->SetError(0, status);
+       },
+       R"({"code":0,"data":0})"},
+  };
+  for (const auto& row : rows) EXPECT_EQ(Run(row.entry), row.reply) << row.why;
+}
+
+TEST_F(RunnerTest, OneUserHasFewLargeCallsAtOnce) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "without a bound there are no permits";
+#endif
+  nas::Config config = nas::CurrentConfig();
+  config.large_calls_per_user = 2;
+  nas::Configure(config);
+  // Three at once: the third has its permit when one of the others ends, and not before.
+  const NUVA::APIMethod row = {
+      "Api", 2, "method", [](APIRequest* request, APIResponse* r) {
+        const std::string user = request->GetLoginUserName();
+        const auto permit = nas::TakeLargePermit(user);
+        const std::string held = nas::TaskFolder(user) + "/held";
+        const std::string mine = held + std::to_string(getpid());
+        WriteFile(mine, "");
+        usleep(300'000);
+        int count = 0;
+        for (const auto& entry : std::filesystem::directory_iterator(nas::TaskFolder(user))) {
+          count += entry.path().string().starts_with(held);
+        }
+        unlink(mine.c_str());
+        r->SetError(0, permit.ok() && count <= 2);
+      }};
+  ASSERT_TRUE(nas::EnterUserState(Me()));
+  std::vector<nas::Child> calls;
+  for (int call = 0; call < 3; ++call) {
+    calls.push_back(
+        nas::StartCall(row, {"method", Json::Value(), Me(), "sid"}, nas::EncodeJsonReply));
+  }
+  for (nas::Child& call : calls) {
+    EXPECT_EQ(nas::FinishCall(std::move(call), nas::EncodeJsonReply).body,
+              R"({"code":0,"data":true})");
+  }
+}
+
+TEST_F(RunnerTest, ACallIsAmongTheFirstToGoAndKnowsOfNoFailure) {
+  NUVAUSER* nobody = nullptr;
+  ASSERT_LT(NUVAUserGet("no-such-user-here", &nobody), 0);
+  ASSERT_NE(NLIBCErrGet(), 0);
+  const NUVA::APIEntry entry = [](APIRequest*, APIResponse* r) {
+    Json::Value data;
+    data["failure"] = NLIBCErrGet();
+    nas::SetLastError(nas::kErrorOther);
+    const pid_t worker = NLIBCProcFork();
+    if (worker == 0) {
+      const bool good = NLIBCErrGet() == 0 && ReadFile("/proc/self/oom_score_adj") == "500\n";
+      _exit(good ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(worker, &status, 0);
+    data["worker"] = status;
+    r->SetError(0, data);
+  };
+  for (const std::string& user : {Me(), std::string(AmRoot() ? kOtherUser : Me())}) {
+    EXPECT_EQ(Run(entry, Json::Value(), user), R"({"code":0,"data":{"failure":0,"worker":0}})")
+        << user;
   }
 }
 

@@ -121,8 +121,9 @@ void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
 
 // The code is the HTTP status and the data its JSON body.
 nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
-  if (!data.isNull()) return {{code, code}, nas::JsonText(data, nas::JsonBytes::kClean)};
-  // The runner answers by itself, without data, when the call could not even begin.
+  if (!data.isNull() && code >= kOk)
+    return {{code, code}, nas::JsonText(data, nas::JsonBytes::kClean)};
+  // The runner answers by itself when the call could not even begin, or came to no end.
   return {
       {kUnavailable, kUnavailable},
       ErrorReply(kUnavailable, "The user's state folder cannot be used; the system log says why.")
