@@ -176,7 +176,8 @@ std::string JsonText(const Json::Value& value, JsonBytes bytes) {
 }
 
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
-  if (HasCommentOrTooMany(text)) return false;
+  // JsonCpp's reader takes a NUL for the text's end, whatever follows.
+  if (HasCommentOrTooMany(text) || text.find('\0') != std::string_view::npos) return false;
   Json::CharReaderBuilder settings;
   settings["collectComments"] = false;
   settings["allowComments"] = false;

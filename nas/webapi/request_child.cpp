@@ -18,7 +18,8 @@ namespace {
 
 class Request : public NUVA::APIRequest {
  public:
-  Request(const NUVA::APIMethod& row, const ApiCall& call) : row_(row), call_(call) {}
+  Request(const NUVA::APIMethod& row, const ApiCall& call, const Json::Value& params)
+      : row_(row), call_(call), params_(params) {}
 
   std::string GetLoginUserName() const override { return call_.user; }
   std::string GetSessionID() const override { return call_.session; }
@@ -27,15 +28,16 @@ class Request : public NUVA::APIRequest {
   int GetAPIVersion() const override { return row_.version; }
 
   bool HasParam(const std::string& name) const override {
-    return call_.params.isObject() && call_.params.isMember(name);
+    return params_.isObject() && params_.isMember(name);
   }
   Json::Value GetParam(const std::string& name, const Json::Value& fallback) const override {
-    return HasParam(name) ? call_.params[name] : fallback;
+    return HasParam(name) ? params_[name] : fallback;
   }
 
  private:
   const NUVA::APIMethod& row_;
   const ApiCall& call_;
+  const Json::Value& params_;
 };
 
 class Response : public NUVA::APIResponse {
@@ -61,9 +63,13 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   SetLastError(kErrorNone);
   errno = 0;
   if (call.leased) LeaseNewTasks();
-  Request request(row, call);
   Response response(encode);
   try {
+    Json::Value read;
+    if (call.read_params) {
+      if (auto trouble = call.read_params(&read)) return std::move(*trouble);
+    }
+    Request request(row, call, call.read_params ? read : call.params);
     row.entry(&request, &response);
     if (response.reply()) return *response.reply();
     syslog(LOG_ERR, "%s %s gave no reply", row.api, row.method);

@@ -6,6 +6,7 @@
 // thread, as every fork is.
 
 #include <functional>
+#include <optional>
 #include <string>
 
 #include "nas/system/child.h"
@@ -39,6 +40,9 @@ struct ApiCall {
   // A search that the call begins ends when nobody has asked after it for Config::lease_seconds,
   // and its results go with it.
   bool leased = false;
+  // Where given, makes `params` in the request child, as the user: reading what a client sent costs
+  // time and memory that nobody else shall wait for. Gives the reply instead when it cannot.
+  std::function<std::optional<Reply>(Json::Value* params)> read_params = {};
 };
 
 // Turns the entry function's reply into what is sent. Runs in the request child, so that a caller

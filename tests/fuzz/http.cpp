@@ -19,9 +19,17 @@ using asio::ip::tcp;
 constexpr int kBodyBytes = 4096;
 constexpr size_t kMostBytes = size_t{40} << 10;
 
+class EndlessRoom : public arbory::BodyRoom {
+ public:
+  bool Take(std::uint64_t /*bytes*/) override { return true; }
+};
+
 // Answers every request with what it was taken for.
 class Echo : public arbory::HttpService {
  public:
+  std::shared_ptr<arbory::BodyRoom> RoomFor(const arbory::HttpRequest& /*request*/) override {
+    return std::make_shared<EndlessRoom>();
+  }
   arbory::Answer Handle(arbory::HttpRequest* request) override {
     Check(*request);
     methods.push_back(request->method);

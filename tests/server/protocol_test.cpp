@@ -153,6 +153,7 @@ TEST_F(ProtocolTest, BodiesOfEveryWrongKindAreRefused) {
       {"7", "application/json", 400},
       {"{\"a\":" + deep, "application/json", 400},
       {std::string("\0", 1), "application/json", 400},
+      {std::string("{}\0{}", 5), "application/json", 400},
       {"{\"text\":\"" + std::string(1000, 'a') + "\"}", "application/json", 413},
   };
   for (const auto& row : rows) {

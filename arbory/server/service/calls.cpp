@@ -39,8 +39,11 @@ Answer Calls::Run(const std::string& user, const std::string& name,
   const auto begun = Clock::now();
   answer.make_reply = [this, name, begun](const nas::ReplyHead* head) {
     const std::chrono::duration<double> spent = Clock::now() - begun;
-    metrics_.CountCall(name, head == nullptr ? nas::kCodeUnknownFailure : head->code,
-                       spent.count());
+    const bool malformed = head != nullptr && head->status == kBadRequest;
+    if (!name.empty() && !malformed) {
+      metrics_.CountCall(name, head == nullptr ? nas::kCodeUnknownFailure : head->code,
+                         spent.count());
+    }
     return ChildsReply(head);
   };
   return answer;

@@ -26,7 +26,8 @@ class Calls {
 
   // Has the child that `start` forks answer for the user; 503 when too many run or none can be
   // forked. `name` names the call in the counts: a route or a row of the module, never what a
-  // client made up. A child that ends without a reply is answered for with 503.
+  // client made up; empty for what is not counted. Nor is what turns out malformed in the child. A
+  // child that ends without a reply is answered for with 503.
   Answer Run(const std::string& user, const std::string& name,
              const std::function<nas::Child()>& start);
 

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "arbory/caller.h"
+#include "arbory/server/service/bodies.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
@@ -17,9 +18,12 @@ constexpr long kMinuteSeconds = 60;
 constexpr std::chrono::seconds kRefusalTime{2};
 // Names and passwords longer than this are not looked at.
 constexpr size_t kMaxCredentialBytes = 1024;
-// Both, each byte escaped, and some room. Reading a megabyte of JSON takes the loop a fifth of a
-// second, which nobody may ask for who is not logged in.
-constexpr size_t kMaxLoginBytes = size_t{16} << 10;
+// Both, each byte escaped, and some room.
+constexpr std::uint64_t kMaxBodyBytes = Bodies::kSmallBytes;
+// Objects, lists and further members in them. These bodies alone are read in the loop, which must
+// know whom a login is for and whether a logout is one; many small values would take it
+// milliseconds.
+constexpr int kMaxParts = 32;
 constexpr char kStopMethod[] = "stop";
 
 // Takes as long wherever the texts differ.
@@ -33,6 +37,32 @@ bool SameText(const std::string& a, const std::string& b) {
 
 bool IsAbsurd(const std::string& text) {
   return text.size() > kMaxCredentialBytes || text.find('\0') != std::string::npos;
+}
+
+bool HasFewParts(const std::string& json) {
+  int parts = 0;
+  bool in_string = false;
+  for (size_t at = 0; at < json.size(); ++at) {
+    const char byte = json[at];
+    if (byte == '\\') {
+      ++at;
+    } else if (byte == '"') {
+      in_string = !in_string;
+    } else if (!in_string && (byte == '{' || byte == '[' || byte == ',')) {
+      ++parts;
+    }
+  }
+  return parts <= kMaxParts;
+}
+
+// The parameters in the body of a request that this file answers, or the reply to a bad one.
+std::variant<Json::Value, HttpReply> SmallBody(const HttpRequest& request, const char* too_large) {
+  if (request.body_bytes > kMaxBodyBytes) {
+    return ErrorReply(kTooLarge, too_large);
+  }
+  auto params = HasFewParts(request.body) ? JsonBody(request.body) : std::nullopt;
+  if (!params) return BadBodyReply();
+  return std::move(*params);
 }
 
 }  // namespace
@@ -56,6 +86,11 @@ std::optional<HttpReply> Entrance::LetIn(HttpRequest* request) {
   if (!session) return NotLoggedIn();
   request->user = session->user;
   return std::nullopt;
+}
+
+std::string Entrance::UserOf(const HttpRequest& request) {
+  const auto session = sessions_.Find(SessionId(request), std::time(nullptr));
+  return session ? session->user : std::string();
 }
 
 HttpReply Entrance::Describe(const HttpRequest& request) {
@@ -85,13 +120,11 @@ Answer Entrance::Login(const HttpRequest& request) {
   if (!rules_.single_user.empty()) {
     return ErrorReply(kForbidden, "This server has one user; open the address it printed.");
   }
-  if (request.body.size() > kMaxLoginBytes) {
-    return ErrorReply(kTooLarge, "The user or the password is too long.");
-  }
-  const auto params = JsonBody(request);
-  if (!params) return BadBodyReply();
-  const Json::Value& user = (*params)["user"];
-  const Json::Value& password = (*params)["password"];
+  auto body = SmallBody(request, "The user or the password is too long.");
+  if (auto* reply = std::get_if<HttpReply>(&body)) return std::move(*reply);
+  const Json::Value& params = std::get<Json::Value>(body);
+  const Json::Value& user = params["user"];
+  const Json::Value& password = params["password"];
   if (!user.isString() || !password.isString() || user.asString().empty()) {
     return ErrorReply(kBadRequest, R"(Send {"user": TEXT, "password": TEXT}.)");
   }
@@ -139,9 +172,9 @@ HttpReply Entrance::LoginReply(const Attempt& attempt, const nas::ReplyHead* hea
 }
 
 Answer Entrance::Logout(const HttpRequest& request) {
-  const auto params = JsonBody(request);
-  if (!params) return BadBodyReply();
-  const Json::Value& stops = (*params)["stop_searches"];
+  auto body = SmallBody(request, "The request is too large; send fewer parameters.");
+  if (auto* reply = std::get_if<HttpReply>(&body)) return std::move(*reply);
+  const Json::Value& stops = std::get<Json::Value>(body)["stop_searches"];
   if (!stops.isNull() && !stops.isBool()) {
     return ErrorReply(kBadRequest, R"(Send {"stop_searches": true} or false.)");
   }

@@ -40,6 +40,8 @@ class Entrance {
 
   // Fills in the request's user; a refusal when it has no session.
   std::optional<HttpReply> LetIn(HttpRequest* request);
+  // Whose session the request has; empty for nobody's.
+  std::string UserOf(const HttpRequest& request);
   // Of a request that was let in: who and until when.
   HttpReply Describe(const HttpRequest& request);
   // The id in the request's cookie; empty without one. It is the key to the account.

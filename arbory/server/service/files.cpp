@@ -85,8 +85,7 @@ nas::Result<RegularFile> OpenFile(const FileRequest& request) {
 }
 
 void SendError(int pipe, int status, const char* sentence) {
-  const HttpReply reply = ErrorReply(status, sentence);
-  nas::SendReply(pipe, {{status, status, reply.fields}, reply.body});
+  nas::SendReply(pipe, AsChildsReply(ErrorReply(status, sentence)));
 }
 
 // What is no file and what lies outside the share is as if it were not there.

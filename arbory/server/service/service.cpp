@@ -21,6 +21,7 @@ namespace {
 constexpr int kNoSuchApi = 102;
 constexpr int kNoSuchMethod = 103;
 constexpr int kNoSuchVersion = 104;
+constexpr char kRetrySeconds[] = "1";
 
 std::string ListRows(const nas::Module& module) {
   Json::Value rows(Json::arrayValue);
@@ -34,10 +35,29 @@ std::string ListRows(const nas::Module& module) {
   return nas::JsonText(rows, nas::JsonBytes::kClean);
 }
 
+// Reads the parameters in a child, from its own copy of the body.
+auto ReaderOf(const std::string& body) {
+  return [&body](Json::Value* params) -> std::optional<nas::Reply> {
+    auto read = JsonBody(body);
+    if (!read) return AsChildsReply(BadBodyReply());
+    *params = std::move(*read);
+    return std::nullopt;
+  };
+}
+
 CallLimits LimitsOf(const Service::Setup& setup) {
   const int all = setup.settings.max_calls;
   // With logins nobody may take all of it, so that others get through.
   return {all, setup.single_user.empty() ? (all + 1) / 2 : all};
+}
+
+// So many of the largest bodies: a person's page sends small ones, one after the other.
+constexpr std::uint64_t kLargestOfOneUser = 2;
+constexpr std::uint64_t kLargestOfAll = 8;
+
+Bodies::Limits BodyLimitsOf(const Service::Setup& setup) {
+  const auto largest = static_cast<std::uint64_t>(setup.settings.body_bytes);
+  return {kLargestOfAll * largest, kLargestOfOneUser * largest};
 }
 
 Entrance::Rules RulesOf(const Service::Setup& setup) {
@@ -111,6 +131,7 @@ Service::Service(Setup setup, const nas::Module& module)
       module_(module),
       calls_(
           LimitsOf(setup_), [this] { return setup_.counts().children; }, &metrics_),
+      bodies_(BodyLimitsOf(setup_)),
       entrance_(RulesOf(setup_), module, &calls_, &metrics_),
       api_list_(ListRows(module)),
       openapi_(OpenApiText(module, Routes())) {}
@@ -120,6 +141,10 @@ void Service::Finished(const HttpRequest& request, int status, std::uint64_t byt
   if (setup_.settings.access_log) {
     (void)nas::WriteAll(STDERR_FILENO, AccessLine(request, status, bytes));
   }
+}
+
+std::shared_ptr<BodyRoom> Service::RoomFor(const HttpRequest& request) {
+  return request.method == "POST" ? bodies_.RoomOf(entrance_.UserOf(request)) : nullptr;
 }
 
 Answer Service::Handle(HttpRequest* request) {
@@ -142,7 +167,7 @@ std::optional<HttpReply> Service::Refusal(const Route& route, HttpRequest* reque
   if (route.method == RouteMethod::kPost) {
     const std::string origin_trouble = TroubleWithOrigin(*request, setup_.site);
     if (!origin_trouble.empty()) return ErrorReply(kForbidden, origin_trouble);
-    if (!request->body.empty() && !IsJson(*request)) {
+    if (request->body_bytes != 0 && !IsJson(*request)) {
       return ErrorReply(kNotJson, "Send the parameters as Content-Type: application/json.");
     }
   }
@@ -164,21 +189,36 @@ Answer Service::MetricsReply() {
 }
 
 Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
-  const auto params = JsonBody(request);
-  if (!params) return BadBodyReply();
+  if (request.body.size() != request.body_bytes) {
+    return BusyReply(kUnavailable, "Other requests of this size are being answered; try again.",
+                     kRetrySeconds);
+  }
+  Answer answer = StartCall(request, path);
+  if (auto* child = std::get_if<ChildAnswer>(&answer)) {
+    // The child holds the body as long as it runs.
+    child->token = std::make_shared<std::pair<std::shared_ptr<void>, std::shared_ptr<BodyRoom>>>(
+        std::move(child->token), request.room);
+  }
+  return answer;
+}
+
+Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
   int version = 0;
   const std::string& text = path[2];
   const auto parsed = std::from_chars(text.data(), text.data() + text.size(), version);
   const bool is_number = parsed.ec == std::errc() && parsed.ptr == text.data() + text.size();
   const NUVA::APIMethod* row = is_number ? module_.Find(path[1], version, path[3]) : nullptr;
-  if (row == nullptr) return NoSuchRow(path);
+  nas::ApiCall call = {path[3], Json::Value(Json::objectValue), request.user, "",
+                       request.Field("arbory-lease") != nullptr};
+  if (!request.body.empty()) call.read_params = ReaderOf(request.body);
+  if (row == nullptr) return NoSuchRow(path, call);
   const std::string session = entrance_.SessionId(request);
   Answer answer = calls_.Run(request.user, std::string(row->api) + "/" + row->method, [&] {
     // The id is the key to the account, which no log line of the module needs to hold whole.
     constexpr size_t kShown = 8;
-    const bool leased = request.Field("arbory-lease") != nullptr;
-    return nas::StartCall(*row, {path[3], *params, request.user, session.substr(0, kShown), leased},
-                          nas::EncodeJsonReply);
+    call.session = session.substr(0, kShown);
+    call.leased = request.Field("arbory-lease") != nullptr;
+    return nas::StartCall(*row, call, nas::EncodeJsonReply);
   });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [make = std::move(child->make_reply)](const nas::ReplyHead* head) {
@@ -190,7 +230,14 @@ Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
   return answer;
 }
 
-HttpReply Service::NoSuchRow(const RequestPath& path) const {
+// A body that is no object is told of first, and only a child looks into one.
+Answer Service::NoSuchRow(const RequestPath& path, const nas::ApiCall& call) {
+  HttpReply reply = NoSuchRowReply(path);
+  if (!call.read_params) return reply;
+  return calls_.Run(call.user, "", [&] { return StartReply(call, AsChildsReply(reply)); });
+}
+
+HttpReply Service::NoSuchRowReply(const RequestPath& path) const {
   bool has_api = false;
   bool has_version = false;
   for (const NUVA::APIMethod* row = module_.table(); row->api != nullptr; ++row) {

@@ -7,6 +7,7 @@
 #include <span>
 #include <string>
 
+#include "arbory/server/service/bodies.h"
 #include "arbory/server/service/calls.h"
 #include "arbory/server/service/entrance.h"
 #include "arbory/server/service/guard.h"
@@ -37,13 +38,16 @@ class Service : public HttpService {
   // Every path is answered by one of these; the last stands for all that are not named.
   static std::span<const Route> Routes();
 
+  std::shared_ptr<BodyRoom> RoomFor(const HttpRequest& request) override;
   Answer Handle(HttpRequest* request) override;
   void Finished(const HttpRequest& request, int status, std::uint64_t bytes) override;
 
  private:
   Answer MetricsReply();
   Answer CallApi(const HttpRequest& request, const RequestPath& path);
-  HttpReply NoSuchRow(const RequestPath& path) const;
+  Answer StartCall(const HttpRequest& request, const RequestPath& path);
+  Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
+  HttpReply NoSuchRowReply(const RequestPath& path) const;
   Answer GetFile(const HttpRequest& request, const RequestPath& path);
   // The reply to a request that may not ask this route.
   std::optional<HttpReply> Refusal(const Route& route, HttpRequest* request);
@@ -52,6 +56,7 @@ class Service : public HttpService {
   const nas::Module& module_;
   Metrics metrics_;
   Calls calls_;
+  Bodies bodies_;
   Entrance entrance_;
   const std::string api_list_;
   const std::string openapi_;

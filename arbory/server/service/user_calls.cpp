@@ -137,6 +137,15 @@ nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Valu
 
 }  // namespace
 
+nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply) {
+  const NUVA::APIMethod row = {"arbory", 1, "",
+                               [](NUVA::APIRequest* /*request*/, NUVA::APIResponse* response) {
+                                 response->SetError(kOk, Json::Value());
+                               }};
+  return nas::StartCall(row, call,
+                        [&](int /*code*/, const Json::Value& /*data*/) { return reply; });
+}
+
 nas::Child StartListShares(const std::string& user) {
   return Start(ListSharesEntry, user, Json::Value());
 }

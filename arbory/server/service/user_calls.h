@@ -20,4 +20,7 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 // Stops the user's running searches by the module's own method "stop". {"stopped":N}.
 nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop);
 
+// Has the call's parameters read and gives `reply` where they are well-formed.
+nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply);
+
 }  // namespace arbory

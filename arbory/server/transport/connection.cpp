@@ -109,6 +109,9 @@ void Connection::AwaitRequest() {
   between_requests_ = true;
   if (host_->stopping()) return Drop();
   if (in_.size() > 0) return ReadHeader();
+  // What a large request or reply needed is not kept for the time until the next one.
+  if (in_.capacity() > kReadBytes) in_.shrink_to_fit();
+  if (out_.capacity() > kReadBytes) std::string().swap(out_);
   Arm(host_->settings().idle_seconds);
   socket_.async_read_some(in_.prepare(kReadBytes),
                           [self = shared_from_this()](Error error, size_t count) {
@@ -126,7 +129,7 @@ void Connection::ReadHeader() {
   request_.method.clear();
   request_.target.clear();
   request_.fields.clear();
-  request_.body.clear();
+  ForgetBody();
   request_.user.clear();
   request_.begun = Clock::now();
   parser_.emplace();
@@ -150,6 +153,7 @@ void Connection::OnHeader(Error error) {
   }
   if (error) return OnReadError(error);
   if (!EndsClearly(request_)) return OnReadError(http::error::bad_transfer_encoding);
+  parser_->get().body().room = host_->service().RoomFor(request_);
   const std::string* expect = request_.Field("expect");
   if (expect == nullptr) return ReadBody();
   out_ = "HTTP/1.1 100 Continue\r\n\r\n";
@@ -187,10 +191,22 @@ void Connection::Refuse(int status, const char* sentence) {
 
 void Connection::Dispatch() {
   keep_alive_ = parser_->keep_alive() && !host_->stopping();
-  request_.body = std::move(parser_->get().body());
+  HeldBody::value_type& body = parser_->get().body();
+  request_.body = std::move(body.bytes);
+  request_.body_bytes = body.came;
+  request_.room = std::move(body.room);
   Answer answer = HandleSafely();
+  // A child that needs it has its own by now.
+  ForgetBody();
   if (auto* reply = std::get_if<HttpReply>(&answer)) return Send(std::move(*reply));
   AwaitChild(std::move(std::get<ChildAnswer>(answer)));
+}
+
+void Connection::ForgetBody() {
+  std::string().swap(request_.body);
+  request_.room.reset();
+  request_.body_bytes = 0;
+  if (parser_) parser_->get().body() = {};
 }
 
 // One request's trouble, such as no memory for its answer, is not the others'.

@@ -8,12 +8,12 @@
 #include <boost/asio/steady_timer.hpp>
 #include <boost/beast/core/flat_buffer.hpp>
 #include <boost/beast/http/parser.hpp>
-#include <boost/beast/http/string_body.hpp>
 #include <memory>
 #include <optional>
 #include <string>
 
 #include "arbory/server/transport/child_pipe.h"
+#include "arbory/server/transport/held_body.h"
 #include "arbory/server/transport/http.h"
 #include "nas/system/child.h"
 #include "nas/system/config.h"
@@ -48,7 +48,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void Abort();
 
  private:
-  using Parser = boost::beast::http::request_parser<boost::beast::http::string_body>;
+  using Parser = boost::beast::http::request_parser<HeldBody>;
   using Error = boost::system::error_code;
 
   // What the socket does is cancelled, and timed_out_ set, after this long.
@@ -60,6 +60,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void OnReadError(Error error);
   void Dispatch();
   Answer HandleSafely();
+  void ForgetBody();
   void Refuse(int status, const char* sentence);
 
   void Send(HttpReply reply);

@@ -43,12 +43,22 @@ enum HttpStatus : int {
 using Clock = std::chrono::steady_clock;
 using Fields = std::vector<std::pair<std::string, std::string>>;
 
+// Counts what the server holds of one request's body; what was taken is given back with it.
+class BodyRoom {
+ public:
+  virtual ~BodyRoom() = default;
+  // False, with nothing taken, where so many more may not be held.
+  virtual bool Take(std::uint64_t bytes) = 0;
+};
+
 struct HttpRequest {
   std::string method;
-  std::string target;  // as sent
-  Fields fields;       // names in lower case
-  std::string body;
-  std::string peer;  // the client's address
+  std::string target;              // as sent
+  Fields fields;                   // names in lower case
+  std::string body;                // empty where there was no room to hold it
+  std::uint64_t body_bytes = 0;    // that came
+  std::shared_ptr<BodyRoom> room;  // that the body is held in
+  std::string peer;                // the client's address
   bool from_loopback = false;
   Clock::time_point begun;
 
@@ -87,6 +97,8 @@ using Answer = std::variant<HttpReply, ChildAnswer>;
 class HttpService {
  public:
   virtual ~HttpService() = default;
+  // The room for the body of a request whose header has come; null when none of it is needed.
+  virtual std::shared_ptr<BodyRoom> RoomFor(const HttpRequest& request) = 0;
   // In the loop, so it must not wait. The request is the caller's, and whole. What it throws is
   // answered with 503.
   virtual Answer Handle(HttpRequest* request) = 0;

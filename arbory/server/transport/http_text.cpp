@@ -124,10 +124,10 @@ std::string LowerCase(std::string_view text) {
   return lower;
 }
 
-std::optional<Json::Value> JsonBody(const HttpRequest& request) {
+std::optional<Json::Value> JsonBody(const std::string& body) {
   Json::Value params(Json::objectValue);
-  if (request.body.empty()) return params;
-  const bool read = nas::ParseJson(request.body, &params, nas::kRequestMaxDepth);
+  if (body.empty()) return params;
+  const bool read = nas::ParseJson(body, &params, nas::kRequestMaxDepth);
   return read && params.isObject() ? std::optional(params) : std::nullopt;
 }
 
@@ -137,6 +137,10 @@ HttpReply JsonReply(int status, std::string body) {
   return {status,
           {{"Content-Type", "application/json"}, {"Cache-Control", "no-store"}},
           std::move(body)};
+}
+
+nas::Reply AsChildsReply(HttpReply reply) {
+  return {{reply.status, reply.status, std::move(reply.fields)}, std::move(reply.body)};
 }
 
 HttpReply ErrorReply(int status, int code, std::string_view sentence) {

@@ -38,12 +38,15 @@ std::string HttpDate(std::time_t time);
 std::string LowerCase(std::string_view text);
 
 // The parameters in a request's body, a JSON object; an empty one for an empty body, and nothing
-// for any other, which BadBodyReply answers.
-std::optional<Json::Value> JsonBody(const HttpRequest& request);
+// for any other, which BadBodyReply answers. Takes time and memory: in the loop for small bodies
+// only.
+std::optional<Json::Value> JsonBody(const std::string& body);
 HttpReply BadBodyReply();
 
 // `body` is JSON already. Never kept by a cache.
 HttpReply JsonReply(int status, std::string body);
+// As a child sends it.
+nas::Reply AsChildsReply(HttpReply reply);
 // {"code":STATUS,"error":SENTENCE}, or with a code of its own.
 HttpReply ErrorReply(int status, std::string_view sentence);
 HttpReply ErrorReply(int status, int code, std::string_view sentence);
