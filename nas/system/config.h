@@ -23,6 +23,7 @@ struct ServerSettings {
   std::string web_dir;                    // the built page; empty: the one beside the program
   bool behind_tls = false;                // a proxy in front speaks HTTPS
   std::vector<std::string> origins;       // what browsers may call it, such as "https://nas.home"
+  std::vector<std::string> proxies;       // addresses whose X-Forwarded-For is believed
   std::string pam_service = "arbory";
   std::string pam_dir;  // folder of PAM service files; empty: the system's
   bool access_log = true;
@@ -34,7 +35,7 @@ struct ServerSettings {
   int idle_seconds = 60;       // that a connection may wait for its next request
   int stall_seconds = 30;      // that a client may take nothing of a reply
   int call_seconds = 120;      // for a child to begin or go on with its reply
-  int logins_per_minute = 10;  // refused ones, by address and by user
+  int logins_per_minute = 10;  // refused ones of an address; of an account ten times as many
   int session_minutes = 12 * 60;
 };
 

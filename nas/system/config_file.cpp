@@ -130,6 +130,7 @@ class Reader {
         {"web_dir", [&](const toml::node& value) { server->web_dir = Path(value); }},
         {"behind_tls", [&](const toml::node& value) { server->behind_tls = Truth(value); }},
         {"origins", [&](const toml::node& value) { server->origins = Texts(value); }},
+        {"proxies", [&](const toml::node& value) { server->proxies = Texts(value); }},
         {"pam_service", [&](const toml::node& value) { server->pam_service = Text(value); }},
         {"pam_dir", [&](const toml::node& value) { server->pam_dir = Path(value); }},
         {"access_log", [&](const toml::node& value) { server->access_log = Truth(value); }},

@@ -7,6 +7,7 @@
 #include <set>
 #include <vector>
 
+#include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/connection.h"
 #include "arbory/server/transport/http_text.h"
 #include "tests/fuzz/fuzz.h"
@@ -68,6 +69,7 @@ class Host : public arbory::ConnectionHost {
   explicit Host(asio::io_context* loop) : loop_(*loop) { settings_.body_bytes = kBodyBytes; }
   asio::io_context& loop() override { return loop_; }
   const nas::ServerSettings& settings() const override { return settings_; }
+  const arbory::Proxies& proxies() const override { return proxies_; }
   arbory::HttpService& service() override { return echo; }
   bool stopping() const override { return false; }
   std::shared_ptr<arbory::ChildPipe> Adopt(arbory::ChildAnswer* /*answer*/) override {
@@ -81,6 +83,7 @@ class Host : public arbory::ConnectionHost {
  private:
   asio::io_context& loop_;
   nas::ServerSettings settings_;
+  arbory::Proxies proxies_{{}};
 };
 
 struct Exchange {

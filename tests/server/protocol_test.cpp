@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "arbory/server/service/guard.h"
+#include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/http_text.h"
 #include "tests/server/server_test.h"
 
@@ -250,6 +251,43 @@ TEST_F(ProtocolTest, ConnectionsAreBounded) {
   EXPECT_TRUE(Client(server.port).Ended());
   held.pop_back();
   EXPECT_TRUE(Eventually([&] { return server.Get("/health").status == 200; }));
+}
+
+TEST(AddressesTest, TheClientIsTheLastWhomAProxyNames) {
+  const arbory::Proxies proxies({"127.0.0.1", "10.0.0.1", "2001:db8::1"});
+  const struct {
+    const char* peer;
+    arbory::Fields fields;
+    const char* client;
+  } rows[] = {
+      {"127.0.0.1", {}, "127.0.0.1"},
+      {"1.2.3.4", {{"x-forwarded-for", "5.6.7.8"}}, "1.2.3.4"},
+      {"127.0.0.1", {{"x-forwarded-for", "5.6.7.8"}}, "5.6.7.8"},
+      {"::ffff:127.0.0.1", {{"x-forwarded-for", "::ffff:5.6.7.8"}}, "5.6.7.8"},
+      {"127.0.0.1", {{"x-forwarded-for", "9.9.9.9, 5.6.7.8 "}}, "5.6.7.8"},
+      {"127.0.0.1", {{"x-forwarded-for", "9.9.9.9,5.6.7.8,10.0.0.1"}}, "5.6.7.8"},
+      {"127.0.0.1", {{"x-forwarded-for", "9.9.9.9"}, {"x-forwarded-for", "5.6.7.8"}}, "5.6.7.8"},
+      {"127.0.0.1", {{"x-forwarded-for", "2001:DB8:0::7"}}, "2001:db8::7"},
+      {"2001:db8::1", {{"x-forwarded-for", "5.6.7.8, 127.0.0.1"}}, "5.6.7.8"},
+      {"127.0.0.1", {{"x-forwarded-for", "5.6.7.8, unknown, 10.0.0.1"}}, "10.0.0.1"},
+      {"127.0.0.1", {{"x-forwarded-for", "5.6.7.8,"}}, "127.0.0.1"},
+      {"127.0.0.1", {{"x-forwarded-for", ""}}, "127.0.0.1"},
+      {"127.0.0.1", {{"x-real-ip", "5.6.7.8"}}, "127.0.0.1"},
+      {"127.0.0.1", {{"x-forwarded-for", "10.0.0.1"}}, "10.0.0.1"},
+  };
+  for (const auto& row : rows) {
+    arbory::HttpRequest request;
+    request.fields = row.fields;
+    EXPECT_EQ(proxies.ClientOf(row.peer, request).text, row.client)
+        << row.peer << " " << (row.fields.empty() ? "" : row.fields[0].second);
+  }
+  EXPECT_THROW(arbory::Proxies({"nas.home"}), std::runtime_error);
+  for (const auto& [address, network] : {std::pair("1.2.3.4", "1.2.3.4"),
+                                         {"::ffff:1.2.3.4", "1.2.3.4"},
+                                         {"2001:db8:1:2:3:4:5:6", "2001:db8:1:2::"},
+                                         {"", ""}}) {
+    EXPECT_EQ(arbory::NetworkOf(address), network);
+  }
 }
 
 TEST(GuardTest, HostsAndOriginsFollowTheirTable) {

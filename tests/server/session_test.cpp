@@ -91,13 +91,25 @@ TEST(SessionsTest, EndWithTheirTime) {
   EXPECT_EQ(sessions.Count(1103), 0U);
 }
 
-TEST(LoginLimitTest, CountsRefusedOnesByAddressAndByUser) {
-  arbory::LoginLimit limit(2);
+TEST(LoginLimitTest, CountsRefusedOnesByAddressAndByAccount) {
+  arbory::LoginLimit counts(2);
+  const struct {
+    arbory::LoginLimit& counts;
+    int Begin(const std::string& address, const std::string& user, int second) const {
+      return counts.Begin(address, user, arbory::LoginLimit::Time(seconds(second)));
+    }
+    void Succeeded(const std::string& address, const std::string& user) const {
+      counts.Succeeded(address, user);
+    }
+  } limit{counts};
   EXPECT_EQ(limit.Begin("1.1.1.1", "ann", 100), 0);
   EXPECT_EQ(limit.Begin("1.1.1.1", "bob", 110), 0);
   EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 120), 40) << "the address has had two";
-  EXPECT_EQ(limit.Begin("2.2.2.2", "ann", 120), 0);
-  EXPECT_EQ(limit.Begin("3.3.3.3", "ann", 120), 40) << "the user has had two";
+  EXPECT_EQ(limit.Begin("2.2.2.2", "ann", 120), 0) << "no stranger locks an account";
+  for (int at = 2; at < 2 * arbory::LoginLimit::kAccountTimes; ++at) {
+    EXPECT_EQ(limit.Begin("9.9.9." + std::to_string(at), "ann", 120), 0);
+  }
+  EXPECT_EQ(limit.Begin("3.3.3.3", "ann", 120), 40) << "unless from many places";
   EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 160), 0) << "the first is a minute old";
   limit.Succeeded("1.1.1.1", "cid");
   EXPECT_EQ(limit.Begin("1.1.1.1", "cid", 160), 0) << "one that succeeded does not count";
@@ -174,6 +186,26 @@ TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
   EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 6\n"),
             std::string::npos);
   EXPECT_EQ(Log().find("right"), std::string::npos) << "a password was logged";
+}
+
+TEST_F(LoginTest, BehindAProxyEachClientIsCountedByItself) {
+  SKIP_UNLESS_ROOT();
+  const auto log_in = [](const Server& server, const char* from, const char* password) {
+    return server
+        .Ask("POST", "/login", std::string(R"({"user":"nobody","password":")") + password + "\"}",
+             std::string("Content-Type: application/json\r\nX-Forwarded-For: ") + from + "\r\n")
+        .status;
+  };
+  const Server behind = StartWithLogins("logins_per_minute = 1\nproxies = [\"127.0.0.1\"]\n");
+  EXPECT_EQ(log_in(behind, "203.0.113.1", "wrong"), 401);
+  EXPECT_EQ(log_in(behind, "203.0.113.9, 203.0.113.1", "right"), 429) << "it made up the first";
+  EXPECT_EQ(log_in(behind, "203.0.113.2", "right"), 200) << "locked out by another";
+  EXPECT_TRUE(
+      Eventually([&] { return Log().find("\"peer\":\"203.0.113.2\"") != std::string::npos; }));
+  EXPECT_EQ(behind.Ask("GET", "/metrics", "", "X-Forwarded-For: 203.0.113.2\r\n").status, 403);
+  const Server alone = StartWithLogins("logins_per_minute = 1\n");
+  EXPECT_EQ(log_in(alone, "203.0.113.1", "wrong"), 401);
+  EXPECT_EQ(log_in(alone, "203.0.113.2", "right"), 429) << "anybody can send the field";
 }
 
 TEST_F(LoginTest, AClosedAccountIsRefused) {

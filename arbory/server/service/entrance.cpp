@@ -5,6 +5,7 @@
 #include "arbory/caller.h"
 #include "arbory/server/service/bodies.h"
 #include "arbory/server/service/user_calls.h"
+#include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
 #include "nas/base/random_name.h"
@@ -132,7 +133,8 @@ Answer Entrance::Login(const HttpRequest& request) {
   if (IsAbsurd(credentials.user) || IsAbsurd(credentials.password)) {
     return ErrorReply(kBadRequest, "The user or the password is too long or malformed.");
   }
-  const int wait = login_limit_.Begin(request.peer, credentials.user, std::time(nullptr));
+  const std::string client = NetworkOf(request.peer);
+  const int wait = login_limit_.Begin(client, credentials.user, Clock::now());
   if (wait > 0) {
     metrics_.CountRefusedLogin();
     return BusyReply(kTooMany, "Too many refused logins; wait a minute and try again.",
@@ -141,7 +143,7 @@ Answer Entrance::Login(const HttpRequest& request) {
   Answer answer =
       calls_.Run(request.user, "login", [&] { return StartLogin(credentials, rules_.pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
-    child->make_reply = [this, attempt = Attempt{request.peer, credentials.user, Clock::now()},
+    child->make_reply = [this, attempt = Attempt{client, credentials.user, Clock::now()},
                          count = std::move(child->make_reply)](const nas::ReplyHead* head) {
       count(head);
       return LoginReply(attempt, head);
@@ -154,7 +156,7 @@ HttpReply Entrance::LoginReply(const Attempt& attempt, const nas::ReplyHead* hea
   if (head != nullptr && head->status == kOk) {
     const auto named = SplitPath("/" + head->fields.at(0).second);
     const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
-    login_limit_.Succeeded(attempt.peer, attempt.user);
+    login_limit_.Succeeded(attempt.client, attempt.user);
     const std::time_t now = std::time(nullptr);
     const std::string id = sessions_.Begin(user, now);
     HttpReply reply = SessionReply(*sessions_.Find(id, now));

@@ -51,7 +51,7 @@ class Entrance {
 
  private:
   struct Attempt {
-    std::string peer, user;
+    std::string client, user;
     Clock::time_point begun;  // the check, as a client may draw its request out as it likes
   };
   HttpReply LoginReply(const Attempt& attempt, const nas::ReplyHead* head);

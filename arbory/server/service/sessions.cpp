@@ -7,7 +7,7 @@
 namespace arbory {
 namespace {
 
-constexpr std::time_t kMinute = 60;
+constexpr std::chrono::seconds kMinute{60};
 // Beyond this many addresses and users, those whose minute is over are looked for and forgotten.
 constexpr size_t kSweepAbove = 4096;
 
@@ -45,19 +45,20 @@ void Sessions::Sweep(std::time_t now) {
   std::erase_if(sessions_, [&](const auto& entry) { return entry.second.expires <= now; });
 }
 
-int LoginLimit::Begin(const std::string& address, const std::string& user, std::time_t now) {
+int LoginLimit::Begin(const std::string& address, const std::string& user, Time now) {
   if (attempts_.size() > kSweepAbove) Sweep(now);
-  const std::string keys[] = {"a" + address, "u" + user};
+  const std::pair<std::string, int> limits[] = {{"a" + address, per_minute_},
+                                                {"u" + user, kAccountTimes * per_minute_}};
   int wait = 0;
-  for (const std::string& key : keys) {
+  for (const auto& [key, limit] : limits) {
     auto& times = attempts_[key];
     while (!times.empty() && times.front() <= now - kMinute) times.pop_front();
-    if (times.size() >= static_cast<size_t>(per_minute_)) {
-      wait = std::max(wait, static_cast<int>(times.front() + kMinute - now));
-    }
+    if (times.size() < static_cast<size_t>(limit)) continue;
+    const auto left = std::chrono::ceil<std::chrono::seconds>(times.front() + kMinute - now);
+    wait = std::max(wait, static_cast<int>(left.count()));
   }
   if (wait == 0) {
-    for (const std::string& key : keys) attempts_[key].push_back(now);
+    for (const auto& [key, limit] : limits) attempts_[key].push_back(now);
   }
   return wait;
 }
@@ -71,7 +72,7 @@ void LoginLimit::Succeeded(const std::string& address, const std::string& user) 
   }
 }
 
-void LoginLimit::Sweep(std::time_t now) {
+void LoginLimit::Sweep(Time now) {
   std::erase_if(attempts_, [&](const auto& entry) {
     return entry.second.empty() || entry.second.back() <= now - kMinute;
   });

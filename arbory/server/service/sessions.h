@@ -36,22 +36,27 @@ class Sessions {
   std::map<std::string, Session> sessions_;
 };
 
-// Counts refused logins of the last minute by address and by user. An attempt counts from its
-// beginning, so that many at once do not slip through, and is taken back when it succeeds.
+// Counts refused logins of the last minute by address and by account. Of an account many more are
+// let through than of an address: that bounds guessing from many places, and one stranger's
+// refusals lock nobody out of an account of theirs. An attempt counts from its beginning, so that
+// many at once do not slip through, and is taken back when it succeeds.
 class LoginLimit {
  public:
   explicit LoginLimit(int per_minute) : per_minute_(per_minute) {}
 
+  static constexpr int kAccountTimes = 10;  // as many refusals as of one address
+
+  using Time = std::chrono::steady_clock::time_point;
   // Seconds to wait before another attempt; 0 when it may begin now, and then it has.
-  int Begin(const std::string& address, const std::string& user, std::time_t now);
+  int Begin(const std::string& address, const std::string& user, Time now);
   void Succeeded(const std::string& address, const std::string& user);
 
  private:
-  void Sweep(std::time_t now);
+  void Sweep(Time now);
 
-  int per_minute_;
+  const int per_minute_;
   // Times of attempts, by "a" + address and "u" + user.
-  std::map<std::string, std::deque<std::time_t>> attempts_;
+  std::map<std::string, std::deque<Time>> attempts_;
 };
 
 }  // namespace arbory

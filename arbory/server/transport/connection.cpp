@@ -10,6 +10,7 @@
 #include <ctime>
 #include <exception>
 
+#include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/http_text.h"
 
 namespace arbory {
@@ -77,8 +78,7 @@ void Connection::Start() {
   socket_.set_option(asio::ip::tcp::no_delay(true), error);
   const auto peer = socket_.remote_endpoint(error);
   if (error) return;
-  request_.peer = peer.address().to_string();
-  request_.from_loopback = peer.address().is_loopback();
+  peer_ = peer.address().to_string();
   AwaitRequest();
 }
 
@@ -131,6 +131,7 @@ void Connection::ReadHeader() {
   request_.fields.clear();
   ForgetBody();
   request_.user.clear();
+  SetClient();
   request_.begun = Clock::now();
   parser_.emplace();
   parser_->header_limit(kMaxHeaderBytes);
@@ -139,6 +140,12 @@ void Connection::ReadHeader() {
   http::async_read_header(socket_, in_, *parser_, [self = shared_from_this()](Error error, size_t) {
     self->OnHeader(error);
   });
+}
+
+void Connection::SetClient() {
+  const ClientAddress client = host_->proxies().ClientOf(peer_, request_);
+  request_.peer = client.text;
+  request_.from_loopback = client.loopback;
 }
 
 void Connection::OnHeader(Error error) {
@@ -150,6 +157,7 @@ void Connection::OnHeader(Error error) {
       const std::string name(field.name_string());
       request_.fields.emplace_back(LowerCase(name), std::string(field.value()));
     }
+    SetClient();
   }
   if (error) return OnReadError(error);
   if (!EndsClearly(request_)) return OnReadError(http::error::bad_transfer_encoding);

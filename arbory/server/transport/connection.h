@@ -21,6 +21,7 @@
 namespace arbory {
 
 class Connection;
+class Proxies;
 
 // What connections need of the server they belong to, which outlives them.
 class ConnectionHost {
@@ -28,6 +29,7 @@ class ConnectionHost {
   virtual ~ConnectionHost() = default;
   virtual boost::asio::io_context& loop() = 0;
   virtual const nas::ServerSettings& settings() const = 0;
+  virtual const Proxies& proxies() const = 0;
   virtual HttpService& service() = 0;
   virtual bool stopping() const = 0;
   // Takes the child and its token over: it is reaped there, and killed when it stays silent.
@@ -55,6 +57,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void Arm(int seconds);
   void AwaitRequest();
   void ReadHeader();
+  void SetClient();
   void OnHeader(Error error);
   void ReadBody();
   void OnReadError(Error error);
@@ -85,6 +88,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   boost::asio::steady_timer delay_;  // of a reply that must not show how long it took
   boost::beast::flat_buffer in_;
   std::optional<Parser> parser_;
+  std::string peer_;  // who is connected, which may be a proxy
   HttpRequest request_;
   bool between_requests_ = true;
   bool keep_alive_ = false;

@@ -58,7 +58,7 @@ struct HttpRequest {
   std::string body;                // empty where there was no room to hold it
   std::uint64_t body_bytes = 0;    // that came
   std::shared_ptr<BodyRoom> room;  // that the body is held in
-  std::string peer;                // the client's address
+  std::string peer;                // the client's address, behind whatever proxy is configured
   bool from_loopback = false;
   Clock::time_point begun;
 

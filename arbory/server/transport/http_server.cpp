@@ -16,6 +16,7 @@
 #include <stdexcept>
 #include <unordered_map>
 
+#include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/child_pipe.h"
 #include "arbory/server/transport/children.h"
 #include "arbory/server/transport/connection.h"
@@ -63,6 +64,7 @@ class HttpServer::Loop : public ConnectionHost {
  public:
   explicit Loop(const nas::ServerSettings& settings)
       : settings_(settings),
+        proxies_(settings.proxies),
         loop_(kThreads),
         acceptor_(loop_),
         accept_pause_(loop_),
@@ -106,6 +108,7 @@ class HttpServer::Loop : public ConnectionHost {
 
   asio::io_context& loop() override { return loop_; }
   const nas::ServerSettings& settings() const override { return settings_; }
+  const Proxies& proxies() const override { return proxies_; }
   HttpService& service() override { return *service_; }
   bool stopping() const override { return stopping_; }
 
@@ -269,6 +272,7 @@ class HttpServer::Loop : public ConnectionHost {
   }
 
   const nas::ServerSettings settings_;
+  const Proxies proxies_;
   HttpService* service_ = nullptr;
   bool stopping_ = false;
   bool ended_ = false;
