@@ -162,6 +162,16 @@ TEST_F(CallTest, CallsAtOnceAreBounded) {
   EXPECT_TRUE(Eventually([&] { return server.Post("/api/Test/1/echo", "{}").status == 200; }));
 }
 
+TEST_F(CallTest, DownloadsTakeNoCalls) {
+  WriteFile(share_ + "/film", "");
+  fs::resize_file(share_ + "/film", 100'000'000);  // more than pipes and sockets hold
+  Server server = StartMisbehaving("max_calls = 1\n");
+  Client slow(server.port);
+  slow.Send(server.RequestText("GET", "/files/photo/film", "", ""));
+  EXPECT_TRUE(Eventually([&] { return server.Get("/files/photo/film").status == 503; }));
+  EXPECT_EQ(server.Post("/api/Test/1/echo", "{}").status, 200);
+}
+
 TEST_F(CallTest, ALargeReplyIsPassedOnAsItIsTaken) {
   Server server = StartMisbehaving();
   server.Post("/api/Test/1/echo", "{}");

@@ -118,6 +118,7 @@ TEST_F(FilesTest, NamesAndRangesFollowTheirTables) {
       {"a b.txt", "attachment; filename=\"a b.txt\"; filename*=UTF-8''a%20b.txt"},
       {"\"q\"\\.txt", "attachment; filename=\"_q__.txt\"; filename*=UTF-8''%22q%22%5C.txt"},
       {"\xC3\xA9%41", "attachment; filename=\"___41\"; filename*=UTF-8''%C3%A9%2541"},
+      {"a\u202Efdp.exe", "attachment; filename=\"a___fdp.exe\"; filename*=UTF-8''a_fdp.exe"},
       {"a\r\nX: y", "attachment; filename=\"a__X: y\"; filename*=UTF-8''a%0D%0AX%3A%20y"},
   };
   for (const auto& row : names) {

@@ -91,7 +91,13 @@ TEST_F(ProtocolTest, MalformedRequestsAreRefused) {
       {"GET /health HTTP/2.0\r\n" + host + "\r\n", 400},
       {"GET /health\r\n\r\n", 400},
       {"GET health HTTP/1.1\r\n" + host + "\r\n", 400},
-      {"GET http://127.0.0.1/health HTTP/1.1\r\n" + host + "\r\n", 400},
+      {"GET http://127.0.0.1/health HTTP/1.1\r\n" + host + "\r\n", 200},
+      {"GET HTTPS://127.0.0.1:9/health?a HTTP/1.1\r\nHost: evil.example\r\n\r\n", 200},
+      {"GET http://evil.example/health HTTP/1.1\r\n" + host + "\r\n", 403},
+      {"GET http://127.0.0.1/health HTTP/1.1\r\n\r\n", 400},
+      {"GET http://evil@127.0.0.1/health HTTP/1.1\r\n" + host + "\r\n", 400},
+      {"GET http:///health HTTP/1.1\r\n" + host + "\r\n", 400},
+      {"GET ftp://127.0.0.1/health HTTP/1.1\r\n" + host + "\r\n", 400},
       {"OPTIONS * HTTP/1.1\r\n" + host + "\r\n", 400},
       {"GET /he\x01lth HTTP/1.1\r\n" + host + "\r\n", 400},
       {"GET /health HTTP/1.1\r\n" + host + "A b: c\r\n\r\n", 400},
@@ -240,17 +246,31 @@ TEST_F(ProtocolTest, SlowClientsAreLetGo) {
   EXPECT_EQ(stalled.Read().status, 0) << "the rest of the reply came after all";
 }
 
-TEST_F(ProtocolTest, ConnectionsAreBounded) {
-  const Server server = Start("max_connections = 3\n");
-  std::vector<std::unique_ptr<Client>> held;
-  for (int at = 0; at < 3; ++at) {
-    held.push_back(std::make_unique<Client>(server.port));
-    held.back()->Send(server.RequestText("GET", "/health", "", ""));
-    EXPECT_EQ(held.back()->Read().status, 200);
+TEST_F(ProtocolTest, AFullServerEndsWhatWaitsOfTheGreediest) {
+  Server server = StartMisbehaving("max_connections = 3\n");
+  const auto connect = [&](const char* from) {
+    auto client = std::make_unique<Client>(server.port, from);
+    client->Send(server.RequestText("GET", "/health", "", ""));
+    EXPECT_EQ(client->Read().status, 200) << from;
+    return client;
+  };
+  const auto answers = [&](Client& client) {
+    client.Send(server.RequestText("GET", "/health", "", ""));
+    return client.Read().status == 200;
+  };
+  const auto polite = connect("127.0.0.2");
+  const auto older = connect("127.0.0.1");
+  const auto newer = connect("127.0.0.1");
+  const auto third = connect("127.0.0.3");
+  EXPECT_TRUE(older->Ended());
+  EXPECT_TRUE(answers(*polite) && answers(*newer) && answers(*third));
+  const auto again = connect("127.0.0.2");
+  EXPECT_TRUE(polite->Ended()) << "with as many as all others, one's own go";
+  for (Client* client : {newer.get(), third.get(), again.get()}) {
+    client->Send(server.RequestText("POST", "/api/Test/1/sleep", R"({"ms":60000})", kJson));
   }
-  EXPECT_TRUE(Client(server.port).Ended());
-  held.pop_back();
-  EXPECT_TRUE(Eventually([&] { return server.Get("/health").status == 200; }));
+  std::this_thread::sleep_for(milliseconds(300));
+  EXPECT_TRUE(Client(server.port, "127.0.0.4").Ended()) << "nobody waits";
 }
 
 TEST(AddressesTest, TheClientIsTheLastWhomAProxyNames) {

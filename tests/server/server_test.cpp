@@ -73,9 +73,12 @@ Json::Value Parsed(const std::string& text) {
   return value;
 }
 
-Client::Client(int port) : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+Client::Client(int port, const std::string& from)
+    : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
   sockaddr_in address = {};
   address.sin_family = AF_INET;
+  inet_pton(AF_INET, from.c_str(), &address.sin_addr);
+  EXPECT_EQ(bind(fd_.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
   address.sin_port = htons(static_cast<uint16_t>(port));
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
   EXPECT_EQ(connect(fd_.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);

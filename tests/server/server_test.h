@@ -37,7 +37,8 @@ struct Reply {
 // One connection.
 class Client {
  public:
-  explicit Client(int port);
+  // `from` is the loopback address that the connection comes from.
+  explicit Client(int port, const std::string& from = "127.0.0.1");
   bool Send(const std::string& bytes);
   // The next reply; `without_body` for one to HEAD.
   Reply Read(bool without_body = false);

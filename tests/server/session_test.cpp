@@ -185,6 +185,10 @@ TEST_F(LoginTest, RefusalsTellNothingOfTheUser) {
   EXPECT_EQ(server.Post("/login", large).status, 413) << "not even read as JSON";
   EXPECT_NE(server.Get("/metrics").body.find("\narbory_logins_refused_total 6\n"),
             std::string::npos);
+  EXPECT_NE(
+      server.Get("/metrics").body.find("arbory_call_seconds_bucket{method=\"login\",le=\"1\"} 0\n"),
+      std::string::npos)
+      << "the counts show how long a check took";
   EXPECT_EQ(Log().find("right"), std::string::npos) << "a password was logged";
 }
 

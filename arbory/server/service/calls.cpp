@@ -1,11 +1,18 @@
 #include "arbory/server/service/calls.h"
 
+#include <cmath>
+
 #include "arbory/server/transport/http_text.h"
 
 namespace arbory {
 namespace {
 
 constexpr char kRetrySeconds[] = "1";
+// At once: each waits for PAM, which may wait for a directory server.
+constexpr int kLogins = 16;
+// Durations of logins are told no finer: a password's check ends sooner for a user that there is
+// not, which the reply's delay hides.
+constexpr double kLoginSeconds = 2;
 
 // The reply as the child says it.
 HttpReply ChildsReply(const nas::ReplyHead* head) {
@@ -20,29 +27,50 @@ HttpReply ChildsReply(const nas::ReplyHead* head) {
 
 }  // namespace
 
-Answer Calls::Run(const std::string& user, const std::string& name,
+std::shared_ptr<void> Places::Take(const std::string& who) {
+  const auto found = by_taker_.find(who);
+  const int of_taker = found == by_taker_.end() ? 0 : found->second;
+  const int left = all_ - taken_;
+  if (left <= 0 || (shared_ && of_taker >= left)) return nullptr;
+  ++taken_;
+  ++by_taker_[who];
+  // Any address but null will do.
+  return {static_cast<void*>(this), [this, who](void*) {
+            --taken_;
+            if (--by_taker_[who] == 0) by_taker_.erase(who);
+          }};
+}
+
+Calls::Calls(int calls, bool several_users, Metrics* metrics)
+    : calls_(calls, several_users),
+      downloads_((calls + 1) / 2, several_users),
+      logins_(kLogins, /*shared=*/true),
+      metrics_(*metrics) {}
+
+Places& Calls::PlacesOf(Kind kind) {
+  if (kind == Kind::kLogin) return logins_;
+  return kind == Kind::kDownload ? downloads_ : calls_;
+}
+
+Answer Calls::Run(Kind kind, const std::string& who, const std::string& name,
                   const std::function<nas::Child()>& start) {
-  int& of_user = by_user_[user];
-  if (running_() >= static_cast<size_t>(limits_.all) || of_user >= limits_.of_one_user) {
+  ChildAnswer answer;
+  answer.token = PlacesOf(kind).Take(who);
+  if (!answer.token) {
     return BusyReply(kUnavailable, "The server is busy; try again in a moment.", kRetrySeconds);
   }
-  ChildAnswer answer;
   answer.child = start();
   if (answer.child.pid < 0) {
     return BusyReply(kUnavailable, "The machine has no room for another request; try again.",
                      kRetrySeconds);
   }
-  ++of_user;
-  answer.token = std::shared_ptr<void>(nullptr, [this, user](void*) {
-    if (--by_user_[user] == 0) by_user_.erase(user);
-  });
   const auto begun = Clock::now();
-  answer.make_reply = [this, name, begun](const nas::ReplyHead* head) {
-    const std::chrono::duration<double> spent = Clock::now() - begun;
+  answer.make_reply = [this, kind, name, begun](const nas::ReplyHead* head) {
+    double spent = std::chrono::duration<double>(Clock::now() - begun).count();
+    if (kind == Kind::kLogin) spent = kLoginSeconds * std::ceil(spent / kLoginSeconds);
     const bool malformed = head != nullptr && head->status == kBadRequest;
     if (!name.empty() && !malformed) {
-      metrics_.CountCall(name, head == nullptr ? nas::kCodeUnknownFailure : head->code,
-                         spent.count());
+      metrics_.CountCall(name, head == nullptr ? nas::kCodeUnknownFailure : head->code, spent);
     }
     return ChildsReply(head);
   };

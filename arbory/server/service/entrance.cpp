@@ -140,8 +140,8 @@ Answer Entrance::Login(const HttpRequest& request) {
     return BusyReply(kTooMany, "Too many refused logins; wait a minute and try again.",
                      std::to_string(wait));
   }
-  Answer answer =
-      calls_.Run(request.user, "login", [&] { return StartLogin(credentials, rules_.pam); });
+  Answer answer = calls_.Run(Calls::Kind::kLogin, client, "login",
+                             [&] { return StartLogin(credentials, rules_.pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [this, attempt = Attempt{client, credentials.user, Clock::now()},
                          count = std::move(child->make_reply)](const nas::ReplyHead* head) {
@@ -188,8 +188,8 @@ Answer Entrance::Logout(const HttpRequest& request) {
     reply.fields.emplace_back("Set-Cookie", gone);
     return reply;
   }
-  Answer answer =
-      calls_.Run(request.user, "logout", [&] { return StartStopSearches(request.user, *stop); });
+  Answer answer = calls_.Run(Calls::Kind::kCall, request.user, "logout",
+                             [&] { return StartStopSearches(request.user, *stop); });
   if (auto* busy = std::get_if<HttpReply>(&answer)) {
     busy->fields.emplace_back("Set-Cookie", gone);
     return answer;

@@ -45,12 +45,6 @@ auto ReaderOf(const std::string& body) {
   };
 }
 
-CallLimits LimitsOf(const Service::Setup& setup) {
-  const int all = setup.settings.max_calls;
-  // With logins nobody may take all of it, so that others get through.
-  return {all, setup.single_user.empty() ? (all + 1) / 2 : all};
-}
-
 // So many of the largest bodies: a person's page sends small ones, one after the other.
 constexpr std::uint64_t kLargestOfOneUser = 2;
 constexpr std::uint64_t kLargestOfAll = 8;
@@ -94,13 +88,13 @@ std::span<const Route> Service::Routes() {
        "Who is logged in and until when", kJson},
       {kGet, "/shares", Access::kLoggedIn,
        [](Self self, Request request, Path) {
-         return self.calls_.Run(request->user, "shares",
+         return self.calls_.Run(Calls::Kind::kCall, request->user, "shares",
                                 [&] { return StartListShares(request->user); });
        },
        "The shares the user can enter", kJson},
       {kGet, "/searches/{taskid}", Access::kLoggedIn,
        [](Self self, Request request, Path path) {
-         return self.calls_.Run(request->user, "searches",
+         return self.calls_.Run(Calls::Kind::kCall, request->user, "searches",
                                 [&] { return StartReadSearch(request->user, path[1]); });
        },
        "How far a search has come", kJson},
@@ -129,8 +123,7 @@ std::span<const Route> Service::Routes() {
 Service::Service(Setup setup, const nas::Module& module)
     : setup_(std::move(setup)),
       module_(module),
-      calls_(
-          LimitsOf(setup_), [this] { return setup_.counts().children; }, &metrics_),
+      calls_(setup_.settings.max_calls, setup_.single_user.empty(), &metrics_),
       bodies_(BodyLimitsOf(setup_)),
       entrance_(RulesOf(setup_), module, &calls_, &metrics_),
       api_list_(ListRows(module)),
@@ -213,13 +206,13 @@ Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
   if (!request.body.empty()) call.read_params = ReaderOf(request.body);
   if (row == nullptr) return NoSuchRow(path, call);
   const std::string session = entrance_.SessionId(request);
-  Answer answer = calls_.Run(request.user, std::string(row->api) + "/" + row->method, [&] {
-    // The id is the key to the account, which no log line of the module needs to hold whole.
-    constexpr size_t kShown = 8;
-    call.session = session.substr(0, kShown);
-    call.leased = request.Field("arbory-lease") != nullptr;
-    return nas::StartCall(*row, call, nas::EncodeJsonReply);
-  });
+  Answer answer =
+      calls_.Run(Calls::Kind::kCall, request.user, std::string(row->api) + "/" + row->method, [&] {
+        // The id is the key to the account, which no log line of the module needs to hold whole.
+        constexpr size_t kShown = 8;
+        call.session = session.substr(0, kShown);
+        return nas::StartCall(*row, call, nas::EncodeJsonReply);
+      });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [make = std::move(child->make_reply)](const nas::ReplyHead* head) {
       HttpReply reply = make(head);
@@ -234,7 +227,8 @@ Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
 Answer Service::NoSuchRow(const RequestPath& path, const nas::ApiCall& call) {
   HttpReply reply = NoSuchRowReply(path);
   if (!call.read_params) return reply;
-  return calls_.Run(call.user, "", [&] { return StartReply(call, AsChildsReply(reply)); });
+  return calls_.Run(Calls::Kind::kCall, call.user, "",
+                    [&] { return StartReply(call, AsChildsReply(reply)); });
 }
 
 HttpReply Service::NoSuchRowReply(const RequestPath& path) const {
@@ -264,7 +258,7 @@ Answer Service::GetFile(const HttpRequest& request, const RequestPath& path) {
   const std::string* range = request.Field("range");
   if (range != nullptr) file.range = *range;
   file.head_only = request.method == "HEAD";
-  return calls_.Run(request.user, "files", [&] { return StartFile(file); });
+  return calls_.Run(Calls::Kind::kDownload, request.user, "files", [&] { return StartFile(file); });
 }
 
 }  // namespace arbory

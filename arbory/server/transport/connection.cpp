@@ -79,12 +79,13 @@ void Connection::Start() {
   const auto peer = socket_.remote_endpoint(error);
   if (error) return;
   peer_ = peer.address().to_string();
+  network_ = NetworkOf(peer_);
   AwaitRequest();
 }
 
 void Connection::Stop() {
   keep_alive_ = false;
-  if (between_requests_) Drop();
+  if (stage_ == Stage::kIdle) Drop();
 }
 
 void Connection::Abort() {
@@ -105,8 +106,13 @@ void Connection::Arm(int limit) {
   });
 }
 
+void Connection::Enter(Stage stage) {
+  stage_ = stage;
+  since_ = Clock::now();
+}
+
 void Connection::AwaitRequest() {
-  between_requests_ = true;
+  Enter(Stage::kIdle);
   if (host_->stopping()) return Drop();
   if (in_.size() > 0) return ReadHeader();
   // What a large request or reply needed is not kept for the time until the next one.
@@ -122,7 +128,7 @@ void Connection::AwaitRequest() {
 }
 
 void Connection::ReadHeader() {
-  between_requests_ = false;
+  Enter(Stage::kReading);
   status_ = 0;
   sent_ = 0;
   keep_alive_ = false;
@@ -157,6 +163,7 @@ void Connection::OnHeader(Error error) {
       const std::string name(field.name_string());
       request_.fields.emplace_back(LowerCase(name), std::string(field.value()));
     }
+    UseHostOfTarget(&request_);
     SetClient();
   }
   if (error) return OnReadError(error);
@@ -194,11 +201,13 @@ void Connection::OnReadError(Error error) {
 
 void Connection::Refuse(int status, const char* sentence) {
   keep_alive_ = false;
+  Enter(Stage::kAnswering);
   SendNow(ErrorReply(status, sentence));
 }
 
 void Connection::Dispatch() {
   keep_alive_ = parser_->keep_alive() && !host_->stopping();
+  Enter(Stage::kAnswering);
   HeldBody::value_type& body = parser_->get().body();
   request_.body = std::move(body.bytes);
   request_.body_bytes = body.came;
@@ -348,6 +357,7 @@ void Connection::Linger() {
 }
 
 void Connection::Drop() {
+  Enter(Stage::kEnded);
   if (child_) {
     child_->Close();
     child_.reset();

@@ -46,6 +46,13 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void Start();
   // Ends it now when it is between requests; otherwise after the reply.
   void Stop();
+  // What it is doing, and since when.
+  enum class Stage { kIdle, kReading, kAnswering, kEnded };
+  Stage stage() const { return stage_; }
+  std::chrono::steady_clock::time_point since() const { return since_; }
+  // What stands for its client in counts.
+  const std::string& network() const { return network_; }
+
   // Ends it now, and kills the child that answers.
   void Abort();
 
@@ -55,6 +62,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
   // What the socket does is cancelled, and timed_out_ set, after this long.
   void Arm(int seconds);
+  void Enter(Stage stage);
   void AwaitRequest();
   void ReadHeader();
   void SetClient();
@@ -88,9 +96,11 @@ class Connection : public std::enable_shared_from_this<Connection> {
   boost::asio::steady_timer delay_;  // of a reply that must not show how long it took
   boost::beast::flat_buffer in_;
   std::optional<Parser> parser_;
+  std::string network_;
   std::string peer_;  // who is connected, which may be a proxy
   HttpRequest request_;
-  bool between_requests_ = true;
+  Stage stage_ = Stage::kIdle;
+  std::chrono::steady_clock::time_point since_ = Clock::now();
   bool keep_alive_ = false;
 
   std::shared_ptr<ChildPipe> child_;

@@ -12,8 +12,10 @@
 #include <boost/asio/signal_set.hpp>
 #include <boost/asio/steady_timer.hpp>
 #include <charconv>
+#include <map>
 #include <set>
 #include <stdexcept>
+#include <tuple>
 #include <unordered_map>
 
 #include "arbory/server/transport/addresses.h"
@@ -163,8 +165,9 @@ class HttpServer::Loop : public ConnectionHost {
       accepting_ = false;
       if (stopping_) return;
       if (error) return AcceptLater();
-      // One client more than allowed finds its connection closed, as by a machine that is full.
-      if (connections_.size() < static_cast<size_t>(settings_.max_connections)) {
+      // Where nobody has to go for it, one client more than allowed finds its connection closed.
+      if (connections_.size() < static_cast<size_t>(settings_.max_connections) ||
+          MakeRoom(socket)) {
         const auto connection = std::make_shared<Connection>(this, std::move(socket));
         connections_.insert(connection.get());
         connection->Start();
@@ -172,6 +175,34 @@ class HttpServer::Loop : public ConnectionHost {
       Accept();
     });
     accepting_ = true;
+  }
+
+  // Ends a connection that waits for its client, of the client with most of them. Nobody goes for
+  // one who would then have more, but each client's own idle ones go for its new ones.
+  bool MakeRoom(const tcp::socket& socket) {
+    Error error;
+    const auto peer = socket.remote_endpoint(error);
+    if (error) return false;
+    std::map<std::string, size_t> counts;
+    for (const Connection* each : connections_) {
+      if (each->stage() != Connection::Stage::kEnded) ++counts[each->network()];
+    }
+    const std::string newcomer = NetworkOf(peer.address().to_string());
+    const auto rank = [&](const Connection* each) {
+      return std::make_tuple(counts[each->network()], each->stage() == Connection::Stage::kIdle,
+                             -each->since().time_since_epoch());
+    };
+    Connection* chosen = nullptr;
+    for (Connection* each : connections_) {
+      const bool idle = each->stage() == Connection::Stage::kIdle;
+      if (!idle && each->stage() != Connection::Stage::kReading) continue;
+      const bool own = each->network() == newcomer;
+      if (own ? !idle : counts[each->network()] <= counts[newcomer]) continue;
+      if (chosen == nullptr || rank(each) > rank(chosen)) chosen = each;
+    }
+    const auto alive = chosen == nullptr ? nullptr : chosen->weak_from_this().lock();
+    if (alive) alive->Abort();
+    return alive != nullptr;
   }
 
   void AcceptLater() {

@@ -40,6 +40,20 @@ bool IsPlainSegment(const std::string& segment) {
                       [](char byte) { return byte == '/' || nas::IsControl(byte); });
 }
 
+// The characters that turn the direction of what follows, each replaced by "_".
+std::string WithoutTurns(std::string text) {
+  static constexpr std::string_view kTurns[] = {
+      "\u061C", "\u200E", "\u200F", "\u202A", "\u202B", "\u202C",
+      "\u202D", "\u202E", "\u2066", "\u2067", "\u2068", "\u2069",
+  };
+  for (const std::string_view turn : kTurns) {
+    for (size_t at = text.find(turn); at != std::string::npos; at = text.find(turn, at)) {
+      text.replace(at, turn.size(), "_");
+    }
+  }
+  return text;
+}
+
 }  // namespace
 
 std::optional<std::vector<std::string>> SplitPath(std::string_view path) {
@@ -66,6 +80,24 @@ std::optional<std::string> QueryValue(std::string_view query, std::string_view n
     return Decoded(equals == std::string_view::npos ? "" : pair.substr(equals + 1));
   }
   return std::nullopt;
+}
+
+void UseHostOfTarget(HttpRequest* request) {
+  constexpr std::string_view kScheme = "http://";
+  constexpr std::string_view kTlsScheme = "https://";
+  const std::string lower = LowerCase(request->target.substr(0, kTlsScheme.size()));
+  const size_t scheme = lower.starts_with(kScheme)      ? kScheme.size()
+                        : lower.starts_with(kTlsScheme) ? kTlsScheme.size()
+                                                        : 0;
+  if (scheme == 0) return;
+  const size_t end = std::min(request->target.find_first_of("/?", scheme), request->target.size());
+  const std::string host = request->target.substr(scheme, end - scheme);
+  if (host.empty() || host.find('@') != std::string::npos) return;
+  request->target.erase(0, end);
+  if (!request->target.starts_with('/')) request->target.insert(0, "/");
+  for (auto& [name, value] : request->fields) {
+    if (name == "host") value = host;
+  }
 }
 
 std::string PercentEncoded(std::string_view text) {
@@ -105,7 +137,7 @@ std::string ContentDisposition(bool inline_shown, const std::string& name) {
     if (!safe) byte = '_';
   }
   return std::string(inline_shown ? "inline" : "attachment") + "; filename=\"" + plain +
-         "\"; filename*=UTF-8''" + PercentEncoded(name);
+         "\"; filename*=UTF-8''" + PercentEncoded(WithoutTurns(name));
 }
 
 std::string HttpDate(std::time_t time) {

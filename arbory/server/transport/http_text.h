@@ -23,13 +23,17 @@ namespace arbory {
 std::optional<std::vector<std::string>> SplitPath(std::string_view path);
 // The value of a parameter in a query; nothing when it is not there or badly encoded.
 std::optional<std::string> QueryValue(std::string_view query, std::string_view name);
+// Makes a target in the absolute form, which proxies and some programs send, one of the usual form:
+// its host takes the place of the Host field's.
+void UseHostOfTarget(HttpRequest* request);
 // Encodes all but letters, digits and "-._~".
 std::string PercentEncoded(std::string_view text);
 
 // The value of the first cookie of that name, as it stands; empty when it is not there.
 std::string Cookie(const HttpRequest& request, std::string_view name);
 
-// The field Content-Disposition with the name in both forms, the plain one for old clients.
+// The field Content-Disposition with the name in both forms, the plain one for old clients. Without
+// the characters that turn the direction of text: a name must show its extension where it is.
 std::string ContentDisposition(bool inline_shown, const std::string& name);
 
 // "Sat, 21 Nov 2026 22:28:36 GMT".
