@@ -131,7 +131,8 @@ bool Task::setProperty(const char* name, const Json::Value& value) {
   const std::lock_guard guard(record_->mutex);
   if (name == nullptr) return false;
   const bool collect = record_->in_batch;
-  record_->pending[name] = value;
+  Json::Value copy = value;  // made first: without memory for it, no empty one may be collected
+  record_->pending[name].swap(copy);
   return collect || record_->Write(/*finish=*/false);
 }
 

@@ -133,9 +133,9 @@ std::vector<std::string> TaskFiles::Ids() const {
 
 bool TaskFiles::IsAlive(const std::string& id) const {
   const UniqueFd fd = OpenLock(id, 0);
-  if (!fd) return false;
+  if (!fd) return errno != ENOENT;
   struct flock lock = WriteLockOn(kLifeByte);
-  return fcntl(fd.get(), F_OFD_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
+  return fcntl(fd.get(), F_OFD_GETLK, &lock) != 0 || lock.l_type != F_UNLCK;
 }
 
 Result<TaskState> TaskFiles::Load(const std::string& id) const {

@@ -59,7 +59,8 @@ class TaskFiles {
   // Of the owner's tasks, running and finished, in no order; none where the folder cannot be read.
   std::vector<std::string> Ids() const;
 
-  // Whether some process still works on the task.
+  // Whether some process still works on the task; also where its lock file is there and cannot be
+  // asked, as a search that runs must not be taken for a finished one.
   bool IsAlive(const std::string& id) const;
   // ENOENT without a record, EBADMSG for one that is not readable.
   Result<TaskState> Load(const std::string& id) const;
