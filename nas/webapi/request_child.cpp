@@ -60,7 +60,6 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
     return encode(WfmLibGetErr(), Json::Value());
   }
   // What failed before is not this call's, whose failures may have no number of their own.
-  SetLastError(kErrorNone);
   errno = 0;
   if (call.leased) LeaseNewTasks();
   Response response(encode);
