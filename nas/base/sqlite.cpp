@@ -91,6 +91,10 @@ void Database::BoundValues(std::uint64_t bytes) {
   sqlite3_limit(db_, SQLITE_LIMIT_LENGTH, static_cast<int>(std::min(bytes, kMost)));
 }
 
+void Database::SetReadOnly(bool read_only) {
+  Execute(read_only ? "PRAGMA query_only=1" : "PRAGMA query_only=0");
+}
+
 Statement::Statement(const Database& db, const char* sql) : db_(db.handle()) {
   if (sqlite3_prepare_v2(db_, sql, -1, &statement_, nullptr) != SQLITE_OK) {
     throw SqliteError(db_, sql);

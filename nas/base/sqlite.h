@@ -48,6 +48,8 @@ class Database {
   // No value longer than this is read or written from now on, whatever a damaged file claims to
   // hold: asking for one fails with a SqliteError.
   void BoundValues(std::uint64_t bytes);
+  // Whether statements that write fail from now on, in the middle of a transaction too.
+  void SetReadOnly(bool read_only);
   sqlite3* handle() const { return db_; }
 
  private:

@@ -192,6 +192,7 @@ Ordering RowSorter::OrderByOwner(std::uint32_t FileAttributes::*id, NameOf name_
 void RowSorter::KeepOrdering(SortColumn column, const Ordering& ordering) {
   if (!WorthKeeping()) return;
   try {
+    db_.SetReadOnly(false);
     Statement insert(db_, "INSERT OR REPLACE INTO ordering VALUES(?,?)");
     const std::string_view bytes(reinterpret_cast<const char*>(ordering.data()),
                                  ordering.size() * sizeof(Ordering::value_type));
@@ -203,6 +204,7 @@ void RowSorter::KeepOrdering(SortColumn column, const Ordering& ordering) {
     }
   } catch (const SqliteError&) {
   }
+  db_.SetReadOnly(true);
 }
 
 bool RowSorter::WorthKeeping() {

@@ -183,7 +183,10 @@ TEST_F(Results, ManyRowsKeepTheirOrderAndPurgesHold) {
   for (std::uint32_t i = kRows; i-- > 0;) expected.push_back("f" + std::to_string(i));
   ResultReader reader(path_);
   EXPECT_EQ(Names(reader, by_size), expected);
+  const std::uint64_t unsorted_bytes = ResultFileBytes(path_);
   reader.KeepAllOrderings();
+  EXPECT_GE(ResultFileBytes(path_),
+            unsorted_bytes + std::size(kSortColumns) * kRows * sizeof(std::uint32_t));
   EXPECT_EQ(Names(reader, by_size), expected) << "as kept";
   by_size.ascending = false;
   EXPECT_EQ(Names(reader, by_size), std::vector<std::string>(expected.rbegin(), expected.rend()));
