@@ -46,18 +46,26 @@ void AppendEscaped(unsigned char byte, std::string* out) {
   }
 }
 
-bool NeedsCare(unsigned char byte, JsonBytes bytes) {
-  return byte < kFirstPrintable || byte == '"' || byte == '\\' ||
-         (byte >= kFirstNonAscii && bytes == JsonBytes::kClean);
+using Bytes = std::array<bool, 256>;
+
+// Bytes of a string that cannot be copied as they are.
+constexpr Bytes CareFor(JsonBytes bytes) {
+  Bytes care = {};
+  for (size_t byte = 0; byte < care.size(); ++byte) {
+    care[byte] = byte < kFirstPrintable || byte == '"' || byte == '\\' ||
+                 (byte >= kFirstNonAscii && bytes == JsonBytes::kClean);
+  }
+  return care;
 }
+constexpr Bytes kCareWhenRaw = CareFor(JsonBytes::kRaw);
+constexpr Bytes kCareWhenClean = CareFor(JsonBytes::kClean);
 
 void AppendString(std::string_view text, JsonBytes bytes, std::string* out) {
+  const Bytes& care = bytes == JsonBytes::kRaw ? kCareWhenRaw : kCareWhenClean;
   *out += '"';
   while (!text.empty()) {
     size_t plain = 0;
-    while (plain < text.size() && !NeedsCare(static_cast<unsigned char>(text[plain]), bytes)) {
-      ++plain;
-    }
+    while (plain < text.size() && !care[static_cast<unsigned char>(text[plain])]) ++plain;
     out->append(text.substr(0, plain));
     text.remove_prefix(plain);
     if (text.empty()) break;
@@ -113,7 +121,7 @@ void AppendArray(const Json::Value& value, JsonBytes bytes, std::string* out) {
 void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
   *out += '{';
   bool first = true;
-  for (auto member = value.begin(); member != value.end(); ++member) {
+  for (auto member = value.begin(), last = value.end(); member != last; ++member) {
     if (!first) *out += ',';
     first = false;
     const char* end = nullptr;
@@ -142,6 +150,17 @@ bool HasCommentOrTooMany(std::string_view text) {
     }
   }
   return false;
+}
+
+Json::CharReaderBuilder StrictReading() {
+  Json::CharReaderBuilder settings;
+  settings["collectComments"] = false;
+  settings["allowComments"] = false;
+  settings["allowTrailingCommas"] = false;
+  settings["strictRoot"] = false;
+  settings["failIfExtra"] = true;
+  settings["rejectDupKeys"] = false;
+  return settings;
 }
 
 }  // namespace
@@ -178,13 +197,8 @@ std::string JsonText(const Json::Value& value, JsonBytes bytes) {
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
   // JsonCpp's reader takes a NUL for the text's end, whatever follows.
   if (HasCommentOrTooMany(text) || text.find('\0') != std::string_view::npos) return false;
-  Json::CharReaderBuilder settings;
-  settings["collectComments"] = false;
-  settings["allowComments"] = false;
-  settings["allowTrailingCommas"] = false;
-  settings["strictRoot"] = false;
-  settings["failIfExtra"] = true;
-  settings["rejectDupKeys"] = false;
+  // Made once, as that takes longer than to read a short document.
+  thread_local Json::CharReaderBuilder settings = StrictReading();
   settings["stackLimit"] = max_depth;
   const std::unique_ptr<Json::CharReader> reader(settings.newCharReader());
   // The reader throws when a document is too deep, and may leave a half-read value behind.

@@ -60,9 +60,14 @@ class Task::Record {
   // Life first: a task found dead can no longer change, so what is read after that is complete.
   bool Read() {
     const bool alive = files_.IsAlive(id_);
-    auto state = files_.Load(id_);
-    if (!state) return false;
-    Take(std::move(*state));
+    auto text = files_.Read(id_);
+    if (!text) return false;
+    if (text_ != *text) {
+      auto state = nas::TaskFiles::Parse(*text);
+      if (!state) return false;
+      Take(std::move(*state));
+      text_ = std::move(*text);
+    }
     abandoned_ = abandoned_ || !alive;
     return true;
   }
@@ -79,6 +84,7 @@ class Task::Record {
     state->finished = state->finished || finish;
     if (!files_.Store(id_, *state)) return false;
     Take(std::move(*state));
+    text_.reset();
     return true;
   }
 
@@ -107,6 +113,7 @@ class Task::Record {
   std::optional<nas::LeaseWatch> lease_;
   std::string id_;
   Json::Value properties_{Json::objectValue};
+  std::optional<std::string> text_;  // what they were read from, where they were
   // Neither is taken back, as neither a mark nor a death is.
   bool finished_ = false;
   bool abandoned_ = false;

@@ -139,12 +139,22 @@ bool TaskFiles::IsAlive(const std::string& id) const {
 }
 
 Result<TaskState> TaskFiles::Load(const std::string& id) const {
-  const auto text = ReadWholeFile(folder_.get(), RecordName(id), kMaxRecordBytes);
+  const auto text = Read(id);
   if (!text) return text.error();
+  auto state = Parse(*text);
+  if (!state) return state.error().Of(RecordName(id));
+  return state;
+}
+
+Result<std::string> TaskFiles::Read(const std::string& id) const {
+  return ReadWholeFile(folder_.get(), RecordName(id), kMaxRecordBytes);
+}
+
+Result<TaskState> TaskFiles::Parse(const std::string& text) {
   Json::Value record;
-  if (!ParseJson(*text, &record) || !record.isObject() || record[kVersion] != kRecordVersion ||
+  if (!ParseJson(text, &record) || !record.isObject() || record[kVersion] != kRecordVersion ||
       !record[kFinished].isBool() || !record[kProperties].isObject()) {
-    return ErrnoError(EBADMSG, RecordName(id));
+    return ErrnoError(EBADMSG);
   }
   TaskState state;
   state.finished = record[kFinished].asBool();

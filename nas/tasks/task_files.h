@@ -64,6 +64,9 @@ class TaskFiles {
   bool IsAlive(const std::string& id) const;
   // ENOENT without a record, EBADMSG for one that is not readable.
   Result<TaskState> Load(const std::string& id) const;
+  // The two halves of it, for who asks again and again: the same text is the same state.
+  Result<std::string> Read(const std::string& id) const;
+  static Result<TaskState> Parse(const std::string& text);
 
   // The write lock, held while the descriptor is open. ENOENT when the task is gone, EBUSY when the
   // lock stays taken.
