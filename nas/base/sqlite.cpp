@@ -156,7 +156,14 @@ void Blob::Read(size_t offset, size_t count, void* out) const {
   if (result != SQLITE_OK) throw SqliteError(db_, "a blob");
 }
 
-void LoadSqlite() { sqlite3_initialize(); }
+void LoadSqlite() {
+  // No memory in advance for what a connection may want: a call opens one, reads a few pages and
+  // ends, and pays for each page of memory that it touches.
+  sqlite3_config(SQLITE_CONFIG_LOOKASIDE, 0, 0);
+  sqlite3_config(SQLITE_CONFIG_PAGECACHE, nullptr, 0, 0);
+  sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);
+  sqlite3_initialize();
+}
 
 Transaction::Transaction(Database& db, Kind kind) : db_(db), kind_(kind) {
   db_.Execute(kind == Kind::kWrite ? "BEGIN IMMEDIATE" : "PRAGMA query_only=1;BEGIN");
