@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <array>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -82,79 +83,79 @@ using Key = Json::StaticString;
 enum Additional { kRealPath = 1, kSize = 2, kOwner = 4, kTime = 8, kPerm = 16, kType = 32 };
 constexpr size_t kAdditionalMasks = 64;
 
-Json::Value OwnerOf(const DIRENTRY_INFO& entry) {
-  Json::Value owner(Json::objectValue);
-  owner[Key("user")] = entry.user;
-  owner[Key("group")] = entry.group;
-  owner[Key("uid")] = entry.uid;
-  owner[Key("gid")] = entry.gid;
-  return owner;
-}
-
-Json::Value TimesOf(const DIRENTRY_INFO& entry) {
-  Json::Value times(Json::objectValue);
-  times[Key("atime")] = entry.atime;
-  times[Key("mtime")] = entry.mtime;
-  times[Key("ctime")] = entry.ctime;
-  times[Key("crtime")] = entry.crtime;
-  return times;
-}
-
-Json::Value PermissionsOf(const DIRENTRY_INFO& entry) {
-  Json::Value permissions(Json::objectValue);
-  permissions[Key("mode")] = ModeAsDecimal(entry.mode);
-  permissions[Key("privilege")] = entry.acl_privilege;
-  permissions[Key("acl_mode")] = entry.acl_mode;
-  return permissions;
-}
-
 struct Member {
   const char* name;
   int asked_by;  // bit of `additional`; 0: always there
   void (*fill)(const DIRENTRY_INFO& entry, Json::Value& value);
 };
-constexpr Member kMembers[] = {
-    {"name", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.name; }},
-    {"path", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.path; }},
-    {"is_dir", 0, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.is_dir; }},
-    {"real_path", kRealPath,
-     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.real_path; }},
-    {"size", kSize,
-     [](const DIRENTRY_INFO& entry, Json::Value& value) {
-       value = static_cast<Json::UInt64>(entry.size);
-     }},
-    {"owner", kOwner,
-     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = OwnerOf(entry); }},
-    {"time", kTime, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = TimesOf(entry); }},
-    {"perm", kPerm,
-     [](const DIRENTRY_INFO& entry, Json::Value& value) { value = PermissionsOf(entry); }},
-    {"type", kType, [](const DIRENTRY_INFO& entry, Json::Value& value) { value = entry.type; }},
-};
 
-// The object of a file for one choice of attributes, its members not filled yet, and those members
-// in the order in which the object holds them. Copying it and filling the copy from end to end
-// takes less than finding or adding each member by its name.
+// An object for a file, its members not filled yet, and those members in the order in which the
+// object holds them. Copying it and filling the copy from end to end takes less than finding or
+// adding each member by its name.
 struct Shape {
   Json::Value object;
   std::vector<const Member*> members;
 };
 
-Shape ShapeFor(int additional) {
-  Shape shape;
-  for (const Member& member : kMembers) {
+Shape ShapeOf(std::span<const Member> members, int additional) {
+  Shape shape{Json::Value(Json::objectValue), {}};
+  for (const Member& member : members) {
     if (member.asked_by == 0 || (additional & member.asked_by)) shape.object[Key(member.name)];
   }
   for (auto it = shape.object.begin(); it != shape.object.end(); ++it) {
     shape.members.push_back(
-        std::ranges::find_if(kMembers, [&](const Member& m) { return it.name() == m.name; }));
+        &*std::ranges::find_if(members, [&](const Member& m) { return it.name() == m.name; }));
   }
   return shape;
 }
 
+void Fill(const Shape& shape, const DIRENTRY_INFO& entry, Json::Value& out) {
+  out = shape.object;
+  auto member = shape.members.begin();
+  for (Json::Value& value : out) (*member++)->fill(entry, value);
+}
+
+// A member that is an object of these.
+template <const auto& kParts>
+void FillParts(const DIRENTRY_INFO& entry, Json::Value& value) {
+  thread_local const Shape shape = ShapeOf(kParts, 0);
+  Fill(shape, entry, value);
+}
+
+template <auto kField>
+void FillField(const DIRENTRY_INFO& entry, Json::Value& value) {
+  value = entry.*kField;
+}
+
+using Entry = DIRENTRY_INFO;
+constexpr Member kOwnerParts[] = {{"user", 0, FillField<&Entry::user>},
+                                  {"group", 0, FillField<&Entry::group>},
+                                  {"uid", 0, FillField<&Entry::uid>},
+                                  {"gid", 0, FillField<&Entry::gid>}};
+constexpr Member kTimeParts[] = {{"atime", 0, FillField<&Entry::atime>},
+                                 {"mtime", 0, FillField<&Entry::mtime>},
+                                 {"ctime", 0, FillField<&Entry::ctime>},
+                                 {"crtime", 0, FillField<&Entry::crtime>}};
+constexpr Member kPermissionParts[] = {
+    {"mode", 0, [](const Entry& entry, Json::Value& value) { value = ModeAsDecimal(entry.mode); }},
+    {"privilege", 0, FillField<&Entry::acl_privilege>},
+    {"acl_mode", 0, FillField<&Entry::acl_mode>}};
+constexpr Member kMembers[] = {
+    {"name", 0, FillField<&Entry::name>},
+    {"path", 0, FillField<&Entry::path>},
+    {"is_dir", 0, FillField<&Entry::is_dir>},
+    {"real_path", kRealPath, FillField<&Entry::real_path>},
+    {"size", kSize, FillField<&Entry::size>},
+    {"owner", kOwner, FillParts<kOwnerParts>},
+    {"time", kTime, FillParts<kTimeParts>},
+    {"perm", kPerm, FillParts<kPermissionParts>},
+    {"type", kType, FillField<&Entry::type>},
+};
+
 const Shape& KnownShape(int additional) {
   thread_local std::array<Shape, kAdditionalMasks> shapes;
   Shape& shape = shapes[static_cast<size_t>(additional) % kAdditionalMasks];
-  if (shape.members.empty()) shape = ShapeFor(additional);
+  if (shape.members.empty()) shape = ShapeOf(kMembers, additional);
   return shape;
 }
 
@@ -184,8 +185,5 @@ Json::Value StringExplodeEx(const Json::Value& value, const char* separator, int
 
 void DumpFileInfo(int additional, const DIRENTRY_INFO& entry, Json::Value& out, int /*reserved1*/,
                   int /*reserved2*/) {
-  const nas::Shape& shape = nas::KnownShape(additional);
-  out = shape.object;
-  auto member = shape.members.begin();
-  for (Json::Value& value : out) (*member++)->fill(entry, value);
+  nas::Fill(nas::KnownShape(additional), entry, out);
 }

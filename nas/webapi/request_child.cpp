@@ -6,6 +6,7 @@
 #include <exception>
 #include <new>
 #include <optional>
+#include <utility>
 
 #include "nas/base/error.h"
 #include "nas/system/lease.h"
@@ -45,7 +46,8 @@ class Response : public NUVA::APIResponse {
   explicit Response(const ReplyEncoder& encode) : encode_(encode) {}
 
   void SetError(int code, const Json::Value& data) override { reply_ = encode_(code, data); }
-  const std::optional<Reply>& reply() const { return reply_; }
+  // Once.
+  std::optional<Reply> TakeReply() { return std::exchange(reply_, std::nullopt); }
 
  private:
   const ReplyEncoder& encode_;
@@ -70,7 +72,7 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
     }
     Request request(row, call, call.read_params ? read : call.params);
     row.entry(&request, &response);
-    if (response.reply()) return *response.reply();
+    if (auto reply = response.TakeReply()) return std::move(*reply);
     syslog(LOG_ERR, "%s %s gave no reply", row.api, row.method);
   } catch (const TooManyPieces& error) {
     syslog(LOG_ERR, "%s %s refused: %s", row.api, row.method, error.what());
