@@ -5,11 +5,19 @@
 #include <cstring>
 
 #include "nas/base/accounts.h"
+#include "nas/system/identity.h"
 #include "platform/system.h"
 
 namespace {
 
 std::string Text(const char* text) { return text == nullptr ? "" : text; }
+
+// A call mostly asks for the user whom it acts for, who has just been looked up.
+nas::Result<nas::Account> AccountNamed(const std::string& name) {
+  const auto& acting = nas::ActingAccount();
+  if (acting && acting->name == name) return *acting;
+  return nas::FindAccount(name);
+}
 
 int Fail(const nas::Error& error) {
   nas::Report(error);
@@ -21,7 +29,7 @@ int Fail(const nas::Error& error) {
 int NUVAUserGet(const char* name, NUVAUSER** out) {
   if (out == nullptr) return -1;
   *out = nullptr;
-  const auto account = nas::FindAccount(Text(name));
+  const auto account = AccountNamed(Text(name));
   if (!account) return Fail(account.error());
   auto* user = static_cast<NUVAUSER*>(std::calloc(1, sizeof(NUVAUSER)));
   if (user == nullptr) return Fail(nas::ErrnoError(ENOMEM));

@@ -133,7 +133,7 @@ Result<int> RunForGood(const char* program, const std::vector<const char*>& comm
   const bool there = program != nullptr && access(program, X_OK) == 0;
   Result<int> status = there ? RunConfined(command) : ErrnoError();
   // A folder that root made is the user's to empty, yet only root can take it away.
-  if (CanBeRoot() && !ActingUser().empty()) RemoveEmptyResultFolders(ActingUser());
+  if (CanBeRoot() && ActingAccount()) RemoveEmptyResultFolders(ActingAccount()->name);
   GiveUpRoot();
   return status;
 }

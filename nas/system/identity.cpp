@@ -8,7 +8,6 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
-#include <optional>
 
 #include "platform/webfm.h"
 
@@ -106,7 +105,7 @@ Status CheckActsAs(const std::string& user) {
   return account->uid == geteuid() ? Status() : ErrnoError(EPERM, user);
 }
 
-std::string ActingUser() { return g_self ? g_self->name : std::string(); }
+const std::optional<Account>& ActingAccount() { return g_self; }
 
 void GiveUpRoot() {
   const gid_t group = getegid();

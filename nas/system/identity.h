@@ -7,6 +7,7 @@
 
 #include <sys/types.h>
 
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -26,8 +27,8 @@ Result<Account> BecomeUser(const std::string& user);
 // EPERM unless the process acts as `user` now; kErrorUnknownUser when there is none.
 Status CheckActsAs(const std::string& user);
 
-// Whom BecomeUser has made the process; empty for nobody yet.
-std::string ActingUser();
+// Whom BecomeUser has made the process, as it was found then; nobody yet without a value.
+const std::optional<Account>& ActingAccount();
 
 // Gives up for good the root that the process could go back to. For whoever is about to read what
 // the user can write, once no folder is left to be made. A process that cannot aborts; one whose
