@@ -5,5 +5,5 @@ set_target_properties(arbory_nas PROPERTIES LINKER_LANGUAGE CXX)
 target_link_libraries(
   arbory_nas
   PUBLIC PkgConfig::JSONCPP
-  PRIVATE PkgConfig::SQLITE PkgConfig::UTF8PROC PkgConfig::PCRE2 PkgConfig::ACL PkgConfig::TOML
+  PRIVATE PkgConfig::SQLITE PkgConfig::UCHARDET PkgConfig::UTF8PROC PkgConfig::PCRE2 PkgConfig::ACL PkgConfig::TOML
           Threads::Threads ${CMAKE_DL_LIBS})

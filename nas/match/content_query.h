@@ -1,8 +1,5 @@
 #pragma once
-// What a search asks of the contents of files, and the reading of one file to answer it.
-//
-// A file is read in bounded pieces, never mapped: a file that shrinks or a disk that fails ends in
-// an error, not a signal. Files with a NUL in their first block are binary and match nothing.
+// What a search asks of the contents of files.
 
 #include <memory>
 #include <optional>
@@ -31,39 +28,18 @@ class ContentQuery {
     bool negated = false;
     std::optional<LiteralFinder> literal;
     std::vector<std::shared_ptr<const Regex>> expressions;
-    bool Finds(std::string_view text) const;
+    bool Finds(std::string_view text) const { return Find(text, 0).has_value(); }
+    // The first place of it that does not begin before `from`.
+    std::optional<TextPlace> Find(std::string_view text, size_t from) const;
   };
   static std::optional<Needle> MakeNeedle(const NamePattern::Alternative& alternative);
 
   std::vector<Needle> needles_;
   std::vector<std::vector<size_t>> terms_;  // indexes of needles: all terms, either needle
   bool has_negated_ = false;
-  bool by_lines_ = false;  // an expression must see whole lines
-  size_t overlap_ = 0;     // bytes of the longest literal, so none is cut in two
-};
-
-// Reads files for one thread. Query and flag are borrowed. Its buffer (256 KiB, more for a very
-// long text) is made once.
-class ContentScanner {
- public:
-  explicit ContentScanner(const ContentQuery& query, const int& stop_flag);
-
-  enum class Outcome { kMatch, kNoMatch, kBinary, kStopped, kFailed };
-  // Whether the regular file `name` in `folder` matches. kFailed leaves errno. Ends within one
-  // piece once the stop flag is set.
-  Outcome Scan(int folder, const char* name);
-
- private:
-  int Open(int folder, const char* name);
-  Outcome ScanOpen(int fd);
-  void Search(std::string_view text);
-  bool Decided(bool at_end) const;
-
-  const ContentQuery& query_;
-  const int& stop_flag_;
-  std::vector<char> buffer_;
-  std::vector<bool> found_;
-  bool keep_access_time_ = true;
+  bool by_lines_ = false;      // an expression must see whole lines
+  bool beyond_ascii_ = false;  // bytes beyond ASCII matter, so their encoding does
+  size_t overlap_ = 0;         // bytes of the longest literal, so none is cut in two
 };
 
 }  // namespace nas

@@ -60,13 +60,16 @@ bool LiteralFinder::MatchesAt(const char* at) const {
   return true;
 }
 
-bool LiteralFinder::Finds(std::string_view buffer) const {
-  if (buffer.size() < lowered_.size()) return false;
+std::optional<TextPlace> LiteralFinder::Find(std::string_view buffer) const {
+  if (buffer.size() < lowered_.size()) return std::nullopt;
   const char* at = buffer.data();
   const char* const last = at + (buffer.size() - lowered_.size());  // last possible place
-  const auto fits = [this](const char* place) {
-    return first_.Fits(place[first_.offset]) && second_.Fits(place[second_.offset]) &&
-           MatchesAt(place);
+  const auto place = [&](const char* found) {
+    return TextPlace{static_cast<size_t>(found - buffer.data()), lowered_.size()};
+  };
+  const auto fits = [this](const char* start) {
+    return first_.Fits(start[first_.offset]) && second_.Fits(start[second_.offset]) &&
+           MatchesAt(start);
   };
   // The places at .. at + 15 are all possible ones, so every byte that is loaded is in the buffer.
   constexpr std::ptrdiff_t kPlaces = sizeof(Vector);
@@ -75,13 +78,13 @@ bool LiteralFinder::Finds(std::string_view buffer) const {
                         ((Load(at + second_.offset) | second_.mask) == second_.value);
     if (!AnySet(hits)) continue;
     for (std::ptrdiff_t i = 0; i < kPlaces; ++i) {
-      if (fits(at + i)) return true;
+      if (fits(at + i)) return place(at + i);
     }
   }
   for (; at <= last; ++at) {
-    if (fits(at)) return true;
+    if (fits(at)) return place(at);
   }
-  return false;
+  return std::nullopt;
 }
 
 }  // namespace nas

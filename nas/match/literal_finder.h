@@ -6,8 +6,11 @@
 // ask.
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
+
+#include "nas/match/text_place.h"
 
 namespace nas {
 
@@ -15,7 +18,9 @@ class LiteralFinder {
  public:
   // `text` is ASCII and not empty.
   explicit LiteralFinder(std::string_view text);
-  bool Finds(std::string_view buffer) const;
+  bool Finds(std::string_view buffer) const { return Find(buffer).has_value(); }
+  // The first place of it.
+  std::optional<TextPlace> Find(std::string_view buffer) const;
   size_t size() const { return lowered_.size(); }
 
  private:

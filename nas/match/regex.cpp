@@ -3,6 +3,7 @@
 #define PCRE2_CODE_UNIT_WIDTH 8
 #include <pcre2.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <new>
@@ -100,12 +101,16 @@ Regex::~Regex() {
   pcre2_code_free(static_cast<pcre2_code*>(ascii_code_));
 }
 
-bool Regex::Finds(std::string_view text) const {
+std::optional<TextPlace> Regex::Find(std::string_view text, size_t from) const {
   thread_local Scratch scratch;
   const void* code = ascii_code_ != nullptr && IsAscii(text) ? ascii_code_ : code_;
-  return pcre2_match(static_cast<const pcre2_code*>(code),
-                     reinterpret_cast<PCRE2_SPTR>(text.data()), text.size(), 0, 0, scratch.match(),
-                     scratch.context()) >= 0;
+  if (pcre2_match(static_cast<const pcre2_code*>(code), reinterpret_cast<PCRE2_SPTR>(text.data()),
+                  text.size(), from, 0, scratch.match(), scratch.context()) < 0) {
+    return std::nullopt;
+  }
+  const PCRE2_SIZE* ends = pcre2_get_ovector_pointer(scratch.match());
+  // \K may put the beginning behind the end.
+  return TextPlace{ends[0], ends[1] - std::min(ends[0], ends[1])};
 }
 
 }  // namespace nas

@@ -4,9 +4,11 @@
 // given up and counts as not matching.
 
 #include <memory>
+#include <optional>
 #include <string_view>
 
 #include "nas/base/error.h"
+#include "nas/match/text_place.h"
 
 namespace nas {
 
@@ -25,7 +27,9 @@ class Regex {
   Regex& operator=(const Regex&) = delete;
 
   // Whether the expression matches anywhere in `text`. Any number of threads may ask.
-  bool Finds(std::string_view text) const;
+  bool Finds(std::string_view text) const { return Find(text, 0).has_value(); }
+  // The first place that does not begin before `from`.
+  std::optional<TextPlace> Find(std::string_view text, size_t from) const;
 
  private:
   Regex(void* code, void* ascii_code) : code_(code), ascii_code_(ascii_code) {}

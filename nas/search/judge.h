@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "nas/files/directory_reader.h"
-#include "nas/match/content_query.h"
+#include "nas/match/content_scanner.h"
 #include "nas/results/row_sink.h"
 #include "nas/search/candidate_list.h"
 #include "nas/search/criteria.h"

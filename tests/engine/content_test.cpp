@@ -7,7 +7,7 @@
 #include <fstream>
 #include <random>
 
-#include "nas/match/content_query.h"
+#include "nas/match/content_scanner.h"
 #include "nas/search/candidate_list.h"
 
 namespace nas {
@@ -69,8 +69,20 @@ TEST_F(Contents, Table) {
       {"regex:\\bint\\s+main", "int  main()", true, ""},
       {"needle", "needle\0"s, false, "binary"},
       {"needle", std::string(40'000, 'x') + "\0needle"s, true, "a NUL behind the first block"},
-      {"x", "\xff\xfex", true, "not UTF-8"},
-      {"regex:x", "\xff\xfex", true, "not UTF-8"},
+      {"x", "\xff\xc0x", true, "not UTF-8"},
+      {"regex:x", "\xff\xc0x", true, "not UTF-8"},
+      {"regex:^x", "\xef\xbb\xbfx", true, "behind the mark of UTF-8"},
+      {"needle", "\xff\xfen\0e\0E\0d\0l\0e\0"s, true, "UTF-16, little end first"},
+      {"é", "\xfe\xff\0\xe9"s, true, "UTF-16, big end first"},
+      {"é", "\xfe\xff\0\0\0\xe9"s, false, "binary, though it begins with a mark"},
+      {"é", "caf\xe9", true, "Latin-1"},
+      {"x !é", "x caf\xe9", false, "Latin-1"},
+      {"regex:f.\\b", "caf\xe9 au lait", true, "Latin-1"},
+      {"привет", "\xd3\xeb\xe8\xf6\xe0 \xcf\xf0\xe8\xe2\xe5\xf2, \xea\xe0\xea \xe4\xe5\xeb\xe0?",
+       true, "Windows-1251"},
+      {"日本語", "\x82\xb1\x82\xea\x82\xcd\x93\xfa\x96\x7b\x8c\xea\x82\xc5\x82\xb7", true,
+       "Shift JIS"},
+      {"é", "\xff caf\xc3\xa9", true, "UTF-8 with damages"},
   };
   for (const auto& row : rows) {
     EXPECT_EQ(Finds(row.pattern, row.content), row.found)
@@ -118,6 +130,56 @@ TEST_F(Contents, LiteralAgainstPlainSearch) {
     found += expected;
   }
   EXPECT_GT(found, 1'000);
+}
+
+// In another encoding a text grows when it is read, and what makes it foreign may come late.
+TEST_F(Contents, OtherEncodingsAcrossPieces) {
+  for (size_t at = kPiece - 4; at <= kPiece + 4; ++at) {
+    EXPECT_TRUE(Finds("café", std::string(at, '-') + "caf\xe9")) << at;
+    EXPECT_FALSE(Finds("cafe", std::string(at, '-') + "caf\xe9")) << at;
+    EXPECT_TRUE(Finds("café", std::string(at, '-') + "caf\xc3\xa9 \xff")) << at;
+    std::string wide = "\xff\xfe";
+    for (size_t count = 0; count < at / 3; ++count) wide += "\x2c\x67";  // three bytes in UTF-8
+    EXPECT_TRUE(Finds("本é", wide + "\xe9" + std::string(1, '\0'))) << at;
+  }
+}
+
+TEST_F(Contents, FirstLine) {
+  using std::string_literals::operator""s;
+  constexpr size_t kMost = 24;
+  const std::string blank(3 * kPiece, '\n');
+  const struct {
+    std::string pattern, content;
+    std::uint64_t number;
+    std::string text;  // what is marked in brackets
+  } rows[] = {
+      {"needle", "hay\nA Needle, needles\r\nneedle", 2, "A [Needle], [needle]s"},
+      {"needle", "hay", 0, ""},
+      {"one two", "x\nan aone\ntwo", 2, "an a[one]"},
+      {"aab baa !c", "aabaa", 1, "[aabaa]"},
+      {"regex:^b.d$", "bed \nbad", 2, "[bad]"},
+      {"regex:a\\sb", "xa\nb", 1, "x[a]"},
+      {"regex:(?=b)", "ab", 1, "a[]b"},
+      {"needle", blank + "needle", 3 * kPiece + 1, "[needle]"},
+      {"end", std::string(30, 'x') + "the end" + std::string(30, 'y'), 1,
+       "…xxthe [end]yyyyyyyyyyyyyyy…"},
+      {"end", std::string(3 * kPiece, 'x') + " end", 1, "…xxxxx [end]"},
+      {"é", "\n\ncaf\xe9", 3, "caf[é]"},
+      {"é", "\xff\xfe\n\0c\0a\0\xe9\0"s, 2, "ca[é]"},
+  };
+  for (const auto& row : rows) {
+    const auto query = ContentQuery::From(*NamePattern::Parse(row.pattern));
+    std::ofstream(folder_ + "/file", std::ios::binary) << row.content;
+    const auto line = ContentScanner(*query, stop_).FirstLine(fd_.get(), "file", kMost);
+    EXPECT_EQ(line ? line->number : 0, row.number) << row.pattern;
+    if (!line) continue;
+    std::string text = line->text;
+    for (auto mark = line->marks.rbegin(); mark != line->marks.rend(); ++mark) {
+      text.insert(mark->first + mark->second, "]");
+      text.insert(mark->first, "[");
+    }
+    EXPECT_EQ(text, row.text) << row.pattern;
+  }
 }
 
 TEST_F(Contents, StopsAndFails) {

@@ -5,7 +5,7 @@
 #include <unistd.h>
 
 #include "nas/base/unique_fd.h"
-#include "nas/match/content_query.h"
+#include "nas/match/content_scanner.h"
 #include "tests/fuzz/fuzz.h"
 
 namespace {

@@ -1,0 +1,208 @@
+#include "nas/match/content_scanner.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "nas/base/system_call.h"
+#include "nas/base/unique_fd.h"
+
+namespace nas {
+namespace {
+
+// Fits the second-level cache together with what is searched for.
+constexpr size_t kPieceBytes = 256 * 1024;
+// A line longer than this is searched in cuts that overlap by kLineOverlap.
+constexpr size_t kLongestLine = 128 * 1024;
+constexpr size_t kLineOverlap = 4 * 1024;
+
+constexpr std::string_view kEllipsis = "…";
+constexpr size_t npos = std::string_view::npos;
+
+bool IsContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xC0) == 0x80; }
+
+// Marks in order, those that overlap as one.
+void Merge(std::vector<std::pair<size_t, size_t>>* marks) {
+  std::ranges::sort(*marks);
+  std::vector<std::pair<size_t, size_t>> merged;
+  for (const auto& [at, length] : *marks) {
+    if (!merged.empty() && at <= merged.back().first + merged.back().second) {
+      auto& last = merged.back();
+      last.second = std::max(last.second, at + length - last.first);
+    } else {
+      merged.emplace_back(at, length);
+    }
+  }
+  marks->swap(merged);
+}
+
+// Keeps `most` bytes around the first mark; `whole_before`: nothing was left out before.
+MatchingLine Cut(std::string_view line, std::vector<std::pair<size_t, size_t>> marks, size_t most,
+                 bool whole_before) {
+  constexpr size_t kShareBefore = 4;
+  size_t from = 0;
+  size_t end = line.size();
+  if (line.size() > most) {
+    const size_t before = most / kShareBefore;
+    from = marks[0].first > before ? marks[0].first - before : 0;
+    end = std::min(line.size(), from + most);
+    while (from < marks[0].first && IsContinuation(line[from])) ++from;
+    while (end > marks[0].first && end < line.size() && IsContinuation(line[end])) --end;
+  }
+  MatchingLine found;
+  if (from > 0 || !whole_before) found.text = kEllipsis;
+  const size_t shift = found.text.size();
+  found.text += line.substr(from, end - from);
+  if (end < line.size()) found.text += kEllipsis;
+  for (const auto& [at, length] : marks) {
+    if (at < from || at >= end) continue;
+    found.marks.emplace_back(at - from + shift, std::min(length, end - at));
+  }
+  return found;
+}
+
+}  // namespace
+
+ContentScanner::ContentScanner(const ContentQuery& query, const int& stop_flag)
+    : query_(query),
+      stop_flag_(stop_flag),
+      reader_(std::max(kPieceBytes, 4 * query.overlap_), query.beyond_ascii_),
+      found_(query.needles_.size()) {}
+
+// Reading must not change the access time, which is itself a criterion; only a file's owner may
+// ask for that.
+int ContentScanner::Open(int folder, const char* name) {
+  constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY;
+  if (keep_access_time_) {
+    const int fd = openat(folder, name, kFlags | O_NOATIME);
+    if (fd >= 0 || errno != EPERM) return fd;
+    keep_access_time_ = false;
+  }
+  return openat(folder, name, kFlags);
+}
+
+ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name) {
+  const UniqueFd fd(Open(folder, name));
+  if (!fd) return Outcome::kFailed;
+  std::fill(found_.begin(), found_.end(), false);
+  reader_.Start(fd.get());
+  Outcome outcome = Read();
+  // What stands there in either reading is there: the guess may be wrong.
+  if (outcome == Outcome::kNoMatch && !Decided() && reader_.StartGuessed()) outcome = Read();
+  if (outcome == Outcome::kNoMatch && Matches()) return Outcome::kMatch;
+  return outcome;
+}
+
+// kNoMatch for a file that was read as far as is needed to tell.
+ContentScanner::Outcome ContentScanner::Read() {
+  return EachPiece(query_.by_lines_ ? Units::kLines : Units::kBytes,
+                   [this](std::string_view text, size_t /*done*/) {
+                     Search(text);
+                     return Decided();
+                   });
+}
+
+template <typename Look>
+ContentScanner::Outcome ContentScanner::EachPiece(Units units, const Look& look) {
+  for (size_t keep = 0;;) {
+    if (__atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0) return Outcome::kStopped;
+    switch (reader_.Next(keep)) {
+      case TextReader::Piece::kText:
+        break;
+      case TextReader::Piece::kBinary:
+        return Outcome::kBinary;
+      case TextReader::Piece::kFailed:
+        return Outcome::kFailed;
+    }
+    const std::string_view all = reader_.text();
+    size_t searched = all.size();
+    size_t keep_from = all.size() - std::min(all.size(), query_.overlap_);
+    if (units == Units::kLines && !reader_.at_end()) {
+      const size_t line = all.rfind('\n');
+      const bool cut = line == npos || all.size() - line > kLongestLine;
+      if (!cut) searched = line + 1;
+      const size_t overlap = std::min(all.size(), kLineOverlap);
+      keep_from = std::min(cut ? all.size() - overlap : searched, keep_from);
+    }
+    if (look(all.substr(0, searched), keep_from) || reader_.at_end()) return Outcome::kNoMatch;
+    keep = all.size() - keep_from;
+  }
+}
+
+void ContentScanner::Search(std::string_view text) {
+  for (size_t i = 0; i < found_.size(); ++i) {
+    if (!found_[i] && query_.needles_[i].Finds(text)) found_[i] = true;
+  }
+}
+
+// Whether reading on cannot change the answer.
+bool ContentScanner::Decided() const {
+  if (query_.has_negated_) return false;
+  return std::ranges::all_of(query_.terms_, [this](const auto& term) {
+    return std::ranges::any_of(term, [this](size_t i) { return found_[i]; });
+  });
+}
+
+bool ContentScanner::Matches() const {
+  return std::ranges::all_of(query_.terms_, [this](const auto& term) {
+    return std::ranges::any_of(
+        term, [this](size_t i) { return found_[i] != query_.needles_[i].negated; });
+  });
+}
+
+std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* name,
+                                                      size_t most_bytes) {
+  if (Scan(folder, name) != Outcome::kMatch) return std::nullopt;
+  const UniqueFd fd(Open(folder, name));
+  if (!fd) return std::nullopt;
+  reader_.Start(fd.get());
+  std::optional<MatchingLine> line;
+  do {
+    std::uint64_t lines_before = 0;
+    bool at_line_start = true;
+    EachPiece(Units::kLines, [&](std::string_view text, size_t done) {
+      line = LineIn(text, at_line_start, most_bytes);
+      if (line) line->number += lines_before;
+      const std::string_view gone = text.substr(0, done);
+      lines_before += static_cast<std::uint64_t>(std::ranges::count(gone, '\n'));
+      if (!gone.empty()) at_line_start = gone.back() == '\n';
+      return line.has_value();
+    });
+  } while (!line && reader_.StartGuessed());
+  return line;
+}
+
+// The first line of the text that has one of the needles, with all that it has of them.
+std::optional<MatchingLine> ContentScanner::LineIn(std::string_view text, bool at_line_start,
+                                                   size_t most_bytes) {
+  TextPlace first{npos, 0};
+  for (const auto& needle : query_.needles_) {
+    if (needle.negated) continue;
+    const auto place = needle.Find(text, 0);
+    if (place && place->at < first.at) first = *place;
+  }
+  if (first.at == npos) return std::nullopt;
+  const size_t before = first.at == 0 ? npos : text.rfind('\n', first.at - 1);
+  const size_t from = before == npos ? 0 : before + 1;
+  size_t end = std::min(text.find('\n', first.at), text.size());
+  if (end > from && text[end - 1] == '\r') --end;
+  const std::string_view line = text.substr(from, std::max(end, first.at) - from);
+  std::vector<std::pair<size_t, size_t>> marks{
+      {first.at - from, std::min(first.length, line.size() - (first.at - from))}};
+  for (const auto& needle : query_.needles_) {
+    if (needle.negated) continue;
+    size_t at = 0;
+    for (auto place = needle.Find(line, at); place; place = needle.Find(line, at)) {
+      if (place->at < at || place->length == 0) break;  // of an expression that marks nothing
+      marks.emplace_back(place->at, place->length);
+      at = place->at + place->length;
+    }
+  }
+  Merge(&marks);
+  MatchingLine found = Cut(line, std::move(marks), most_bytes, before != npos || at_line_start);
+  found.number = 1 + static_cast<std::uint64_t>(std::ranges::count(text.substr(0, from), '\n'));
+  return found;
+}
+
+}  // namespace nas
