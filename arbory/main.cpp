@@ -113,6 +113,8 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   CLI::Option* long_format = search->add_flag("-l,--long", options->long_format,
                                               "Mode, owner, group, size and time of each file");
   CLI::Option* json = search->add_flag("--json", options->json, "One JSON object a line");
+  search->add_flag("-n,--line-number", options->line_number,
+                   "First matching line of files found by their contents; means --content too");
   search->add_flag("-0,--print0", options->null_separated, "End each path with a NUL byte")
       ->excludes(json)
       ->excludes(long_format);
@@ -186,6 +188,7 @@ int Run(int argc, char** argv) {
     Unmark(&why_options.file);
     return RunWhyCommand(why_options);
   }
+  search_options.query.content |= search_options.line_number;
   return RunSearchCommand(search_options);
 }
 

@@ -76,6 +76,7 @@ struct SearchOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
+  bool line_number = false;  // tell the first line of what matches by its contents
 };
 
 struct WhyOptions {

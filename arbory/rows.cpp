@@ -1,13 +1,16 @@
 #include "arbory/rows.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 
 #include <cstdio>
 #include <ctime>
+#include <optional>
 
 #include "arbory/terminal.h"
 #include "nas/base/json_text.h"
 #include "nas/base/utf8.h"
+#include "nas/match/content_scanner.h"
 
 namespace arbory {
 namespace {
@@ -76,8 +79,35 @@ void AppendLong(const Json::Value& file, const RowFormat& format, std::string* o
   AppendName(path, format, out);
 }
 
+using Line = std::optional<nas::MatchingLine>;
+
+// ":NUMBER:TEXT", on a terminal with what was found in bold red.
+void AppendLine(const nas::MatchingLine& line, const RowFormat& format, std::string* out) {
+  constexpr char kMarked[] = "\033[1;31m";
+  constexpr char kUnmarked[] = "\033[m";
+  const std::string_view text = line.text;
+  *out += ":" + std::to_string(line.number) + ":";
+  if (!format.escape) {
+    *out += text;
+    return;
+  }
+  size_t at = 0;
+  for (const auto& [from, length] : line.marks) {
+    AppendEscaped(text.substr(at, from - at), out);
+    *out += kMarked;
+    AppendEscaped(text.substr(from, length), out);
+    *out += kUnmarked;
+    at = from + length;
+  }
+  AppendEscaped(text.substr(at), out);
+}
+
 // Control characters are escaped by JSON itself, all but DEL and those of the second set.
-void AppendJsonRow(const Json::Value& file, const RowFormat& format, std::string* out) {
+void AppendJsonRow(Json::Value file, const Line& line, const RowFormat& format, std::string* out) {
+  if (line) {
+    file["line"]["number"] = Json::UInt64{line->number};
+    file["line"]["text"] = line->text;
+  }
   std::string text = nas::JsonText(file, nas::JsonBytes::kClean);
   if (format.escape) {
     for (size_t at = 0; at < text.size(); ++at) {
@@ -94,7 +124,8 @@ void AppendJsonRow(const Json::Value& file, const RowFormat& format, std::string
   *out += text;
 }
 
-void AppendRow(const Json::Value& file, const RowFormat& format, std::string* out) {
+void AppendRow(const Json::Value& file, const Line& line, const RowFormat& format,
+               std::string* out) {
   switch (format.kind) {
     case RowFormat::Kind::kPath:
       AppendName(TextOf(file["real_path"]), format, out);
@@ -103,9 +134,10 @@ void AppendRow(const Json::Value& file, const RowFormat& format, std::string* ou
       AppendLong(file, format, out);
       break;
     case RowFormat::Kind::kJson:
-      AppendJsonRow(file, format, out);
+      AppendJsonRow(file, line, format, out);
       break;
   }
+  if (line && format.kind != RowFormat::Kind::kJson) AppendLine(*line, format, out);
   *out += format.end;
 }
 
@@ -132,7 +164,18 @@ nas::ReplyEncoder PageEncoder(const RowFormat& format) {
                          std::to_string(gone ? 0 : total.asUInt()) + "\n"};
     constexpr size_t kUsualRowBytes = 128;
     reply.body.reserve(reply.body.size() + files.size() * kUsualRowBytes);
-    for (const Json::Value& file : files) AppendRow(file, format, &reply.body);
+    constexpr size_t kMostLineBytes = 4096;
+    const int never = 0;
+    std::optional<nas::ContentScanner> scanner;
+    if (format.lines) scanner.emplace(*format.lines, never);
+    for (const Json::Value& file : files) {
+      Line line;
+      if (scanner && !file["is_dir"].asBool()) {
+        const std::string path(TextOf(file["real_path"]));
+        line = scanner->FirstLine(AT_FDCWD, path.c_str(), kMostLineBytes);
+      }
+      AppendRow(file, line, format, &reply.body);
+    }
     return reply;
   };
 }

@@ -5,9 +5,11 @@
 // A page's body is "FINISHED ROWS TOTAL\n" and the rows as they are printed.
 
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <string_view>
 
+#include "nas/match/content_query.h"
 #include "nas/webapi/runner.h"
 
 namespace arbory {
@@ -17,6 +19,8 @@ struct RowFormat {
   Kind kind = Kind::kPath;
   char end = '\n';
   bool escape = false;  // for a terminal
+  // Where given, the first line is told of each file whose contents hold what it asks for.
+  std::shared_ptr<const nas::ContentQuery> lines;
 
   // What the listing must be asked for: names of additional attributes.
   Json::Value Additional() const;

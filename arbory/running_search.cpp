@@ -37,6 +37,9 @@ void ReadWalk(Json::Value walk, RunningSearch* search) {
   const Json::Value& skipped = Member(walk, record::kSkipped);
   search->unreadable = CountOf(Member(skipped, record::kPermission));
   search->troubled = CountOf(Member(skipped, record::kOther));
+  const Json::Value& files = Member(walk, record::kFiles);
+  search->unreadable_files = CountOf(Member(files, record::kUnreadable));
+  search->not_text = CountOf(Member(files, record::kNotText));
   search->walk.swap(walk);
 }
 

@@ -32,6 +32,8 @@ struct RunningSearch {
   std::uint64_t matches = 0;
   std::uint64_t unreadable = 0;  // folders skipped for lack of permission
   std::uint64_t troubled = 0;  // folders skipped for other reasons; those that vanished not counted
+  std::uint64_t unreadable_files = 0;
+  std::uint64_t not_text = 0;  // files whose contents were not looked into
 };
 
 // Throws nothing: a record that cannot be read is that of a search that does not exist.

@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
+#include <memory>
 #include <optional>
 #include <string>
 
@@ -42,6 +43,14 @@ constexpr std::chrono::milliseconds kMostUnasked{1000};
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
 
+// Null for a pattern that asks for no contents.
+std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
+  const auto pattern = nas::NamePattern::Parse(text);
+  if (!pattern) return nullptr;
+  auto query = nas::ContentQuery::From(*pattern);
+  return query ? std::make_shared<const nas::ContentQuery>(std::move(*query)) : nullptr;
+}
+
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
 class Search {
@@ -51,6 +60,7 @@ class Search {
     if (options.json) format_.kind = RowFormat::Kind::kJson;
     if (options.long_format) format_.kind = RowFormat::Kind::kLong;
     if (options.null_separated) format_.end = '\0';
+    if (options.line_number) format_.lines = LinesOf(options.query.pattern);
     format_.escape = isatty(STDOUT_FILENO) != 0 && !options.null_separated;
   }
 
@@ -182,8 +192,7 @@ class Search {
       return kExitError;
     }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
-    ComplainOfSkipped(state.unreadable, "permission denied");
-    ComplainOfSkipped(state.troubled, "errors other than missing permission");
+    TellOfSkipped(state);
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
 
@@ -200,9 +209,15 @@ class Search {
     return false;
   }
 
-  static void ComplainOfSkipped(std::uint64_t folders, const char* reason) {
-    if (folders == 0) return;
-    Complain(Counted(folders, "folder", "folders") + " could not be read (" + reason + ")");
+  static void TellOfSkipped(const RunningSearch& state) {
+    const auto tell = [](std::uint64_t count, const char* one, const char* many, const char* what) {
+      if (count > 0) Complain(Counted(count, one, many) + what);
+    };
+    tell(state.unreadable, "folder", "folders", " could not be read (permission denied)");
+    tell(state.troubled, "folder", "folders",
+         " could not be read (errors other than missing permission)");
+    tell(state.unreadable_files, "file", "files", " could not be read");
+    tell(state.not_text, "file is", "files are", " not text");
   }
 
   // The cleaning goes on by itself after the reply.

@@ -13,7 +13,9 @@
 //   "walk"          what the walk has seen so far: walker, a few times a second
 //                   "phase" ("names", then perhaps "contents", then "done": no more rows will
 //                   come), "folders", "entries", "matches",
-//                   "skipped" {"permission", "vanished", "other"}: folders that could not be read
+//                   "skipped" {"permission", "vanished", "other"}: folders that could not be read;
+//                   files that vanished are among those
+//                   "files" {"unreadable", "not_text"}: files left out
 //
 // After the first write only the worker writes, and always the whole of "data": it reads the object
 // back, adds to it and writes it. A stopped worker marks the task finished and writes nothing, so
@@ -50,5 +52,8 @@ inline constexpr char kSkipped[] = "skipped";
 inline constexpr char kPermission[] = "permission";
 inline constexpr char kVanished[] = "vanished";
 inline constexpr char kOther[] = "other";
+inline constexpr char kFiles[] = "files";
+inline constexpr char kUnreadable[] = "unreadable";
+inline constexpr char kNotText[] = "not_text";
 
 }  // namespace task_record

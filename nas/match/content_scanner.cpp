@@ -1,6 +1,8 @@
 #include "nas/match/content_scanner.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -84,9 +86,12 @@ int ContentScanner::Open(int folder, const char* name) {
 
 ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name) {
   const UniqueFd fd(Open(folder, name));
-  if (!fd) return Outcome::kFailed;
+  return fd ? ScanOpen(fd.get()) : Outcome::kFailed;
+}
+
+ContentScanner::Outcome ContentScanner::ScanOpen(int fd) {
   std::fill(found_.begin(), found_.end(), false);
-  reader_.Start(fd.get());
+  reader_.Start(fd);
   Outcome outcome = Read();
   // What stands there in either reading is there: the guess may be wrong.
   if (outcome == Outcome::kNoMatch && !Decided() && reader_.StartGuessed()) outcome = Read();
@@ -153,10 +158,18 @@ bool ContentScanner::Matches() const {
 
 std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* name,
                                                       size_t most_bytes) {
-  if (Scan(folder, name) != Outcome::kMatch) return std::nullopt;
+  // Opening something else, such as a device, may have effects.
+  struct stat info;
+  if (fstatat(folder, name, &info, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(info.st_mode)) {
+    return std::nullopt;
+  }
   const UniqueFd fd(Open(folder, name));
-  if (!fd) return std::nullopt;
-  reader_.Start(fd.get());
+  return fd ? FirstLine(fd.get(), most_bytes) : std::nullopt;
+}
+
+std::optional<MatchingLine> ContentScanner::FirstLine(int fd, size_t most_bytes) {
+  if (ScanOpen(fd) != Outcome::kMatch || lseek(fd, 0, SEEK_SET) != 0) return std::nullopt;
+  reader_.Start(fd);
   std::optional<MatchingLine> line;
   do {
     std::uint64_t lines_before = 0;

@@ -33,13 +33,16 @@ class ContentScanner {
   // piece once the stop flag is set.
   Outcome Scan(int folder, const char* name);
 
-  // Where a file of that name matches; nothing where it does not, as when it has changed since, or
-  // cannot be read.
+  // Where the regular file of that name matches; nothing where it does not, as when it has changed
+  // since, is something else, or cannot be read.
   std::optional<MatchingLine> FirstLine(int folder, const char* name, size_t most_bytes);
+  // The same of a file that is open at its beginning.
+  std::optional<MatchingLine> FirstLine(int fd, size_t most_bytes);
 
  private:
   enum class Units { kBytes, kLines };
   int Open(int folder, const char* name);
+  Outcome ScanOpen(int fd);
   Outcome Read();
   // Hands the text over, in pieces that overlap so that nothing is cut in two: `look` is told a
   // piece and how much of it is not yet handed over again, and answers whether it has seen enough.

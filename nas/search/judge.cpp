@@ -76,7 +76,7 @@ Result<FileAttributes> Judge::Look(const char* name) {
 
 void Judge::Skip(int error_number) {
   error_number_ = error_number;
-  search_.progress.AddSkipped(error_number);
+  search_.progress.AddUnreadableFile(error_number);
 }
 
 Refusal Judge::Contents(const char* name) {
@@ -87,6 +87,7 @@ Refusal Judge::Contents(const char* name) {
     case ContentScanner::Outcome::kNoMatch:
       return Refusal::kContents;
     case ContentScanner::Outcome::kBinary:
+      search_.progress.AddNotText();
       return Refusal::kBinary;
     case ContentScanner::Outcome::kStopped:
       return Refusal::kStopped;

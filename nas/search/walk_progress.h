@@ -22,16 +22,23 @@ class WalkProgress {
     entries_.fetch_add(entries, std::memory_order_relaxed);
   }
   void AddMatch() { matches_.fetch_add(1, std::memory_order_relaxed); }
-  // Something could not be read; `error_number` says why.
+  // A folder could not be read; `error_number` says why.
   void AddSkipped(int error_number) {
     if (error_number == EACCES || error_number == EPERM) {
       permission_.fetch_add(1, std::memory_order_relaxed);
-    } else if (error_number == ENOENT || error_number == ENOTDIR) {
+    } else if (HasVanished(error_number)) {
       vanished_.fetch_add(1, std::memory_order_relaxed);
     } else {
       other_.fetch_add(1, std::memory_order_relaxed);
     }
   }
+  // The same of a file, or of what is known of it.
+  void AddUnreadableFile(int error_number) {
+    auto& count = HasVanished(error_number) ? vanished_ : unreadable_files_;
+    count.fetch_add(1, std::memory_order_relaxed);
+  }
+  // A file's contents were not looked into, because they are no text.
+  void AddNotText() { not_text_.fetch_add(1, std::memory_order_relaxed); }
   void SetPhase(Phase phase) { phase_ = phase; }
 
   Json::Value ToJson() const {
@@ -45,10 +52,16 @@ class WalkProgress {
     json[kSkipped][kPermission] = Json::UInt64{permission_};
     json[kSkipped][kVanished] = Json::UInt64{vanished_};
     json[kSkipped][kOther] = Json::UInt64{other_};
+    json[kFiles][kUnreadable] = Json::UInt64{unreadable_files_};
+    json[kFiles][kNotText] = Json::UInt64{not_text_};
     return json;
   }
 
  private:
+  static bool HasVanished(int error_number) {
+    return error_number == ENOENT || error_number == ENOTDIR;
+  }
+
   std::atomic<Phase> phase_ = Phase::kNames;
   std::atomic<std::uint64_t> folders_ = 0;
   std::atomic<std::uint64_t> entries_ = 0;
@@ -56,6 +69,8 @@ class WalkProgress {
   std::atomic<std::uint64_t> permission_ = 0;
   std::atomic<std::uint64_t> vanished_ = 0;
   std::atomic<std::uint64_t> other_ = 0;
+  std::atomic<std::uint64_t> unreadable_files_ = 0;
+  std::atomic<std::uint64_t> not_text_ = 0;
 };
 
 }  // namespace nas

@@ -119,8 +119,9 @@ def check_search(attack, task, harmless):
             properties = json.load(file)["properties"]
     except FileNotFoundError:
         raise Broken("a search that was started has no record") from None
-    skipped = (properties.get("walk") or {}).get("skipped", {})
-    complete = properties.get("progress") == 1 and not any(skipped.values())
+    walk = properties.get("walk") or {}
+    skipped = [*walk.get("skipped", {}).values(), walk.get("files", {}).get("unreadable", 0)]
+    complete = properties.get("progress") == 1 and not any(skipped)
     demand(complete or not harmless, f"what is no failure made one: {properties}")
     if complete:
         demand(paths(reply) == FOUND, f"a complete search lost files: {paths(reply)} {reply['code']}")

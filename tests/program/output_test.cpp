@@ -171,6 +171,17 @@ TEST_F(PrintedRows, JsonIsOneValidObjectALine) {
   EXPECT_TRUE(file["time"].isMember("mtime") && file["perm"].isMember("mode"));
 }
 
+TEST_F(PrintedRows, LinesOfContents) {
+  WriteFile(share_ + "/old.txt", "one\ntwo caf\xe9\xc9");
+  WriteFile(share_ + "/caf\u00e9.bin", std::string(3, '\0'));
+  WriteFile(share_ + "/other.bin", std::string(3, '\0'));
+  const Output output = Run({"search", "-n", "caf\u00e9", "--sort", "name"});
+  EXPECT_EQ(output.out, share_ + "/caf\u00e9.bin\n" + share_ + "/old.txt:2:two caf\u00e9\u00c9\n");
+  EXPECT_EQ(output.err, "arbory: 1 file is not text\n");
+  const Json::Value row = Json_(Run({"search", "-n", "one", "--json"}).out);
+  EXPECT_EQ(row["line"], Json_(R"({"number": 1, "text": "one"})"));
+}
+
 TEST_F(PrintedRows, LongRowsTellModeOwnerSizeAndTime) {
   ASSERT_EQ(chmod((share_ + "/IMG2.jpg").c_str(), 0640), 0);
   const Output output = Run({"search", "img2", "-l"});

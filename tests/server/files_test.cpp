@@ -61,13 +61,40 @@ TEST_F(FilesTest, NothingButReadableFilesOfTheShareComesOut) {
       {"photo/closed.txt", 403, nullptr},
   };
   for (const auto& row : rows) {
-    const Reply reply = server.Get(std::string("/files/") + row.path);
-    EXPECT_EQ(reply.status, row.status) << row.path << reply.body;
+    const Reply file = server.Get(std::string("/files/") + row.path);
     if (row.body != nullptr) {
-      EXPECT_EQ(reply.body, row.body) << row.path;
+      EXPECT_EQ(file.body, row.body) << row.path;
     }
-    EXPECT_EQ(reply.body.find("secret"), std::string::npos) << row.path;
-    EXPECT_EQ(reply.body.find(dir_), std::string::npos) << row.path;
+    const Reply line = server.Get(std::string("/lines/") + row.path + "?pattern=e");
+    for (const Reply& reply : {file, line}) {
+      EXPECT_EQ(reply.status, row.status) << row.path << reply.body;
+      EXPECT_EQ(reply.body.find("secret"), std::string::npos) << row.path;
+      EXPECT_EQ(reply.body.find(dir_), std::string::npos) << row.path;
+    }
+  }
+}
+
+TEST_F(FilesTest, FirstLineOfWhatContentsHold) {
+  WriteFile(share_ + "/notes.txt", "one\nA \xff<b>Two</b> two\n");
+  Server server = Start();
+  server.Open();
+  const struct {
+    const char* pattern;
+    int status;
+    const char* body;
+  } rows[] = {
+      {"two", 200, R"({"line":2,"parts":["A \ufffd<b>","Two","</b> ","two",""]})"},
+      {"three", 200, R"({"line":null,"parts":[]})"},
+      {"regex:%5EA", 200, R"({"line":2,"parts":["","A"," \ufffd<b>Two</b> two"]})"},
+      {"*.txt", 200, R"({"line":null,"parts":[]})"},
+      {"regex:(", 400, nullptr},
+  };
+  for (const auto& row : rows) {
+    const Reply reply = server.Get(std::string("/lines/photo/notes.txt?pattern=") + row.pattern);
+    EXPECT_EQ(reply.status, row.status) << row.pattern;
+    if (row.body != nullptr) {
+      EXPECT_EQ(reply.json(), Parsed(row.body)) << row.pattern << reply.body;
+    }
   }
 }
 

@@ -12,8 +12,11 @@
 
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
+#include "nas/base/json_text.h"
 #include "nas/base/system_call.h"
+#include "nas/match/content_scanner.h"
 #include "nas/system/child.h"
+#include "nas/system/config.h"
 #include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
@@ -151,6 +154,38 @@ void ServeFile(const FileRequest& request, int pipe) {
   SendBytes(pipe, file->fd.get(), range);
 }
 
+Json::Value LineJson(const std::optional<nas::MatchingLine>& line) {
+  Json::Value body;
+  body["line"] = line ? Json::Value(Json::UInt64{line->number}) : Json::Value();
+  Json::Value& parts = body["parts"] = Json::Value(Json::arrayValue);
+  if (!line) return body;
+  size_t at = 0;
+  for (const auto& [from, length] : line->marks) {
+    parts.append(line->text.substr(at, from - at));
+    parts.append(line->text.substr(from, length));
+    at = from + length;
+  }
+  parts.append(line->text.substr(at));
+  return body;
+}
+
+void ServeFirstLine(const FileRequest& request, const std::string& pattern, int pipe) {
+  constexpr size_t kMostLineBytes = 400;  // more than a row of the page can show
+  if (!BecomeForGood(request.user)) {
+    return SendError(pipe, kUnavailable, "The server cannot act as this user.");
+  }
+  const auto parsed = nas::NamePattern::Parse(pattern);
+  if (!parsed) return SendError(pipe, kBadRequest, "The pattern cannot be understood.");
+  const auto file = OpenFile(request);
+  if (!file) return SendOpenError(pipe, file.error().error_number);
+  const auto query = nas::ContentQuery::From(*parsed);
+  const int never = 0;
+  std::optional<nas::MatchingLine> line;
+  if (query) line = nas::ContentScanner(*query, never).FirstLine(file->fd.get(), kMostLineBytes);
+  const std::string body = nas::JsonText(LineJson(line), nas::JsonBytes::kClean);
+  nas::SendReply(pipe, AsChildsReply(JsonReply(kOk, body)));
+}
+
 bool ParseNumber(std::string_view text, std::uint64_t* number) {
   const auto parsed = std::from_chars(text.data(), text.data() + text.size(), *number);
   return parsed.ec == std::errc() && parsed.ptr == text.data() + text.size();
@@ -160,6 +195,11 @@ bool ParseNumber(std::string_view text, std::uint64_t* number) {
 
 nas::Child StartFile(const FileRequest& request) {
   return nas::StartChild([&](int pipe) { ServeFile(request, pipe); });
+}
+
+nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern) {
+  return nas::StartChild([&](int pipe) { ServeFirstLine(request, pattern, pipe); },
+                         nas::CurrentConfig().call_memory_bytes());
 }
 
 ByteRange ParseRange(const std::optional<std::string>& field, std::uint64_t size) {

@@ -24,6 +24,11 @@ struct FileRequest {
 // when nothing can be forked.
 nas::Child StartFile(const FileRequest& request);
 
+// Forks the child that looks for the first line of the file that holds what `pattern` asks for:
+// {"line": number, "parts": [text, marked text, text, ...]}, with `line` null where there is none.
+// Refuses a pattern that cannot be understood with 400, files as StartFile does.
+nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern);
+
 // The bytes that a Range field asks for of a file of `size` bytes. Nothing to ask for (no field,
 // several ranges, or none that is understood) gives the whole file; `satisfiable` tells whether the
 // file has any of the bytes.

@@ -4,7 +4,6 @@
 
 #include <charconv>
 
-#include "arbory/server/service/files.h"
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/user_calls.h"
@@ -101,6 +100,9 @@ std::span<const Route> Service::Routes() {
       {kGet, "/files/{share}/{path...}", Access::kLoggedIn,
        [](Self self, Request request, Path path) { return self.GetFile(*request, path); },
        "One file, as a download or with preview=1 to look at", "application/octet-stream"},
+      {kGet, "/lines/{share}/{path...}", Access::kLoggedIn,
+       [](Self self, Request request, Path path) { return self.GetFirstLine(*request, path); },
+       "The first line of a file that holds what ?pattern= asks for", kJson},
       {kGet, "/api", Access::kEverybody,
        [](Self self, Request, Path) -> Answer { return JsonReply(kOk, self.api_list_); },
        "The rows of the method table", kJson},
@@ -248,12 +250,29 @@ HttpReply Service::NoSuchRowReply(const RequestPath& path) const {
                     path[1] + " " + path[2] + " has no method " + path[3] + hint);
 }
 
-Answer Service::GetFile(const HttpRequest& request, const RequestPath& path) {
-  if (path.size() < 3) return ErrorReply(kNotFound, "Name a file: /files/SHARE/PATH.");
+// Of an address /ROUTE/SHARE/PATH.
+std::optional<FileRequest> Service::FileOf(const HttpRequest& request, const RequestPath& path) {
+  constexpr size_t kBeforePath = 2;
+  if (path.size() <= kBeforePath) return std::nullopt;
   FileRequest file;
   file.user = request.user;
   file.share = path[1];
-  file.path.assign(path.begin() + 2, path.end());
+  file.path.assign(path.begin() + kBeforePath, path.end());
+  return file;
+}
+
+Answer Service::GetFirstLine(const HttpRequest& request, const RequestPath& path) {
+  const auto file = FileOf(request, path);
+  if (!file) return ErrorReply(kNotFound, "Name a file: /lines/SHARE/PATH.");
+  const std::string pattern = QueryValue(request.query(), "pattern").value_or("");
+  return calls_.Run(Calls::Kind::kCall, request.user, "lines",
+                    [&] { return StartFirstLine(*file, pattern); });
+}
+
+Answer Service::GetFile(const HttpRequest& request, const RequestPath& path) {
+  auto named = FileOf(request, path);
+  if (!named) return ErrorReply(kNotFound, "Name a file: /files/SHARE/PATH.");
+  FileRequest& file = *named;
   file.preview = QueryValue(request.query(), "preview").value_or("") == "1";
   const std::string* range = request.Field("range");
   if (range != nullptr) file.range = *range;

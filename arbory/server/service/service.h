@@ -10,6 +10,7 @@
 #include "arbory/server/service/bodies.h"
 #include "arbory/server/service/calls.h"
 #include "arbory/server/service/entrance.h"
+#include "arbory/server/service/files.h"
 #include "arbory/server/service/guard.h"
 #include "arbory/server/service/metrics.h"
 #include "arbory/server/service/routes.h"
@@ -48,7 +49,9 @@ class Service : public HttpService {
   Answer StartCall(const HttpRequest& request, const RequestPath& path);
   Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
   HttpReply NoSuchRowReply(const RequestPath& path) const;
+  static std::optional<FileRequest> FileOf(const HttpRequest& request, const RequestPath& path);
   Answer GetFile(const HttpRequest& request, const RequestPath& path);
+  Answer GetFirstLine(const HttpRequest& request, const RequestPath& path);
   // The reply to a request that may not ask this route.
   std::optional<HttpReply> Refusal(const Route& route, HttpRequest* request);
 

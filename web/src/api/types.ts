@@ -27,6 +27,7 @@ export interface Walk {
   entries: number;
   matches: number;
   skipped: { permission: number; vanished: number; other: number };
+  files: { unreadable: number; not_text: number };
 }
 
 export interface Progress {

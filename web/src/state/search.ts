@@ -28,6 +28,7 @@ export class Search {
     entries: 0,
     matches: 0,
     skipped: { permission: 0, vanished: 0, other: 0 },
+    files: { unreadable: 0, not_text: 0 },
   };
   readonly pages: Pages;
   private taskid = '';
@@ -101,7 +102,12 @@ export class Search {
     const walk = progress.walk;
     if (!walk) return;
     const grew = (walk.matches ?? 0) > this.walk.matches;
-    this.walk = { ...this.walk, ...walk, skipped: { ...this.walk.skipped, ...walk.skipped } };
+    this.walk = {
+      ...this.walk,
+      ...walk,
+      skipped: { ...this.walk.skipped, ...walk.skipped },
+      files: { ...this.walk.files, ...walk.files },
+    };
     if (grew) this.pages.grown(this.walk.matches, this.sort === null);
     this.changed();
   }

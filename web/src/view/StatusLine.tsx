@@ -2,7 +2,7 @@
 // whole result.
 import { useEffect, useRef, useState } from 'preact/hooks';
 import type { Sort, SortColumn } from '../model/address.ts';
-import { count, elapsed, plural } from '../model/text.ts';
+import { elapsed, plural } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import { exportResults, type ExportFormat } from '../state/export.ts';
 import type { Search } from '../state/search.ts';
@@ -16,6 +16,7 @@ const SPOKEN_MS = 5000;
 
 export function StatusLine({ app, search }: { app: App; search: Search }) {
   const running = !search.over;
+  const notText = search.walk.files.not_text;
   return (
     <div class={`status ${running ? 'running' : ''}`}>
       <p class="figures">
@@ -27,6 +28,7 @@ export function StatusLine({ app, search }: { app: App; search: Search }) {
         </span>
         <span class="aside seen">
           {plural(search.walk.entries, 'name')} seen in {plural(search.walk.folders, 'folder')}
+          {notText > 0 && `; ${plural(notText, 'file is', 'files are')} not text`}
         </span>
       </p>
       <Skipped search={search} />
@@ -69,9 +71,14 @@ function Spoken({ search }: { search: Search }) {
 
 function Skipped({ search }: { search: Search }) {
   const { permission, other } = search.walk.skipped;
-  const unread = permission + other;
-  if (unread === 0) return null;
-  const title = `${plural(unread, 'folder')} could not be read`;
+  const folders = permission + other;
+  const files = search.walk.files.unreadable;
+  if (folders + files === 0) return null;
+  const what = [
+    ...(folders > 0 ? [plural(folders, 'folder')] : []),
+    ...(files > 0 ? [plural(files, 'file')] : []),
+  ];
+  const title = `${what.join(' and ')} could not be read`;
   return (
     <Popover
       className="tool caution"
@@ -87,15 +94,16 @@ function Skipped({ search }: { search: Search }) {
       {() => (
         <>
           <p>The result may not be complete.</p>
+          {files > 0 && <p>The contents of {plural(files, 'file')} could not be looked into.</p>}
           {permission > 0 && (
             <p>
-              {count(permission)} {permission === 1 ? 'is' : 'are'} closed to you. Ask the owner for
+              {plural(permission, 'folder')} {permission === 1 ? 'is' : 'are'} closed to you. Ask the owner for
               permission to read.
             </p>
           )}
           {other > 0 && (
             <p>
-              {count(other)} could not be read for another reason, such as a faulty disk. Search
+              {plural(other, 'folder')} could not be read for another reason, such as a faulty disk. Search
               again; if it stays, tell who runs the server.
             </p>
           )}
