@@ -4,7 +4,8 @@ fails in it."""
 import json
 import os
 
-from house import FOUND, HISTORY, Hang, QUERY, SEARCH, Server, children, eventually
+from house import (FOUND, HISTORY, Hang, QUERY, SEARCH, Server, children, eventually,
+                   password)
 from injector import Faults
 from scene import OLD_HISTORY, Broken, Scene, check_reply, demand, paths, patterns
 
@@ -17,26 +18,11 @@ class Attack(Scene):
     """A scene whose calls go through `faults`."""
 
     def __init__(self, bin_dir, faults=Faults):
-        super().__init__(bin_dir, 'logins_per_minute = 1000000\npam_dir = "PAM"\n')
+        super().__init__(bin_dir, "logins_per_minute = 1000000\n", logins=True)
         self.faults = faults(self.house)
-        self.make_pam()
         self.victim = self.logins = None
         self.left = 0  # runs that left a file to the sweep
         self.furnish()
-
-    def make_pam(self):
-        folder = self.house.dir + "/pam"
-        os.mkdir(folder)
-        with open(folder + "/check", "w") as file:
-            file.write('#!/bin/sh\nread -r given || :\n[ "$given" = right ]\n')
-        os.chmod(folder + "/check", 0o755)
-        with open(folder + "/arbory", "w") as file:
-            file.write(f"auth required pam_exec.so quiet expose_authtok {folder}/check\n"
-                       "account required pam_permit.so\n")
-        with open(self.house.config) as file:
-            text = file.read()
-        with open(self.house.config, "w") as file:
-            file.write(text.replace('"PAM"', f'"{folder}"'))
 
     def server(self, logins):
         """The one whose calls fail."""
@@ -220,18 +206,19 @@ class Download(Http):
 class Login(Http):
     logins = True
 
-    def __init__(self, password):
+    def __init__(self, right):
         super().__init__("login")
-        self.password = password
-        if password != "right":
+        self.right = right
+        if not right:
             self.most = MOST_REFUSALS
 
     def run(self, attack):
         return self.ask(attack, "POST", "/login",
-                        {"user": attack.house.user, "password": self.password})
+                        {"user": attack.house.user,
+                         "password": password(attack.house.user) if self.right else "wrong"})
 
     def check(self, attack, result, harmless):
-        if self.password != "right":
+        if not self.right:
             demand(result[0] != 200, "a wrong password opened the door")
             harmless = False
         super().check(attack, result, harmless)
@@ -258,5 +245,5 @@ def operations():
                            adds_search=True),
         "http-list": Http(SEARCH + "list", listed),
         "download": Download("download"),
-        **({"login": Login("right"), "refusal": Login("wrong")} if os.geteuid() == 0 else {}),
+        **({"login": Login(True), "refusal": Login(False)} if os.geteuid() == 0 else {}),
     }

@@ -85,7 +85,8 @@ class Tree:
 
 
 class House:
-    def __init__(self, bin_dir, server_lines=""):
+    def __init__(self, bin_dir, server_lines="", logins=False):
+        """`logins` makes a PAM service of its own, where everybody's password is known."""
         self.program = bin_dir + "/arbory"
         self.bin_dir = bin_dir
         # As root everything is done for another user, which is the harder case.
@@ -105,11 +106,24 @@ class House:
             os.makedirs(os.path.dirname(path), exist_ok=True)
             with open(path, "w") as file:
                 file.write(content)
+        if logins:
+            server_lines += f'pam_dir = "{self.make_pam()}"\n'
         self.config = self.dir + "/arbory.toml"
         with open(self.config, "w") as file:
             file.write(f'state_dir = "{self.state}"\nvolumes = ["{self.dir}/volume*"]\n'
                        f'[server]\nlisten = "127.0.0.1:0"\naccess_log = false\n{server_lines}')
         self.known = set()  # children that may stay
+
+    def make_pam(self):
+        folder = self.dir + "/pam"
+        os.mkdir(folder)
+        with open(folder + "/check", "w") as file:
+            file.write('#!/bin/sh\nread -r given || :\n[ "$given" = "right-$PAM_USER" ]\n')
+        os.chmod(folder + "/check", 0o755)
+        with open(folder + "/arbory", "w") as file:
+            file.write(f"auth required pam_exec.so quiet expose_authtok {folder}/check\n"
+                       "account required pam_permit.so\n")
+        return folder
 
     def remove(self):
         for process in self.known:
@@ -211,11 +225,11 @@ class Server:
             reply = self.ask("GET", match[2])
             self.cookie = reply.getheader("Set-Cookie").partition(";")[0]
 
-    def ask(self, method, path, body=None, seconds=DEADLINE):
+    def ask(self, method, path, body=None, seconds=DEADLINE, more=None):
         connection = http.client.HTTPConnection("127.0.0.1", self.port, timeout=seconds)
-        fields = {"Content-Type": "application/json", "Connection": "close"}
+        fields = {"Content-Type": "application/json", "Connection": "close", **(more or {})}
         if self.cookie:
-            fields["Cookie"] = self.cookie
+            fields.setdefault("Cookie", self.cookie)
         try:
             connection.request(method, path, None if body is None else json.dumps(body), fields)
             reply = connection.getresponse()
@@ -257,3 +271,25 @@ class Server:
         os.kill(self.process, signal.SIGTERM)
         os.waitpid(self.process, 0)
         self.house.known.discard(self.process)
+
+
+def password(user):
+    return "right-" + user
+
+
+class Visitor:
+    """One of a server's users, once logged in. Asks as a Server does."""
+
+    def __init__(self, server, user):
+        self.server = server
+        self.user = user
+        reply = server.ask("POST", "/login", {"user": user, "password": password(user)})
+        if reply.status != 200:
+            raise RuntimeError(f"{user} is not let in: {reply.status} {reply.content}")
+        self.cookie = reply.getheader("Set-Cookie").partition(";")[0]
+
+    def ask(self, method, path, body=None, seconds=DEADLINE, more=None):
+        return self.server.ask(method, path, body, seconds, {"Cookie": self.cookie, **(more or {})})
+
+    def call(self, method, params, seconds=DEADLINE):
+        return json.loads(self.ask("POST", "/api/" + method, params, seconds).content)

@@ -29,14 +29,17 @@ def demand(holds, what):
 
 
 class Scene:
-    def __init__(self, bin_dir, server_lines=""):
-        self.house = House(bin_dir, server_lines)
+    def __init__(self, bin_dir, server_lines="", logins=False):
+        self.house = House(bin_dir, server_lines, logins)
         self.make_endless_share()
 
     def make_endless_share(self):
         """Names are found there at once, and contents are read for hours."""
         os.makedirs(self.house.dir + "/volume1/endless")
-        with open(self.house.dir + "/volume1/endless/one.log", "w") as file:
+        with open(self.house.dir + "/volume1/endless/one.log", "w"):
+            pass
+        # What its name has matched is not read.
+        with open(self.house.dir + "/volume1/endless/other.log", "w") as file:
             file.write("a" * (1 << 18))
             file.truncate(1 << 42)
 
