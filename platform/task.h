@@ -49,8 +49,8 @@ class Task {
   // finished first and ends later; until it has, the record may still change.
   bool isAbandoned() const;
 
-  // For the worker of a new task, a few times a second: whether it was made with a lease, and
-  // nobody has opened it for so long that nobody will.
+  // For the worker of a new task, a few times a second: whether it was removed, or was made with a
+  // lease and nobody has opened it for so long that nobody will.
   bool isForsaken();
 
   // Deletes the record. Objects that still hold the task cannot write it any more.

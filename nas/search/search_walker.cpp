@@ -261,11 +261,11 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   // A task that was removed meanwhile has nobody left to tell.
   task_->endUpdate();
   told_ready_ = true;
-  // Ends the way a search does that is told to stop.
-  if (!last && !forsaken_ && task_->isForsaken()) {
-    forsaken_ = true;
-    raise(SIGTERM);
-  }
+  if (last || stopped()) return;
+  // Ends the way a search does that is told to stop. It was, where somebody has marked it as
+  // finished, even if their signal was never sent.
+  forsaken_ = task_->isForsaken();
+  if (forsaken_ || task_->isFinished()) raise(SIGTERM);
 }
 
 // What nobody asks after leaves nothing. The database goes first, as when it is cleaned.

@@ -95,7 +95,7 @@ class Task::Record {
 
   bool finished() const { return finished_ || abandoned_; }
   bool abandoned() const { return abandoned_; }
-  bool LeaseIsOver() { return lease_ && lease_->IsOver(life_.get()); }
+  bool IsForsaken() { return nas::IsRemoved(life_) || (lease_ && lease_->IsOver(life_.get())); }
   bool Remove() { return files_.Remove(id_).ok(); }
 
   mutable std::mutex mutex;
@@ -170,7 +170,7 @@ bool Task::isAbandoned() const {
 
 bool Task::isForsaken() {
   const std::lock_guard guard(record_->mutex);
-  return record_->LeaseIsOver();
+  return record_->IsForsaken();
 }
 
 bool Task::remove() {

@@ -196,6 +196,11 @@ UniqueFd TaskFiles::Ask(const std::string& id) const {
   return fd;
 }
 
+bool IsRemoved(const UniqueFd& life) {
+  struct stat info;
+  return life && fstat(life.get(), &info) == 0 && info.st_nlink == 0;
+}
+
 bool LeaseWatch::IsOver(int lock_fd) {
   const auto now = std::chrono::steady_clock::now();
   struct flock lock = WriteLockOn(kAskerByte);

@@ -94,6 +94,9 @@ class TaskFiles {
   UniqueFd folder_;
 };
 
+// Whether the task that `life` keeps alive was removed, for the process that made it and its forks.
+bool IsRemoved(const UniqueFd& life);
+
 // Tells a leased task's worker when the lease is over. Goes by changes alone, not by what the clock
 // of the day says of them.
 class LeaseWatch {

@@ -235,6 +235,7 @@ def operations():
         "start": Call(SEARCH + "start", start, after_start, adds_search=True),
         "list": Call(SEARCH + "list", listed),
         "stop": Stop(SEARCH + "stop", {"taskid": "RUNNING"}),
+        "clean-running": Stop(SEARCH + "clean", {"taskid": "RUNNING"}),
         "clean": Call(SEARCH + "clean", {"taskid": "FOUND"}, keeps_results=False),
         "clean-all": Call(SEARCH + "Clean", {"action": "cleanall"}, keeps_results=False),
         "get": Call(HISTORY + "get", {}),
