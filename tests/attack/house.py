@@ -204,14 +204,16 @@ def list_folder(path):
 class Server:
     """`arbory serve` for the house's user, or for all who log in. `name` is that of its output."""
 
-    def __init__(self, house, name="server", environment=None, logins=False, memory=None):
-        """`memory` bounds what each of its children, and itself, may map."""
+    def __init__(self, house, name="server", environment=None, logins=False, memory=None,
+                 before=()):
+        """`memory` bounds what each of its children, and itself, may map; `before` are words that come
+        before the command."""
         self.house = house
         self.cookie = None
         words = [house.program, "serve", "--config", house.config]
         # A campaign that is killed leaves no server behind.
         mortal = ["/usr/bin/setpriv", "--pdeathsig", "KILL"]
-        self.process = house.spawn(mortal + (words if logins else house.words("serve")),
+        self.process = house.spawn([*mortal, *before] + (words if logins else house.words("serve")),
                                    environment, name)
         house.known.add(self.process)
         if memory:

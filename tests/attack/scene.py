@@ -12,7 +12,7 @@ from house import (FOUND, HISTORY, House, SEARCH, Server, Tree, children, eventu
 
 CODES = {0, 100, 101, 400, 401, 405, 407, 408, 418, 600}
 OLD_HISTORY = ["one", "older"]
-TASK_FILES = r"lock|[0-9a-f]{32}\.(json|lock)"
+TASK_FILES = r"lock|large|[0-9a-f]{32}\.(json|lock)"
 RESULT_FILES = r"[0-9a-f]{32}\.db(-wal|-shm|-journal)?"
 TEMPORARY = ".arbory-new-"
 DAY = 24 * 60 * 60
