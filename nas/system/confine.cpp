@@ -9,11 +9,14 @@
 // called /volume-something appears under an unused /volumeN, so that "/volume*" reaches it.
 
 #include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -31,6 +34,8 @@ namespace nas {
 namespace {
 
 constexpr char kBubblewrap[] = "/usr/bin/bwrap";
+// For emptying a folder of result files; longer takes only what will never end.
+constexpr std::chrono::minutes kPatience{10};
 constexpr char kCommandPath[] = "/usr/bin:/bin";
 constexpr const char* kSystemFolders[] = {"/usr",   "/bin",   "/sbin",   "/lib",
                                           "/lib32", "/lib64", "/libx32", "/etc"};
@@ -66,8 +71,10 @@ void AddVolumes(CommandLine* line) {
 
 CommandLine Confine(const std::vector<const char*>& command, int status_fd) {
   CommandLine line;
-  line.Add({kBubblewrap, "--unshare-all", "--die-with-parent", "--new-session", "--clearenv",
-            "--setenv", "PATH", kCommandPath, "--json-status-fd", std::to_string(status_fd)});
+  // It does not die with its parent: half of it would, and leave the other half, which waits for
+  // that one while they begin, behind for ever. Its work ends by itself.
+  line.Add({kBubblewrap, "--unshare-all", "--new-session", "--clearenv", "--setenv", "PATH",
+            kCommandPath, "--json-status-fd", std::to_string(status_fd)});
   for (const char* folder : kSystemFolders) line.Add({"--ro-bind-try", folder, folder});
   line.Add({"--dev", "/dev"});
   AddVolumes(&line);
@@ -78,30 +85,48 @@ CommandLine Confine(const std::vector<const char*>& command, int status_fd) {
 
 // bubblewrap's own failures and the command's exit status share one number; only its status
 // report, one JSON object a line, tells whether the command ran to its end.
-int ReportedStatus(const std::string& report) {
+constexpr char kExitCode[] = "exit-code";
+// The first process within, whose end is that of all the others there.
+constexpr char kInnerProcess[] = "child-pid";
+
+// -1 where nothing of that name was reported.
+int Reported(const std::string& report, const char* name) {
   size_t start = 0;
   while (start < report.size()) {
     size_t end = report.find('\n', start);
     if (end == std::string::npos) end = report.size();
     Json::Value line;
     if (ParseJson(report.substr(start, end - start), &line) && line.isObject() &&
-        line["exit-code"].isInt()) {
-      return line["exit-code"].asInt();
+        line[name].isInt()) {
+      return line[name].asInt();
     }
     start = end + 1;
   }
   return -1;
 }
 
-std::string ReadToEnd(int fd) {
+// False when it did not end in time.
+bool ReadToEnd(int fd, std::string* all) {
   constexpr size_t kReadBytes = 4096;
-  std::string all;
   char bytes[kReadBytes];
+  const auto end = std::chrono::steady_clock::now() + kPatience;
   for (;;) {
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+        end - std::chrono::steady_clock::now());
+    pollfd ready{fd, POLLIN, 0};
+    const int polled = left.count() > 0 ? poll(&ready, 1, static_cast<int>(left.count())) : 0;
+    if (polled < 0 && errno == EINTR) continue;
+    if (polled == 0) return false;
     const ssize_t count = Uninterrupted([&] { return read(fd, bytes, sizeof bytes); });
-    if (count <= 0) return all;
-    all.append(bytes, static_cast<size_t>(count));
+    if (count <= 0) return true;
+    all->append(bytes, static_cast<size_t>(count));
   }
+}
+
+void Kill(pid_t child, const std::string& report) {
+  const int inner = Reported(report, kInnerProcess);
+  if (inner > 0) kill(inner, SIGKILL);
+  kill(child, SIGKILL);
 }
 
 Result<int> RunConfined(const std::vector<const char*>& command) {
@@ -120,11 +145,12 @@ Result<int> RunConfined(const std::vector<const char*>& command) {
     _exit(EXIT_FAILURE);
   }
   status.Reset();
-  const std::string text = ReadToEnd(report.get());
+  std::string text;
+  if (!ReadToEnd(report.get(), &text)) Kill(child, text);
   int ended = 0;
   while (waitpid(child, &ended, 0) < 0 && errno == EINTR) {
   }
-  const int code = ReportedStatus(text);
+  const int code = Reported(text, kExitCode);
   if (code < 0) return Error{kErrorOther, 0, kBubblewrap};
   return code;
 }
