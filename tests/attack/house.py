@@ -85,8 +85,9 @@ class Tree:
 
 
 class House:
-    def __init__(self, bin_dir, server_lines="", logins=False):
-        """`logins` makes a PAM service of its own, where everybody's password is known."""
+    def __init__(self, bin_dir, server_lines="", logins=False, place=None):
+        """`logins` makes a PAM service of its own, where everybody's password is known. `place` is
+        called with the folder before anything is put into it."""
         self.program = bin_dir + "/arbory"
         self.bin_dir = bin_dir
         # As root everything is done for another user, which is the harder case.
@@ -95,6 +96,8 @@ class House:
         # In memory where that can be had: what is attacked is the program, not the disk.
         fast = "/dev/shm" if os.access("/dev/shm", os.W_OK) else None
         self.dir = os.path.realpath(tempfile.mkdtemp(prefix="arbory-attack-", dir=fast))
+        if place:
+            place(self.dir)
         os.chmod(self.dir, 0o755)
         self.share = self.dir + "/volume1/share"
         self.state = self.dir + "/state"
@@ -128,6 +131,7 @@ class House:
     def remove(self):
         for process in self.known:
             os.kill(process, signal.SIGKILL)
+            os.waitpid(process, 0)
         shutil.rmtree(self.dir, ignore_errors=True)
 
     def words(self, *words):

@@ -29,8 +29,8 @@ def demand(holds, what):
 
 
 class Scene:
-    def __init__(self, bin_dir, server_lines="", logins=False):
-        self.house = House(bin_dir, server_lines, logins)
+    def __init__(self, bin_dir, server_lines="", logins=False, place=None):
+        self.house = House(bin_dir, server_lines, logins, place)
         self.make_endless_share()
 
     def make_endless_share(self):
