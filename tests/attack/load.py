@@ -22,11 +22,12 @@ PROMISE = "Nobody waits for another: a hostile user costs the others little, and
 ATTACK = "users search, page, stop, clean, download and log in, half of the time beside a hostile one"
 
 USERS, SECONDS, SLICE, THINK = 50, 600, 20, 1.0
-SHORT_USERS, SHORT_SECONDS, SHORT_SLICE, SHORT_THINK = 6, 8, 1, 0.05
+SHORT_USERS, SHORT_SECONDS, SHORT_SLICE, SHORT_THINK = 6, 8, 2, 0.05
 FIRST_UID = 23000
 HOSTILE = "hostile"
 FOLDERS, FILES_OF_A_FOLDER = 60, 40
 MANY = 30_000  # files that the hostile one finds
+DAMAGED_BYTES = 1 << 20  # the results of so many are larger
 PAGE = 500
 MOST_SLOWER = 3  # times, of the slowest hundredth of the others' requests
 SERVER_KIB = 32 << 10
@@ -197,17 +198,36 @@ class Load:
 
     # The hostile one.
 
+    async def prepare(self):
+        """The hostile one's session, a search with very many results, and one whose results it has
+        made something else."""
+        self.enemy = Connection(self.server.port, HOSTILE)
+        await self.enemy.log_in()
+        self.large = await self.enemys_search("/many", "file")
+        self.damaged = await self.enemys_search("/data", "report")
+        folder = f"{self.house.dir}/volume1/@tmp/webfm/FBSearch/{HOSTILE}"
+        for name in os.listdir(folder):
+            path = f"{folder}/{name}"
+            if name.endswith(".db") and os.path.getsize(path) < DAMAGED_BYTES:
+                with open(path, "r+b") as file:
+                    file.seek(os.path.getsize(path) // 2)
+                    file.write(random.Random(1).randbytes(4096))
+                self.outcome.count("damaged result files")
+        self.enemy.close()
+
+    async def enemys_search(self, folder, pattern):
+        async def ask(method, params):
+            return json.loads((await self.enemy.ask("POST", "/api/" + SEARCH + method, params))[1])
+        task = (await ask("start", {"folder_path": folder, "pattern": pattern}))["data"]["taskid"]
+        while not (await ask("list", {"taskid": task, "limit": 1}))["data"].get("finished"):
+            await asyncio.sleep(RETRY)
+        return task
+
     async def attack(self):
         """Goes on with everything until it is cancelled."""
-        first = Connection(self.server.port, HOSTILE)
-        await first.log_in()
-        started = json.loads((await first.ask("POST", "/api/" + SEARCH + "start", {
-            "folder_path": "/many", "pattern": "file"}))[1])
-        task = (started.get("data") or {}).get("taskid", "")
-
         def another():
             connection = Connection(self.server.port, HOSTILE)
-            connection.cookie = first.cookie
+            connection.cookie = self.enemy.cookie
             return connection
 
         async def again(path, body):
@@ -238,27 +258,12 @@ class Load:
             finally:
                 connection.close()
 
-        lists = {"taskid": task, "limit": 0, "additional": EVERYTHING}
+        lists = [{"taskid": self.large, "limit": 0, "additional": EVERYTHING}] * 4
+        lists += [{"taskid": self.damaged, "additional": EVERYTHING}] * 2
         await asyncio.gather(
             *[again("/api/" + SEARCH + "start", DEEP) for _ in range(6)],
-            *[again("/api/" + SEARCH + "list", lists) for _ in range(4)],
-            *[hold("/files/share/large") for _ in range(20)], *[hold("") for _ in range(40)],
-            self.damage(again, another()))
-
-    async def damage(self, again, connection):
-        """Lists a search whose results have become something else."""
-        started = json.loads((await connection.ask("POST", "/api/" + SEARCH + "start", {
-            "folder_path": "/data", "pattern": "report"}))[1])
-        task = (started.get("data") or {}).get("taskid", "")
-        folder = f"{self.house.dir}/volume1/@tmp/webfm/FBSearch/{HOSTILE}"
-        await asyncio.sleep(0.2)
-        for name in os.listdir(folder):
-            path = f"{folder}/{name}"
-            if name.endswith(".db") and os.path.getsize(path) < 1 << 20:
-                with open(path, "r+b") as file:
-                    file.seek(os.path.getsize(path) // 2)
-                    file.write(random.Random(1).randbytes(4096))
-        await again("/api/" + SEARCH + "list", {"taskid": task, "additional": EVERYTHING})
+            *[again("/api/" + SEARCH + "list", params) for params in lists],
+            *[hold("/files/share/large") for _ in range(20)], *[hold("") for _ in range(40)])
 
     async def turns(self, until):
         while time.monotonic() < until:
@@ -286,6 +291,7 @@ class Load:
         for number in range(len(QUERIES)):
             await self.search(quiet, number, never)
         quiet.close()
+        await self.prepare()
         self.took = {False: [], True: []}
         until = time.monotonic() + self.options.seconds
         lives = asyncio.gather(*[self.live(user, until) for user in self.names])
@@ -312,7 +318,9 @@ class Load:
         if most > SERVER_KIB:
             self.outcome.breaks(f"the server took {most} KiB", self.repeat())
         if not eventually(lambda: not children(self.server.process)):
-            self.outcome.breaks("children are left", self.repeat())
+            left = [open(f"/proc/{child}/status").read().split("\n")[:9] for child in
+                    children(self.server.process)]
+            self.outcome.breaks(f"children are left: {left}", self.repeat())
 
 
 def options(parser):
