@@ -160,6 +160,7 @@ class Http(Call):
     """The same by way of a server whose calls fail."""
 
     logins = False
+    ends_early = ("socket", "watch", "alloc")
 
     def run(self, attack):
         return self.ask(attack, "POST", "/api/" + self.method, self.made(attack))
@@ -181,10 +182,11 @@ class Http(Call):
         demand(eventually(lambda: not children(server.process)), "the server keeps a child")
         demand(eventually(lambda: server.descriptors() == server.quiet, 5),
                f"the server keeps descriptors: {server.quiet} became {server.descriptors()}")
-        demand(server.ask("GET", "/health").status == 200, "the server is not well")
+        # Without any memory it turns clients away until it has some.
+        demand(eventually(lambda: is_well(server)), "the server is not well")
         status, content = result
         # Where the server itself cannot hear, think or speak the connection ends.
-        lost = any(attack.faults.wants(kind) for kind in ("socket", "watch", "alloc"))
+        lost = any(attack.faults.wants(kind) for kind in self.ends_early)
         demand(status in STATUSES or (status == 0 and lost), f"status {status}: {content}")
         if harmless:
             demand(status == 200, f"what is no failure made one: {status} {content}")
@@ -195,7 +197,17 @@ class Http(Call):
         self.check_content(attack, check_reply(json.loads(content)), harmless)
 
 
+def is_well(server):
+    try:
+        return server.ask("GET", "/health").status == 200
+    except OSError:
+        return False
+
+
 class Download(Http):
+    # What cannot be read of a file whose size has been told is told by an early end alone.
+    ends_early = (*Http.ends_early, "read")
+
     def run(self, attack):
         return self.ask(attack, "GET", "/files/share/one.txt")
 

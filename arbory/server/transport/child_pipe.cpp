@@ -5,6 +5,7 @@
 
 #include <boost/asio/post.hpp>
 #include <cerrno>
+#include <exception>
 
 #include "nas/base/system_call.h"
 
@@ -30,8 +31,15 @@ ChildPipe::ChildPipe(boost::asio::io_context& loop, nas::Child child, std::share
 
 void ChildPipe::Read(Reader reader) {
   reader_ = std::move(reader);
-  Watch();
-  Wait();
+  try {
+    Watch();
+    Wait();
+  } catch (const std::exception&) {
+    // The timer holds this, and a reader would be held with it, and its client left to wait.
+    reader_ = nullptr;
+    Kill();
+    throw;
+  }
 }
 
 void ChildPipe::Wait() {
@@ -70,7 +78,11 @@ void ChildPipe::Close() {
   reader_ = nullptr;
   boost::system::error_code ignored;
   pipe_.close(ignored);
-  Watch();
+  try {
+    Watch();
+  } catch (const std::exception&) {
+    Kill();
+  }
 }
 
 void ChildPipe::OnExit() {

@@ -22,6 +22,7 @@
 #include "arbory/server/transport/child_pipe.h"
 #include "arbory/server/transport/children.h"
 #include "arbory/server/transport/connection.h"
+#include "nas/base/unique_fd.h"
 
 namespace arbory {
 namespace {
@@ -134,6 +135,7 @@ class HttpServer::Loop : public ConnectionHost {
       acceptor_.set_option(tcp::acceptor::reuse_address(true));
       acceptor_.bind(wanted);
       acceptor_.listen(asio::socket_base::max_listen_connections);
+      acceptor_.native_non_blocking(true);
       endpoint_ = acceptor_.local_endpoint();
     } catch (const boost::system::system_error& error) {
       throw std::runtime_error("cannot listen on " + AddressText(wanted) + ": " +
@@ -145,17 +147,43 @@ class HttpServer::Loop : public ConnectionHost {
   // What a request throws, for want of memory or of a place to watch its socket, ends that request
   // with its connection. The server goes on once it can wait for clients and children again.
   void RunLoop() {
+    while (!TryRun([this] {
+      Prepare();
+      loop_.run();
+    })) {
+      usleep(std::chrono::microseconds(kAcceptPause).count());
+      // Nobody is left waiting where not even the preparing is possible: what is under way goes on
+      // or ends, and who comes finds the connection closed.
+      if (TryRun([this] { Prepare(); })) continue;
+      TryRun([this] { loop_.poll(); });
+      loop_.restart();
+      TurnAway();
+    }
+  }
+
+  void Prepare() {
+    if (!awaiting_children_) AwaitChildren();
+    Reap();  // also those whose signal came to nothing
+    if (!accepting_ && !stopping_) Accept();
+  }
+
+  template <typename Step>
+  bool TryRun(Step step) {
+    try {
+      step();
+      return true;
+    } catch (const std::exception& error) {
+      syslog(LOG_ERR, "a request was dropped: %s", error.what());
+      return false;
+    }
+  }
+
+  // Takes no memory.
+  void TurnAway() {
     for (;;) {
-      try {
-        if (!awaiting_children_) AwaitChildren();
-        Reap();  // also those whose signal came to nothing
-        if (!accepting_ && !stopping_) Accept();
-        loop_.run();
-        return;
-      } catch (const std::exception& error) {
-        syslog(LOG_ERR, "a request was dropped: %s", error.what());
-        usleep(std::chrono::microseconds(kAcceptPause).count());
-      }
+      const nas::UniqueFd client(
+          accept4(acceptor_.native_handle(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+      if (!client) return;
     }
   }
 
