@@ -85,7 +85,9 @@ def paths(reply):
 
 def check_reply(reply):
     demand(set(reply) == {"code", "data"} and reply["code"] in CODES, f"an unknown reply: {reply}")
-    demand(reply["code"] == 0 or reply["data"] is None, f"an error with data: {reply}")
+    # What the call had no memory for is told in words.
+    told = reply["code"] == 100 and set(reply["data"] or {}) == {"error"}
+    demand(reply["code"] == 0 or reply["data"] is None or told, f"an error with data: {reply}")
     return reply
 
 
