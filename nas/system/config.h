@@ -37,6 +37,7 @@ struct ServerSettings {
   int call_seconds = 120;      // for a child to begin or go on with its reply
   int logins_per_minute = 10;  // refused ones of an address; of an account ten times as many
   int session_minutes = 12 * 60;
+  int account_check_seconds = 60;  // between two looks at whether a user may still be logged in
 };
 
 struct Config {

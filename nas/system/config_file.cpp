@@ -145,6 +145,7 @@ class Reader {
         {"call_seconds", &server->call_seconds},
         {"logins_per_minute", &server->logins_per_minute},
         {"session_minutes", &server->session_minutes},
+        {"account_check_seconds", &server->account_check_seconds},
     };
     for (const auto& [name, limit] : limits) {
       keys[name] = [this, limit = limit](const toml::node& value) { *limit = Limit(value); };

@@ -2,12 +2,18 @@
 
 #include "arbory/server/service/sessions.h"
 
+#include <fcntl.h>
 #include <grp.h>
 #include <pwd.h>
+#include <sched.h>
 #include <signal.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <iterator>
+#include <sstream>
 #include <thread>
 
 #include "tests/server/server_test.h"
@@ -218,6 +224,74 @@ TEST_F(LoginTest, AClosedAccountIsRefused) {
   EXPECT_FALSE(server.LogIn(kAnn, "right"));
   Server missing = StartWithLogins("pam_service = \"missing\"\n");
   EXPECT_FALSE(missing.LogIn(kAnn, "right")) << "no service file: nobody is let in";
+}
+
+TEST_F(LoginTest, ASessionEndsWithWhatItWasGivenFor) {
+  SKIP_UNLESS_ROOT();
+  // Written in one step each: a look may fall between any two. This one cannot be replaced where it
+  // is mounted.
+  const std::string shadow = dir_ + "/shadow";
+  const auto set_password = [&](const std::string& eight_letters) {
+    const std::string text =
+        "nobody:" + eight_letters + ":20000::::::\ndaemon:whatever:20000::::::\n";
+    const nas::UniqueFd fd(open(shadow.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
+    EXPECT_EQ(write(fd.get(), text.data(), text.size()), static_cast<ssize_t>(text.size()));
+  };
+  set_password("as it is");
+  if (unshare(CLONE_NEWNS) != 0 ||
+      mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+      mount(shadow.c_str(), "/etc/shadow", nullptr, MS_BIND, nullptr) != 0) {
+    GTEST_SKIP() << "no accounts of its own: " << strerror(errno);
+  }
+  const std::string looks = dir_ + "/looks";
+  WriteFile(dir_ + "/look", "#!/bin/sh\necho \"$PAM_USER\" >> " + looks + "\n");
+  chmod((dir_ + "/look").c_str(), 0755);
+  const auto set_account_phase = [&](const std::string& line) {
+    WriteFile(dir_ + "/next", "auth required pam_permit.so\naccount required pam_exec.so " + dir_ +
+                                  "/look\naccount required " + line + "\n");
+    ASSERT_EQ(rename((dir_ + "/next").c_str(), (dir_ + "/pam/watched").c_str()), 0);
+  };
+  MakeFolder("pam");
+  set_account_phase("pam_permit.so");
+  Server ann = StartWithLogins("pam_service = \"watched\"\naccount_check_seconds = 1\n");
+  Server bob = ann;
+  ASSERT_TRUE(bob.LogIn(kBob, ""));
+  const auto looked_again_at = [&](const std::string& user) {
+    const auto count = [&] {
+      std::istringstream lines(ReadFile(looks));
+      return std::count(std::istream_iterator<std::string>(lines), {}, user);
+    };
+    // Of two looks the second begins after the first was acted on.
+    const auto before = count();
+    return Eventually([&] { return count() >= before + 2; });
+  };
+  const struct {
+    const char* account_phase;
+    const char* password;
+    int status;
+    const char* why;
+  } rows[] = {
+      {"pam_debug.so acct=authinfo_unavail", "as it is", 200, "a directory that does not answer"},
+      {"pam_permit.so", "another.", 401, "another password"},
+      {"pam_permit.so", "!another", 401, "locked"},
+      {"pam_succeed_if.so quiet user != nobody", "!another", 401, "closed for her alone"},
+  };
+  for (const auto& row : rows) {
+    set_account_phase("pam_permit.so");
+    ASSERT_TRUE(ann.LogIn(kAnn, "")) << row.why;
+    set_password(row.password);
+    set_account_phase(row.account_phase);
+    if (row.status == 401) {
+      EXPECT_TRUE(Eventually([&] { return ann.Get("/session").status == 401; })) << row.why;
+    } else {
+      EXPECT_TRUE(looked_again_at(kAnn));
+      EXPECT_EQ(ann.Get("/session").status, 200) << row.why;
+    }
+  }
+  EXPECT_TRUE(looked_again_at(kBob));
+  EXPECT_EQ(bob.Get("/session").status, 200) << "nothing of his has changed";
+  EXPECT_NE(bob.Get("/metrics").body.find("\narbory_sessions_ended_total 4\n"), std::string::npos);
+  EXPECT_NE(Log().find("\"sessions_ended\":1,"), std::string::npos) << Log();
 }
 
 TEST_F(LoginTest, NobodyTakesAllCallsFromTheOthers) {

@@ -10,6 +10,7 @@ namespace {
 constexpr char kRetrySeconds[] = "1";
 // At once: each waits for PAM, which may wait for a directory server.
 constexpr int kLogins = 16;
+constexpr int kChecks = 8;
 // Durations of logins are told no finer: a password's check ends sooner for a user that there is
 // not, which the reply's delay hides.
 constexpr double kLoginSeconds = 2;
@@ -45,10 +46,12 @@ Calls::Calls(int calls, bool several_users, Metrics* metrics)
     : calls_(calls, several_users),
       downloads_((calls + 1) / 2, several_users),
       logins_(kLogins, /*shared=*/true),
+      checks_(kChecks, /*shared=*/false),
       metrics_(*metrics) {}
 
 Places& Calls::PlacesOf(Kind kind) {
   if (kind == Kind::kLogin) return logins_;
+  if (kind == Kind::kCheck) return checks_;
   return kind == Kind::kDownload ? downloads_ : calls_;
 }
 

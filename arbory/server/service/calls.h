@@ -35,7 +35,7 @@ class Calls {
  public:
   // Each kind has places of its own: a download lasts as long as its client likes, and a login must
   // be possible whatever the others do.
-  enum class Kind { kCall, kDownload, kLogin };
+  enum class Kind { kCall, kDownload, kLogin, kCheck };
 
   // `calls` is the number of calls at once; `several_users`: they are shared among users. What is
   // given must outlive this object, and this object the children it started.
@@ -51,7 +51,7 @@ class Calls {
  private:
   Places& PlacesOf(Kind kind);
 
-  Places calls_, downloads_, logins_;
+  Places calls_, downloads_, logins_, checks_;
   Metrics& metrics_;
 };
 

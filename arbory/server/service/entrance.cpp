@@ -74,7 +74,8 @@ Entrance::Entrance(Rules rules, const nas::Module& module, Calls* calls, Metrics
       calls_(*calls),
       metrics_(*metrics),
       sessions_(std::chrono::seconds(rules_.session_minutes * kMinuteSeconds)),
-      login_limit_(rules_.logins_per_minute) {}
+      login_limit_(rules_.logins_per_minute),
+      checks_(rules_.checks, &sessions_, calls, metrics) {}
 
 const std::string& Entrance::NewToken() { return token_ = nas::RandomName(); }
 
@@ -141,7 +142,7 @@ Answer Entrance::Login(const HttpRequest& request) {
                      std::to_string(wait));
   }
   Answer answer = calls_.Run(Calls::Kind::kLogin, client, "login",
-                             [&] { return StartLogin(credentials, rules_.pam); });
+                             [&] { return StartLogin(credentials, rules_.checks.pam); });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [this, attempt = Attempt{client, credentials.user, Clock::now()},
                          count = std::move(child->make_reply)](const nas::ReplyHead* head) {
@@ -158,7 +159,7 @@ HttpReply Entrance::LoginReply(const Attempt& attempt, const nas::ReplyHead* hea
     const std::string user = named && named->size() == 1 ? named->front() : attempt.user;
     login_limit_.Succeeded(attempt.client, attempt.user);
     const std::time_t now = std::time(nullptr);
-    const std::string id = sessions_.Begin(user, now);
+    const std::string id = sessions_.Begin(user, now, head->fields.at(1).second);
     HttpReply reply = SessionReply(*sessions_.Find(id, now));
     reply.fields.emplace_back("Set-Cookie", NewSessionCookie(id));
     return reply;
@@ -201,6 +202,11 @@ Answer Entrance::Logout(const HttpRequest& request) {
     return reply;
   };
   return answer;
+}
+
+std::optional<std::vector<ChildAnswer>> Entrance::Checks() {
+  if (!rules_.single_user.empty()) return std::nullopt;
+  return checks_.Due(Clock::now());
 }
 
 HttpReply Entrance::SessionReply(const Sessions::Session& session) const {

@@ -9,6 +9,7 @@
 #include "arbory/server/service/calls.h"
 #include "arbory/server/service/login.h"
 #include "arbory/server/service/metrics.h"
+#include "arbory/server/service/session_checks.h"
 #include "arbory/server/service/sessions.h"
 #include "arbory/server/transport/http.h"
 #include "nas/webapi/runner.h"
@@ -23,7 +24,7 @@ class Entrance {
     bool behind_tls = false;
     int session_minutes = 0;
     int logins_per_minute = 0;  // refused ones, of an address or a user
-    PamService pam;
+    SessionChecks::Rules checks;
   };
   // What is given must outlive this object.
   Entrance(Rules rules, const nas::Module& module, Calls* calls, Metrics* metrics);
@@ -47,6 +48,9 @@ class Entrance {
   // The id in the request's cookie; empty without one. It is the key to the account.
   std::string SessionId(const HttpRequest& request) const;
 
+  // See SessionChecks::Due; no value where nobody logs in.
+  std::optional<std::vector<ChildAnswer>> Checks();
+
   size_t SessionCount() { return sessions_.Count(std::time(nullptr)); }
 
  private:
@@ -66,6 +70,7 @@ class Entrance {
   Metrics& metrics_;
   Sessions sessions_;
   LoginLimit login_limit_;
+  SessionChecks checks_;
   std::string token_;
 };
 

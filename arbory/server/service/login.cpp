@@ -1,11 +1,13 @@
 #include "arbory/server/service/login.h"
 
 #include <security/pam_appl.h>
+#include <shadow.h>
 #include <syslog.h>
 
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <vector>
 
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/accounts.h"
@@ -13,6 +15,9 @@
 
 namespace arbory {
 namespace {
+
+// Far more than the longest line of a shadow file.
+constexpr size_t kShadowBytes = size_t{16} << 10;
 
 // Answers what PAM asks: a hidden question is taken for the password, a shown one for the name.
 int Converse(int count, const pam_message** questions, pam_response** answers, void* data) {
@@ -50,8 +55,11 @@ class Pam {
   Pam(const Pam&) = delete;
   Pam& operator=(const Pam&) = delete;
 
-  int Check() {
+  int CheckPassword() {
     if (status_ == PAM_SUCCESS) status_ = pam_authenticate(handle_, PAM_DISALLOW_NULL_AUTHTOK);
+    return status_;
+  }
+  int CheckAccount() {
     if (status_ == PAM_SUCCESS) status_ = pam_acct_mgmt(handle_, PAM_DISALLOW_NULL_AUTHTOK);
     return status_;
   }
@@ -71,10 +79,32 @@ class Pam {
   int status_ = PAM_ABORT;
 };
 
+// What stands for the password, and for its lock, which is a part of it. Nothing that a password
+// could be guessed by leaves this process. An error where the shadow file cannot be read.
+nas::Result<std::string> StampOf(const std::string& user) {
+  std::vector<char> room(kShadowBytes);
+  spwd entry;
+  spwd* found = nullptr;
+  const int trouble = getspnam_r(user.c_str(), &entry, room.data(), room.size(), &found);
+  if (found == nullptr && trouble != 0 && trouble != ENOENT) {
+    return nas::Error{nas::kErrorOther, trouble};
+  }
+  if (found == nullptr) return std::string();
+  return std::to_string(
+      std::hash<std::string>{}(std::to_string(found->sp_lstchg) + ":" + found->sp_pwdp));
+}
+
+nas::ReplyHead LetIn(const std::string& user, const std::string& stamp) {
+  return {kOk, 0, {{"User", PercentEncoded(user)}, {"Stamp", stamp}}};
+}
+
 nas::ReplyHead CheckLogin(const Credentials& credentials, const PamService& service) {
   const nas::ReplyHead refused{kForbidden, kForbidden, {}};
+  // Before the password is looked at: one that is changed meanwhile is then a later one.
+  auto stamp = StampOf(credentials.user);
   Pam pam(credentials, service);
-  const int status = pam.Check();
+  int status = pam.CheckPassword();
+  if (status == PAM_SUCCESS) status = pam.CheckAccount();
   // Modules tell a wrong password by many codes, some of which are also those of their own trouble,
   // so the client is told one thing and the administrator the other.
   if (status != PAM_SUCCESS) {
@@ -88,7 +118,31 @@ nas::ReplyHead CheckLogin(const Credentials& credentials, const PamService& serv
            account.error().Text().c_str());
     return refused;
   }
-  return {kOk, 0, {{kLoginUser, PercentEncoded(account->name)}}};
+  if (account->name != credentials.user) stamp = StampOf(account->name);
+  if (!stamp) {
+    syslog(LOG_ERR, "login refused, as the shadow file cannot be read: %s",
+           stamp.error().Text().c_str());
+    return refused;
+  }
+  return LetIn(account->name, *stamp);
+}
+
+nas::ReplyHead CheckAccount(const std::string& user, const PamService& service) {
+  const nas::ReplyHead unknown{kUnavailable, kUnavailable, {}};
+  const auto stamp = StampOf(user);
+  if (!stamp) {
+    syslog(LOG_ERR, "%s's account cannot be checked: %s", user.c_str(),
+           stamp.error().Text().c_str());
+    return unknown;
+  }
+  const Credentials nobody{user, ""};
+  const int status = Pam(nobody, service).CheckAccount();
+  if (status == PAM_SUCCESS) return LetIn(user, *stamp);
+  syslog(LOG_NOTICE, "%s may be logged in no more by service %s: %s", user.c_str(),
+         service.name.c_str(), pam_strerror(nullptr, status));
+  // A directory server that does not answer says nothing of the account.
+  if (status == PAM_AUTHINFO_UNAVAIL || status == PAM_BUF_ERR) return unknown;
+  return {kForbidden, kForbidden, {}};
 }
 
 }  // namespace
@@ -96,6 +150,12 @@ nas::ReplyHead CheckLogin(const Credentials& credentials, const PamService& serv
 nas::Child StartLogin(const Credentials& credentials, const PamService& service) {
   return nas::StartChild([&](int pipe) {
     nas::SendReply(pipe, {CheckLogin(credentials, service), {}});
+  });
+}
+
+nas::Child StartAccountCheck(const std::string& user, const PamService& service) {
+  return nas::StartChild([&](int pipe) {
+    nas::SendReply(pipe, {CheckAccount(user, service), {}});
   });
 }
 

@@ -29,6 +29,16 @@ std::string Visible(std::string_view path) {
   return out;
 }
 
+std::string TimeText() {
+  constexpr size_t kRoom = 32;
+  char time[kRoom];
+  const std::time_t now = std::time(nullptr);
+  std::tm parts;
+  gmtime_r(&now, &parts);
+  strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", &parts);
+  return time;
+}
+
 class PrometheusText {
  public:
   void Begin(const std::string& name, const char* type, const char* help) {
@@ -90,6 +100,9 @@ std::string Metrics::Text(const Now& now) const {
   }
   out.Single("arbory_sent_bytes_total", "counter", "Bytes sent to clients.", bytes_);
   out.Single("arbory_logins_refused_total", "counter", "Logins refused.", refused_logins_);
+  out.Single("arbory_sessions_ended_total", "counter",
+             "Sessions ended as their account may log in no more or has another password.",
+             ended_sessions_);
   out.Single("arbory_connections", "gauge", "Open connections.", now.connections);
   out.Single("arbory_running_calls", "gauge", "Children answering requests.", now.running);
   out.Single("arbory_workers", "gauge", "Processes that searches and cleanings run in.",
@@ -99,18 +112,12 @@ std::string Metrics::Text(const Now& now) const {
 }
 
 std::string AccessLine(const HttpRequest& request, int status, std::uint64_t bytes) {
-  constexpr size_t kRoom = 32;
   constexpr double kTenths = 10;
   constexpr size_t kMaxPath = 1024;  // a longer one is cut: a line must fit a log's line
   constexpr size_t kMaxMethod = 32;  // clients may make one up
-  char time[kRoom];
-  const std::time_t now = std::time(nullptr);
-  std::tm parts;
-  gmtime_r(&now, &parts);
-  strftime(time, sizeof time, "%Y-%m-%dT%H:%M:%SZ", &parts);
   const std::chrono::duration<double, std::milli> spent = Clock::now() - request.begun;
   Json::Value line;
-  line["time"] = time;
+  line["time"] = TimeText();
   line["peer"] = request.peer;
   line["method"] = request.method.substr(0, kMaxMethod);
   line["path"] = Visible(request.path().substr(0, kMaxPath));
@@ -118,6 +125,15 @@ std::string AccessLine(const HttpRequest& request, int status, std::uint64_t byt
   line["user"] = request.user;
   line["ms"] = std::round(spent.count() * kTenths) / kTenths;
   line["bytes"] = Json::UInt64{bytes};
+  return nas::JsonText(line, nas::JsonBytes::kClean) + "\n";
+}
+
+std::string EndedLine(const std::string& user, size_t sessions, const char* why) {
+  Json::Value line;
+  line["time"] = TimeText();
+  line["user"] = user;
+  line["sessions_ended"] = Json::UInt64{sessions};
+  line["why"] = why;
   return nas::JsonText(line, nas::JsonBytes::kClean) + "\n";
 }
 

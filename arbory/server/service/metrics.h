@@ -18,6 +18,7 @@ class Metrics {
   void CountCall(const std::string& method, int code, double seconds);
   void CountReply(int status, std::uint64_t bytes);
   void CountRefusedLogin() { ++refused_logins_; }
+  void CountEndedSessions(size_t count) { ended_sessions_ += count; }
 
   struct Now {
     size_t connections, running, workers, sessions;
@@ -39,10 +40,13 @@ class Metrics {
   std::map<int, std::uint64_t> replies_;
   std::uint64_t bytes_ = 0;
   std::uint64_t refused_logins_ = 0;
+  std::uint64_t ended_sessions_ = 0;
 };
 
 // One line of JSON, with its newline, without what a query holds; no byte of it can be a command to
 // a terminal.
 std::string AccessLine(const HttpRequest& request, int status, std::uint64_t bytes);
+// The same of sessions that ended with what their account was.
+std::string EndedLine(const std::string& user, size_t sessions, const char* why);
 
 }  // namespace arbory

@@ -55,9 +55,14 @@ Bodies::Limits BodyLimitsOf(const Service::Setup& setup) {
 
 Entrance::Rules RulesOf(const Service::Setup& setup) {
   const nas::ServerSettings& settings = setup.settings;
-  return {setup.single_user,          setup.cookie,
-          setup.site.behind_tls,      settings.session_minutes,
-          settings.logins_per_minute, {settings.pam_service, settings.pam_dir}};
+  return {setup.single_user,
+          setup.cookie,
+          setup.site.behind_tls,
+          settings.session_minutes,
+          settings.logins_per_minute,
+          {{settings.pam_service, settings.pam_dir},
+           std::chrono::seconds(settings.account_check_seconds),
+           settings.access_log}};
 }
 
 }  // namespace

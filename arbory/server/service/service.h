@@ -42,6 +42,7 @@ class Service : public HttpService {
   std::shared_ptr<BodyRoom> RoomFor(const HttpRequest& request) override;
   Answer Handle(HttpRequest* request) override;
   void Finished(const HttpRequest& request, int status, std::uint64_t bytes) override;
+  std::optional<std::vector<ChildAnswer>> Errands() override { return entrance_.Checks(); }
 
  private:
   Answer MetricsReply();

@@ -13,7 +13,7 @@ constexpr size_t kSweepAbove = 4096;
 
 }  // namespace
 
-std::string Sessions::Begin(const std::string& user, std::time_t now) {
+std::string Sessions::Begin(const std::string& user, std::time_t now, const std::string& stamp) {
   Sweep(now);
   auto oldest = sessions_.end();
   int count = 0;
@@ -24,7 +24,7 @@ std::string Sessions::Begin(const std::string& user, std::time_t now) {
   }
   if (count >= kMaxPerUser) sessions_.erase(oldest);
   const std::string id = nas::RandomName();
-  sessions_[id] = {user, now + static_cast<std::time_t>(lifetime_.count())};
+  sessions_[id] = {user, now + static_cast<std::time_t>(lifetime_.count()), stamp};
   return id;
 }
 
@@ -34,6 +34,19 @@ std::optional<Sessions::Session> Sessions::Find(const std::string& id, std::time
   if (found->second.expires > now) return found->second;
   sessions_.erase(found);
   return std::nullopt;
+}
+
+size_t Sessions::EndThoseOf(const std::string& user, const std::optional<std::string>& stamp) {
+  return std::erase_if(sessions_, [&](const auto& entry) {
+    return entry.second.user == user && entry.second.stamp != stamp;
+  });
+}
+
+std::set<std::string> Sessions::Users(std::time_t now) {
+  Sweep(now);
+  std::set<std::string> users;
+  for (const auto& [id, session] : sessions_) users.insert(session.user);
+  return users;
 }
 
 size_t Sessions::Count(std::time_t now) {

@@ -7,6 +7,7 @@
 #include <deque>
 #include <map>
 #include <optional>
+#include <set>
 #include <string>
 
 namespace arbory {
@@ -15,17 +16,22 @@ class Sessions {
  public:
   explicit Sessions(std::chrono::seconds lifetime) : lifetime_(lifetime) {}
 
-  // A new session's id: 128 random bits in hexadecimal. Throws std::runtime_error without
-  // randomness. A user with kMaxPerUser sessions loses the one that would end first.
-  std::string Begin(const std::string& user, std::time_t now);
+  // `stamp` is what the user's account was known by then (login.h). A new session's id: 128 random
+  // bits in hexadecimal. Throws std::runtime_error without randomness. A user with kMaxPerUser
+  // sessions loses the one that would end first.
+  std::string Begin(const std::string& user, std::time_t now, const std::string& stamp = {});
   struct Session {
     std::string user;
     std::time_t expires;
+    std::string stamp = {};
   };
   // Nothing for an id that is unknown or past its time.
   std::optional<Session> Find(const std::string& id, std::time_t now);
   void End(const std::string& id) { sessions_.erase(id); }
+  // Ends the user's sessions but those with the stamp given, or all without one; how many.
+  size_t EndThoseOf(const std::string& user, const std::optional<std::string>& stamp);
   size_t Count(std::time_t now);
+  std::set<std::string> Users(std::time_t now);
 
   static constexpr int kMaxPerUser = 32;  // browsers and scripts of one person
 

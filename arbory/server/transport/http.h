@@ -105,6 +105,10 @@ class HttpService {
   // The reply went out, or the client went away in the midst of it. Once for each request that was
   // answered, those that were refused before Handle among them.
   virtual void Finished(const HttpRequest& request, int status, std::uint64_t bytes) = 0;
+  // Children that do something for the service itself; what their replies are made into goes
+  // nowhere. Asked about once a second while there are connections, and after that until there is
+  // nothing left to do, which is no value.
+  virtual std::optional<std::vector<ChildAnswer>> Errands() { return std::nullopt; }
 };
 
 // What a running server can be asked.

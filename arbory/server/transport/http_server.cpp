@@ -36,6 +36,8 @@ constexpr std::chrono::milliseconds kStopPause{20};
 // After a failed accept, when the machine is short of descriptors or memory.
 constexpr std::chrono::milliseconds kAcceptPause{100};
 
+constexpr std::chrono::seconds kErrandPause{1};
+
 constexpr int kThreads = 1;  // a process of several could not fork safely
 
 tcp::endpoint ParseAddress(const std::string& text) {
@@ -71,6 +73,7 @@ class HttpServer::Loop : public ConnectionHost {
         loop_(kThreads),
         acceptor_(loop_),
         accept_pause_(loop_),
+        errand_timer_(loop_),
         stop_timer_(loop_),
         stop_signals_(loop_, SIGTERM, SIGINT),
         child_signals_(loop_, SIGCHLD),
@@ -199,6 +202,7 @@ class HttpServer::Loop : public ConnectionHost {
         const auto connection = std::make_shared<Connection>(this, std::move(socket));
         connections_.insert(connection.get());
         connection->Start();
+        if (!errands_wait_) AwaitErrands();
       }
       Accept();
     });
@@ -262,6 +266,35 @@ class HttpServer::Loop : public ConnectionHost {
       child->OnExit();
     }
     if (stopping_) EndWhenIdle();
+  }
+
+  void AwaitErrands() {
+    errand_timer_.expires_after(kErrandPause);
+    errand_timer_.async_wait([this](Error error) {
+      errands_wait_ = false;
+      if (error || stopping_) return;
+      auto errands = service_->Errands();
+      if (errands || !connections_.empty()) AwaitErrands();
+      if (!errands) return;
+      for (ChildAnswer& errand : *errands) AwaitHead(Adopt(&errand).get(), {errand.make_reply, {}});
+    });
+    errands_wait_ = true;
+  }
+
+  struct Errand {
+    std::function<HttpReply(const nas::ReplyHead* head)> done;
+    nas::ReplyReader head;
+  };
+  // The pipe lives while it has somebody to read to, whom it owns.
+  static void AwaitHead(ChildPipe* child, Errand errand) {
+    child->Read([child, errand = std::move(errand)](std::string_view bytes) mutable {
+      const auto state = errand.head.Feed(bytes);
+      if (state == nas::ReplyReader::State::kMore && !bytes.empty()) {
+        return AwaitHead(child, std::move(errand));
+      }
+      child->Close();
+      errand.done(state == nas::ReplyReader::State::kReady ? &errand.head.head() : nullptr);
+    });
   }
 
   void BeginStop() {
@@ -337,6 +370,7 @@ class HttpServer::Loop : public ConnectionHost {
   bool ended_ = false;
   bool accepting_ = false;  // or pausing before it does
   bool awaiting_children_ = false;
+  bool errands_wait_ = false;
   std::function<void()> on_hangup_;
   tcp::endpoint endpoint_;
   std::string address_;
@@ -344,6 +378,7 @@ class HttpServer::Loop : public ConnectionHost {
   asio::io_context loop_;
   tcp::acceptor acceptor_;
   asio::steady_timer accept_pause_;
+  asio::steady_timer errand_timer_;
   asio::steady_timer stop_timer_;
   asio::signal_set stop_signals_;
   asio::signal_set child_signals_;
