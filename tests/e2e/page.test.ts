@@ -2,6 +2,7 @@
 import assert from 'node:assert/strict';
 import * as fs from 'node:fs';
 import { after, before, test } from 'node:test';
+import { join } from 'node:path';
 import type { Browser } from 'playwright-core';
 import { openBrowser, Tab } from './browser.ts';
 import { Place, Server } from './server.ts';
@@ -212,6 +213,19 @@ test('past searches are offered, repeated and cleared', async () => {
   await page.fill('#pattern', '');
   await page.press('#pattern', 'ArrowDown');
   assert.equal(await page.getByRole('option').count(), 0);
+  // A damaged file costs its own entries; what stays as it is must not be told as if it would pass.
+  await tab.search('notes');
+  await page.goto(`${server.origin}/#q=plan&ext=txt&in=/files/docs`);
+  await tab.over();
+  const users = join(place.root, 'state/users');
+  const store = join(users, fs.readdirSync(users)[0]!, 'preference/search_history.db');
+  fs.writeFileSync(store, 'no database'.repeat(100));
+  await page.fill('#pattern', '');
+  await page.click('text=Clear history');
+  await page.getByText('its file on the server is damaged').waitFor();
+  await page.press('#pattern', 'ArrowDown');
+  assert.equal(await page.getByRole('option').count(), 0);
+  fs.rmSync(store);
   await tab.close();
 });
 

@@ -32,6 +32,7 @@ const WALK_FAILURES: Record<number, string> = {
 const BAD_REGEX =
   'What follows regex: is not a complete regular expression. Check its brackets and repetitions.';
 const CRITERION = 418;
+const STORE = 401;
 
 export function walkFailure(code: number, pattern: string): string {
   if (code === CRITERION && pattern.includes('regex:')) return BAD_REGEX;
@@ -45,6 +46,10 @@ export function callFailure(method: string, code: number): string {
       : 'The search could not be started. Too many may be running: wait a moment and try again.';
   }
   if (method === 'list') return 'The results could not be read. Search again to see them.';
-  if (method === 'delete') return 'The history could not be cleared. Try again.';
+  if (method === 'delete') {
+    return code === STORE
+      ? 'A part of the history could not be cleared: its file on the server is damaged or cannot be written. Ask who runs the server; the system log names the file.'
+      : 'The history could not be cleared. Try again.';
+  }
   return `The server could not do this (error ${code}). Try again.`;
 }

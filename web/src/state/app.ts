@@ -212,14 +212,19 @@ export class App {
   }
 
   async forgetHistory(): Promise<void> {
-    try {
-      await Promise.all([client.clearHistory('simple'), client.clearHistory('advance')]);
-      remember(INSIDE, '');
-      this.set({ history: [] });
-      this.tell('The history is cleared.');
-    } catch (error) {
-      this.tell(error instanceof Error ? error.message : String(error));
+    const asked = [client.clearHistory('simple'), client.clearHistory('advance')];
+    // One that cannot be cleared keeps the other no more.
+    const failures = (await Promise.allSettled(asked)).flatMap((each) =>
+      each.status === 'rejected' ? [each.reason as unknown] : [],
+    );
+    if (failures.some((error) => error instanceof ApiError && error.signedOut)) {
+      return this.signedOut();
     }
+    remember(INSIDE, '');
+    await this.loadHistory();
+    const [error] = failures;
+    if (!error) this.tell('The history is cleared.');
+    else this.tell(error instanceof Error ? error.message : String(error));
   }
 
   // A short word at the edge of the page.
