@@ -165,10 +165,22 @@ Result<TaskState> TaskFiles::Parse(const std::string& text) {
 Result<UniqueFd> TaskFiles::LockForWriting(const std::string& id) const {
   UniqueFd fd = OpenLock(id, 0);
   if (!fd) return ErrnoError(LockName(id));
-  if (const Status locked = TakeLock(fd.get(), kWriteByte); !locked) {
-    return locked.error().Of(LockName(id));
+  // Each who has the lock replaces the record.
+  struct timespec before = RecordChange(id);
+  for (;;) {
+    const Status locked = TakeLock(fd.get(), kWriteByte);
+    if (locked) return fd;
+    const struct timespec now = RecordChange(id);
+    const bool stuck = now.tv_sec == before.tv_sec && now.tv_nsec == before.tv_nsec;
+    if (locked.error().error_number != EBUSY || stuck) return locked.error().Of(LockName(id));
+    before = now;
   }
-  return fd;
+}
+
+struct timespec TaskFiles::RecordChange(const std::string& id) const {
+  struct stat info = {};
+  (void)fstatat(folder_.get(), RecordName(id).c_str(), &info, AT_SYMLINK_NOFOLLOW);
+  return info.st_ctim;
 }
 
 Status TaskFiles::Store(const std::string& id, const TaskState& state) const {

@@ -69,7 +69,8 @@ class TaskFiles {
   static Result<TaskState> Parse(const std::string& text);
 
   // The write lock, held while the descriptor is open. ENOENT when the task is gone, EBUSY when the
-  // lock stays taken.
+  // lock is taken for longer than kLockTenths and nobody writes: many who take turns on a loaded
+  // machine are no reason to give up.
   Result<UniqueFd> LockForWriting(const std::string& id) const;
   // To be called with the write lock held. After a failure the old record is whole. EFBIG beyond
   // what Load takes; where the disk is full, the task's reserve of space is used up first.
@@ -90,6 +91,7 @@ class TaskFiles {
   int CountRunningAndSweep() const;
   void SweepRecord(const std::string& name, time_t now) const;
   bool IsUntouched(const std::string& name, time_t now) const;
+  struct timespec RecordChange(const std::string& id) const;
 
   UniqueFd folder_;
 };

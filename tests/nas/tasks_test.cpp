@@ -88,7 +88,7 @@ TEST_F(TasksTest, ABatchIsSeenAtOnceAndTheMarkStays) {
 
 TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
   constexpr int kWriters = 4;
-  constexpr int kRounds = 50;
+  constexpr int kRounds = 20;
   const auto task = New();
   const std::string id = task->getTaskId();
   std::vector<pid_t> writers;
