@@ -70,14 +70,20 @@ std::map<std::string, Parameters> Documented() {
   return methods;
 }
 
-// What the module asks for in a call, also in the processes that the call forks.
+// What the module asks for in a call, also in the processes that the call forks: those go on when
+// the next call has begun, and may end at any moment.
 struct Asked {
-  static constexpr size_t kMost = 1024;
+  static constexpr size_t kMost = 4096;
   static constexpr size_t kBytes = 64;
+  struct Question {
+    std::atomic<int> call;  // 0 until the name is there
+    char name[kBytes];
+  };
   std::atomic<size_t> count;
-  char names[kMost][kBytes];
+  Question questions[kMost];
 };
 Asked* g_asked = nullptr;
+int g_call = 0;
 const NUVA::APIMethod* g_row = nullptr;
 
 class ListeningRequest : public NUVA::APIRequest {
@@ -100,7 +106,9 @@ class ListeningRequest : public NUVA::APIRequest {
  private:
   static void Note(const std::string& name) {
     const size_t at = g_asked->count++;
-    if (at < Asked::kMost) strncpy(g_asked->names[at], name.c_str(), Asked::kBytes - 1);
+    if (at >= Asked::kMost) return;
+    strncpy(g_asked->questions[at].name, name.c_str(), Asked::kBytes - 1);
+    g_asked->questions[at].call = g_call;
   }
   const NUVA::APIRequest& inner_;
 };
@@ -150,6 +158,7 @@ class ParameterNamesTest : public nas_test::PlatformTest {
   Json::Value Call(const char* api, int version, const std::string& method,
                    const std::string& params) {
     g_row = module_.Find(api, version, method);
+    ++g_call;
     return Run({api, version, g_row->method, Listen}, method, params);
   }
   Json::Value RunPlain(const std::string& method, const std::string& params) {
@@ -164,11 +173,14 @@ class ParameterNamesTest : public nas_test::PlatformTest {
     EXPECT_EQ(reply["code"], 0) << method << params;
     return reply["data"];
   }
-  static Names TakeAsked() {
-    Names names;
+  // In the last call, so far.
+  static Names AskedNames() {
     EXPECT_LE(g_asked->count, Asked::kMost);
-    for (size_t at = 0; at < g_asked->count; ++at) names.insert(g_asked->names[at]);
-    g_asked->count = 0;
+    Names names;
+    for (size_t at = 0; at < g_asked->count; ++at) {
+      const Asked::Question& question = g_asked->questions[at];
+      if (question.call == g_call) names.insert(question.name);
+    }
     return names;
   }
 
@@ -181,12 +193,9 @@ TEST_F(ParameterNamesTest, TheModuleReadsWhatIsDocumented) {
   const auto expect = [&](const std::string& method) {
     const Names expected = NamesOf(documented_[method]);
     const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-    Names asked;
-    while (asked.size() < expected.size() && std::chrono::steady_clock::now() < end) {
-      asked.merge(TakeAsked());
+    while (AskedNames().size() < expected.size() && std::chrono::steady_clock::now() < end) {
     }
-    asked.merge(TakeAsked());
-    EXPECT_EQ(asked, expected) << method;
+    EXPECT_EQ(AskedNames(), expected) << method;
   };
   const std::string search = kSearch;
   const std::string history = kHistory;
@@ -211,7 +220,6 @@ TEST_F(ParameterNamesTest, TheModuleReadsWhatIsDocumented) {
   criteria.erase("search_content");
   criteria.erase("search_type");
   EXPECT_EQ(Names(kept.begin(), kept.end()), criteria) << "in the history";
-  TakeAsked();
   Call(kSearch, 2, "stop", task);
   expect(search + " stop");
   Call(kSearch, 2, "clean", task);
