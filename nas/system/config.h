@@ -14,6 +14,8 @@ struct ShareSetting {
   std::string name;
   std::string directory;    // as given; made real when the share is looked up
   std::string origin = {};  // "FILE:LINE" for messages; empty when no file says so
+
+  bool operator==(const ShareSetting&) const = default;
 };
 
 // What `arbory serve` goes by. Each number is a limit that keeps one client from taking the server
@@ -38,6 +40,8 @@ struct ServerSettings {
   int logins_per_minute = 10;  // refused ones of an address; of an account ten times as many
   int session_minutes = 12 * 60;
   int account_check_seconds = 60;  // between two looks at whether a user may still be logged in
+
+  bool operator==(const ServerSettings&) const = default;
 };
 
 struct Config {
@@ -60,6 +64,8 @@ struct Config {
   std::uint64_t large_call_memory_bytes() const { return Megabytes(large_call_memory_mb); }
   static std::uint64_t Megabytes(int count) { return static_cast<std::uint64_t>(count) << 20; }
   ServerSettings server;
+
+  bool operator==(const Config&) const = default;
 };
 
 // A configuration that cannot be used. what() names the file, the line and the trouble.

@@ -77,7 +77,7 @@ class Reader {
     const toml::table document = Parse(*text);
     const Keys keys = {
         {"state_dir", [&](const toml::node& node) { config->state_dir = Path(node); }},
-        {"module", [&](const toml::node& node) { config->module = Path(node); }},
+        {"module", [&](const toml::node& node) { config->module = PathOrNone(node); }},
         {"volumes", [&](const toml::node& node) { config->volumes = Paths(node); }},
         {"shares", [&](const toml::node& node) { config->shares = Shares(node); }},
         {"searches_per_user",
@@ -127,12 +127,12 @@ class Reader {
     if (table == nullptr) Fail(node.source(), "a table is expected here");
     Keys keys = {
         {"listen", [&](const toml::node& value) { server->listen = Text(value); }},
-        {"web_dir", [&](const toml::node& value) { server->web_dir = Path(value); }},
+        {"web_dir", [&](const toml::node& value) { server->web_dir = PathOrNone(value); }},
         {"behind_tls", [&](const toml::node& value) { server->behind_tls = Truth(value); }},
         {"origins", [&](const toml::node& value) { server->origins = Texts(value); }},
         {"proxies", [&](const toml::node& value) { server->proxies = Texts(value); }},
         {"pam_service", [&](const toml::node& value) { server->pam_service = Text(value); }},
-        {"pam_dir", [&](const toml::node& value) { server->pam_dir = Path(value); }},
+        {"pam_dir", [&](const toml::node& value) { server->pam_dir = PathOrNone(value); }},
         {"access_log", [&](const toml::node& value) { server->access_log = Truth(value); }},
     };
     const std::pair<const char*, int*> limits[] = {
@@ -163,6 +163,11 @@ class Reader {
     const std::string path = Text(node);
     if (!path.starts_with('/')) Fail(node.source(), "an absolute path is expected here");
     return path;
+  }
+
+  // Where an empty text, which is the default, stands for a place of the program's own choice.
+  std::string PathOrNone(const toml::node& node) {
+    return node.value_or<std::string_view>("?").empty() ? std::string() : Path(node);
   }
 
   bool Truth(const toml::node& node) {

@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <filesystem>
+#include <sstream>
 
 #include "nas/system/config.h"
 #include "nas/system/shares.h"
@@ -73,6 +74,32 @@ TEST_F(ConfigTest, NamesTheLineOfTheTrouble) {
   }
   EXPECT_THROW(nas::LoadConfig(dir_ + "/missing.toml"), nas::ConfigError);
   EXPECT_THROW(nas::LoadConfig(dir_), nas::ConfigError);
+}
+
+// An administrator takes the comment's mark away and has what stands there: nothing but the
+// default.
+TEST_F(ConfigTest, TheSampleShowsTheDefaults) {
+  const std::string guide = ReadFile(ARBORY_SOURCE_DIR "/docs/deploy.md");
+  std::istringstream sample(ReadFile(ARBORY_SOURCE_DIR "/packaging/arbory.toml"));
+  std::string all, table;
+  for (std::string line; std::getline(sample, line);) {
+    if (line.starts_with('[')) table = line + "\n";
+    const size_t mark = line.find(" = ");
+    const bool is_key =
+        mark != std::string::npos && line.starts_with("# ") && line.find(' ', 2) == mark;
+    if (is_key) line = line.substr(2);
+    all += line + "\n";
+    if (!is_key) continue;
+    EXPECT_EQ(Trouble(table + line + "\n"), "") << line;
+    if (table == "[shares]\n") continue;
+    EXPECT_NE(guide.find("`" + line.substr(0, mark - 2)), std::string::npos) << line;
+  }
+  ASSERT_EQ(Trouble(all), "");
+  nas::Config config = nas::CurrentConfig();
+  EXPECT_EQ(config.shares.size(), 2U);
+  config.shares.clear();
+  config.state_dir = nas::DefaultConfig().state_dir;  // another for whom is not root
+  EXPECT_EQ(config, nas::DefaultConfig());
 }
 
 TEST_F(ConfigTest, FindsTheFileByTheEnvironment) {
