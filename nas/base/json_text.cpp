@@ -107,18 +107,21 @@ std::string_view StringOf(const Json::Value& value) {
   return {begin, static_cast<size_t>(end - begin)};
 }
 
-void AppendArray(const Json::Value& value, JsonBytes bytes, std::string* out) {
+void AppendArray(const Json::Value& value, JsonBytes bytes, std::string* out,
+                 const JsonSpill& spill) {
   *out += '[';
   bool first = true;
   for (const Json::Value& item : value) {
     if (!first) *out += ',';
     first = false;
-    AppendJson(item, bytes, out);
+    AppendJson(item, bytes, out, spill);
+    if (spill) spill(out);
   }
   *out += ']';
 }
 
-void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
+void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out,
+                  const JsonSpill& spill) {
   *out += '{';
   bool first = true;
   for (auto member = value.begin(), last = value.end(); member != last; ++member) {
@@ -128,7 +131,8 @@ void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out) {
     const char* begin = member.memberName(&end);
     AppendString({begin, static_cast<size_t>(end - begin)}, bytes, out);
     *out += ':';
-    AppendJson(*member, bytes, out);
+    AppendJson(*member, bytes, out, spill);
+    if (spill) spill(out);
   }
   *out += '}';
 }
@@ -165,7 +169,8 @@ Json::CharReaderBuilder StrictReading() {
 
 }  // namespace
 
-void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out) {
+void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out,
+                const JsonSpill& spill) {
   switch (value.type()) {
     case Json::nullValue:
       *out += "null";
@@ -182,9 +187,9 @@ void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out) {
       *out += value.asBool() ? "true" : "false";
       return;
     case Json::arrayValue:
-      return AppendArray(value, bytes, out);
+      return AppendArray(value, bytes, out, spill);
     case Json::objectValue:
-      return AppendObject(value, bytes, out);
+      return AppendObject(value, bytes, out, spill);
   }
 }
 

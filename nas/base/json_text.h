@@ -5,6 +5,7 @@
 
 #include <json/value.h>
 
+#include <functional>
 #include <string>
 #include <string_view>
 
@@ -18,7 +19,11 @@ enum class JsonBytes {
 // Appends `value` in one line without spaces, members in the order of their names. Numbers that
 // JSON cannot hold (NaN, infinities) are written as null. Recurses for each level of `value`, so it
 // is for values that are not deeper than what ParseJson reads.
-void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out);
+// With `spill`, calls it with `out` after each element of an array or object, so that what has
+// come together can be taken from there; it may empty `out` or leave it.
+using JsonSpill = std::function<void(std::string* out)>;
+void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out,
+                const JsonSpill& spill = {});
 std::string JsonText(const Json::Value& value, JsonBytes bytes);
 
 // Far above any request or record, and low enough for the recursion to fit every stack.

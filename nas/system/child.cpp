@@ -127,6 +127,10 @@ bool SendHead(int pipe, const ReplyHead& head, std::uint64_t body_bytes) {
 }
 
 bool SendReply(int pipe, const Reply& reply) {
+  if (reply.beginning) {
+    return SendHead(pipe, reply.head, reply.beginning->bytes() + reply.body.size()) &&
+           reply.beginning->CopyTo(pipe) && WriteAll(pipe, reply.body).ok();
+  }
   if (reply.body.size() > kUsualPipeBytes) {
     return SendHead(pipe, reply.head, reply.body.size()) && WriteAll(pipe, reply.body).ok();
   }

@@ -35,11 +35,13 @@
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
 
+#include "nas/base/spool.h"
 #include "nas/base/unique_fd.h"
 
 namespace nas {
@@ -53,6 +55,7 @@ struct ReplyHead {
 struct Reply {
   ReplyHead head;
   std::string body;
+  std::shared_ptr<const Spool> beginning = nullptr;  // of the body, where that is long
 };
 
 // A child at work. Whoever holds it reaps it. For event loops: watch fd and feed what it yields to

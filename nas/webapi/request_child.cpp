@@ -54,7 +54,11 @@ class Response : public NUVA::APIResponse {
   std::optional<Reply> reply_;
 };
 
+std::string g_spool_folder;
+
 }  // namespace
+
+const std::string& SpoolFolder() { return g_spool_folder; }
 
 Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
   if (const Status entered = EnterUserState(call.user); !entered) {
@@ -63,6 +67,7 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   }
   // What failed before is not this call's, whose failures may have no number of their own.
   errno = 0;
+  g_spool_folder = TaskFolder(call.user);
   if (call.leased) LeaseNewTasks();
   Response response(encode);
   try {

@@ -11,4 +11,8 @@ namespace nas {
 // Throws what `encode` does. A worker that the entry function forked may come back from here too.
 Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
+// Where the text of a reply goes that is too long to be held, once the process is its user's: a
+// folder of theirs. Empty before.
+const std::string& SpoolFolder();
+
 }  // namespace nas

@@ -27,6 +27,8 @@ constexpr size_t kReadBytes = size_t{64} << 10;
 // Room taken at once on the word of a length; more only as bytes come.
 constexpr std::uint64_t kMaxReserve = std::uint64_t{64} << 20;
 constexpr int kForever = -1;
+// Of a reply's text, held at once. A page that a person looks at is far shorter.
+constexpr size_t kSpoolBytes = size_t{1} << 20;
 
 // A reply as it comes in.
 class Incoming {
@@ -93,8 +95,19 @@ void Reap(pid_t child) {
 
 Reply EncodeJsonReply(int code, const Json::Value& data) {
   Reply reply{{.code = code}, "{\"code\":" + std::to_string(code) + ",\"data\":"};
-  AppendJson(data, JsonBytes::kClean, &reply.body);
+  std::shared_ptr<Spool> spool;
+  size_t most = kSpoolBytes;
+  AppendJson(data, JsonBytes::kClean, &reply.body, [&](std::string* text) {
+    if (text->size() < most || SpoolFolder().empty()) return;
+    if (!spool) spool = std::make_shared<Spool>(SpoolFolder());
+    if (spool->Append(*text)) {
+      text->clear();
+    } else {
+      most = 2 * text->size();  // no place on the disk: held as far as the call's memory goes
+    }
+  });
   reply.body += '}';
+  reply.beginning = spool && spool->bytes() > 0 ? std::move(spool) : nullptr;
   return reply;
 }
 
@@ -112,7 +125,10 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
       [&](int pipe) {
         const pid_t self = getpid();
         const Reply reply = ServeCall(row, call, encode);
-        if (getpid() == self) SendReply(pipe, reply);
+        if (getpid() != self) return;
+        // What a long page was made of is free by now, and a client may take its time.
+        if (reply.beginning) malloc_trim(0);
+        SendReply(pipe, reply);
       },
       CurrentConfig().call_memory_bytes());
 }

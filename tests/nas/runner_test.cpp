@@ -2,6 +2,7 @@
 // child is given.
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -263,6 +264,16 @@ std::string UserIds() {
   return status.substr(at, status.find('\n', at) - at);
 }
 
+// Values that are six times as long in a reply.
+Json::Value LongInText(int count) {
+  Json::Value values(Json::arrayValue);
+  for (int at = 0; at < count; ++at) values.append(std::string(256 << 10, '\x01'));
+  return values;
+}
+std::string TextOfLong(int count) {
+  return R"({"code":0,"data":)" + nas::JsonText(LongInText(count), nas::JsonBytes::kClean) + "}";
+}
+
 // From where a call reads what its user can write, nothing leads back to root.
 TEST_F(RunnerTest, RootsCallsGiveRootUpBeforeTheyReadWhatTheUserWrote) {
   SKIP_UNLESS_ROOT();
@@ -354,6 +365,18 @@ TEST_F(RunnerTest, ACallMayNotTakeAllMemory) {
        R"({"code":0,"data":0})"},
   };
   for (const auto& row : rows) EXPECT_EQ(Run(row.entry), row.reply) << row.why;
+  // A long reply's text is on the disk, as far as there is room.
+  const NUVA::APIEntry entries[] = {
+      [](APIRequest*, APIResponse* r) { r->SetError(0, LongInText(60)); },
+      [](APIRequest*, APIResponse* r) {
+        const rlimit small = {2 << 20, 2 << 20};
+        setrlimit(RLIMIT_FSIZE, &small);
+        r->SetError(0, LongInText(10));
+      }};
+  for (const bool room : {true, false}) {
+    const std::string reply = Run(entries[room ? 0 : 1]);
+    EXPECT_TRUE(reply == TextOfLong(room ? 60 : 10)) << room << reply.substr(0, 100);
+  }
 }
 
 TEST_F(RunnerTest, OneUserHasFewLargeCallsAtOnce) {
