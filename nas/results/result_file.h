@@ -37,7 +37,7 @@ namespace nas {
 constexpr int kResultVersion = 1;
 
 // Rows in one piece of a kept ordering: 64 KB.
-constexpr std::uint64_t kOrderingPiece = 16 * 1024;
+constexpr std::uint64_t kOrderingPiece = std::uint64_t{16} * 1024;
 
 // How long a writer waits for another: longer than any listing holds its short write transaction.
 constexpr int kResultBusyMilliseconds = 10'000;

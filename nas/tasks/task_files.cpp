@@ -39,7 +39,7 @@ constexpr int kMostNames = 10'000;
 constexpr int kMostRecords = 100;
 // Kept in the lock file for the day the disk is full: a search that ends for want of space must
 // still be able to say so. Two blocks, as a directory may need one besides the record.
-constexpr off_t kReserveBytes = 8 * 1024;
+constexpr off_t kReserveBytes = off_t{8} * 1024;
 
 constexpr int kRecordVersion = 1;
 constexpr char kVersion[] = "version";
