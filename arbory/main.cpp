@@ -1,5 +1,7 @@
 // The `arbory` program: reads its command line and hands each command its options.
 
+#include <unistd.h>
+
 #include <CLI/CLI.hpp>
 #include <exception>
 #include <memory>
@@ -192,10 +194,17 @@ int Run(int argc, char** argv) {
   return RunSearchCommand(search_options);
 }
 
+// Libraries end the process in places where they have no memory, or have an error of their own.
+[[noreturn]] void EndWithWords() {
+  WriteOut(STDERR_FILENO, "arbory: out of memory, or an error in the program\n");
+  _exit(kExitError);
+}
+
 }  // namespace
 }  // namespace arbory
 
 int main(int argc, char** argv) {
+  std::set_terminate(arbory::EndWithWords);
   try {
     try {
       return arbory::Run(argc, argv);
