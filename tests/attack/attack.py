@@ -58,7 +58,7 @@ def campaigns():
 def commit(top):
     def git(*words):
         return subprocess.run(["git", "-C", top, *words], capture_output=True, text=True).stdout.strip()
-    changed = git("status", "--porcelain", "--untracked-files=no")
+    changed = git("status", "--porcelain", "--untracked-files=no", ".", ":!docs/reliability.md")
     return git("rev-parse", "--short=10", "HEAD") + (" and changes" if changed else "")
 
 
