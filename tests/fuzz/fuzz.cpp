@@ -11,6 +11,16 @@
 #include "nas/base/utf8.h"
 
 namespace fuzz {
+namespace {
+
+// One that was left open makes it higher.
+int LowestFreeDescriptor() {
+  const int fd = dup(STDERR_FILENO);
+  close(fd);
+  return fd;
+}
+
+}  // namespace
 
 std::string_view Take(std::string_view* rest, char separator) {
   const std::string_view part = rest->substr(0, rest->find(separator));
@@ -43,12 +53,6 @@ void WriteFile(const std::string& path, std::string_view bytes) {
   std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
 }
 
-int LowestFreeDescriptor() {
-  const int fd = dup(STDERR_FILENO);
-  close(fd);
-  return fd;
-}
-
 bool IsValidUtf8(std::string_view text) {
   while (!text.empty()) {
     const nas::Utf8Step step = nas::NextUtf8(text);
@@ -59,3 +63,13 @@ bool IsValidUtf8(std::string_view text) {
 }
 
 }  // namespace fuzz
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  // What a target opens for all inputs is open after the first.
+  static const int prepared = fuzz::Target({});
+  (void)prepared;
+  const int free = fuzz::LowestFreeDescriptor();
+  const int used = fuzz::Target({reinterpret_cast<const char*>(data), size});
+  DEMAND(fuzz::LowestFreeDescriptor() == free);
+  return used;
+}

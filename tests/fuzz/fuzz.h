@@ -1,10 +1,7 @@
 #pragma once
-// What the fuzz targets share. A target is one file: LLVMFuzzerTestOneInput takes an input, gives
-// it to the code as a client or a damaged disk would, and demands what that code promises, beyond
-// not crashing. scripts/fuzz runs a target with inputs that libFuzzer finds, replay.cpp with the
-// seeds.
-
-#include <json/value.h>
+// What the fuzz targets share. A target is one file: it takes an input, gives it to the code as a
+// client or a damaged disk would, and demands what that code promises, beyond not crashing.
+// scripts/fuzz runs a target with inputs that libFuzzer finds, replay.cpp with the seeds.
 
 #include <cstddef>
 #include <cstdint>
@@ -19,9 +16,8 @@ namespace fuzz {
 inline constexpr int kUsed = 0;
 inline constexpr int kUseless = -1;
 
-inline std::string_view Text(const std::uint8_t* data, std::size_t size) {
-  return {reinterpret_cast<const char*>(data), size};
-}
+// Defined by each target. What it opens for one input it closes again, which fuzz.cpp demands.
+int Target(std::string_view input);
 
 // Takes off `rest` what stands before the first `separator`, which is dropped; all of it where
 // there is none.
@@ -33,9 +29,6 @@ void Demand(bool kept, const char* promise, const char* file, int line);
 // A folder of this process's own, removed at its end.
 const std::string& Scratch();
 void WriteFile(const std::string& path, std::string_view bytes);
-
-// The lowest free descriptor: one that was left open makes it higher.
-int LowestFreeDescriptor();
 
 bool IsValidUtf8(std::string_view text);
 

@@ -1,19 +1,12 @@
 // Histories read back: a damaged file, or whole ones whose records are not what this program
 // writes.
 
-#include <filesystem>
-
-#include "nas/base/json_text.h"
 #include "nas/base/sqlite.h"
 #include "platform/filedb.h"
 #include "tests/fuzz/fuzz.h"
 #include "tests/fuzz/module_calls.h"
 
 namespace {
-
-using fuzz::Call;
-using fuzz::Outcome;
-using fuzz::Side;
 
 constexpr std::string_view kDatabase = "SQLite format 3";
 constexpr size_t kMostRecords = 16;
@@ -33,52 +26,44 @@ void MakeStore(std::string_view lines) {
   transaction.Commit();
 }
 
-Outcome Get(int limit = 0) {
-  Call call{"get", 1, Side::kParent, {}};
-  call.params["limit"] = limit;
+fuzz::Outcome Ask(const char* method, const char* name, const Json::Value& value) {
+  fuzz::Call call{method};
+  call.params[name] = value;
   return fuzz::Make(call);
 }
-
-void CheckGet() {
-  const Outcome all = Get();
-  DEMAND(all.code == 0);
-  const Json::Value& records = all.data["history"];
-  DEMAND(all.data["total"] == records.size());
-  const Json::Value first = Get(1).data["history"];
-  DEMAND(first.size() <= 1 && (first.empty() || first[0] == records[0]));
-  DEMAND(!first.empty() || records.empty());
+Json::Value Get(int limit) {
+  const fuzz::Outcome all = Ask("get", "limit", limit);
+  DEMAND(all.code == 0 && all.data["total"] == all.data["history"].size());
+  return all.data["history"];
 }
 
 // What was remembered is the newest, once, among no more than a history holds.
 void CheckSet() {
-  Call call{"set", 1, Side::kParent, {}};
-  call.params["pattern"] = "fuzz";
-  const Outcome set = fuzz::Make(call);
-  if (set.code != 0) return;
-  const Json::Value records = Get().data["history"];
+  if (Ask("set", "pattern", "fuzz").code != 0) return;
+  const Json::Value records = Get(0);
   DEMAND(records.size() >= 1 && records.size() <= 10);
   DEMAND(records[0]["pattern"] == "fuzz");
   for (Json::ArrayIndex i = 1; i < records.size(); ++i) {
     DEMAND(!records[i].isObject() || records[i]["pattern"] != "fuzz");
   }
-  DEMAND(fuzz::Make({"delete", 1, Side::kParent, {}}).code == 0);
-  DEMAND(Get().data["history"].empty());
+  DEMAND(fuzz::Make({"delete"}).code == 0 && Get(0).empty());
 }
 
 }  // namespace
 
 // A whole database file, or the bodies of records, a line each.
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  fuzz::PreparePlatform();
-  fuzz::CleanPlatform();
-  const std::string_view input = fuzz::Text(data, size);
+int fuzz::Target(std::string_view input) {
+  PreparePlatform();
+  CleanPlatform();
   if (input.starts_with(kDatabase)) {
-    fuzz::WriteFile(Path(), input);
+    WriteFile(Path(), input);
   } else {
     MakeStore(input);
   }
-  CheckGet();
+  const Json::Value all = Get(0);
+  const Json::Value first = Get(1);
+  DEMAND(first.empty() == all.empty() && (first.empty() || first[0] == all[0]));
   CheckSet();
-  fuzz::CleanPlatform();
-  return fuzz::kUsed;
+  CleanPlatform();
+  return kUsed;
 }

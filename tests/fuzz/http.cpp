@@ -162,13 +162,14 @@ void CheckReplies(const Exchange& exchange) {
 }  // namespace
 
 // Where the bytes are cut, as a share of their length, and the bytes.
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  if (size < 2 || size > kMostBytes) return fuzz::kUseless;
-  const std::string_view bytes = fuzz::Text(data + 1, size - 1);
+int fuzz::Target(std::string_view input) {
+  if (input.size() < 2 || input.size() > kMostBytes) return fuzz::kUseless;
+  const std::string_view bytes = input.substr(1);
   const Exchange whole = Talk(bytes, bytes.size());
   CheckReplies(whole);
   constexpr size_t kShares = 256;
-  for (const size_t cut : {bytes.size() * data[0] / kShares, bytes.size() - 1}) {
+  for (const size_t cut :
+       {bytes.size() * static_cast<unsigned char>(input[0]) / kShares, bytes.size() - 1}) {
     const Exchange pieces = Talk(bytes, cut);
     DEMAND(pieces.methods == whole.methods && pieces.replies == whole.replies);
   }

@@ -2,7 +2,6 @@
 
 #include <json/reader.h>
 
-#include <cmath>
 #include <memory>
 
 #include "nas/base/json_text.h"
@@ -11,15 +10,6 @@
 namespace {
 
 using nas::JsonBytes;
-
-// What JSON cannot hold is written as null.
-bool HoldsOnlyFinite(const Json::Value& value) {
-  if (value.isDouble() && !value.isIntegral()) return std::isfinite(value.asDouble());
-  for (const Json::Value& item : value) {
-    if (!HoldsOnlyFinite(item)) return false;
-  }
-  return true;
-}
 
 // The library's own reader, as strict as it can be made.
 bool ReadStrictly(std::string_view text, Json::Value* value) {
@@ -40,23 +30,24 @@ void CheckRoundTrip(const Json::Value& value) {
   const std::string raw = nas::JsonText(value, JsonBytes::kRaw);
   Json::Value again;
   DEMAND(nas::ParseJson(raw, &again));
-  DEMAND(!HoldsOnlyFinite(value) || again == value);
+  // What JSON cannot hold, as a number beyond all, is written as null.
+  DEMAND(again == value || raw.find("null") != std::string::npos);
   DEMAND(nas::JsonText(again, JsonBytes::kRaw) == raw);
 
   const std::string clean = nas::JsonText(value, JsonBytes::kClean);
   DEMAND(fuzz::IsValidUtf8(clean));
-  DEMAND(nas::ParseJson(clean, &again));
+  Json::Value cleaned;
+  DEMAND(nas::ParseJson(clean, &cleaned));
   // Cleaned names may come in another order, or two of them become one; once more changes nothing.
   Json::Value twice;
-  DEMAND(nas::ParseJson(nas::JsonText(again, JsonBytes::kClean), &twice));
-  DEMAND(!HoldsOnlyFinite(value) || twice == again);
+  DEMAND(nas::ParseJson(nas::JsonText(cleaned, JsonBytes::kClean), &twice));
+  DEMAND(twice == cleaned);
   for (const char byte : raw + clean) DEMAND(static_cast<unsigned char>(byte) >= ' ');
 }
 
 }  // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  const std::string_view text = fuzz::Text(data, size);
+int fuzz::Target(std::string_view text) {
   Json::Value untouched("untouched");
   Json::Value value = untouched;
   const bool read = nas::ParseJson(text, &value);

@@ -1,14 +1,10 @@
 // Locations as clients write them: what is opened lies in the share that the text begins with.
 
-#include <unistd.h>
-
-#include <filesystem>
-
+#include "search/locations.h"
 #include "nas/base/paths.h"
 #include "nas/search/location.h"
 #include "platform/webfm.h"
 #include "search/find_handler.h"
-#include "search/locations.h"
 #include "tests/fuzz/fuzz.h"
 #include "tests/fuzz/module_calls.h"
 
@@ -38,29 +34,10 @@ void CheckOpening(const std::string& text) {
   DEMAND(again->path == location->path);
 }
 
-class NoResponse : public NUVA::APIResponse {
- public:
-  void SetError(int /*code*/, const Json::Value& /*data*/) override {}
-};
-
-class UsersRequest : public NUVA::APIRequest {
- public:
-  std::string GetLoginUserName() const override { return fuzz::User(); }
-  std::string GetSessionID() const override { return {}; }
-  std::string GetPreferenceDir() const override { return {}; }
-  std::string GetAPIMethod() const override { return {}; }
-  int GetAPIVersion() const override { return 1; }
-  bool HasParam(const std::string& /*name*/) const override { return false; }
-  Json::Value GetParam(const std::string& /*name*/, const Json::Value& other) const override {
-    return other;
-  }
-};
-
 // Tidying twice changes nothing more, and nobody's own home is left under its alias.
 void CheckTidying(const std::string& text) {
-  UsersRequest request;
-  NoResponse response;
-  const ArboryFindHandler handler(&request, &response);
+  fuzz::Request request({});
+  const ArboryFindHandler handler(&request, nullptr);
   const Json::Value locations = StringExplodeEx(text, ",", 1, false);
   const Json::Value tidy = handler.RemoveDuplicatedLocations(locations);
   DEMAND(tidy.size() <= locations.size());
@@ -72,12 +49,10 @@ void CheckTidying(const std::string& text) {
 
 }  // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  fuzz::PreparePlatform();
-  const std::string text(fuzz::Text(data, size));
-  const int free = fuzz::LowestFreeDescriptor();
+int fuzz::Target(std::string_view input) {
+  PreparePlatform();
+  const std::string text(input);
   CheckOpening(text);
   CheckTidying(text);
-  DEMAND(fuzz::LowestFreeDescriptor() == free);
   return fuzz::kUsed;
 }

@@ -40,23 +40,6 @@ void WriteAsParent() {
   pTask->setProperty(task_record::kData, data);
 }
 
-class Request : public NUVA::APIRequest {
- public:
-  explicit Request(const fuzz::Call& call) : call_(call) {}
-  std::string GetLoginUserName() const override { return fuzz::User(); }
-  std::string GetSessionID() const override { return "session"; }
-  std::string GetPreferenceDir() const override { return fuzz::Preference(); }
-  std::string GetAPIMethod() const override { return call_.method; }
-  int GetAPIVersion() const override { return call_.version; }
-  bool HasParam(const std::string& name) const override { return call_.params.isMember(name); }
-  Json::Value GetParam(const std::string& name, const Json::Value& fallback) const override {
-    return HasParam(name) ? call_.params[name] : fallback;
-  }
-
- private:
-  const fuzz::Call& call_;
-};
-
 class Response : public NUVA::APIResponse {
  public:
   explicit Response(fuzz::Outcome* outcome) : outcome_(outcome) {}
@@ -150,7 +133,6 @@ void PreparePlatform() {
 
 Outcome Make(const Call& call) {
   Outcome outcome;
-  const int free = LowestFreeDescriptor();
   g_side = call.side;
   g_playing = true;
   pTask = nullptr;
@@ -170,7 +152,6 @@ Outcome Make(const Call& call) {
   // Listing leaves it to the end of its process.
   delete dbTask;
   dbTask = nullptr;
-  DEMAND(LowestFreeDescriptor() == free);
   DEMAND(outcome.ended || outcome.threw || outcome.code);
   if (outcome.ended) DEMAND(call.side != Side::kParent);
   const std::string text = nas::JsonText(outcome.data, nas::JsonBytes::kClean);

@@ -128,8 +128,7 @@ bool Matches(const NamePattern& pattern, std::string_view name) {
 }  // namespace
 
 // The pattern, a line's end, the name.
-extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  std::string_view name = fuzz::Text(data, size);
+int fuzz::Target(std::string_view name) {
   const std::string_view text = fuzz::Take(&name, '\n');
   if (name.size() > 255) return fuzz::kUseless;
   const auto pattern = NamePattern::Parse(text);
