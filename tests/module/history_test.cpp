@@ -13,18 +13,20 @@ struct Row {
   const char* why;
   const char* params;
   const char* fail;
-  Trace expected;
+  std::string expected;
 };
 
-const char kSimple[] = "FileDB(/prefs/search_history.db)";
-const char kAdvanced[] = "FileDB(/prefs/adv_search_history.db)";
+const std::string kSimple = "FileDB(/prefs/search_history.db)";
+const std::string kAdvanced = "FileDB(/prefs/adv_search_history.db)";
+const std::string kOpened = kSimple + "; FileDB.IsGood()";
+const std::string kWriting = kOpened + "; FileDB.Max(10); FileDB.Key(pattern); ";
 
 void Check(const Row& row, NUVA::APIEntry entry) {
   Script play;
   play.params = Parse(row.params);
   play.fail = {row.fail};
   play.history = {Parse(R"({"pattern":"b"})"), Parse(R"({"pattern":"a"})")};
-  EXPECT_EQ(Keep(Serve(play, entry), {"FileDB", "~FileDB", "log", "reply"}), row.expected)
+  EXPECT_EQ(Told(Serve(play, entry), {"FileDB", "~FileDB", "log", "reply"}), row.expected)
       << row.why;
 }
 
@@ -36,100 +38,66 @@ TEST(History, KindSelectsTheFile) {
 }
 
 TEST(History, Get) {
+  const std::string both =
+      R"(; ~FileDB; reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})";
   const Row rows[] = {
-      {"everything, in the store's order",
-       "{}",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Select(0,0)", "~FileDB",
-        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
-      {"counts pass unchanged",
-       R"({"offset":-2,"limit":3,"search_type":"advance"})",
-       "",
-       {kAdvanced, "FileDB.IsGood()", "FileDB.Select(-2,3)", "~FileDB",
-        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
+      {"everything, in the store's order", "{}", "", kOpened + "; FileDB.Select(0,0)" + both},
+      {"counts pass unchanged", R"({"offset":-2,"limit":3,"search_type":"advance"})", "",
+       kAdvanced + "; FileDB.IsGood(); FileDB.Select(-2,3)" + both},
       {"what is no number counts nothing, and what is no text names no other history",
-       R"({"offset":"x","limit":[1],"search_type":{}})",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Select(0,0)", "~FileDB",
-        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
-      {"counts beyond all",
-       R"({"offset":1e10,"limit":-99999999999})",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Select(2147483647,-2147483648)", "~FileDB",
-        R"(reply 0 {"history":[{"pattern":"b"},{"pattern":"a"}],"total":2})"}},
-      {"an unusable store is empty",
-       "{}",
-       "FileDB.IsGood",
-       {kSimple, "FileDB.IsGood()",
-        "log S:1060 db is not good, /prefs/search_history.db, Permission denied", "~FileDB",
-        R"(reply 0 {"history":[],"total":0})"}},
+       R"({"offset":"x","limit":[1],"search_type":{}})", "",
+       kOpened + "; FileDB.Select(0,0)" + both},
+      {"counts beyond all", R"({"offset":1e10,"limit":-99999999999})", "",
+       kOpened + "; FileDB.Select(2147483647,-2147483648)" + both},
+      {"an unusable store is empty", "{}", "FileDB.IsGood",
+       kOpened + "; log S:1060 db is not good, /prefs/search_history.db, Permission denied; "
+                 R"(~FileDB; reply 0 {"history":[],"total":0})"},
   };
   for (const Row& row : rows) Check(row, SearchHistoryGetEntry);
 }
 
 TEST(History, Set) {
   const Row rows[] = {
-      {"defaults",
-       R"({"pattern":"x"})",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
-        R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}))", "~FileDB",
-        "reply 0 null"}},
-      {"values as received",
-       R"({"pattern":5,"folder_path":["/a"],"recursive":"yes"})",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
-        R"(FileDB.Insert({"folder_path":["/a"],"pattern":"5","recursive":"yes"}))", "~FileDB",
-        "reply 0 null"}},
-      {"no pattern: the store is not opened", R"({"folder_path":"/a"})", "", {"reply 401 null"}},
-      {"nor for one that is no text", R"({"pattern":{"a":1}})", "", {"reply 401 null"}},
-      {"store",
-       R"({"pattern":"x","search_type":"advance"})",
-       "FileDB.IsGood",
-       {kAdvanced, "FileDB.IsGood()",
-        "log S:1089 db is not good, /prefs/adv_search_history.db, "
-        "Permission denied",
-        "~FileDB", "reply 401 null"}},
-      {"insert",
-       R"({"pattern":"x"})",
-       "FileDB.Insert",
-       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
-        R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}))", "~FileDB",
-        "reply 401 null"}},
+      {"defaults", R"({"pattern":"x"})", "",
+       kWriting + R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}); )"
+                  "~FileDB; reply 0 null"},
+      {"values as received", R"({"pattern":5,"folder_path":["/a"],"recursive":"yes"})", "",
+       kWriting + R"(FileDB.Insert({"folder_path":["/a"],"pattern":"5","recursive":"yes"}); )"
+                  "~FileDB; reply 0 null"},
+      {"no pattern: the store is not opened", R"({"folder_path":"/a"})", "", "reply 401 null"},
+      {"nor for one that is no text", R"({"pattern":{"a":1}})", "", "reply 401 null"},
+      {"store", R"({"pattern":"x","search_type":"advance"})", "FileDB.IsGood",
+       kAdvanced + "; FileDB.IsGood(); log S:1089 db is not good, /prefs/adv_search_history.db, "
+                   "Permission denied; ~FileDB; reply 401 null"},
+      {"insert", R"({"pattern":"x"})", "FileDB.Insert",
+       kWriting + R"(FileDB.Insert({"folder_path":"","pattern":"x","recursive":false}); )"
+                  "~FileDB; reply 401 null"},
   };
   for (const Row& row : rows) Check(row, SearchHistorySetEntry);
 }
 
 TEST(History, Delete) {
   const Row rows[] = {
-      {"everything",
-       R"({"pattern":"x"})",
-       "",
-       {kSimple, "FileDB.IsGood()", "FileDB.Delete(0,0)", "~FileDB", "reply 0 null"}},
-      {"store",
-       "{}",
-       "FileDB.IsGood",
-       {kSimple, "FileDB.IsGood()",
-        "log S:1111 db is not good, /prefs/search_history.db, Permission denied", "~FileDB",
-        "reply 401 null"}},
-      {"delete",
-       R"({"search_type":"advance"})",
-       "FileDB.Delete",
-       {kAdvanced, "FileDB.IsGood()", "FileDB.Delete(0,0)", "~FileDB", "reply 401 null"}},
+      {"everything", R"({"pattern":"x"})", "",
+       kOpened + "; FileDB.Delete(0,0); ~FileDB; reply 0 null"},
+      {"store", "{}", "FileDB.IsGood",
+       kOpened + "; log S:1111 db is not good, /prefs/search_history.db, Permission denied; "
+                 "~FileDB; reply 401 null"},
+      {"delete", R"({"search_type":"advance"})", "FileDB.Delete",
+       kAdvanced + "; FileDB.IsGood(); FileDB.Delete(0,0); ~FileDB; reply 401 null"},
   };
   for (const Row& row : rows) Check(row, SearchHistoryDeleteEntry);
 }
 
 TEST(Recording, WritesTheCriteriaUnderTheRequestsPattern) {
-  const Trace opened = {kSimple, "FileDB.IsGood()", "~FileDB"};
+  const std::string opened = kOpened + "; ~FileDB";
   const Row rows[] = {
-      {"old record goes, new one comes",
-       R"({"pattern":"p","folder_path":"/a","recursive":true})",
+      {"old record goes, new one comes", R"({"pattern":"p","folder_path":"/a","recursive":true})",
        "FileDB.Delete",  // its failure is ignored
-       {kSimple, "FileDB.IsGood()", "FileDB.Max(10)", "FileDB.Key(pattern)",
-        "FileDB.Delete(0,0,pattern=p)",
-        R"(FileDB.Update({"folder_path":"/a","pattern":"c","recursive":true,"size_to":1},3))",
-        "~FileDB"}},
+       kWriting +
+           "FileDB.Delete(0,0,pattern=p); "
+           R"(FileDB.Update({"folder_path":"/a","pattern":"c","recursive":true,"size_to":1},3); )"
+           "~FileDB"},
       {"no pattern", "{}", "", opened},
       {"unusable store: not a word", R"({"pattern":"p"})", "FileDB.IsGood", opened},
       {"a pattern that is no text", R"({"pattern":["p"],"search_type":{}})", "", opened},
@@ -142,7 +110,7 @@ TEST(Recording, WritesTheCriteriaUnderTheRequestsPattern) {
       ArboryFindHandler handler(Request(), Response());
       handler.SetSearchHistory(Parse(R"({"pattern":"c","size_to":1,"folder_path":"old"})"));
     });
-    EXPECT_EQ(Keep(trace, {"FileDB", "~FileDB", "log", "threw"}), row.expected) << row.why;
+    EXPECT_EQ(Told(trace, {"FileDB", "~FileDB", "log", "threw"}), row.expected) << row.why;
   }
 }
 
@@ -166,19 +134,19 @@ TEST(Recording, CountsSearches) {
       ArboryFindHandler handler(Request(), Response());
       handler.SetSearchCount();
     });
-    return Keep(trace, {"fromFile", "toFile", "log", "threw"});
+    return Told(trace, {"fromFile", "toFile", "log", "threw"});
   };
+  const std::string read = "fromFile(/prefs/usersettings)";
   for (const auto& row : rows) {
     Script play;
     play.settings = Parse(row.before);
-    Trace expected = {"fromFile(/prefs/usersettings)"};
-    if (!row.after.empty()) expected.push_back("toFile(/prefs/usersettings," + row.after + ")");
-    EXPECT_EQ(count(play), expected) << row.why;
+    EXPECT_EQ(count(play),
+              row.after.empty() ? read : read + "; toFile(/prefs/usersettings," + row.after + ")")
+        << row.why;
   }
   Script missing;
   missing.fail = {"fromFile"};
-  EXPECT_EQ(count(missing), (Trace{"fromFile(/prefs/usersettings)",
-                                   "log S:801 Failed to load usersettings, Permission denied"}));
+  EXPECT_EQ(count(missing), read + "; log S:801 Failed to load usersettings, Permission denied");
 }
 
 }  // namespace

@@ -244,6 +244,12 @@ Trace Keep(const Trace& trace, const std::vector<std::string>& words) {
   return kept;
 }
 
+std::string Told(const Trace& trace, const std::vector<std::string>& words) {
+  std::string text;
+  for (const std::string& line : Keep(trace, words)) text += (text.empty() ? "" : "; ") + line;
+  return text;
+}
+
 // --- web file manager -------------------------------------------------------------------------
 
 unsigned int WfmLibUmask() {

@@ -75,3 +75,5 @@ Trace Serve(const Script& play, NUVA::APIEntry entry);
 
 // The lines that begin with one of the words.
 Trace Keep(const Trace& trace, const std::vector<std::string>& words);
+// The same as one text, a line after the other with "; " between.
+std::string Told(const Trace& trace, const std::vector<std::string>& words);
