@@ -9,6 +9,7 @@
 
 #include "arbory/options.h"
 #include "nas/system/config.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 
 namespace arbory {

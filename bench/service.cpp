@@ -24,6 +24,7 @@
 #include <vector>
 
 #include "nas/system/config.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 #include "platform/task.h"
 #include "platform/task_record.h"

@@ -1,4 +1,4 @@
-// Loading of a module, which is known by one exported function.
+#include "nas/webapi/module.h"
 
 #include <dlfcn.h>
 #include <strings.h>
@@ -8,7 +8,6 @@
 
 #include "nas/base/paths.h"
 #include "nas/system/config.h"
-#include "nas/webapi/runner.h"
 
 namespace nas {
 namespace {

@@ -1,9 +1,9 @@
 #pragma once
-// Runs one API call as the web API server does: finds the table row, forks a request child
-// (nas/system/child.h), becomes the user there, calls the row's entry function and receives one
-// reply. A search worker that the call forks lives on after the child; what it leaves in its copy
-// of the response, when it falls back into the request's path, is dropped. For a process of one
-// thread, as every fork is.
+// Runs one API call as the web API server does: forks a request child (nas/system/child.h), becomes
+// the user there, calls the entry function of the table's row and receives one reply. A search
+// worker that the call forks lives on after the child; what it leaves in its copy of the response,
+// when it falls back into the request's path, is dropped. For a process of one thread, as every
+// fork is.
 
 #include <functional>
 #include <optional>
@@ -13,24 +13,6 @@
 #include "platform/webapi.h"
 
 namespace nas {
-
-// A module, loaded for the rest of the process.
-class Module {
- public:
-  // Loads the module at `path`; empty: the configured one, or the one beside the program. Throws
-  // std::runtime_error naming the file and the trouble.
-  explicit Module(const std::string& path);
-
-  // The row that serves the method: api and version exactly, the method ignoring letter case (a
-  // client reaches clean-all by the method "Clean" with "action" = "cleanall"). Null when none
-  // matches.
-  const NUVA::APIMethod* Find(const std::string& api, int version, const std::string& method) const;
-  // The table; ends with a row whose api is null.
-  const NUVA::APIMethod* table() const { return table_; }
-
- private:
-  const NUVA::APIMethod* table_ = nullptr;
-};
 
 struct ApiCall {
   std::string method;  // as the client spelled it

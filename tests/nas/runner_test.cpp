@@ -17,6 +17,7 @@
 #include "nas/system/memory.h"
 #include "nas/system/user_state.h"
 #include "nas/system/volumes.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 #include "platform/filedb.h"
 #include "platform/filesearch.h"

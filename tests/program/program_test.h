@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 #include "tests/nas/fixture.h"
 

@@ -18,6 +18,7 @@
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/service.h"
 #include "nas/base/json_text.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 #include "tests/nas/fixture.h"
 
@@ -230,7 +231,7 @@ TEST_F(ParameterNamesTest, TheModuleReadsWhatIsDocumented) {
 
 TEST_F(ParameterNamesTest, TheDescriptionNamesWhatIsDocumented) {
   Json::Value document;
-  ASSERT_TRUE(nas::ParseJson(OpenApiText(module_, arbory::Service::Routes()), &document));
+  ASSERT_TRUE(nas::ParseJson(OpenApiText(module_, arbory::Service::Routes(), "cookie"), &document));
   size_t methods = 0;
   for (const NUVA::APIMethod* row = module_.table(); row->api != nullptr; ++row, ++methods) {
     const std::string path =

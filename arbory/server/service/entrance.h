@@ -12,6 +12,7 @@
 #include "arbory/server/service/session_checks.h"
 #include "arbory/server/service/sessions.h"
 #include "arbory/server/transport/http.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 
 namespace arbory {

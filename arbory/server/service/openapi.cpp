@@ -110,7 +110,7 @@ constexpr char kComponents[] = R"({
   },
   "responses": {"Error": {"description": "The server itself refuses; a sentence says what to do.",
     "content": {"application/json": {"schema": {"$ref": "#/components/schemas/Error"}}}}},
-  "securitySchemes": {"session": {"type": "apiKey", "in": "cookie", "name": "arbory"}}
+  "securitySchemes": {"session": {"type": "apiKey", "in": "cookie"}}
 })";
 
 Json::Value Parsed(const char* text) {
@@ -222,12 +222,14 @@ void AddRoute(const Route& route, Json::Value* paths) {
 
 }  // namespace
 
-std::string OpenApiText(const nas::Module& module, std::span<const Route> routes) {
+std::string OpenApiText(const nas::Module& module, std::span<const Route> routes,
+                        const std::string& cookie) {
   Json::Value document;
   document["openapi"] = "3.1.0";
   document["info"]["title"] = "Arbory Search";
   document["info"]["version"] = ARBORY_VERSION;
   document["components"] = Parsed(kComponents);
+  document["components"]["securitySchemes"]["session"]["name"] = cookie;
   for (const Route& route : routes) {
     if (route.summary == nullptr) continue;
     if (route.pattern != std::string_view(kCallPattern)) {

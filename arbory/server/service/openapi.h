@@ -6,11 +6,12 @@
 #include <string>
 
 #include "arbory/server/service/routes.h"
-#include "nas/webapi/runner.h"
+#include "nas/webapi/module.h"
 
 namespace arbory {
 
 // One line of JSON.
-std::string OpenApiText(const nas::Module& module, std::span<const Route> routes);
+std::string OpenApiText(const nas::Module& module, std::span<const Route> routes,
+                        const std::string& cookie);
 
 }  // namespace arbory

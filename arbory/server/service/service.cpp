@@ -134,7 +134,7 @@ Service::Service(Setup setup, const nas::Module& module)
       bodies_(BodyLimitsOf(setup_)),
       entrance_(RulesOf(setup_), module, &calls_, &metrics_),
       api_list_(ListRows(module)),
-      openapi_(OpenApiText(module, Routes())) {}
+      openapi_(OpenApiText(module, Routes(), setup_.cookie)) {}
 
 void Service::Finished(const HttpRequest& request, int status, std::uint64_t bytes) {
   metrics_.CountReply(status, bytes);

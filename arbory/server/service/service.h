@@ -16,6 +16,7 @@
 #include "arbory/server/service/routes.h"
 #include "arbory/server/transport/http.h"
 #include "nas/system/config.h"
+#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 
 namespace arbory {

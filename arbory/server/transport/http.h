@@ -18,7 +18,7 @@
 #include <variant>
 #include <vector>
 
-#include "nas/webapi/runner.h"
+#include "nas/system/child.h"
 
 namespace arbory {
 
