@@ -58,6 +58,7 @@ enum Class : uint32_t {
 constexpr int32_t kShortTransfer = -1;
 constexpr size_t kWholeBytes = 8;
 constexpr size_t kWhatBytes = 256;
+constexpr long kNoPath = 0;
 
 struct Control {
   std::atomic<uint32_t> armed;
@@ -148,12 +149,17 @@ Function* Real(const char* name) {
 
 // The names that the program calls are given by label, so that the C library's own declarations,
 // with their attributes, are not in the way.
-#define HOOK(kind, result, name, parameters, arguments, path, failure)           \
-  extern "C" __attribute__((used)) result Hook_##name parameters __asm__(#name); \
-  result Hook_##name parameters {                                                \
-    static auto* const real = Real<result parameters>(#name);                    \
-    if (Fails(kind, #name, path, __builtin_return_address(0))) return failure;   \
-    return real arguments;                                                       \
+// A call is passed on as six whole registers, of which the function takes as many as it has
+// parameters, and its answer likewise; `path` is the register that holds one.
+#define HOOK(kind, name, path, failure)                                                          \
+  extern "C"                                                                                     \
+      __attribute__((used)) long Hook_##name(long, long, long, long, long, long) __asm__(#name); \
+  long Hook_##name([[maybe_unused]] long a, [[maybe_unused]] long b, long c, long d, long e,     \
+                   long f) {                                                                     \
+    static auto* const real = Real<long(long, long, long, long, long, long)>(#name);             \
+    const void* caller = __builtin_return_address(0);                                            \
+    if (Fails(kind, #name, reinterpret_cast<const char*>(path), caller)) return failure;         \
+    return real(a, b, c, d, e, f);                                                               \
   }
 #define HOOK_TRANSFER(kind, name, parameters, arguments)                                \
   extern "C" __attribute__((used)) ssize_t Hook_##name parameters __asm__(#name);       \
@@ -163,27 +169,23 @@ Function* Real(const char* name) {
     return real arguments;                                                              \
   }
 
-// A mode that was not given is whatever stands in its register, and not looked at.
-HOOK(kOpen, int, open, (const char* path, int flags, mode_t mode), (path, flags, mode), path, -1)
-HOOK(kOpen, int, open64, (const char* path, int flags, mode_t mode), (path, flags, mode), path, -1)
-HOOK(kOpen, int, openat, (int dir, const char* path, int flags, mode_t mode),
-     (dir, path, flags, mode), path, -1)
-HOOK(kOpen, int, openat64, (int dir, const char* path, int flags, mode_t mode),
-     (dir, path, flags, mode), path, -1)
-HOOK(kOpen, void*, opendir, (const char* path), (path), path, nullptr)
-HOOK(kOpen, void*, fdopendir, (int fd), (fd), "", nullptr)
-HOOK(kOpen, void*, fopen, (const char* path, const char* mode), (path, mode), path, nullptr)
-HOOK(kOpen, void*, fopen64, (const char* path, const char* mode), (path, mode), path, nullptr)
-HOOK(kOpen, int, mkostemp64, (char* path, int flags), (path, flags), path, -1)
+HOOK(kOpen, open, a, -1)
+HOOK(kOpen, open64, a, -1)
+HOOK(kOpen, openat, b, -1)
+HOOK(kOpen, openat64, b, -1)
+HOOK(kOpen, opendir, a, 0)
+HOOK(kOpen, fdopendir, kNoPath, 0)
+HOOK(kOpen, fopen, a, 0)
+HOOK(kOpen, fopen64, a, 0)
+HOOK(kOpen, mkostemp64, a, -1)
 
 HOOK_TRANSFER(kRead, read, (int fd, void* to, size_t count), (fd, to, count))
 HOOK_TRANSFER(kRead, pread, (int fd, void* to, size_t count, off_t at), (fd, to, count, at))
 HOOK_TRANSFER(kRead, pread64, (int fd, void* to, size_t count, off_t at), (fd, to, count, at))
-HOOK(kRead, ssize_t, getdents64, (int fd, void* to, size_t count), (fd, to, count), "", -1)
-HOOK(kRead, void*, readdir, (void* folder), (folder), "", nullptr)
-HOOK(kRead, void*, readdir64, (void* folder), (folder), "", nullptr)
-HOOK(kRead, ssize_t, readlink, (const char* path, char* to, size_t size), (path, to, size), path,
-     -1)
+HOOK(kRead, getdents64, kNoPath, -1)
+HOOK(kRead, readdir, kNoPath, 0)
+HOOK(kRead, readdir64, kNoPath, 0)
+HOOK(kRead, readlink, a, -1)
 
 HOOK_TRANSFER(kWrite, write, (int fd, const void* from, size_t count), (fd, from, count))
 HOOK_TRANSFER(kWrite, pwrite, (int fd, const void* from, size_t count, off_t at),
@@ -191,88 +193,70 @@ HOOK_TRANSFER(kWrite, pwrite, (int fd, const void* from, size_t count, off_t at)
 HOOK_TRANSFER(kWrite, pwrite64, (int fd, const void* from, size_t count, off_t at),
               (fd, from, count, at))
 
-HOOK(kRename, int, rename, (const char* from, const char* to), (from, to), to, -1)
-HOOK(kRename, int, renameat, (int a, const char* from, int b, const char* to), (a, from, b, to), to,
-     -1)
-HOOK(kLink, int, linkat, (int a, const char* from, int b, const char* to, int flags),
-     (a, from, b, to, flags), to, -1)
-HOOK(kUnlink, int, unlink, (const char* path), (path), path, -1)
-HOOK(kUnlink, int, unlinkat, (int dir, const char* path, int flags), (dir, path, flags), path, -1)
-HOOK(kUnlink, int, rmdir, (const char* path), (path), path, -1)
-HOOK(kMkdir, int, mkdir, (const char* path, mode_t mode), (path, mode), path, -1)
-HOOK(kMkdir, int, mkdirat, (int dir, const char* path, mode_t mode), (dir, path, mode), path, -1)
-HOOK(kSync, int, fsync, (int fd), (fd), "", -1)
-HOOK(kSync, int, fdatasync, (int fd), (fd), "", -1)
-HOOK(kTruncate, int, ftruncate, (int fd, off_t size), (fd, size), "", -1)
-HOOK(kTruncate, int, ftruncate64, (int fd, off_t size), (fd, size), "", -1)
-HOOK(kTruncate, int, fallocate, (int fd, int mode, off_t at, off_t size), (fd, mode, at, size), "",
-     -1)
-HOOK(kTruncate, int, fallocate64, (int fd, int mode, off_t at, off_t size), (fd, mode, at, size),
-     "", -1)
+HOOK(kRename, rename, b, -1)
+HOOK(kRename, renameat, d, -1)
+HOOK(kLink, linkat, d, -1)
+HOOK(kUnlink, unlink, a, -1)
+HOOK(kUnlink, unlinkat, b, -1)
+HOOK(kUnlink, rmdir, a, -1)
+HOOK(kMkdir, mkdir, a, -1)
+HOOK(kMkdir, mkdirat, b, -1)
+HOOK(kSync, fsync, kNoPath, -1)
+HOOK(kSync, fdatasync, kNoPath, -1)
+HOOK(kTruncate, ftruncate, kNoPath, -1)
+HOOK(kTruncate, ftruncate64, kNoPath, -1)
+HOOK(kTruncate, fallocate, kNoPath, -1)
+HOOK(kTruncate, fallocate64, kNoPath, -1)
 
-HOOK(kFork, pid_t, fork, (), (), "", -1)
+HOOK(kFork, fork, kNoPath, -1)
 // Its failures are returned.
-HOOK(kThread, int, pthread_create, (void* id, const void* how, void* (*body)(void*), void* with),
-     (id, how, body, with), "", errno)
-HOOK(kKill, int, kill, (pid_t process, int number), (process, number), "", -1)
+HOOK(kThread, pthread_create, kNoPath, errno)
+HOOK(kKill, kill, kNoPath, -1)
 
-HOOK(kMap, void*, mmap, (void* at, size_t size, int how, int flags, int fd, off_t from),
-     (at, size, how, flags, fd, from), "", MAP_FAILED)
-HOOK(kMap, void*, mmap64, (void* at, size_t size, int how, int flags, int fd, off_t from),
-     (at, size, how, flags, fd, from), "", MAP_FAILED)
-HOOK(kMap, void*, mremap, (void* at, size_t old_size, size_t size, int flags, void* to),
-     (at, old_size, size, flags, to), "", MAP_FAILED)
+HOOK(kMap, mmap, kNoPath, -1)
+HOOK(kMap, mmap64, kNoPath, -1)
+HOOK(kMap, mremap, kNoPath, -1)
 
-HOOK(kPipe, int, pipe, (int* ends), (ends), "", -1)
-HOOK(kPipe, int, pipe2, (int* ends, int flags), (ends, flags), "", -1)
-HOOK(kPoll, int, poll, (void* watched, unsigned long count, int time), (watched, count, time), "",
-     -1)
-HOOK(kPoll, int, epoll_wait, (int fd, void* events, int most, int time), (fd, events, most, time),
-     "", -1)
-HOOK(kWatch, int, epoll_ctl, (int fd, int what, int of, void* event), (fd, what, of, event), "", -1)
-HOOK(kPoll, int, nanosleep, (const void* length, void* left), (length, left), "", -1)
+HOOK(kPipe, pipe, kNoPath, -1)
+HOOK(kPipe, pipe2, kNoPath, -1)
+HOOK(kPoll, poll, kNoPath, -1)
+HOOK(kPoll, epoll_wait, kNoPath, -1)
+HOOK(kWatch, epoll_ctl, kNoPath, -1)
+HOOK(kPoll, nanosleep, kNoPath, -1)
 
-HOOK(kDescriptor, int, dup2, (int from, int to), (from, to), "", -1)
-HOOK(kDescriptor, int, close_range, (unsigned from, unsigned to, int flags), (from, to, flags), "",
-     -1)
-HOOK(kStat, int, stat, (const char* path, void* to), (path, to), path, -1)
-HOOK(kStat, int, stat64, (const char* path, void* to), (path, to), path, -1)
-HOOK(kStat, int, lstat, (const char* path, void* to), (path, to), path, -1)
-HOOK(kStat, int, lstat64, (const char* path, void* to), (path, to), path, -1)
-HOOK(kStat, int, fstat, (int fd, void* to), (fd, to), "", -1)
-HOOK(kStat, int, fstat64, (int fd, void* to), (fd, to), "", -1)
-HOOK(kStat, int, fstatat, (int dir, const char* path, void* to, int how), (dir, path, to, how),
-     path, -1)
-HOOK(kStat, int, fstatat64, (int dir, const char* path, void* to, int how), (dir, path, to, how),
-     path, -1)
-HOOK(kStat, int, fstatfs64, (int fd, void* to), (fd, to), "", -1)
-HOOK(kStat, int, statx, (int dir, const char* path, int flags, unsigned mask, void* to),
-     (dir, path, flags, mask, to), path, -1)
-HOOK(kStat, int, access, (const char* path, int mode), (path, mode), path, -1)
-HOOK(kStat, int, faccessat, (int dir, const char* path, int mode, int flags),
-     (dir, path, mode, flags), path, -1)
-HOOK(kStat, char*, realpath, (const char* path, char* to), (path, to), path, nullptr)
+HOOK(kDescriptor, dup2, kNoPath, -1)
+HOOK(kDescriptor, close_range, kNoPath, -1)
+HOOK(kStat, stat, a, -1)
+HOOK(kStat, stat64, a, -1)
+HOOK(kStat, lstat, a, -1)
+HOOK(kStat, lstat64, a, -1)
+HOOK(kStat, fstat, kNoPath, -1)
+HOOK(kStat, fstat64, kNoPath, -1)
+HOOK(kStat, fstatat, b, -1)
+HOOK(kStat, fstatat64, b, -1)
+HOOK(kStat, fstatfs64, kNoPath, -1)
+HOOK(kStat, statx, b, -1)
+HOOK(kStat, access, a, -1)
+HOOK(kStat, faccessat, b, -1)
+HOOK(kStat, realpath, a, 0)
 
-HOOK(kIdentity, int, setresuid, (uid_t a, uid_t b, uid_t c), (a, b, c), "", -1)
-HOOK(kIdentity, int, setresgid, (gid_t a, gid_t b, gid_t c), (a, b, c), "", -1)
-HOOK(kIdentity, int, seteuid, (uid_t id), (id), "", -1)
-HOOK(kIdentity, int, setegid, (gid_t id), (id), "", -1)
-HOOK(kIdentity, int, setgroups, (size_t count, const gid_t* list), (count, list), "", -1)
-HOOK(kIdentity, int, initgroups, (const char* user, gid_t group), (user, group), user, -1)
-HOOK(kIdentity, int, setsid, (), (), "", -1)
-HOOK(kIdentity, int, setpgid, (pid_t process, pid_t group), (process, group), "", -1)
-HOOK(kOwner, int, fchmod, (int fd, mode_t mode), (fd, mode), "", -1)
-HOOK(kOwner, int, fchown, (int fd, uid_t user, gid_t group), (fd, user, group), "", -1)
-HOOK(kOwner, int, fchownat, (int dir, const char* path, uid_t user, gid_t group, int flags),
-     (dir, path, user, group, flags), path, -1)
+HOOK(kIdentity, setresuid, kNoPath, -1)
+HOOK(kIdentity, setresgid, kNoPath, -1)
+HOOK(kIdentity, seteuid, kNoPath, -1)
+HOOK(kIdentity, setegid, kNoPath, -1)
+HOOK(kIdentity, setgroups, kNoPath, -1)
+HOOK(kIdentity, initgroups, a, -1)
+HOOK(kIdentity, setsid, kNoPath, -1)
+HOOK(kIdentity, setpgid, kNoPath, -1)
+HOOK(kOwner, fchmod, kNoPath, -1)
+HOOK(kOwner, fchown, kNoPath, -1)
+HOOK(kOwner, fchownat, b, -1)
 
-HOOK(kSocket, int, socket, (int domain, int type, int protocol), (domain, type, protocol), "", -1)
-HOOK(kSocket, int, accept, (int fd, void* address, void* size), (fd, address, size), "", -1)
-HOOK(kSocket, int, setsockopt, (int fd, int level, int name, const void* value, unsigned size),
-     (fd, level, name, value, size), "", -1)
-HOOK(kSocket, ssize_t, recvmsg, (int fd, void* message, int flags), (fd, message, flags), "", -1)
-HOOK(kSocket, ssize_t, sendmsg, (int fd, const void* message, int flags), (fd, message, flags), "",
-     -1)
+HOOK(kSocket, socket, kNoPath, -1)
+HOOK(kSocket, accept, kNoPath, -1)
+HOOK(kSocket, setsockopt, kNoPath, -1)
+HOOK(kSocket, recvmsg, kNoPath, -1)
+HOOK(kSocket, sendmsg, kNoPath, -1)
 HOOK_TRANSFER(kSocket, recv, (int fd, void* to, size_t count, int flags), (fd, to, count, flags))
 HOOK_TRANSFER(kSocket, send, (int fd, const void* from, size_t count, int flags),
               (fd, from, count, flags))

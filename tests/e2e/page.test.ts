@@ -279,7 +279,7 @@ test('files are previewed, downloaded and their paths copied, by keyboard', asyn
   assert.equal(await page.evaluate(() => navigator.clipboard.readText()), '/files/docs/100% & "fine" #1.txt');
   await go('view.png');
   await page.keyboard.press('Space');
-  await page.waitForFunction(() => document.querySelector<HTMLImageElement>('.details img')?.naturalWidth === 320);
+  await page.waitForFunction(() => document.querySelector<HTMLImageElement>('.details img')?.naturalWidth === 1);
   await go('notes.txt'); // the details follow the keyboard
   await page.locator('.details pre', { hasText: 'the needle is here' }).waitFor();
   await page.keyboard.press('Escape');

@@ -3,9 +3,9 @@ import * as fs from 'node:fs';
 import { dirname, join } from 'node:path';
 import { test } from 'node:test';
 import type { Browser, BrowserContextOptions } from 'playwright-core';
-import { openBrowser, Tab } from './browser.ts';
-import { Place, Server } from './server.ts';
-import { picture } from './tree.ts';
+import { openBrowser, Tab } from '../../tests/e2e/browser.ts';
+import { Place, Server } from '../../tests/e2e/server.ts';
+import { picture } from './picture.ts';
 
 const NOW = Date.UTC(2026, 9, 14, 9, 30) / 1000;
 const DAY = 86_400;
