@@ -3,52 +3,31 @@
 // program.
 
 #include <dirent.h>
-#include <fcntl.h>
-#include <gtest/gtest.h>
 #include <sys/mount.h>
-#include <sys/stat.h>
 
 #include <atomic>
-#include <chrono>
 #include <cstdlib>
-#include <filesystem>
 #include <fstream>
 #include <set>
-#include <thread>
 
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
 #include "nas/search/content_reading.h"
 #include "nas/search/folder_walk.h"
 #include "nas/search/search_job.h"
-#include "nas/system/config.h"
+#include "tests/nas/fixture.h"
 
 namespace nas {
 namespace {
 
-size_t OpenDescriptors() {
-  size_t count = 0;
-  for ([[maybe_unused]] const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
-    ++count;
-  }
-  return count;
-}
-
-class Job : public testing::Test {
+class Job : public nas_test::PlatformTest {
  protected:
-  Job() {
-    std::filesystem::create_directories(tree_);
-    std::filesystem::create_directories(base_ + "/results");
-    Config config;
-    config.state_dir = base_ + "/state";
-    config.volumes = {base_ + "/volume*"};
-    config.shares = {{"tree", tree_}};
-    Configure(config);
-    descriptors_ = OpenDescriptors();
-  }
-  ~Job() override {
-    EXPECT_EQ(OpenDescriptors(), descriptors_);
-    std::filesystem::remove_all(base_);
+  void SetUp() override {
+    PlatformTest::SetUp();
+    base_ = dir_;
+    tree_ = MakeFolder("tree");
+    MakeFolder("results");
+    Configure({{"tree", tree_}});
   }
 
   void Touch(const std::string& name, const std::string& content = "") {
@@ -91,14 +70,13 @@ class Job : public testing::Test {
     return found;
   }
 
-  const std::string base_ = testing::TempDir() + "job-" + NewResultId();
-  const std::string tree_ = base_ + "/tree";
+  std::string base_;
+  std::string tree_;
   int stop_ = 0;
   std::atomic<int> reports_ = 0;
   int stuck_ = 0;
   bool completed_ = false;
   Json::Value progress_;
-  size_t descriptors_ = 0;
 };
 
 TEST_F(Job, ChainDeeperThanAPathMayBeLong) {
@@ -159,9 +137,7 @@ TEST_F(Job, LinksLoopsPipesAndTemporaryFolders) {
   std::filesystem::create_directories(base_ + "/volume1/docs/@tmp");
   std::ofstream(base_ + "/volume1/@tmp/webfm/y1");
   std::ofstream(base_ + "/volume1/docs/@tmp/y2");
-  Config config = CurrentConfig();
-  config.shares = {{"all", base_}};
-  Configure(config);
+  Configure({{"all", base_}});
   EXPECT_EQ(Find("y", {"/all"}), (std::set<std::string>{"volume1/docs/@tmp/y2"}));
   EXPECT_TRUE(OpenLocation("/all/volume1/docs/@tmp"));
   EXPECT_FALSE(OpenLocation("/all/volume1/@tmp"));
@@ -248,30 +224,18 @@ TEST_F(Job, LocationErrors) {
   Touch("file");
   std::filesystem::create_directory_symlink("/etc", tree_ + "/out");
   std::filesystem::create_directory_symlink("in", tree_ + "/alias");
-  const struct {
-    std::string text;
-    int error;
-  } rows[] = {
-      {"/tree", 0},
-      {"/tree/", 0},
-      {"//tree//in/.", 0},
-      {"/tree/alias", 0},
-      {"", 0x9A00},
-      {"tree", 0x9A00},
-      {"/", 0x9A00},
-      {"/tree/..", 0x9A00},
-      {"/tree/in/../in", 0x9A00},
-      {"/tree/out", 0x9A00},
-      {"/tree/file", 0x0600},
-      {"/tree/none", 0x0600},
-      {"/none", 0x0600},
-      {"/Tree", 0x0600},
-      {"/tree/" + std::string(5'000, 'a'), 0x9A00},
-      {std::string("/tree/in\0x", 10), 0x9A00},
+  const std::pair<int, std::vector<std::string>> rows[] = {
+      {0, {"/tree", "/tree/", "//tree//in/.", "/tree/alias"}},
+      {0x9A00,
+       {"", "tree", "/", "/tree/..", "/tree/in/../in", "/tree/out",
+        "/tree/" + std::string(5'000, 'a'), std::string("/tree/in\0x", 10)}},
+      {0x0600, {"/tree/file", "/tree/none", "/none", "/Tree"}},
   };
-  for (const auto& row : rows) {
-    const auto location = OpenLocation(row.text);
-    EXPECT_EQ(location ? kErrorNone : location.error().kind, row.error) << row.text.substr(0, 40);
+  for (const auto& [error, texts] : rows) {
+    for (const std::string& text : texts) {
+      const auto location = OpenLocation(text);
+      EXPECT_EQ(location ? kErrorNone : location.error().kind, error) << text.substr(0, 40);
+    }
   }
 }
 

@@ -45,76 +45,37 @@ TEST_F(Results, EveryColumnSorts) {
   ResultWriter writer(path_);
   writer.AddLocation(0, "share", "/s");
   writer.AddLocation(1, "Alpha", "/a");
-  const struct {
-    const char* name;
-    const char* folder;
-    std::uint16_t location;
-    FileAttributes file;
-  } rows[] = {
-      {"IMG10.png",
-       "b",
-       0,
-       {.size = 5,
-        .atime = 1,
-        .mtime = -5,
-        .ctime = 3,
-        .crtime = 9,
-        .mode = S_IFREG | 0644,
-        .uid = 0,
-        .gid = 0}},
-      {"img2.PNG",
-       "a/x",
-       0,
-       {.size = 1u << 30,
-        .atime = 3,
-        .mtime = 7,
-        .ctime = 2,
-        .crtime = 8,
-        .mode = S_IFREG | 0600,
-        .uid = 65534,
-        .gid = 0}},
-      {"Zoo",
-       "a",
-       0,
-       {.size = 0, .atime = 2, .mtime = 0, .ctime = 1, .mode = S_IFDIR | 0755, .uid = 1, .gid = 0}},
-      {"img002a.doc",
-       "z",
-       1,
-       {.size = 300,
-        .atime = 4,
-        .mtime = 1,
-        .ctime = 4,
-        .crtime = 7,
-        .mode = S_IFREG | 0640,
-        .uid = 0,
-        .gid = 65534}},
+  constexpr std::int64_t kNone = FileAttributes::kNoTime;
+  // Size; the times of reading, writing, changing, making; mode and owners.
+  const std::tuple<const char*, const char*, std::uint16_t, FileAttributes> rows[] = {
+      {"IMG10.png", "b", 0, {5, 1, -5, 3, 9, S_IFREG | 0644, 0, 0}},
+      {"img2.PNG", "a/x", 0, {1u << 30, 3, 7, 2, 8, S_IFREG | 0600, 65534, 0}},
+      {"Zoo", "a", 0, {0, 2, 0, 1, kNone, S_IFDIR | 0755, 1, 0}},
+      {"img002a.doc", "z", 1, {300, 4, 1, 4, 7, S_IFREG | 0640, 0, 65534}},
   };
-  for (const auto& row : rows) {
+  for (const auto& [name, folder, location, file] : rows) {
     RowBlock block;
-    block.SetFolder(row.location, row.folder);
-    block.Add(row.name, row.file);
+    block.SetFolder(location, folder);
+    block.Add(name, file);
     writer.Append(block);
   }
   writer.Complete();
 
   ResultReader reader(path_);
   const std::string a = "IMG10.png", b = "img2.PNG", c = "Zoo", d = "img002a.doc";
-  const struct {
-    const char* column;
-    std::vector<std::string> ascending;
-  } orders[] = {
+  const std::pair<const char*, std::vector<std::string>> orders[] = {
       {"name", {b, d, a, c}},  {"path", {d, c, b, a}},   {"size", {c, a, d, b}},
       {"type", {c, d, a, b}},  {"user", {c, b, a, d}},   {"group", {d, a, b, c}},
       {"mode", {b, d, a, c}},  {"atime", {a, c, b, d}},  {"mtime", {a, c, d, b}},
       {"ctime", {c, b, a, d}}, {"crtime", {c, d, b, a}},
   };
-  for (const auto& order : orders) {
+  for (const auto& [column, ascending] : orders) {
     Selection selection;
-    selection.column = ParseSortColumn(order.column).value();
-    EXPECT_EQ(Names(reader, selection), order.ascending) << order.column;
+    selection.column = ParseSortColumn(column).value();
+    EXPECT_EQ(Names(reader, selection), ascending) << column;
     selection.ascending = false;
-    std::vector<std::string> descending(order.ascending.rbegin(), order.ascending.rend());
-    EXPECT_EQ(Names(reader, selection), descending) << order.column;
+    std::vector<std::string> descending(ascending.rbegin(), ascending.rend());
+    EXPECT_EQ(Names(reader, selection), descending) << column;
   }
   EXPECT_FALSE(ParseSortColumn("name; DROP TABLE names"));
 

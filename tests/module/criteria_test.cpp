@@ -82,12 +82,7 @@ TEST(Walk, IsSetUpFromTheRequest) {
   const std::string everywhere = "Walker.current(false); ";
   const std::string set_data = R"(Task.set(data,{"kept":1,"sdbid":"db1","sdbvol":"/volume1"}))";
   const std::string walk = R"(; Walk([]{"recursive":true,"search_content":true}))";
-  const struct {
-    const char* why;
-    const char* params;
-    const char* fail;
-    std::string expected;
-  } rows[] = {
+  const std::tuple<const char*, const char*, const char*, std::string> rows[] = {
       {"defaults", "{}", "", everywhere + set_data + walk + "; true"},
       {"not recursive, times narrowed, after first",
        R"({"recursive":false,"search_content":false,"atime_to":4294967299,"atime_from":2})", "",
@@ -106,10 +101,10 @@ TEST(Walk, IsSetUpFromTheRequest) {
        everywhere + set_data + "; log S:119 Failed to write progress.; false"},
       {"the walk fails", "{}", "Walk", everywhere + set_data + walk + "; false"},
   };
-  for (const auto& row : rows) {
+  for (const auto& [why, params, fail, expected] : rows) {
     Script play;
-    play.params = Parse(row.params);
-    play.fail = {row.fail};
+    play.params = Parse(params);
+    play.fail = {fail};
     if (!play.fail.contains("the record")) play.properties["data"]["kept"] = 1;
     const Trace trace = Play(play, [] {
       pTask = new OKT::Task("ann", nullptr);
@@ -118,9 +113,9 @@ TEST(Walk, IsSetUpFromTheRequest) {
       Note(handler.Recursive_Find({"/a"}, {}, options) ? "true" : "false");
     });
     EXPECT_EQ(Told(trace, {"Walker.current", "Task.set", "Walk(", "log", "true", "false"}),
-              row.expected)
-        << row.why;
-    EXPECT_EQ(Keep(trace, {"~Walker"}).size(), 1U) << row.why;
+              expected)
+        << why;
+    EXPECT_EQ(Keep(trace, {"~Walker"}).size(), 1U) << why;
   }
 }
 

@@ -20,11 +20,7 @@ Script ListScript(const char* params = "{}") {
 }
 
 TEST(List, PassesThePageOnToTheQuery) {
-  const struct {
-    const char* why;
-    const char* params;
-    const char* query;
-  } rows[] = {
+  const std::tuple<const char*, const char*, const char*> rows[] = {
       {"defaults", "{}", "0,2147483647,null,asc,2,"},
       {"descending in any case", R"({"sort_by":"size","sort_direction":"desc"})",
        "0,2147483647,size,desc,2,"},
@@ -37,14 +33,14 @@ TEST(List, PassesThePageOnToTheQuery) {
       {"a limit whose low bits are 0", R"({"limit":4294967296})", "0,2147483647,null,asc,2,"},
       {"no range", R"({"offset":-1,"limit":-2})", "4294967295,4294967294,null,asc,2,"},
   };
-  for (const auto& row : rows) {
-    const Trace trace = Serve(ListScript(row.params), SearchAPIEntry);
-    EXPECT_EQ(Keep(trace, {"DBTask.query"}), Trace{std::string("DBTask.query(") + row.query + ")"})
-        << row.why;
-    const std::string offset = std::string(row.query).substr(0, std::string(row.query).find(','));
+  for (const auto& [why, params, query] : rows) {
+    const Trace trace = Serve(ListScript(params), SearchAPIEntry);
+    EXPECT_EQ(Keep(trace, {"DBTask.query"}), Trace{std::string("DBTask.query(") + query + ")"})
+        << why;
+    const std::string offset = std::string(query).substr(0, std::string(query).find(','));
     EXPECT_EQ(Keep(trace, {"reply"}), Trace{R"(reply 0 {"files":[],"finished":false,"offset":)" +
                                             offset + R"(,"total":0})"})
-        << row.why;
+        << why;
   }
 }
 
@@ -52,11 +48,7 @@ TEST(List, AnswersEachFailureWithItsCode) {
   const std::string through = "SessionIdentity(sid,ann); WaitKeyReady(data,sdbid,500); ";
   const std::string ready = through + "WaitReady(result_ready,100); ";
   const std::string opened = ready + "getDBTask(/volume1,db1); ";
-  const struct {
-    const char* why;
-    const char* arrange;
-    std::string expected;
-  } rows[] = {
+  const std::tuple<const char*, const char*, std::string> rows[] = {
       {"cleaned: finished", "no tasks", R"(reply 0 {"finished":true})"},
       {"identity", "fail SessionIdentity",
        "SessionIdentity(sid,ann); log S:528 Failed to set UGID for user=ann, sid=sid.; "
@@ -76,16 +68,16 @@ TEST(List, AnswersEachFailureWithItsCode) {
       {"query", "fail DBTask.query",
        opened + "log S:451 Fail to select data from DB by ann; reply 600 null"},
   };
-  for (const auto& row : rows) {
+  for (const auto& [why, arrange, expected] : rows) {
     Script play = ListScript();
-    play.Arrange(row.arrange);
+    play.Arrange(arrange);
     const Trace trace = Serve(play, SearchAPIEntry);
-    EXPECT_EQ(Told(trace, {"SessionIdentity", "Wait", "getDBTask", "log", "reply"}), row.expected)
-        << row.why;
-    EXPECT_EQ(Keep(trace, {"~Task"}).size(), play.tasks.size() / 2) << row.why;
+    EXPECT_EQ(Told(trace, {"SessionIdentity", "Wait", "getDBTask", "log", "reply"}), expected)
+        << why;
+    EXPECT_EQ(Keep(trace, {"~Task"}).size(), play.tasks.size() / 2) << why;
     EXPECT_EQ(Keep(trace, {"NUVAUserGet(ann)"}).size() * play.accounts.size(),
               Keep(trace, {"NUVAUserFree"}).size())
-        << row.why;
+        << why;
   }
 }
 

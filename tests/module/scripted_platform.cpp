@@ -18,6 +18,7 @@
 #include <cstring>
 #include <sstream>
 #include <stdexcept>
+#include <type_traits>
 
 #include "platform/filedb.h"
 #include "platform/filesearch.h"
@@ -33,16 +34,33 @@ namespace {
 int trace_fd = -1;
 constexpr char kSource[] = "NUVA.Arbory.Search:";
 
+std::string Shown(const char* text) { return text == nullptr ? "null" : text; }
+std::string Shown(const std::string& text) { return text; }
+std::string Shown(const Json::Value& value) { return Text(value); }
+template <typename Number>
+requires std::is_arithmetic_v<Number> std::string Shown(Number number) {
+  return std::to_string(number);
+}
+
 // Traces the call and lets the script act in it. True when it is to succeed.
-bool Called(const std::string& operation, const std::string& arguments = "") {
-  Note(operation + "(" + arguments + ")");
+template <typename... Arguments>
+bool Called(const std::string& operation, const Arguments&... arguments) {
+  std::string list;
+  ((list += Shown(arguments) + ","), ...);
+  if (!list.empty()) list.pop_back();
+  Note(operation + "(" + list + ")");
   if (const auto act = script.at.find(operation); act != script.at.end()) act->second();
   if (!script.fail.contains(operation)) return true;
   errno = EACCES;
   return false;
 }
 
-std::string Or(const char* text) { return text == nullptr ? "null" : text; }
+// The same of what cannot fail and answers `value`.
+template <typename Value, typename... Arguments>
+Value Answer(Value value, const std::string& operation, const Arguments&... arguments) {
+  Called(operation, arguments...);
+  return value;
+}
 
 // The arguments that a criterion was made with. The key is not its address, in which a leak check
 // would see an owner.
@@ -252,30 +270,21 @@ std::string Told(const Trace& trace, const std::vector<std::string>& words) {
 
 // --- web file manager -------------------------------------------------------------------------
 
-unsigned int WfmLibUmask() {
-  Called("WfmLibUmask");
-  return 022;
-}
-void WfmLibRestoreUmask(unsigned int mask) {
-  Note("WfmLibRestoreUmask(" + std::to_string(mask) + ")");
-}
+unsigned int WfmLibUmask() { return Answer(022U, "WfmLibUmask"); }
+void WfmLibRestoreUmask(unsigned int mask) { Called("WfmLibRestoreUmask", mask); }
 int WfmLibUGIDSet(const char* session, const char* user) {
-  return Called(session == nullptr ? "RunIdentity" : "SessionIdentity", Or(session) + "," + user)
-             ? 0
-             : -1;
+  return Called(session == nullptr ? "RunIdentity" : "SessionIdentity", session, user) ? 0 : -1;
 }
 int WfmLibGetErr() {
   errno = ENOENT;  // what came after the failure that is to be logged
   return script.wfm_error;
 }
 int WfmParseErrnoToError(int error, const char* path, const char* other_path) {
-  Note("WfmParseErrnoToError(" + Or(path) + "," + Or(other_path) + ")");
-  return error + 1;
+  return Answer(error + 1, "WfmParseErrnoToError", path, other_path);
 }
 Json::Value StringExplodeEx(const Json::Value& value, const char* separator, int version,
                             bool drop_empty) {
-  Called("Explode", Text(value) + "," + separator + "," + std::to_string(version) +
-                        (drop_empty ? ",drop" : ",keep"));
+  Called("Explode", value, separator, version, drop_empty ? "drop" : "keep");
   if (value.isArray()) return value;
   Json::Value pieces(Json::arrayValue);
   if (!value.isString()) return pieces;
@@ -297,10 +306,7 @@ void DumpFileInfo(int additional, const DIRENTRY_INFO& e, Json::Value& out, int,
   if (e.mode != 0) text << " perm=" << e.mode << ',' << e.acl_privilege << ',' << e.acl_mode;
   out = text.str();
 }
-int GetACLPrivilege(const char* path) {
-  Called("GetACLPrivilege", path);
-  return 7;
-}
+int GetACLPrivilege(const char* path) { return Answer(7, "GetACLPrivilege", path); }
 
 // --- system -----------------------------------------------------------------------------------
 
@@ -325,48 +331,39 @@ void NUVAGroupFree(NUVAGROUP* group) {
   delete group;
 }
 int NUVAServiceHomePathGet(const char* user, char* buffer, size_t size) {
-  if (!Called("HomePath", std::string(user) + "," + std::to_string(size))) return -1;
-  if (!script.homes.contains(user)) {
-    errno = ENOENT;
-    return -1;
-  }
+  if (!Called("HomePath", user, size)) return -1;
+  errno = ENOENT;
+  if (!script.homes.contains(user)) return -1;
   snprintf(buffer, size, "%s", script.homes[user].c_str());
   return 0;
 }
 int NUVAServiceUserHomeIsEnabled(const char* user, uid_t uid) {
-  Called("HomeIsEnabled", std::string(user) + "," + std::to_string(uid));
-  return script.home_enabled ? 1 : 0;
+  return Answer(script.home_enabled ? 1 : 0, "HomeIsEnabled", user, uid);
 }
 int NUVAACLIsSupport(const char* path, int fd, int flags) {
-  Called("ACLIsSupport",
-         std::string(path) + "," + std::to_string(fd) + "," + std::to_string(flags));
-  return 5;
+  return Answer(5, "ACLIsSupport", path, fd, flags);
 }
 int FILEIDXIsShareIndexed(const char* share) {
-  Called("IsShareIndexed", share);
-  return script.indexed.contains(share) ? 1 : 0;
+  return Answer(script.indexed.contains(share) ? 1 : 0, "IsShareIndexed", share);
 }
 pid_t NLIBCProcFork() { return Called("NLIBCProcFork") ? script.fork_result : -1; }
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3, int) {
-  Called("NLIBCExec", Or(program) + "," + Or(arg1) + "," + Or(arg2) + "," + Or(arg3));
-  return 0;
+  return Answer(0, "NLIBCExec", program, arg1, arg2, arg3);
 }
 int NLIBCEncShParam(const char* text, char* buffer, size_t size) {
-  if (!Called("NLIBCEncShParam", std::string(text) + "," + std::to_string(size))) return -1;
   snprintf(buffer, size, "<escaped>");
-  return 0;
+  return Called("NLIBCEncShParam", text, size) ? 0 : -1;
 }
 int NLIBCErrGet() { return script.platform_error; }
 
 // --- files ------------------------------------------------------------------------------------
 
 bool Json::fromFile(const std::string& path, Json::Value& out) {
-  if (!Called("fromFile", path)) return false;
   out = script.settings;
-  return true;
+  return Called("fromFile", path);
 }
 bool Json::toFile(const std::string& path, const Json::Value& value) {
-  return Called("toFile", path + "," + Text(value));
+  return Called("toFile", path, value);
 }
 
 namespace NUVA::WEBFM {
@@ -375,11 +372,11 @@ class FileDB::Store {};
 FileDB::FileDB(const std::string& path) { Called("FileDB", path); }
 FileDB::~FileDB() { Note("~FileDB"); }
 bool FileDB::IsGood() const { return Called("FileDB.IsGood"); }
-void FileDB::SetMaxRecordNum(int count) { Called("FileDB.Max", std::to_string(count)); }
+void FileDB::SetMaxRecordNum(int count) { Called("FileDB.Max", count); }
 void FileDB::SetPrimaryKey(const std::string& key) { Called("FileDB.Key", key); }
-bool FileDB::Insert(const Json::Value& record) { return Called("FileDB.Insert", Text(record)); }
+bool FileDB::Insert(const Json::Value& record) { return Called("FileDB.Insert", record); }
 bool FileDB::UpdateLastByTime(const Json::Value& record, long slots) {
-  return Called("FileDB.Update", Text(record) + "," + std::to_string(slots));
+  return Called("FileDB.Update", record, slots);
 }
 static std::string ConditionText(const FileDB::Condition& condition) {
   std::string text = std::to_string(condition.offset) + "," + std::to_string(condition.limit);
@@ -410,7 +407,7 @@ class Task::Record {
   std::string id;
 };
 Task::Task(const char* owner, const char* id) : record_(new Record{id == nullptr ? "new" : id}) {
-  Called("Task", Or(owner) + "," + Or(id));
+  Called("Task", owner, id);
   if (!script.tasks.contains(record_->id) && id != nullptr) throw std::runtime_error("no task");
 }
 Task::~Task() { Note("~Task(" + record_->id + ")"); }
@@ -418,7 +415,7 @@ std::string Task::getTaskId() const { return record_->id; }
 void Task::beginUpdate() { Called("Task.begin"); }
 bool Task::endUpdate() { return Called("Task.end"); }
 bool Task::setProperty(const char* name, const Json::Value& value) {
-  const bool done = Called("Task.set", std::string(name) + "," + Text(value));
+  const bool done = Called("Task.set", name, value);
   if (done) script.properties[name] = value;
   return done;
 }
@@ -427,7 +424,7 @@ Json::Value Task::getProperty(const char* name) const {
   return script.properties.get(name, Json::Value());
 }
 bool Task::finish(bool keep_running) {
-  return Called("Task.finish", record_->id + (keep_running ? ",true" : ",false"));
+  return Called("Task.finish", record_->id, keep_running ? "true" : "false");
 }
 bool Task::isFinished() const { return script.finished; }
 bool Task::remove() { return Called("Task.remove", record_->id); }
@@ -438,11 +435,10 @@ Task* TaskMgr::getTaskWithThrow(const char* id) const { return new Task(owner_.c
 }  // namespace OKT
 
 int WaitForTaskDataReady(OKT::Task* /*task*/, const char* name, int bound) {
-  return Called("WaitReady", std::string(name) + "," + std::to_string(bound)) ? 1 : 0;
+  return Called("WaitReady", name, bound) ? 1 : 0;
 }
 int WaitForTaskDataKeyReady(OKT::Task* /*task*/, const char* name, const char* member, int bound) {
-  const std::string arguments = std::string(name) + "," + member + "," + std::to_string(bound);
-  return Called("WaitKeyReady", arguments) ? 1 : 0;
+  return Called("WaitKeyReady", name, member, bound) ? 1 : 0;
 }
 
 // --- search engine ----------------------------------------------------------------------------
@@ -469,7 +465,7 @@ Refusal FindATimeComp::refusal() const { return {}; }
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                               std::vector<FindComp*>& comps) {
-  const std::string what = "field " + std::to_string(field) + " " + Or(arg1) + "," + Or(arg2);
+  const std::string what = "field " + Shown(int{field}) + " " + Shown(arg1) + "," + Shown(arg2);
   if (!Called("createFindOp " + std::to_string(field))) return 0;
   comps.push_back(new TextComp(what));
   return 1;
@@ -478,8 +474,9 @@ int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const ch
 class WfmSearchWalker::Impl {};
 WfmSearchWalker::WfmSearchWalker(const char* user, const char* session, OKT::Task* task,
                                  int* stop_flag) {
-  Called("Walker", Or(user) + "," + Or(session) + (task == nullptr ? ",no task" : "") +
-                       (*stop_flag != 0 ? ",stopped" : ""));
+  Called(
+      "Walker", user,
+      Shown(session) + (task == nullptr ? ",no task" : "") + (*stop_flag != 0 ? ",stopped" : ""));
 }
 WfmSearchWalker::~WfmSearchWalker() { Note("~Walker"); }
 bool WfmSearchWalker::init(const std::vector<std::string>& locations,
@@ -502,7 +499,7 @@ WfmSearchDBTask::WfmSearchDBTask(std::unique_ptr<Impl> impl) : impl_(std::move(i
 WfmSearchDBTask::~WfmSearchDBTask() { Note("~DBTask"); }
 bool WfmSearchDBTask::remove() { return Called("DBTask.remove"); }
 bool WfmSearchDBTask::delRecs(std::string share_name, std::string real_path) {
-  if (!Called("DBTask.delRecs", share_name + "," + real_path)) return false;
+  if (!Called("DBTask.delRecs", share_name, real_path)) return false;
   std::erase_if(script.rows, [&](const ScriptedRow& row) { return real_path.ends_with(row.path); });
   return true;
 }
@@ -510,31 +507,18 @@ bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
                                   const bool* ascending, const _tag_dir_entry_type_* type,
                                   const char* pattern, SelectCallback callback, void* context,
                                   unsigned long long* total) const {
-  const bool done =
-      Called("DBTask.query", std::to_string(offset) + "," + std::to_string(limit) + "," +
-                                 Or(sort_by) + (*ascending ? ",asc," : ",desc,") +
-                                 std::to_string(*type) + "," + Or(pattern));
+  const bool done = Called("DBTask.query", offset, limit, sort_by, *ascending ? "asc" : "desc",
+                           int{*type}, pattern);
   const std::vector<ScriptedRow> rows = script.rows;  // the selection is not disturbed by purges
   *total = rows.size();
   for (ScriptedRow row : rows) {
     char name[] = "n", extension[] = "Tar.gz", owner[] = "o", group[] = "g";
     const long past = (1L << 32) + 1;  // stamps keep their low 32 bits
-    __tag_FILE_INFO_DATA data{row.root.data(),
-                              row.share.data(),
-                              name,
-                              row.path.data(),
-                              extension,
-                              0644,
-                              owner,
-                              group,
-                              10,
-                              20,
-                              row.is_dir,
-                              1234567890123,
-                              past,
-                              past + 1,
-                              past + 2,
-                              past + 3};
+    char* const root = row.root.data();
+    char* const share = row.share.data();
+    __tag_FILE_INFO_DATA data{
+        root, share, name,       row.path.data(), extension, 0644,     owner,    group,
+        10,   20,    row.is_dir, 1234567890123,   past,      past + 1, past + 2, past + 3};
     if (callback(&data, context) == 0) break;
   }
   return done;
@@ -542,7 +526,7 @@ bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
 
 WfmSearchDBTaskMgr::WfmSearchDBTaskMgr(const char* user) : user_(user) {}
 WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* id) const {
-  return Called("getDBTask", Or(volume) + "," + Or(id)) ? new WfmSearchDBTask(nullptr) : nullptr;
+  return Called("getDBTask", volume, id) ? new WfmSearchDBTask(nullptr) : nullptr;
 }
 
 }  // namespace FileSearch

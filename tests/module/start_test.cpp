@@ -10,11 +10,7 @@
 namespace {
 
 TEST(Locations, AreNormalised) {
-  const struct {
-    const char* why;
-    const char* input;
-    const char* output;
-  } rows[] = {
+  const std::tuple<const char*, const char*, const char*> rows[] = {
       {"home equals its homes entry", R"(["/home","/homes/ann"])", R"(["/homes/ann"])"},
       {"home swallows what lies in it", R"(["/homes/ann/docs","/home"])", R"(["/homes/ann"])"},
       {"home inside an entry is dropped", R"(["/homes","/home/docs"])", R"(["/homes"])"},
@@ -37,12 +33,12 @@ TEST(Locations, AreNormalised) {
   };
   Script play;
   play.homes["ann"] = "/volume1/homes/ann";
-  for (const auto& row : rows) {
+  for (const auto& [why, input, output] : rows) {
     const Trace trace = Play(play, [&] {
       const ArboryFindHandler handler(Request(), Response());
-      Note("out " + Text(handler.RemoveDuplicatedLocations(Parse(row.input))));
+      Note("out " + Text(handler.RemoveDuplicatedLocations(Parse(input))));
     });
-    EXPECT_EQ(Keep(trace, {"out"}), Trace{std::string("out ") + row.output}) << row.why;
+    EXPECT_EQ(Keep(trace, {"out"}), Trace{std::string("out ") + output}) << why;
   }
 }
 
@@ -166,11 +162,7 @@ TEST(Worker, RecordsItsOutcome) {
   const std::string early_401 = failed + R"(Task.set(data,{"errno":401,"pid":1}); )";
   const std::string no_identity = "log S:891 Failed to set UGID for user=ann, sid=sid; ";
   const std::string no_record = "log S:909 Failed to get json data.; ~Task(new); ";
-  const struct {
-    const char* why;
-    const char* arrange;
-    std::string expected;
-  } rows[] = {
+  const std::tuple<const char*, const char*, std::string> rows[] = {
       {"a failing write is logged", "fail Task.finish",
        walk_data + succeeded + finish + "log S:923 Failed to write progress.; _exit(0)"},
       {"identity refused", "fail SessionIdentity", no_identity + early_401 + end},
@@ -205,18 +197,18 @@ TEST(Worker, RecordsItsOutcome) {
        "log S:281 Failed To parse the find parameters, reason=[0]; " +
            no_record + "reply 401 null; returned"},
   };
-  for (const auto& row : rows) {
+  for (const auto& [why, arrange, expected] : rows) {
     Script play = WorkerScript();
-    play.Arrange(row.arrange);
+    play.Arrange(arrange);
     const Trace trace = Serve(play, SearchAPIEntry);
     EXPECT_EQ(Told(trace, {"log", "Task.set", "Task.finish", "reply", "~Task", "_exit", "returned",
                            "threw", "signal"}),
-              row.expected)
-        << row.why;
+              expected)
+        << why;
     // Criteria and walker go on every road.
-    EXPECT_EQ(Keep(trace, {"Walker("}).size(), Keep(trace, {"~Walker"}).size()) << row.why;
+    EXPECT_EQ(Keep(trace, {"Walker("}).size(), Keep(trace, {"~Walker"}).size()) << why;
     const size_t made = play.fail.contains("createFindOp 0") ? 0 : Keep(trace, {"createF"}).size();
-    EXPECT_EQ(Keep(trace, {"~field"}).size(), made) << row.why;
+    EXPECT_EQ(Keep(trace, {"~field"}).size(), made) << why;
   }
 }
 

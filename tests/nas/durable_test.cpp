@@ -1,14 +1,10 @@
 // What must survive a power cut: that everything is brought to the disk before a call returns, the
 // folders that hold the names last. Whether the disk keeps its word is not ours.
 
-#include <fcntl.h>
 #include <limits.h>
 #include <sys/syscall.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <functional>
 
 #include "nas/base/file_io.h"
 #include "nas/base/paths.h"

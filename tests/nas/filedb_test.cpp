@@ -1,10 +1,5 @@
 // The record store: order, limits, replacement, and files that are not stores.
 
-#include <sqlite3.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
-#include <cerrno>
 #include <climits>
 
 #include "nas/base/json_text.h"
@@ -26,11 +21,9 @@ Json::Value Record(const Json::Value& pattern, int number = 0) {
 class FileDBTest : public PlatformTest {
  protected:
   // The patterns of the records selected, each followed by a space.
-  std::string Patterns(const FileDB::Condition& condition = {}) {
-    const FileDB db(path());
-    EXPECT_TRUE(db.IsGood());
+  std::string Patterns(const FileDB::Condition& condition = {}, bool readable = true) {
     std::vector<Json::Value> records;
-    EXPECT_TRUE(db.Select(condition, records));
+    EXPECT_EQ(FileDB(path()).Select(condition, records), readable);
     std::string patterns;
     for (const Json::Value& record : records) patterns += record["pattern"].asString() + " ";
     return patterns;
@@ -109,13 +102,9 @@ TEST_F(FileDBTest, ComparesValuesAsText) {
 
 TEST_F(FileDBTest, OneUnreadableRecordHidesNoOther) {
   for (const char* pattern : {"old", "middle", "new"}) ASSERT_TRUE(Insert(Record(pattern)));
-  sqlite3* store = nullptr;
-  ASSERT_EQ(sqlite3_open(path().c_str(), &store), SQLITE_OK);
-  const char* damage =
-      "UPDATE records SET body=x'7b22' WHERE CAST(body AS TEXT) LIKE '%middle%';"
-      "INSERT INTO records(body) VALUES('5'), (''), ('[{}]'), (7)";
-  ASSERT_EQ(sqlite3_exec(store, damage, nullptr, nullptr, nullptr), SQLITE_OK);
-  sqlite3_close(store);
+  ChangeDatabase(path(),
+                 "UPDATE records SET body=x'7b22' WHERE CAST(body AS TEXT) LIKE '%middle%';"
+                 "INSERT INTO records(body) VALUES('5'), (''), ('[{}]'), (7)");
   EXPECT_EQ(Patterns(), "new old ");
   ASSERT_TRUE(Insert(Record("old", 1), 2));
   EXPECT_EQ(Patterns(), "old new ") << "nor takes its place";
@@ -126,12 +115,7 @@ TEST_F(FileDBTest, OneUnreadableRecordHidesNoOther) {
 
 // The file lies where its user can write: nothing that it brings along is run.
 TEST_F(FileDBTest, RunsNothingThatAFileBringsAlong) {
-  const struct {
-    const char* why;
-    const char* schema;
-    bool inserts;
-    const char* patterns;
-  } rows[] = {
+  const std::tuple<const char*, const char*, bool, const char*> rows[] = {
       {"a view in the table's place",
        "ALTER TABLE records RENAME TO kept;"
        "CREATE VIEW records AS SELECT 1 AS position, CAST('{\"pattern\":\"v\"}' AS BLOB) AS body",
@@ -140,30 +124,20 @@ TEST_F(FileDBTest, RunsNothingThatAFileBringsAlong) {
        "CREATE TRIGGER t AFTER INSERT ON records BEGIN DELETE FROM records WHERE position=1; END",
        true, "new old "},
   };
-  for (const auto& row : rows) {
-    SCOPED_TRACE(row.why);
+  for (const auto& [why, schema, inserts, patterns] : rows) {
+    SCOPED_TRACE(why);
     unlink(path().c_str());
     ASSERT_TRUE(Insert(Record("old")));
-    sqlite3* store = nullptr;
-    ASSERT_EQ(sqlite3_open(path().c_str(), &store), SQLITE_OK);
-    ASSERT_EQ(sqlite3_exec(store, row.schema, nullptr, nullptr, nullptr), SQLITE_OK);
-    sqlite3_close(store);
-    EXPECT_EQ(Insert(Record("new")), row.inserts);
-    std::vector<Json::Value> records;
-    EXPECT_EQ(FileDB(path()).Select({}, records), row.inserts);
-    std::string patterns;
-    for (const Json::Value& record : records) patterns += record["pattern"].asString() + " ";
-    EXPECT_EQ(patterns, row.patterns);
+    ChangeDatabase(path(), schema);
+    EXPECT_EQ(Insert(Record("new")), inserts);
+    EXPECT_EQ(Patterns({}, inserts), patterns);
   }
 }
 
 TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   MakeFolder("directory");
   const std::string garbage(5000, 'g');
-  sqlite3* other = nullptr;
-  ASSERT_EQ(sqlite3_open((dir_ + "/other").c_str(), &other), SQLITE_OK);
-  ASSERT_EQ(sqlite3_exec(other, "CREATE TABLE records(x)", nullptr, nullptr, nullptr), SQLITE_OK);
-  sqlite3_close(other);
+  ChangeDatabase(dir_ + "/other", "CREATE TABLE records(x)");
   ASSERT_TRUE(Insert(Record(std::string(20000, 'x'))));
   const std::string store = ReadFile(path());
   WriteFile(dir_ + "/one", "g");
@@ -173,22 +147,20 @@ TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   std::string flipped = store;
   for (size_t at = 4096; at < 4196; ++at) flipped[at] = static_cast<char>(~flipped[at]);
   WriteFile(dir_ + "/flipped", flipped);
-  const struct {
-    const char* name;
-    int error;
-  } rows[] = {{"one", EBADMSG},      {"hundred", EBADMSG},        {"many", EBADMSG},
-              {"cut", EBADMSG},      {"flipped", EBADMSG},        {"other", EBADMSG},
-              {"directory", EISDIR}, {"missing/file.db", ENOENT}, {"one/file.db", ENOTDIR}};
-  for (const auto& row : rows) {
-    const std::string file = dir_ + "/" + row.name;
+  const std::pair<const char*, int> rows[] = {
+      {"one", EBADMSG},      {"hundred", EBADMSG},        {"many", EBADMSG},
+      {"cut", EBADMSG},      {"flipped", EBADMSG},        {"other", EBADMSG},
+      {"directory", EISDIR}, {"missing/file.db", ENOENT}, {"one/file.db", ENOTDIR}};
+  for (const auto& [name, error] : rows) {
+    const std::string file = dir_ + "/" + name;
     const std::string before = ReadFile(file);
     FileDB db(file);
     errno = 0;
-    EXPECT_FALSE(db.IsGood()) << row.name;
-    EXPECT_EQ(errno, row.error) << row.name;
+    EXPECT_FALSE(db.IsGood()) << name;
+    EXPECT_EQ(errno, error) << name;
     std::vector<Json::Value> records;
-    EXPECT_FALSE(db.Insert(Record("a")) || db.Delete({}) || db.Select({}, records)) << row.name;
-    EXPECT_TRUE(ReadFile(file) == before) << row.name << " was changed";
+    EXPECT_FALSE(db.Insert(Record("a")) || db.Delete({}) || db.Select({}, records)) << name;
+    EXPECT_TRUE(ReadFile(file) == before) << name << " was changed";
   }
   EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
     FileDB db("/usr/history.db");
@@ -203,23 +175,13 @@ TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
 TEST_F(FileDBTest, ProcessesWriteOneFileTogether) {
   constexpr int kWriters = 4;
   constexpr int kRecords = 20;
-  std::vector<pid_t> writers;
-  for (int writer = 0; writer < kWriters; ++writer) {
-    const pid_t pid = fork();
-    if (pid == 0) {
-      bool good = true;
-      for (int at = 0; at < kRecords; ++at) {
-        good = Insert(Record(std::to_string(writer) + "." + std::to_string(at)), 0) && good;
-      }
-      _exit(good ? 0 : 1);
+  EXPECT_TRUE(InChildren(kWriters, [&](int writer) {
+    bool good = true;
+    for (int at = 0; at < kRecords; ++at) {
+      good = Insert(Record(std::to_string(writer) + "." + std::to_string(at)), 0) && good;
     }
-    writers.push_back(pid);
-  }
-  for (const pid_t pid : writers) {
-    int status = -1;
-    waitpid(pid, &status, 0);
-    EXPECT_EQ(status, 0);
-  }
+    return good;
+  }));
   std::vector<Json::Value> records;
   ASSERT_TRUE(FileDB(path()).Select({}, records));
   EXPECT_EQ(records.size(), static_cast<size_t>(kWriters * kRecords));

@@ -2,13 +2,11 @@
 
 #include <grp.h>
 #include <pwd.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <filesystem>
 #include <fstream>
 #include <iterator>
+
+#include "nas/base/sqlite.h"
 
 namespace nas_test {
 
@@ -30,6 +28,15 @@ bool InChild(const std::function<void()>& body) {
   return WIFEXITED(status) && WEXITSTATUS(status) == 0;
 }
 
+bool InChildren(int count, const std::function<bool(int number)>& body) {
+  for (int number = 0; number < count; ++number) {
+    if (fork() == 0) _exit(body(number) ? 0 : 1);
+  }
+  bool good = true;
+  for (int status = -1; count > 0 && wait(&status) > 0; --count) good &= status == 0;
+  return good && count == 0;
+}
+
 bool InOrdinaryChild(const std::function<void(const std::string& user)>& body) {
   return InChild([&] {
     if (AmRoot()) {
@@ -40,6 +47,16 @@ bool InOrdinaryChild(const std::function<void(const std::string& user)>& body) {
     }
     body(Me());
   });
+}
+
+bool Eventually(const std::function<bool()>& holds, std::chrono::seconds bound) {
+  constexpr std::chrono::milliseconds kStep{5};
+  const auto end = std::chrono::steady_clock::now() + bound;
+  while (!holds()) {
+    if (std::chrono::steady_clock::now() > end) return false;
+    std::this_thread::sleep_for(kStep);
+  }
+  return true;
 }
 
 void WriteFile(const std::string& path, const std::string& bytes) {
@@ -66,6 +83,22 @@ std::vector<std::string> OpenDescriptors() {
     if (length > 0) open.push_back(std::to_string(fd) + " " + std::string(target, length));
   }
   return open;
+}
+
+void ChangeDatabase(const std::string& path, const std::string& sql) {
+  nas::Database(path, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, 0).Execute(sql.c_str());
+}
+
+FullDisk::FullDisk(rlim_t bytes) : handler_(std::signal(SIGXFSZ, SIG_IGN)) {
+  getrlimit(RLIMIT_FSIZE, &before_);
+  rlimit none = before_;
+  none.rlim_cur = bytes;
+  setrlimit(RLIMIT_FSIZE, &none);
+}
+
+FullDisk::~FullDisk() {
+  setrlimit(RLIMIT_FSIZE, &before_);
+  std::signal(SIGXFSZ, handler_);
 }
 
 void PlatformTest::SetUp() {

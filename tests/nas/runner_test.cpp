@@ -8,9 +8,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <chrono>
-#include <csignal>
-#include <filesystem>
 #include <stdexcept>
 
 #include "nas/base/json_text.h"
@@ -32,6 +29,7 @@ namespace {
 using NUVA::APIRequest;
 using NUVA::APIResponse;
 
+constexpr char kGood[] = R"({"code":0,"data":true})";
 constexpr char kNoReply[] = R"({"code":100,"data":null})";
 
 class RunnerTest : public PlatformTest {
@@ -91,11 +89,7 @@ void ForkWorker(APIResponse* response, void (*work)(APIResponse*)) {
 }
 
 TEST_F(RunnerTest, OneReplyComesWhateverTheEntryDoes) {
-  const struct {
-    const char* why;
-    NUVA::APIEntry entry;
-    std::string reply;
-  } rows[] = {
+  const std::tuple<const char*, NUVA::APIEntry, std::string> rows[] = {
       {"an error with detail", [](APIRequest*, APIResponse* r) { r->SetError(408, "x"); },
        R"({"code":408,"data":"x"})"},
       {"no reply at all", [](APIRequest*, APIResponse*) {}, kNoReply},
@@ -137,11 +131,11 @@ TEST_F(RunnerTest, OneReplyComesWhateverTheEntryDoes) {
        },
        R"({"code":0,"data":"request"})"},
   };
-  for (const auto& row : rows) {
+  for (const auto& [why, entry, reply] : rows) {
     const auto start = std::chrono::steady_clock::now();
-    EXPECT_EQ(Run(row.entry), row.reply) << row.why;
+    EXPECT_EQ(Run(entry), reply) << why;
     const auto took = std::chrono::steady_clock::now() - start;
-    EXPECT_LT(took, std::chrono::seconds(4)) << row.why << ": waited for a worker";
+    EXPECT_LT(took, std::chrono::seconds(4)) << why << ": waited for a worker";
   }
 }
 
@@ -239,25 +233,6 @@ TEST_F(RunnerTest, WithoutAStateTheEntryIsNotCalled) {
   EXPECT_EQ(reply, R"({"code":408,"data":null})");
 }
 
-TEST_F(RunnerTest, RootsCallsRunAsTheirUser) {
-  SKIP_UNLESS_ROOT();
-  const std::string reply = Run(
-      [](APIRequest* request, APIResponse* r) {
-        const uid_t before = getuid();
-        if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) != 0) return;
-        const bool wrote = Json::Value(open((request->GetPreferenceDir() + "/x").c_str(),
-                                            O_CREAT | O_WRONLY | O_CLOEXEC, 0600) >= 0)
-                               .asBool();
-        Json::Value data;
-        data["before"] = before;
-        data["after"] = geteuid();
-        data["wrote"] = wrote;
-        r->SetError(0, data);
-      },
-      Json::Value(), kOtherUser);
-  EXPECT_EQ(reply, R"({"code":0,"data":{"after":65534,"before":65534,"wrote":true}})");
-}
-
 // The real, effective, saved and file system's user ids of this process.
 std::string UserIds() {
   const std::string status = ReadFile("/proc/self/status");
@@ -279,10 +254,7 @@ std::string TextOfLong(int count) {
 TEST_F(RunnerTest, RootsCallsGiveRootUpBeforeTheyReadWhatTheUserWrote) {
   SKIP_UNLESS_ROOT();
   MakeFolder("volume1");
-  const struct {
-    const char* why;
-    NUVA::APIEntry entry;
-  } rows[] = {
+  const std::pair<const char*, NUVA::APIEntry> rows[] = {
       {"a history",
        [](APIRequest* request, APIResponse* r) {
          const NUVA::WEBFM::FileDB store(request->GetPreferenceDir() + "/search_history.db");
@@ -311,11 +283,24 @@ TEST_F(RunnerTest, RootsCallsGiveRootUpBeforeTheyReadWhatTheUserWrote) {
          r->SetError(0, UserIds());
        }},
   };
-  for (const auto& row : rows) {
-    EXPECT_EQ(Run(row.entry, Json::Value(), kOtherUser),
+  const NUVA::APIEntry first = [](APIRequest*, APIResponse* r) { r->SetError(0, UserIds()); };
+  EXPECT_EQ(Run(first, Json::Value(), kOtherUser),
+            R"({"code":0,"data":"Uid:\t65534\t65534\t0\t65534"})")
+      << "until then it may";
+  for (const auto& [why, entry] : rows) {
+    EXPECT_EQ(Run(entry, Json::Value(), kOtherUser),
               R"({"code":0,"data":"Uid:\t65534\t65534\t65534\t65534"})")
-        << row.why;
+        << why;
   }
+}
+
+template <size_t kMegabytes>
+void Take(APIRequest*, APIResponse* response) {
+  response->SetError(0, std::string(kMegabytes << 20, 'x').size() > 0);
+}
+template <size_t kMegabytes>
+void TakeWithPermit(APIRequest* request, APIResponse* response) {
+  if (nas::TakeLargePermit(request->GetLoginUserName())) Take<kMegabytes>(request, response);
 }
 
 TEST_F(RunnerTest, ACallMayNotTakeAllMemory) {
@@ -335,26 +320,12 @@ TEST_F(RunnerTest, ACallMayNotTakeAllMemory) {
     NUVA::APIEntry entry;
     std::string reply;
   } rows[] = {
-      {"within the bound",
-       [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(30 << 20, 'x').size() > 0); },
-       R"({"code":0,"data":true})"},
-      {"beyond it",
-       [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(100 << 20, 'x').size() > 0); },
-       too_large},
+      {"within the bound", Take<30>, kGood},
+      {"beyond it", Take<100>, too_large},
       {"its reply is beyond it",
        [](APIRequest*, APIResponse* r) { r->SetError(0, std::string(30 << 20, '\n')); }, too_large},
-      {"with a permit",
-       [](APIRequest* request, APIResponse* r) {
-         const auto permit = nas::TakeLargePermit(request->GetLoginUserName());
-         r->SetError(0, permit && std::string(100 << 20, 'x').size() > 0);
-       },
-       R"({"code":0,"data":true})"},
-      {"beyond what a permit gives",
-       [](APIRequest* request, APIResponse* r) {
-         const auto permit = nas::TakeLargePermit(request->GetLoginUserName());
-         r->SetError(0, permit && std::string(300 << 20, 'x').size() > 0);
-       },
-       too_large},
+      {"with a permit", TakeWithPermit<100>, kGood},
+      {"beyond what a permit gives", TakeWithPermit<300>, too_large},
       {"in a worker there is no bound",
        [](APIRequest*, APIResponse* r) {
          const pid_t worker = NLIBCProcFork();
@@ -410,8 +381,7 @@ TEST_F(RunnerTest, OneUserHasFewLargeCallsAtOnce) {
         nas::StartCall(row, {"method", Json::Value(), Me(), "sid"}, nas::EncodeJsonReply));
   }
   for (nas::Child& call : calls) {
-    EXPECT_EQ(nas::FinishCall(std::move(call), nas::EncodeJsonReply).body,
-              R"({"code":0,"data":true})");
+    EXPECT_EQ(nas::FinishCall(std::move(call), nas::EncodeJsonReply).body, kGood);
   }
 }
 
@@ -446,32 +416,8 @@ std::string Frame(const std::string& text) {
 
 using State = nas::ReplyReader::State;
 
-TEST(ReplyReader, TakesAFrameInAnyPieces) {
-  const std::string head = Frame("206 7\nName: a: b\nOther: \n\nhello");
-  const std::string bytes = head + "what a worker wrote";
-  for (size_t piece = 1; piece <= bytes.size(); ++piece) {
-    nas::ReplyReader reader;
-    State state = State::kMore;
-    size_t at = 0;
-    for (; at < bytes.size() && state == State::kMore; at += piece) {
-      state = reader.Feed(bytes.substr(at, piece));
-    }
-    ASSERT_EQ(state, State::kReady) << piece;
-    EXPECT_EQ(reader.head().status, 206);
-    EXPECT_EQ(reader.head().code, 7);
-    const decltype(reader.head().fields) fields = {{"Name", "a: b"}, {"Other", ""}};
-    EXPECT_EQ(reader.head().fields, fields);
-    EXPECT_EQ(reader.body_bytes(), 5U);
-    EXPECT_EQ(reader.body_begin(), std::string("hello").substr(0, at - (head.size() - 5))) << piece;
-  }
-}
-
 TEST(ReplyReader, RefusesWhatIsNoFrame) {
-  const struct {
-    const char* why;
-    std::string bytes;
-    State state;
-  } rows[] = {
+  const std::tuple<const char*, std::string, State> rows[] = {
       {"cut within the length", Frame("200 0\n\n").substr(0, 7), State::kMore},
       {"cut within the head", Frame("200 0\nName: x\n\n").substr(0, 20), State::kMore},
       {"ends within the head", Frame("200 0\n"), State::kBroken},
@@ -482,7 +428,8 @@ TEST(ReplyReader, RefusesWhatIsNoFrame) {
       {"a head without an end", Frame(std::string(17 << 10, 'x')), State::kBroken},
       {"a length that cannot be", std::string(100, '\xFF'), State::kBroken},
   };
-  for (const auto& row : rows) EXPECT_EQ(nas::ReplyReader().Feed(row.bytes), row.state) << row.why;
+  for (const auto& [why, bytes, state] : rows)
+    EXPECT_EQ(nas::ReplyReader().Feed(bytes), state) << why;
 }
 
 TEST_F(RunnerTest, WhatIsNotAModuleIsRefused) {

@@ -1,17 +1,9 @@
 // Task records: what several processes do to one record, and what any death leaves behind.
 
-#include <fcntl.h>
 #include <sys/mount.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <atomic>
-#include <chrono>
-#include <csignal>
 #include <memory>
-#include <thread>
 
 #include "nas/base/file_io.h"
 #include "nas/base/keeping.h"
@@ -83,21 +75,6 @@ TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
   constexpr int kRounds = 20;
   const auto task = New();
   const std::string id = task->getTaskId();
-  std::vector<pid_t> writers;
-  for (int writer = 0; writer < kWriters; ++writer) {
-    const pid_t pid = fork();
-    if (pid == 0) {
-      bool good = true;
-      const auto mine = Open(id);
-      const std::string name = "w" + std::to_string(writer);
-      for (int round = 0; round <= kRounds; ++round) {
-        good = mine->setProperty(name.c_str(), round) && good;
-      }
-      if (writer == 0) good = mine->finish(false) && good;
-      _exit(good ? 0 : 1);
-    }
-    writers.push_back(pid);
-  }
   std::atomic<bool> writing = true;
   std::thread client([&] {
     const auto reader = Open(id);
@@ -106,17 +83,20 @@ TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
   std::thread walker([&] {
     for (int round = 0; round <= kRounds; ++round) task->setProperty("walk", round);
   });
-  for (int round = 0; round <= kRounds; ++round) EXPECT_TRUE(task->setProperty("main", round));
+  EXPECT_TRUE(InChildren(kWriters, [&](int writer) {
+    bool good = true;
+    const auto mine = Open(id);
+    const std::string name = "w" + std::to_string(writer);
+    for (int round = 0; round <= kRounds; ++round) {
+      good = mine->setProperty(name.c_str(), round) && good;
+    }
+    return writer == 0 ? mine->finish(false) && good : good;
+  }));
   walker.join();
-  for (const pid_t pid : writers) {
-    int status = -1;
-    waitpid(pid, &status, 0);
-    EXPECT_EQ(status, 0);
-  }
   writing = false;
   client.join();
   ASSERT_TRUE(task->reload());
-  for (const char* name : {"w0", "w1", "w2", "w3", "walk", "main"}) {
+  for (const char* name : {"w0", "w1", "w2", "w3", "walk"}) {
     EXPECT_EQ(task->getProperty(name), kRounds) << name;
   }
   EXPECT_TRUE(task->isFinished());
@@ -166,13 +146,14 @@ TEST_F(TasksTest, ADeadWorkersTaskIsFinished) {
 TEST_F(TasksTest, OnlyIdsOfItsOwnFormBecomeAPath) {
   const std::string id = New()->getTaskId();
   WriteFile(dir_ + "/x.json", R"({"version":1,"finished":false,"properties":{}})");
+  const std::string upper = "ABCDEF" + id.substr(6);
   const std::string rows[] = {"",
                               ".",
                               "../../../../x",
                               id + "/",
                               id.substr(1),
                               id + "0",
-                              "ABCDEF" + id.substr(6),
+                              upper,
                               std::string(32, '0'),
                               "../" + id.substr(3)};
   for (const std::string& row : rows) EXPECT_THROW(Open(row), std::runtime_error) << row;
@@ -210,9 +191,7 @@ TEST_F(TasksTest, AFailedWriteLeavesTheRecordWhole) {
   const auto task = New();
   ASSERT_TRUE(task->setProperty("a", 1));
   EXPECT_TRUE(InChild([&] {
-    signal(SIGXFSZ, SIG_IGN);
-    const rlimit small = {20, 20};  // as a full disk: bytes fit, the record does not
-    ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &small), 0);
+    const FullDisk full(20);  // bytes fit, the record does not
     EXPECT_FALSE(task->setProperty("a", 2));
     EXPECT_FALSE(task->finish(false));
   }));
@@ -263,23 +242,23 @@ TEST_F(TasksTest, OldTasksAreSweptUnlessSomebodyWorksOnThem) {
   WriteFile(RecordFile(torn), "{");
   const std::string temporary = folder + "/" + std::string(nas::kTemporaryPrefix) + "x";
   const std::string foreign = folder + "/notes.json";
-  WriteFile(temporary, "");
-  WriteFile(foreign, "");
+  for (const std::string& name : {temporary, foreign}) {
+    WriteFile(name, "");
+    Age(name, nas::kKeepSeconds + 60);
+  }
   for (const std::string& id : {alive->getTaskId(), old, torn, recent}) {
-    const long extra = id == recent ? -60 : 60;
-    Age(RecordFile(id), nas::kKeepSeconds + extra);
+    Age(RecordFile(id), nas::kKeepSeconds + (id == recent ? -60 : 60));
     Age(folder + "/" + id + ".lock", nas::kKeepSeconds + 60);
   }
-  Age(temporary, nas::kKeepSeconds + 60);
-  Age(foreign, nas::kKeepSeconds + 60);
   New();
-  EXPECT_EQ(ReadFile(RecordFile(old)), "(none)");
-  EXPECT_EQ(ReadFile(folder + "/" + old + ".lock"), "(none)");
-  EXPECT_EQ(ReadFile(RecordFile(torn)), "(none)");
-  EXPECT_EQ(ReadFile(temporary), "(none)");
-  EXPECT_NE(ReadFile(RecordFile(recent)), "(none)");
-  EXPECT_NE(ReadFile(RecordFile(alive->getTaskId())), "(none)");
-  EXPECT_NE(ReadFile(foreign), "(none)") << "not ours";
+  for (const std::string& gone :
+       {RecordFile(old), folder + "/" + old + ".lock", RecordFile(torn), temporary}) {
+    EXPECT_FALSE(std::filesystem::exists(gone)) << gone;
+  }
+  // Nor does it touch what is not ours.
+  for (const std::string& kept : {RecordFile(recent), RecordFile(alive->getTaskId()), foreign}) {
+    EXPECT_TRUE(std::filesystem::exists(kept)) << kept;
+  }
 }
 
 TEST_F(TasksTest, WaitsEndAsSoonAsTheyCan) {

@@ -2,10 +2,7 @@
 // file entries.
 
 #include <json/value.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
-#include <cerrno>
 #include <cstdio>
 #include <limits>
 
@@ -52,22 +49,20 @@ TEST(Json, ReplacesEachBadSequenceOnce) {
 }
 
 TEST(Json, WritesWhatItReads) {
-  const char* const same[] = {
-      "null",
-      "true",
-      "-9223372036854775808",
-      "18446744073709551615",
-      "1.0",
-      "1e+300",
-      "0.1",
-      "\"\"",
-      "[]",
-      "{}",
-      "[1,[2,{\"a\":null}]]",
-      "{\"a\\\"b\":\"\\\\ \\n\\t\\u0000\\u001f\"}",
-      "\"\xC3\xA9\x7F\"",
-      "\"bytes \xFF\xC3 stay\"",
-  };
+  const char* const same[] = {"null",
+                              "true",
+                              "-9223372036854775808",
+                              "18446744073709551615",
+                              "1.0",
+                              "1e+300",
+                              "0.1",
+                              "\"\"",
+                              "[]",
+                              "{}",
+                              "[1,[2,{\"a\":null}]]",
+                              "{\"a\\\"b\":\"\\\\ \\n\\t\\u0000\\u001f\"}",
+                              "\"\xC3\xA9\x7F\"",
+                              "\"bytes \xFF\xC3 stay\""};
   for (const char* text : same) {
     Json::Value value;
     ASSERT_TRUE(nas::ParseJson(text, &value)) << text;

@@ -1,13 +1,6 @@
 // What a search's walker and its result database leave to each other, to the task and to whoever
-// lists: files that nobody claims or names, rows of files that are gone, full disks, early stops.
+// lists: files that nobody claims or names, full disks, early stops.
 
-#include <fcntl.h>
-#include <sys/resource.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <csignal>
-#include <filesystem>
 #include <memory>
 #include <set>
 
@@ -22,30 +15,7 @@ namespace nas_test {
 namespace {
 
 namespace fs = std::filesystem;
-using FileSearch::WfmSearchDBTask;
 using FileSearch::WfmSearchWalker;
-
-// No file of this process can grow while it lives.
-class FullDisk {
- public:
-  FullDisk() : handler_(std::signal(SIGXFSZ, SIG_IGN)) {
-    getrlimit(RLIMIT_FSIZE, &before_);
-    rlimit none = before_;
-    none.rlim_cur = kBytes;
-    setrlimit(RLIMIT_FSIZE, &none);
-  }
-  ~FullDisk() {
-    setrlimit(RLIMIT_FSIZE, &before_);
-    std::signal(SIGXFSZ, handler_);
-  }
-  FullDisk(const FullDisk&) = delete;
-  FullDisk& operator=(const FullDisk&) = delete;
-
- private:
-  static constexpr rlim_t kBytes = 64 * 1024;  // enough for a task record, not for results
-  void (*handler_)(int);
-  rlimit before_ = {};
-};
 
 class Walker : public PlatformTest {
  protected:
@@ -82,81 +52,11 @@ class Walker : public PlatformTest {
     return static_cast<size_t>(
         std::distance(fs::directory_iterator(ResultFolder()), fs::directory_iterator()));
   }
-  std::unique_ptr<WfmSearchDBTask> OpenResults() {
-    const Json::Value data = task_->getProperty(task_record::kData);
-    return std::unique_ptr<WfmSearchDBTask>(
-        FileSearch::WfmSearchDBTaskMgr(me_.c_str())
-            .getDBTask(data[task_record::kDatabaseVolume].asCString(),
-                       data[task_record::kDatabaseId].asCString()));
-  }
-
   std::string share_;
   std::string me_;
   std::unique_ptr<OKT::Task> task_;
   int stop_ = 0;
 };
-
-// Lists as the search module does: a page in which a file's rows could be purged is asked for
-// again.
-struct Listing {
-  WfmSearchDBTask& results;
-  std::vector<std::string> names = {};
-  bool consistent = true;
-  unsigned long long total = 0;
-  int passes = 0;
-
-  static BOOL Take(FileSearch::__tag_FILE_INFO_DATA* row, void* context) {
-    auto& listing = *static_cast<Listing*>(context);
-    const std::string path = std::string(row->share_root) + "/" + row->relative_path;
-    if (access(path.c_str(), F_OK) != 0) {
-      listing.consistent = listing.results.delRecs(row->share_name, path) == false;
-    }
-    listing.names.emplace_back(row->name);
-    return 1;
-  }
-  void Run() {
-    constexpr int kMostPasses = 5;
-    const bool ascending = true;
-    do {
-      names.clear();
-      consistent = true;
-      ASSERT_TRUE(results.queryResult(0, 100, "name", &ascending, nullptr, "", Take, this, &total));
-    } while (!consistent && ++passes < kMostPasses);
-    EXPECT_TRUE(consistent) << "it would be asked for ever";
-  }
-};
-
-// Rows that cannot be purged stand behind, between and before those that can.
-TEST_F(Walker, WhatIsGoneIsNeverListed) {
-  for (const char* name : {"a", "c", "e"}) WriteFile(share_ + "/" + name, "x");
-  for (const char* name : {"b", "d"}) {
-    ASSERT_EQ(symlink("nowhere", (share_ + "/" + name).c_str()), 0);
-  }
-  const auto walker = NewWalker();
-  ASSERT_TRUE(walker->init({"/share"}, {}));
-  NameInTask(*walker);
-  ASSERT_TRUE(Walk(*walker));
-  const auto results = OpenResults();
-  ASSERT_NE(results, nullptr);
-  Listing listing{*results};
-  listing.Run();
-  EXPECT_EQ(listing.names, (std::vector<std::string>{"a", "b", "c", "d", "e"}));
-
-  fs::remove(share_ + "/a");
-  listing.Run();
-  EXPECT_EQ(listing.names, (std::vector<std::string>{"b", "c", "d", "e"}));
-  EXPECT_EQ(listing.total, 4u);
-  fs::remove(share_ + "/e");
-  listing.Run();
-  EXPECT_EQ(listing.names, (std::vector<std::string>{"b", "c", "d"}));
-  fs::remove(share_ + "/c");
-  {
-    const FullDisk full;
-    listing.Run();
-  }
-  EXPECT_EQ(listing.names, (std::vector<std::string>{"b", "d"})) << "on a full disk too";
-  EXPECT_EQ(listing.total, 2u);
-}
 
 // A clock that jumps and a search that finds nothing for a day look alike.
 TEST_F(Walker, ItsResultsAreNotSweptWhileItLives) {

@@ -1,8 +1,5 @@
 // What a request should not hold: each gets a clear code, and no search is left that says it runs.
 
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include "nas/base/json_text.h"
 #include "tests/program/program_test.h"
 

@@ -1,45 +1,25 @@
 #include "tests/program/program_test.h"
 
-#include <fcntl.h>
 #include <pwd.h>
-#include <signal.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <chrono>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
-#include <filesystem>
 #include <memory>
-#include <thread>
 
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
 #include "nas/base/unique_fd.h"
 #include "nas/system/user_state.h"
+#include "nas/webapi/module.h"
 #include "platform/task.h"
 
 namespace program_test {
 
 namespace fs = std::filesystem;
-using std::chrono::milliseconds;
-using std::chrono::steady_clock;
 
 namespace {
-
-constexpr milliseconds kStep{5};
-
-bool WithinTime(milliseconds bound, const std::function<bool()>& holds) {
-  const auto end = steady_clock::now() + bound;
-  while (!holds()) {
-    if (steady_clock::now() > end) return false;
-    std::this_thread::sleep_for(kStep);
-  }
-  return true;
-}
 
 const nas::Module& LoadedModule() {
   static const nas::Module module(std::string(ARBORY_BIN_DIR) + "/NUVA.Arbory.Search.so");
@@ -76,10 +56,6 @@ void LogTo(const std::string& path, const char* format, va_list arguments) {
 }
 
 }  // namespace
-
-bool Eventually(const std::function<bool()>& holds) {
-  return WithinTime(std::chrono::seconds(10), holds);
-}
 
 Json::Value Json_(const std::string& text) {
   Json::Value value;
@@ -156,8 +132,8 @@ pid_t ProgramTest::Launch(const std::vector<std::string>& arguments) {
 
 Output ProgramTest::Finish(pid_t program) {
   int status = -1;
-  const bool ended = WithinTime(std::chrono::minutes(1),
-                                [&] { return waitpid(program, &status, WNOHANG) == program; });
+  const bool ended = Eventually([&] { return waitpid(program, &status, WNOHANG) == program; },
+                                std::chrono::minutes(1));
   EXPECT_TRUE(ended) << "the program hangs";
   if (!ended) {
     kill(program, SIGKILL);
@@ -192,7 +168,7 @@ Reply ProgramTest::ListToEnd(const std::string& id, const std::string& user) {
   params["taskid"] = id;
   params["additional"] = "real_path,size,time,owner,perm,type";
   Reply reply;
-  EXPECT_TRUE(WithinTime(std::chrono::seconds(30), [&] {
+  EXPECT_TRUE(Eventually([&] {
     reply = Call("list", params, user);
     return reply.code != 0 || reply.data["finished"].asBool();
   })) << "the search does not end";

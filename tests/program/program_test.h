@@ -6,16 +6,15 @@
 #include <json/value.h>
 #include <pwd.h>
 
-#include <functional>
 #include <string>
 #include <vector>
 
-#include "nas/webapi/module.h"
 #include "nas/webapi/runner.h"
 #include "tests/nas/fixture.h"
 
 namespace program_test {
 
+using nas_test::Eventually;
 using nas_test::InOrdinaryChild;
 using nas_test::WriteFile;
 
@@ -72,8 +71,6 @@ class ProgramTest : public nas_test::PlatformTest {
 };
 
 Json::Value Json_(const std::string& text);
-// Waits until it holds; false after ten seconds.
-bool Eventually(const std::function<bool()>& holds);
 // The pieces of `text` that each end with `end`.
 std::vector<std::string> Pieces(const std::string& text, char end);
 

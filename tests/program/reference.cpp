@@ -1,11 +1,7 @@
 #include "tests/program/reference.h"
 
 #include <dirent.h>
-#include <fcntl.h>
-#include <unistd.h>
 
-#include <cerrno>
-#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <vector>

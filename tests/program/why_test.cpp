@@ -1,11 +1,7 @@
 // What the program says of a file that a search does not find: every rule once, as its user sees
 // it.
 
-#include <fcntl.h>
 #include <sys/mount.h>
-#include <sys/stat.h>
-
-#include <filesystem>
 
 #include "tests/program/program_test.h"
 

@@ -2,13 +2,7 @@
 
 #include "arbory/server/service/files.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
 #include <cstdlib>
-#include <filesystem>
 
 #include "arbory/server/transport/http_text.h"
 #include "tests/server/server_test.h"
@@ -37,40 +31,25 @@ TEST_F(FilesTest, NothingButReadableFilesOfTheShareComesOut) {
   WriteFile(share_ + "/%2e%2e", "literal");
   Server server = Start();
   server.Open();
-  const struct {
-    const char* path;
-    int status;
-    const char* body;  // null: not looked at
-  } rows[] = {
-      {"photo/folder/below/file.txt", 200, "inside"},
-      {"photo/near", 200, "inside"},
-      {"photo/%252e%252e", 200, "literal"},
-      {"photo/far", 404, nullptr},
-      {"photo/absolute", 404, nullptr},
-      {"photo/up/secret.txt", 404, nullptr},
-      {"photo/loop", 404, nullptr},
-      {"photo/magic/etc/passwd", 404, nullptr},
-      {"photo/pipe", 404, nullptr},
-      {"photo/folder", 404, nullptr},
-      {"photo/folder/", 400, nullptr},
-      {"photo", 404, nullptr},
-      {"photo/none", 404, nullptr},
-      {"photo/folder/below/file.txt/x", 404, nullptr},
-      {"none/x", 404, nullptr},
-      {"home/x", 404, nullptr},
-      {"photo/closed.txt", 403, nullptr},
+  // As a whole, and a line of it.
+  const auto get = [&](const std::string& path, int status) {
+    const Reply file = server.Get("/files/" + path);
+    for (const Reply& reply : {file, server.Get("/lines/" + path + "?pattern=e")}) {
+      EXPECT_EQ(reply.status, status) << path << reply.body;
+      EXPECT_EQ(reply.body.find("secret"), std::string::npos) << path;
+      EXPECT_EQ(reply.body.find(dir_), std::string::npos) << path;
+    }
+    return file.body;
   };
-  for (const auto& row : rows) {
-    const Reply file = server.Get(std::string("/files/") + row.path);
-    if (row.body != nullptr) {
-      EXPECT_EQ(file.body, row.body) << row.path;
-    }
-    const Reply line = server.Get(std::string("/lines/") + row.path + "?pattern=e");
-    for (const Reply& reply : {file, line}) {
-      EXPECT_EQ(reply.status, row.status) << row.path << reply.body;
-      EXPECT_EQ(reply.body.find("secret"), std::string::npos) << row.path;
-      EXPECT_EQ(reply.body.find(dir_), std::string::npos) << row.path;
-    }
+  EXPECT_EQ(get("photo/folder/below/file.txt", 200), "inside");
+  EXPECT_EQ(get("photo/near", 200), "inside");
+  EXPECT_EQ(get("photo/%252e%252e", 200), "literal");
+  get("photo/folder/", 400);
+  get("photo/closed.txt", 403);
+  for (const char* path : {"photo/far", "photo/absolute", "photo/up/secret.txt", "photo/loop",
+                           "photo/magic/etc/passwd", "photo/pipe", "photo/folder", "photo",
+                           "photo/none", "photo/folder/below/file.txt/x", "none/x", "home/x"}) {
+    get(path, 404);
   }
 }
 
@@ -99,40 +78,37 @@ TEST_F(FilesTest, FirstLineOfWhatContentsHold) {
 }
 
 TEST_F(FilesTest, OnlySafeTypesAreShown) {
-  const struct {
-    const char* name;  // encoded
-    const char* type;  // null: an attachment
-  } rows[] = {
-      {"a.png", "image/png"},
-      {"a.JPG", "image/jpeg"},
-      {"a.txt", "text/plain; charset=utf-8"},
-      {"a.html.txt", "text/plain; charset=utf-8"},
-      {"a.pdf", "application/pdf"},
-      {"a.svg", nullptr},
-      {"a.html", nullptr},
-      {"a.xhtml", nullptr},
-      {"a.txt.html", nullptr},
-      {"a", nullptr},
-      {"png", nullptr},
-      {".png", "image/png"},
-  };
-  for (const auto& row : rows) WriteFile(share_ + "/" + row.name, "<script>alert(1)</script>");
+  const char* const text = "text/plain; charset=utf-8";
+  // Null for an attachment.
+  const std::pair<const char*, const char*> rows[] = {{"a.png", "image/png"},
+                                                      {"a.JPG", "image/jpeg"},
+                                                      {"a.txt", text},
+                                                      {"a.html.txt", text},
+                                                      {"a.pdf", "application/pdf"},
+                                                      {".png", "image/png"},
+                                                      {"a.svg", nullptr},
+                                                      {"a.html", nullptr},
+                                                      {"a.xhtml", nullptr},
+                                                      {"a.txt.html", nullptr},
+                                                      {"a", nullptr},
+                                                      {"png", nullptr}};
+  for (const auto& [name, type] : rows) WriteFile(share_ + "/" + name, "<script>alert(1)</script>");
   Server server = Start();
   server.Open();
-  for (const auto& row : rows) {
-    const std::string target = std::string("/files/photo/") + row.name;
+  for (const auto& [name, type] : rows) {
+    const std::string target = std::string("/files/photo/") + name;
     for (const bool preview : {false, true}) {
       const Reply reply = server.Get(target + (preview ? "?preview=1" : ""));
-      ASSERT_EQ(reply.status, 200) << row.name;
-      const bool shown = preview && row.type != nullptr;
-      EXPECT_EQ(reply.fields.at("content-type"), shown ? row.type : "application/octet-stream");
+      ASSERT_EQ(reply.status, 200) << name;
+      const bool shown = preview && type != nullptr;
+      EXPECT_EQ(reply.fields.at("content-type"), shown ? type : "application/octet-stream");
       EXPECT_TRUE(reply.fields.at("content-disposition").starts_with(shown ? "inline;" : "attach"))
-          << row.name;
+          << name;
       EXPECT_EQ(reply.fields.at("x-content-type-options"), "nosniff");
       const std::string policy = reply.fields.at("content-security-policy");
       EXPECT_TRUE(policy.starts_with("default-src 'none'")) << policy;
-      const bool pdf = shown && row.type == std::string("application/pdf");
-      EXPECT_EQ(policy.ends_with("sandbox"), !pdf) << row.name;
+      const bool pdf = shown && type == std::string("application/pdf");
+      EXPECT_EQ(policy.ends_with("sandbox"), !pdf) << name;
     }
   }
 }
@@ -155,29 +131,24 @@ TEST_F(FilesTest, NamesAndRangesFollowTheirTables) {
     const char* field;
     std::uint64_t size, first, count;
     bool partial, satisfiable;
-  } ranges[] = {
-      {"", 10, 0, 10, false, true},
-      {"bytes=0-0", 10, 0, 1, true, true},
-      {"bytes=9-", 10, 9, 1, true, true},
-      {"bytes=2-99", 10, 2, 8, true, true},
-      {"bytes=-3", 10, 7, 3, true, true},
-      {"bytes=-99", 10, 0, 10, true, true},
-      {"bytes=10-", 10, 0, 0, false, false},
-      {"bytes=-0", 10, 0, 0, false, false},
-      {"bytes=0-", 0, 0, 0, false, false},
-      {"bytes=5-2", 10, 0, 10, false, true},
-      {"bytes=a-b", 10, 0, 10, false, true},
-      {"bytes=0-1,3-4", 10, 0, 10, false, true},
-      {"lines=0-1", 10, 0, 10, false, true},
-      {"bytes=99999999999999999999-", 10, 0, 10, false, true},
-      {"bytes=-", 10, 0, 10, false, true},
+  } ranges[] = {{"bytes=0-0", 10, 0, 1, true, true},  {"bytes=9-", 10, 9, 1, true, true},
+                {"bytes=2-99", 10, 2, 8, true, true}, {"bytes=-3", 10, 7, 3, true, true},
+                {"bytes=-99", 10, 0, 10, true, true}, {"bytes=10-", 10, 0, 0, false, false},
+                {"bytes=-0", 10, 0, 0, false, false}, {"bytes=0-", 0, 0, 0, false, false}};
+  const auto check = [](const char* field, std::uint64_t size, const arbory::ByteRange& expected) {
+    const arbory::ByteRange range = arbory::ParseRange(field, size);
+    EXPECT_EQ(range.first, expected.first) << field;
+    EXPECT_EQ(range.count, expected.count) << field;
+    EXPECT_EQ(range.partial, expected.partial) << field;
+    EXPECT_EQ(range.satisfiable, expected.satisfiable) << field;
   };
   for (const auto& row : ranges) {
-    const arbory::ByteRange range = arbory::ParseRange(row.field, row.size);
-    EXPECT_EQ(range.first, row.first) << row.field;
-    EXPECT_EQ(range.count, row.count) << row.field;
-    EXPECT_EQ(range.partial, row.partial) << row.field;
-    EXPECT_EQ(range.satisfiable, row.satisfiable) << row.field;
+    check(row.field, row.size, {row.first, row.count, row.partial, row.satisfiable});
+  }
+  // What is no range, or several, is the whole.
+  for (const char* none : {"", "bytes=5-2", "bytes=a-b", "bytes=0-1,3-4", "lines=0-1",
+                           "bytes=99999999999999999999-", "bytes=-"}) {
+    check(none, 10, {0, 10, false, true});
   }
 }
 

@@ -1,20 +1,13 @@
 #include "tests/server/server_test.h"
 
 #include <arpa/inet.h>
-#include <fcntl.h>
 #include <netinet/in.h>
 #include <poll.h>
 #include <pwd.h>
-#include <signal.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <filesystem>
-#include <thread>
 
 #include "nas/base/json_text.h"
 
@@ -57,15 +50,6 @@ void GiveTo(const std::string& path, const std::string& user) {
 }
 
 }  // namespace
-
-bool Eventually(const std::function<bool()>& holds) {
-  const auto end = steady_clock::now() + kSoon;
-  while (!holds()) {
-    if (steady_clock::now() > end) return false;
-    std::this_thread::sleep_for(milliseconds(5));
-  }
-  return true;
-}
 
 Json::Value Parsed(const std::string& text) {
   Json::Value value;
@@ -163,10 +147,13 @@ Reply Server::Call(const std::string& method, const std::string& json) const {
   return Post("/api/NUVA.Arbory.Search/2/" + method, json);
 }
 
+bool Server::Counts(const std::string& line) const {
+  return Get("/metrics").body.find("\n" + line + "\n") != std::string::npos;
+}
+
 void Server::Open() {
-  const Reply reply = Get(open_path);
-  ASSERT_EQ(reply.status, 303);
-  const std::string& set = reply.fields.at("set-cookie");
+  const std::string set = Get(open_path).fields["set-cookie"];
+  ASSERT_FALSE(set.empty());
   cookie = set.substr(0, set.find(';'));
 }
 

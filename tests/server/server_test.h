@@ -4,8 +4,6 @@
 
 #include <json/value.h>
 
-#include <chrono>
-#include <functional>
 #include <map>
 #include <memory>
 #include <string>
@@ -16,10 +14,9 @@
 
 namespace server_test {
 
-// A test's bound on what should take no time, on a loaded machine with sanitizers.
-inline constexpr std::chrono::seconds kSoon{20};
+using nas_test::Eventually;
+using nas_test::kSoon;
 
-bool Eventually(const std::function<bool()>& holds);
 Json::Value Parsed(const std::string& text);
 
 // Of the configuration: the module whose methods are slow, large and deadly.
@@ -66,6 +63,8 @@ struct Server {
   Reply Get(const std::string& target) const { return Ask("GET", target); }
   Reply Post(const std::string& target, const std::string& json) const;
   Reply Call(const std::string& method, const std::string& json) const;
+  // Whether a line of the counts is this, a name and a value.
+  bool Counts(const std::string& line) const;
   std::string Host() const { return "127.0.0.1:" + std::to_string(port); }
   std::string RequestText(const std::string& method, const std::string& target,
                           const std::string& body, const std::string& fields) const;
