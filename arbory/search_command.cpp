@@ -45,9 +45,9 @@ constexpr std::chrono::milliseconds kLately{300};
 
 // Null for a pattern that asks for no contents.
 std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
-  const auto pattern = nas::NamePattern::Parse(text);
+  const auto pattern = nas::Query::Parse(text);
   if (!pattern) return nullptr;
-  auto query = nas::ContentQuery::From(*pattern);
+  auto query = nas::ContentQuery::From(pattern->root(), true);
   return query ? std::make_shared<const nas::ContentQuery>(std::move(*query)) : nullptr;
 }
 

@@ -4,6 +4,7 @@
 #include "arbory/locate.h"
 #include "arbory/parse.h"
 #include "nas/base/accounts.h"
+#include "nas/match/query.h"
 #include "nas/system/shares.h"
 #include "platform/filesearch.h"
 
@@ -50,8 +51,9 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
   using Factory = FileSearch::FindFactory;
   Json::Value params(Json::objectValue);
   for (const std::string& location : locations) params["folder_path"].append(location);
-  CheckText(Factory::FIND_PATTERN, query.pattern,
-            "pattern that can be searched for; see arbory search --help");
+  if (const auto parsed = nas::Query::Parse(query.pattern, now); !parsed) {
+    throw UsageError(parsed.error().path);
+  }
   params["pattern"] = query.pattern;
   const std::string extensions = Joined(query.extensions);
   if (!extensions.empty()) {

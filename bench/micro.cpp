@@ -8,17 +8,19 @@
 #include <string_view>
 
 #include "nas/match/literal_finder.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query_match.h"
 #include "nas/results/ordering.h"
 
 namespace {
 
 void MatchName(benchmark::State& state, const char* pattern_text, const char* name) {
-  const auto pattern = nas::NamePattern::Parse(pattern_text);
+  const auto query = nas::Query::Parse(pattern_text);
   nas::FoldedName folded;
+  nas::QuerySubject subject;
+  subject.name = &folded;
   for (auto _ : state) {
     folded.Set(name);
-    benchmark::DoNotOptimize(pattern->Matches(folded));
+    benchmark::DoNotOptimize(nas::Ask(query->root(), subject));
   }
 }
 BENCHMARK_CAPTURE(MatchName, literal_miss, "invoice", "holiday_photo-123456.jpg");

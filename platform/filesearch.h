@@ -18,22 +18,14 @@ enum _tag_dir_entry_type_ { DIR_ENTRY_DIR = 0, DIR_ENTRY_FILE = 1, DIR_ENTRY_ALL
 
 namespace FileSearch {
 
-// What the walker knows of one file while it judges it, and why it leaves one out; the engine's
-// own.
-struct WalkEntry;
-enum class Refusal;
+// What a criterion asks, as the engine judges it; the engine's own.
+struct Criterion;
 
-// One criterion: a file is a result when every criterion matches it. Comparators are immutable and
-// may be asked by several threads at once.
+// One criterion: a file is a result when every criterion matches it. Comparators are immutable.
 class FindComp {
  public:
   virtual ~FindComp() = default;
-  // What has to be known of a file before the criterion can judge it, cheapest first.
-  enum class Needs { kName, kAttributes };
-  virtual Needs needs() const = 0;
-  virtual bool match(const WalkEntry& entry) const = 0;
-  // Why a file that it does not match is left out; the same for all of them.
-  virtual Refusal refusal() const = 0;
+  virtual Criterion criterion() const = 0;
 };
 
 // Size in bytes; both bounds are inclusive ("greater": at least, "less": at most). Folders never
@@ -41,9 +33,7 @@ class FindComp {
 class FindSizeComp : public FindComp {
  public:
   FindSizeComp(const char* op, long long bytes);
-  Needs needs() const override { return Needs::kAttributes; }
-  bool match(const WalkEntry& entry) const override;
-  Refusal refusal() const override;
+  Criterion criterion() const override;
 
  private:
   bool at_least_;
@@ -54,13 +44,10 @@ class FindSizeComp : public FindComp {
 // given, "before": not after it). A file without a recorded creation time matches no creation
 // criterion.
 class FindTimeComp : public FindComp {
- public:
-  Needs needs() const override { return Needs::kAttributes; }
-
  protected:
   FindTimeComp(const char* op, long seconds);
-  bool InRange(std::int64_t file_seconds) const;
-  Refusal OutOfRange(Refusal earlier, Refusal later) const { return after_ ? earlier : later; }
+  bool after() const { return after_; }
+  std::int64_t seconds() const { return seconds_; }
 
  private:
   bool after_;
@@ -69,20 +56,17 @@ class FindTimeComp : public FindComp {
 class FindMTimeComp : public FindTimeComp {
  public:
   FindMTimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
-  bool match(const WalkEntry& entry) const override;
-  Refusal refusal() const override;
+  Criterion criterion() const override;
 };
 class FindCRTimeComp : public FindTimeComp {
  public:
   FindCRTimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
-  bool match(const WalkEntry& entry) const override;
-  Refusal refusal() const override;
+  Criterion criterion() const override;
 };
 class FindATimeComp : public FindTimeComp {
  public:
   FindATimeComp(const char* op, long seconds) : FindTimeComp(op, seconds) {}
-  bool match(const WalkEntry& entry) const override;
-  Refusal refusal() const override;
+  Criterion criterion() const override;
 };
 
 class FindFactory {

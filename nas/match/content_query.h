@@ -8,7 +8,8 @@
 #include <vector>
 
 #include "nas/match/literal_finder.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query.h"
+#include "nas/match/query_match.h"
 #include "nas/match/regex.h"
 
 namespace nas {
@@ -16,14 +17,22 @@ namespace nas {
 // Does not change once made: any thread may ask.
 class ContentQuery {
  public:
-  // The same expression over contents: every term must be found, either of its alternatives will
-  // do. Nothing where the pattern has a wildcard, which speaks of whole names, or where it only
-  // says what must not be there.
-  static std::optional<ContentQuery> From(const NamePattern& pattern);
+  // Looks for what "content:" asks for and, with `texts_too`, for the texts that names are asked
+  // for: then the same query over contents, in which every term has to be found. The texts are left
+  // out where one has a wildcard, which speaks of whole names, or is about letter case, and where
+  // the query only says what must not be there. Nothing where no contents are asked for.
+  static std::optional<ContentQuery> From(const QueryNode& query, bool texts_too);
+
+  // The query, in which leaves know their needles.
+  const QueryNode& root() const { return root_; }
+  bool texts_too() const { return texts_too_; }
+  // What the texts say of a file in which these needles have been found, `all_read` to its end or
+  // not; what else the query asks counts as met.
+  Answer AskTexts(const std::vector<bool>& found, bool all_read) const;
 
  private:
   friend class ContentScanner;
-  // One alternative: found where any of its forms is.
+  // One text: found where any of its forms is.
   struct Needle {
     bool negated = false;
     std::optional<LiteralFinder> literal;
@@ -32,11 +41,12 @@ class ContentQuery {
     // The first place of it that does not begin before `from`.
     std::optional<TextPlace> Find(std::string_view text, size_t from) const;
   };
-  static std::optional<Needle> MakeNeedle(const NamePattern::Alternative& alternative);
+  static std::optional<Needle> MakeNeedle(const TextTerm& text);
+  bool AddNeedles(QueryNode& node, bool negated);
 
+  QueryNode root_;
+  bool texts_too_ = false;
   std::vector<Needle> needles_;
-  std::vector<std::vector<size_t>> terms_;  // indexes of needles: all terms, either needle
-  bool has_negated_ = false;
   bool by_lines_ = false;      // an expression must see whole lines
   bool beyond_ascii_ = false;  // bytes beyond ASCII matter, so their encoding does
   size_t overlap_ = 0;         // bytes of the longest literal, so none is cut in two

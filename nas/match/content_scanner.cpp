@@ -69,6 +69,8 @@ MatchingLine Cut(std::string_view line, std::vector<std::pair<size_t, size_t>> m
 ContentScanner::ContentScanner(const ContentQuery& query, const int& stop_flag)
     : query_(query),
       stop_flag_(stop_flag),
+      texts_(
+          [&query](const auto& found, bool all_read) { return query.AskTexts(found, all_read); }),
       reader_(std::max(kPieceBytes, 4 * query.overlap_), query.beyond_ascii_),
       found_(query.needles_.size()) {}
 
@@ -84,27 +86,28 @@ int ContentScanner::Open(int folder, const char* name) {
   return openat(folder, name, kFlags);
 }
 
-ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name) {
+ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name, const Decide& decide) {
   const UniqueFd fd(Open(folder, name));
-  return fd ? ScanOpen(fd.get()) : Outcome::kFailed;
+  return fd ? ScanOpen(fd.get(), decide) : Outcome::kFailed;
 }
 
-ContentScanner::Outcome ContentScanner::ScanOpen(int fd) {
+ContentScanner::Outcome ContentScanner::ScanOpen(int fd, const Decide& decide) {
   std::fill(found_.begin(), found_.end(), false);
   reader_.Start(fd);
-  Outcome outcome = Read();
+  Outcome outcome = Read(decide);
   // What stands there in either reading is there: the guess may be wrong.
-  if (outcome == Outcome::kNoMatch && !Decided() && reader_.StartGuessed()) outcome = Read();
-  if (outcome == Outcome::kNoMatch && Matches()) return Outcome::kMatch;
-  return outcome;
+  const bool open = outcome == Outcome::kNoMatch && decide(found_, false) == Answer::kMaybe;
+  if (open && reader_.StartGuessed()) outcome = Read(decide);
+  const bool told = outcome == Outcome::kNoMatch || outcome == Outcome::kBinary;
+  return told && decide(found_, true) == Answer::kYes ? Outcome::kMatch : outcome;
 }
 
 // kNoMatch for a file that was read as far as is needed to tell.
-ContentScanner::Outcome ContentScanner::Read() {
+ContentScanner::Outcome ContentScanner::Read(const Decide& decide) {
   return EachPiece(query_.by_lines_ ? Units::kLines : Units::kBytes,
-                   [this](std::string_view text, size_t /*done*/) {
+                   [&](std::string_view text, size_t /*done*/) {
                      Search(text);
-                     return Decided();
+                     return decide(found_, false) != Answer::kMaybe;
                    });
 }
 
@@ -141,21 +144,6 @@ void ContentScanner::Search(std::string_view text) {
   }
 }
 
-// Whether reading on cannot change the answer.
-bool ContentScanner::Decided() const {
-  if (query_.has_negated_) return false;
-  return std::ranges::all_of(query_.terms_, [this](const auto& term) {
-    return std::ranges::any_of(term, [this](size_t i) { return found_[i]; });
-  });
-}
-
-bool ContentScanner::Matches() const {
-  return std::ranges::all_of(query_.terms_, [this](const auto& term) {
-    return std::ranges::any_of(
-        term, [this](size_t i) { return found_[i] != query_.needles_[i].negated; });
-  });
-}
-
 std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* name,
                                                       size_t most_bytes) {
   // Opening something else, such as a device, may have effects.
@@ -168,7 +156,7 @@ std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* na
 }
 
 std::optional<MatchingLine> ContentScanner::FirstLine(int fd, size_t most_bytes) {
-  if (ScanOpen(fd) != Outcome::kMatch || lseek(fd, 0, SEEK_SET) != 0) return std::nullopt;
+  if (ScanOpen(fd, texts_) != Outcome::kMatch || lseek(fd, 0, SEEK_SET) != 0) return std::nullopt;
   reader_.Start(fd);
   std::optional<MatchingLine> line;
   do {

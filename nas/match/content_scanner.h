@@ -2,6 +2,7 @@
 // The reading of one file to answer a content query: whether it matches, and where.
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -29,9 +30,13 @@ class ContentScanner {
   explicit ContentScanner(const ContentQuery& query, const int& stop_flag);
 
   enum class Outcome { kMatch, kNoMatch, kBinary, kStopped, kFailed };
-  // Whether the regular file `name` in `folder` matches. kFailed leaves errno. Ends within one
-  // piece once the stop flag is set.
-  Outcome Scan(int folder, const char* name);
+  // What is known of the file once these needles have been found, `all_read` to its end or not.
+  using Decide = std::function<Answer(const std::vector<bool>& found, bool all_read)>;
+  // Whether the regular file `name` in `folder` matches: reads until `decide` is sure. kFailed
+  // leaves errno. Ends within one piece once the stop flag is set.
+  Outcome Scan(int folder, const char* name, const Decide& decide);
+  // The same by the query's texts alone.
+  Outcome Scan(int folder, const char* name) { return Scan(folder, name, texts_); }
 
   // Where the regular file of that name matches; nothing where it does not, as when it has changed
   // since, is something else, or cannot be read.
@@ -42,19 +47,18 @@ class ContentScanner {
  private:
   enum class Units { kBytes, kLines };
   int Open(int folder, const char* name);
-  Outcome ScanOpen(int fd);
-  Outcome Read();
+  Outcome ScanOpen(int fd, const Decide& decide);
+  Outcome Read(const Decide& decide);
   // Hands the text over, in pieces that overlap so that nothing is cut in two: `look` is told a
   // piece and how much of it is not yet handed over again, and answers whether it has seen enough.
   template <typename Look>
   Outcome EachPiece(Units units, const Look& look);
   void Search(std::string_view text);
-  bool Decided() const;
-  bool Matches() const;
   std::optional<MatchingLine> LineIn(std::string_view text, bool at_line_start, size_t most_bytes);
 
   const ContentQuery& query_;
   const int& stop_flag_;
+  const Decide texts_;
   TextReader reader_;
   std::vector<bool> found_;
   bool keep_access_time_ = true;

@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <span>
 
+#include "nas/match/folded_name.h"
+
 namespace nas {
 namespace {
 
@@ -56,6 +58,24 @@ std::span<const std::string_view> ExtensionsOf(FileCategory category) {
 }
 
 }  // namespace
+
+std::optional<FileType> ParseFileType(std::string_view word) {
+  static constexpr struct {
+    std::string_view word;
+    FileType type;
+  } kTypes[] = {{"file", {}},
+                {"dir", {true}},
+                {"image", {false, FileCategory::kImage}},
+                {"video", {false, FileCategory::kVideo}},
+                {"audio", {false, FileCategory::kAudio}},
+                {"document", {false, FileCategory::kDocument}},
+                {"archive", {false, FileCategory::kArchive}}};
+  const std::string lowered = AsciiLower(word);
+  for (const auto& known : kTypes) {
+    if (lowered == known.word) return known.type;
+  }
+  return std::nullopt;
+}
 
 std::string_view ExtensionOf(std::string_view name) {
   const size_t dot = name.rfind('.');

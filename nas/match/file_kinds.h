@@ -1,11 +1,21 @@
 #pragma once
-// Extensions, and the categories of files that are told by them. Any thread may call.
+// Extensions, and the types of files: what they are, and the categories that extensions tell. Any
+// thread may call.
 
+#include <optional>
 #include <string_view>
 
 namespace nas {
 
 enum class FileCategory { kImage, kVideo, kAudio, kDocument, kArchive };
+
+struct FileType {
+  bool folder = false;
+  std::optional<FileCategory> category = {};  // of a file; none: any file
+};
+// "file", "dir", "image", "video", "audio", "document", "archive" in any letter case; nothing for
+// any other word.
+std::optional<FileType> ParseFileType(std::string_view word);
 
 // What follows the last dot, without it; empty where there is none, or where the only dot begins or
 // ends the name. A part of `name`, case kept.

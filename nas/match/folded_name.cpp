@@ -9,9 +9,43 @@
 namespace nas {
 namespace {
 
-// Decomposes `text` into a buffer of the calling thread and composes it again under `options`.
-// False where it is not valid UTF-8; `out` is then untouched.
-bool Normalise(std::string_view text, utf8proc_option_t options, std::string& out) {
+bool IsWithin(utf8proc_int32_t point, utf8proc_int32_t first, utf8proc_int32_t last) {
+  return first <= point && point <= last;
+}
+
+bool IsMark(utf8proc_int32_t point) {
+  return IsWithin(point, 0x300, 0x36f) || IsWithin(point, 0x483, 0x487) ||
+         IsWithin(point, 0x1ab0, 0x1aff) || IsWithin(point, 0x1dc0, 0x1dff) ||
+         IsWithin(point, 0xfe20, 0xfe2f);
+}
+
+// A letter of Latin, Greek or Cyrillic, folded and decomposed.
+bool TakesAccents(utf8proc_int32_t point) {
+  return IsWithin(point, 'a', 'z') || IsWithin(point, 0xaa, 0x24f) ||
+         IsWithin(point, 0x250, 0x2af) || IsWithin(point, 0x370, 0x52f) ||
+         IsWithin(point, 0x1c80, 0x1c8f) || IsWithin(point, 0x1d00, 0x1dbf) ||
+         IsWithin(point, 0x1e00, 0x1fff) || IsWithin(point, 0x2c60, 0x2c7f) ||
+         IsWithin(point, 0xa640, 0xa69f) || IsWithin(point, 0xa720, 0xa7ff) ||
+         IsWithin(point, 0xab30, 0xab6f);
+}
+
+// Takes the marks on letters that take accents out of decomposed points; returns how many are left.
+utf8proc_ssize_t DropAccents(utf8proc_int32_t* points, utf8proc_ssize_t count) {
+  utf8proc_ssize_t kept = 0;
+  bool on_letter = false;
+  for (utf8proc_ssize_t i = 0; i < count; ++i) {
+    const bool mark = IsMark(points[i]);
+    if (!mark) on_letter = TakesAccents(points[i]);
+    if (!(mark && on_letter)) points[kept++] = points[i];
+  }
+  return kept;
+}
+
+// Decomposes `text` into a buffer of the calling thread and composes it again under `options`,
+// without accents where that is asked for. False where it is not valid UTF-8; `out` is then
+// untouched.
+bool Normalise(std::string_view text, utf8proc_option_t options, std::string& out,
+               bool drop_accents = false) {
   constexpr size_t kUsualPoints = 512;  // most names once taken apart; longer ones make it grow
   thread_local std::vector<utf8proc_int32_t> points(kUsualPoints);
   const auto* bytes = reinterpret_cast<const utf8proc_uint8_t*>(text.data());
@@ -23,6 +57,7 @@ bool Normalise(std::string_view text, utf8proc_option_t options, std::string& ou
     points.resize(static_cast<size_t>(needed));
   }
   if (needed < 0) return false;
+  if (drop_accents) needed = DropAccents(points.data(), needed);
   const utf8proc_ssize_t composed = utf8proc_normalize_utf32(points.data(), needed, options);
   if (composed < 0) return false;
   constexpr size_t kLongestCodePoint = 4;
@@ -71,34 +106,21 @@ bool IsAscii(std::string_view text) {
 bool MayFoldToAscii(std::string_view text) {
   if (IsAscii(text)) return false;
   for (size_t i = 0; i + 1 < text.size(); ++i) {
+    const auto lead = static_cast<unsigned char>(text[i]);
     const auto next = static_cast<unsigned char>(text[i + 1]);
-    switch (static_cast<unsigned char>(text[i])) {
-      case 0xc3:
-        if (next == 0x9f) return true;  // sharp s
-        break;
-      case 0xc4:
-        if (next == 0xb0) return true;  // capital i with dot
-        break;
-      case 0xc5:
-        if (next == 0x89 || next == 0xbf) return true;  // n with apostrophe, long s
-        break;
-      case 0xc7:
-        if (next == 0xb0) return true;  // j with caron
-        break;
-      case 0xcd:
-        if (next == 0xbe) return true;  // Greek question mark
-        break;
-      case 0xe1:
-        if (next == 0xba || next == 0xbf) return true;  // letters with marks below, Greek marks
-        break;
-      case 0xe2:
-        if (next == 0x84) return true;  // Kelvin sign
-        break;
-      case 0xef:
-        if (next == 0xac) return true;  // ligatures
-        break;
-      default:
-        break;
+    if (lead < 0xc3) continue;
+    if (lead <= 0xcd) {
+      // Letters with accents, the sharp s and the long one; behind a few others, marks.
+      if (lead <= 0xc9 || lead >= 0xcc) return true;
+    } else if (lead == 0xd2) {
+      if (next >= 0x83 && next <= 0x87) return true;  // Cyrillic marks
+    } else if (lead == 0xe1) {
+      if (next == 0xaa || next == 0xab) return true;  // marks
+      if (next >= 0xb7) return true;                  // marks, letters with them, Greek marks
+    } else if (lead == 0xe2) {
+      if (next == 0x84) return true;  // the signs of Kelvin and Angstrom
+    } else if (lead == 0xef) {
+      if (next == 0xac || next == 0xb8) return true;  // ligatures; halves of marks
     }
   }
   return false;
@@ -116,6 +138,12 @@ std::string FoldText(std::string_view text, bool* valid) {
   if (!LowerInto(text, folded)) is_valid = Normalise(text, kFold, folded);
   if (valid != nullptr) *valid = is_valid;
   return folded;
+}
+
+std::string WithoutAccents(std::string_view folded) {
+  std::string plain;
+  if (IsAscii(folded) || !Normalise(folded, kCompose, plain, true)) plain = folded;
+  return plain;
 }
 
 std::string ComposeText(std::string_view text) {

@@ -1,8 +1,9 @@
 #pragma once
 // File names as they are compared: NFC-normalised and fully case-folded, so that a name written by
-// a client that decomposes its letters, or in other case, is the same name. A name that is not
-// valid UTF-8 is compared byte by byte, with only its ASCII letters folded. Nothing here fails, and
-// any thread may call.
+// a client that decomposes its letters, or in other case, is the same name. A second form has no
+// accents either, for whoever typed none: the marks on Latin, Greek and Cyrillic letters, and no
+// others, since in other scripts marks are vowels. A name that is not valid UTF-8 is compared byte
+// by byte, with only its ASCII letters folded. Nothing here fails, and any thread may call.
 
 #include <string>
 #include <string_view>
@@ -10,13 +11,16 @@
 namespace nas {
 
 bool IsAscii(std::string_view text);
-// Whether folding may turn something in `text` that is not ASCII into ASCII characters: the Kelvin
-// sign into "k", the sharp s into "ss", a ligature into its letters. May say yes for a few others.
-// Where the answer is no, the ASCII parts of the folded text are those of the text itself.
+// Whether folding, or taking accents away, may turn something in `text` that is not ASCII into ASCII
+// characters, or bring some together: the Kelvin sign into "k", the sharp s into "ss", a ligature
+// into its letters, "\u00e9" into "e". May say yes for others. Where the answer is no, the ASCII
+// parts of both forms are those of the text itself.
 bool MayFoldToAscii(std::string_view text);
 std::string AsciiLower(std::string_view text);
 // The text as it is compared; `valid` (may be null) receives whether it was valid UTF-8.
 std::string FoldText(std::string_view text, bool* valid = nullptr);
+// A folded text without its accents; unchanged where it has none or is not valid UTF-8.
+std::string WithoutAccents(std::string_view folded);
 // The text in NFC, case kept; unchanged where it is not valid UTF-8.
 std::string ComposeText(std::string_view text);
 
@@ -28,11 +32,19 @@ class FoldedName {
   void Set(std::string_view name) {
     name_ = name;
     state_ = State::kUnknown;
+    has_plain_ = false;
   }
   std::string_view name() const { return name_; }
   std::string_view folded() {
     if (state_ == State::kUnknown) Fold();
     return folded_;
+  }
+  // The folded form without accents.
+  std::string_view plain() {
+    if (ascii() || state_ == State::kBroken) return folded_;
+    if (!has_plain_) plain_ = WithoutAccents(folded_);
+    has_plain_ = true;
+    return plain_;
   }
   bool ascii() {
     if (state_ == State::kUnknown) Fold();
@@ -49,6 +61,8 @@ class FoldedName {
 
   std::string_view name_;
   std::string folded_;
+  std::string plain_;
+  bool has_plain_ = false;
   State state_ = State::kUnknown;
 };
 

@@ -25,15 +25,13 @@ char32_t NextCharacter(std::string_view text, size_t& at) {
   return c;
 }
 
-// Position of the "]" that closes the "[" at `open`, or npos. A "]" that comes first in the set
-// stands for itself.
-size_t SetEnd(std::string_view pattern, size_t open) {
+}  // namespace
+
+size_t Glob::SetEnd(std::string_view pattern, size_t open) {
   size_t first = open + 1;
   if (first < pattern.size() && (pattern[first] == '!' || pattern[first] == '^')) ++first;
   return first < pattern.size() ? pattern.find(']', first + 1) : kNone;
 }
-
-}  // namespace
 
 bool Glob::HasWildcard(std::string_view text) {
   for (size_t i = 0; i < text.size(); ++i) {

@@ -18,6 +18,10 @@ class Glob {
   // Whether `text` holds any wildcard.
   static bool HasWildcard(std::string_view text);
 
+  // Position of the "]" that closes the set which opens at `open`, or npos where none does. A "]"
+  // that comes first in the set stands for itself.
+  static size_t SetEnd(std::string_view pattern, size_t open);
+
   explicit Glob(std::string_view pattern);
   bool Matches(std::string_view text) const;
   // The longest plain text between two stars, which every match holds; may be empty.

@@ -78,10 +78,12 @@ pcre2_code* CompileFor(std::string_view pattern, std::uint32_t options, int& num
 
 }  // namespace
 
-Result<std::shared_ptr<const Regex>> Regex::Compile(std::string_view pattern, Kind kind) {
+Result<std::shared_ptr<const Regex>> Regex::Compile(std::string_view pattern, Kind kind,
+                                                    bool exact_case) {
   int number = 0;
   PCRE2_SIZE where = 0;
-  const std::uint32_t options = CompileOptions(kind);
+  const std::uint32_t options =
+      CompileOptions(kind) & ~(exact_case ? std::uint32_t{PCRE2_CASELESS} : 0U);
   pcre2_code* code = CompileFor(pattern, options, number, where);
   if (code == nullptr) {
     std::array<PCRE2_UCHAR, kMostMessageBytes> text{};

@@ -1,6 +1,6 @@
 #pragma once
-// Regular expressions (PCRE2, compiled to machine code). Case is ignored, texts are UTF-8 and may
-// hold bytes that are not: those match nothing. A search that would take exponentially long is
+// Regular expressions (PCRE2, compiled to machine code). Case is ignored unless it is asked for,
+// texts are UTF-8 and may hold bytes that are not: those match nothing. A search that would take exponentially long is
 // given up and counts as not matching.
 
 #include <memory>
@@ -21,7 +21,8 @@ class Regex {
   };
 
   // kErrorIllegal for a broken expression, with what is wrong and where in the place of a path.
-  static Result<std::shared_ptr<const Regex>> Compile(std::string_view pattern, Kind kind);
+  static Result<std::shared_ptr<const Regex>> Compile(std::string_view pattern, Kind kind,
+                                                      bool exact_case = false);
   ~Regex();
   Regex(const Regex&) = delete;
   Regex& operator=(const Regex&) = delete;

@@ -1,5 +1,7 @@
 #include "nas/results/result_reader.h"
 
+#include "nas/results/row_query.h"
+
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -93,16 +95,43 @@ std::vector<bool> ResultReader::Passing(const Selection& selection) {
       if (S_ISDIR(attributes.mode) != *selection.directories) passes[row] = false;
     });
   }
-  if (selection.pattern) {
-    FoldedName folded;
+  if (selection.pattern) FilterByQuery(*selection.pattern, passes);
+  return passes;
+}
+
+void ResultReader::FilterByQuery(const Query& query, std::vector<bool>& passes) {
+  FoldedName folded;
+  QuerySubject subject;
+  subject.name = &folded;
+  const auto more_than_name = [](const QueryNode& leaf) {
+    const bool of_name = leaf.kind == QueryNode::Kind::kText && !leaf.text->of_path();
+    return !of_name && leaf.kind != QueryNode::Kind::kExtension;
+  };
+  if (!AnyLeaf(query.root(), more_than_name)) {
     blocks_.ForEachNames([&](std::uint64_t first, const BlockReader::Names& block) {
       for (size_t i = 0; i < block.names.size(); ++i) {
         folded.Set(block.names[i]);
-        if (passes[first + i] && !selection.pattern->Matches(folded)) passes[first + i] = false;
+        if (passes[first + i] && Ask(query.root(), subject) != Answer::kYes) passes[first + i] = false;
       }
     });
+    return;
   }
-  return passes;
+  EntryPath path;
+  QueryAttributes attributes;
+  subject.path = &path;
+  subject.attributes = &attributes;
+  for (std::uint32_t i = 0; i < passes.size(); ++i) {
+    if (!passes[i]) continue;
+    const ResultRow row = blocks_.Row(i);
+    folded.Set(row.name);
+    subject.is_folder = S_ISDIR(row.attributes->mode);
+    subject.is_file = S_ISREG(row.attributes->mode);
+    path.SetBase({"/" + std::string(row.share_name), std::string(row.share_root), ""});
+    path.SetFolder(row.folder);
+    path.SetEntry(row.name, subject.is_folder);
+    attributes = AttributesOf(*row.attributes);
+    passes[i] = Ask(query.root(), subject) == Answer::kYes;
+  }
 }
 
 void ResultReader::KeepAllOrderings() {

@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "nas/base/sqlite.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query.h"
 #include "nas/results/block_reader.h"
 #include "nas/results/row_sorter.h"
 
@@ -24,7 +24,7 @@ struct Selection {
   SortColumn column = SortColumn::kFound;
   bool ascending = true;
   std::optional<bool> directories;  // only folders, or only others
-  std::optional<NamePattern> pattern;
+  std::optional<Query> pattern;  // judged by what a row holds
   bool filters() const { return directories || pattern; }
 };
 
@@ -67,6 +67,7 @@ class ResultReader {
  private:
   void ReadPurged();
   std::vector<bool> Passing(const Selection& selection);
+  void FilterByQuery(const Query& query, std::vector<bool>& passes);
 
   const std::string path_;
   Database db_;

@@ -25,7 +25,7 @@ void ContentReading::Read(const CandidateList::Record& record, Judge& judge) {
     search_.progress.AddSkipped(errno);
     return;
   }
-  judge.Enter(fd.get(), record.location, record.folder_path);
+  judge.Enter(fd.get(), record.location, location, record.folder_path);
   for (std::string_view names = record.names; !names.empty() && !search_.stopping();) {
     judge.Contents(names.data());
     names.remove_prefix(names.find('\0') + 1);

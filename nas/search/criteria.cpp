@@ -5,104 +5,146 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <memory>
 
 #include "nas/base/accounts.h"
 #include "nas/base/error.h"
-#include "nas/search/walk_entry.h"
 
 namespace nas {
+namespace {
 
-bool PatternComp::match(const FileSearch::WalkEntry& entry) const {
-  return pattern_.Matches(*entry.name);
+using Kind = QueryNode::Kind;
+
+// How much it takes to judge by it: a name, a path, an inode, a folder, contents.
+int CostOf(const QueryNode& node) {
+  enum { kName, kTable, kPath, kInode, kFolder, kContents };
+  switch (node.kind) {
+    case Kind::kText:
+      return node.text->of_path() ? kPath : kName;
+    case Kind::kExtension:
+    case Kind::kType:
+    case Kind::kDepth:
+      return kTable;
+    case Kind::kEmpty:
+      return kFolder;
+    case Kind::kContent:
+      return kContents;
+    default:
+      break;
+  }
+  int cost = IsOfAttributes(node.kind) ? kInode : kName;
+  for (const QueryNode& child : node.children) cost = std::max(cost, CostOf(child));
+  return cost;
 }
 
-ExtensionComp::ExtensionComp(std::string_view list) {
-  constexpr std::string_view kSeparators = ",; ";
-  size_t at = 0;
-  while ((at = list.find_first_not_of(kSeparators, at)) != std::string_view::npos) {
-    const size_t end = std::min(list.find_first_of(kSeparators, at), list.size());
-    std::string_view extension = list.substr(at, end - at);
-    at = end;
-    if (extension.starts_with("*.")) extension.remove_prefix(1);
-    if (extension.starts_with(".")) extension.remove_prefix(1);
-    if (!extension.empty()) suffixes_.push_back("." + FoldText(extension));
+bool AsksPath(const QueryNode& leaf) {
+  return leaf.kind == Kind::kDepth || (leaf.kind == Kind::kText && leaf.text->of_path());
+}
+
+}  // namespace
+
+Criteria::Criteria(const std::vector<FileSearch::FindComp*>& comps) {
+  for (const FileSearch::FindComp* comp : comps) {
+    QueryNode node = comp->criterion().node;
+    if (node.kind == Kind::kAll) {
+      std::ranges::move(node.children, std::back_inserter(root.children));
+    } else {
+      root.children.push_back(std::move(node));
+    }
+  }
+  std::ranges::stable_sort(root.children, {}, CostOf);
+  ask_attributes = AnyLeaf(root, [](const QueryNode& leaf) { return IsOfAttributes(leaf.kind); });
+  ask_paths = AnyLeaf(root, AsksPath);
+}
+
+namespace {
+
+// A leaf of bounds: on which side of them the entry lies.
+Refusal OutOf(const QueryNode& node, std::int64_t value, Refusal below, Refusal above) {
+  return value < node.bounds.front().from ? below : above;
+}
+
+Refusal WhyNotLeaf(const QueryNode& node, const QuerySubject& subject) {
+  const QueryAttributes none;
+  const QueryAttributes& file = subject.attributes != nullptr ? *subject.attributes : none;
+  switch (node.kind) {
+    case Kind::kContent:
+      return Refusal::kContentsAsked;
+    case Kind::kExtension:
+      return Refusal::kExtension;
+    case Kind::kType:
+      return Refusal::kKind;
+    case Kind::kSize:
+      return OutOf(node, file.size, Refusal::kTooSmall, Refusal::kTooLarge);
+    case Kind::kModified:
+      return OutOf(node, file.modified, Refusal::kModifiedEarlier, Refusal::kModifiedLater);
+    case Kind::kCreated:
+      return OutOf(node, file.created, Refusal::kCreatedEarlier, Refusal::kCreatedLater);
+    case Kind::kOpened:
+      return OutOf(node, file.opened, Refusal::kReadEarlier, Refusal::kReadLater);
+    case Kind::kOwner:
+      return Refusal::kOwner;
+    case Kind::kGroup:
+      return Refusal::kGroup;
+    case Kind::kDepth:
+      return Refusal::kDepth;
+    case Kind::kEmpty:
+      return Refusal::kNotEmpty;
+    default:
+      return node.text != nullptr && node.text->of_path() ? Refusal::kPath : Refusal::kName;
   }
 }
 
-bool ExtensionComp::match(const FileSearch::WalkEntry& entry) const {
-  if (suffixes_.empty()) return true;
-  const std::string_view name = entry.name->folded();
-  return std::ranges::any_of(suffixes_, [name](const std::string& suffix) {
-    return name.size() > suffix.size() && name.ends_with(suffix);
-  });
-}
+}  // namespace
 
-std::unique_ptr<KindComp> KindComp::Parse(std::string_view word) {
-  static constexpr struct {
-    std::string_view word;
-    FileCategory category;
-  } kCategories[] = {{"image", FileCategory::kImage},
-                     {"video", FileCategory::kVideo},
-                     {"audio", FileCategory::kAudio},
-                     {"document", FileCategory::kDocument},
-                     {"archive", FileCategory::kArchive}};
-  const std::string folded = AsciiLower(word);
-  std::unique_ptr<KindComp> comp(new KindComp);
-  comp->any_ = folded.empty();
-  if (folded.empty() || folded == "file") return comp;
-  if (folded == "dir") {
-    comp->dirs_ = true;
-    return comp;
+Refusal WhyNot(const QueryNode& node, const QuerySubject& subject) {
+  if (node.kind == Kind::kAll) {
+    for (const QueryNode& child : node.children) {
+      if (Ask(child, subject) == Answer::kNo) return WhyNot(child, subject);
+    }
   }
-  for (const auto& known : kCategories) {
-    if (folded != known.word) continue;
-    comp->category_ = known.category;
-    return comp;
-  }
-  return nullptr;
-}
-
-bool KindComp::match(const FileSearch::WalkEntry& entry) const {
-  if (any_) return true;
-  if (entry.is_dir != dirs_) return false;
-  return !category_ || IsInCategory(ExtensionOf(entry.name->folded()), *category_);
-}
-
-bool OwnerComp::match(const FileSearch::WalkEntry& entry) const {
-  return entry.attributes->uid == uid_;
-}
-
-bool GroupComp::match(const FileSearch::WalkEntry& entry) const {
-  return entry.attributes->gid == gid_;
+  const bool is_list = node.kind <= Kind::kNot;
+  if (!is_list) return WhyNotLeaf(node, subject);
+  const auto is_other = [](const QueryNode& leaf) {
+    return leaf.kind != Kind::kText || leaf.text->of_path();
+  };
+  if (!AnyLeaf(node, is_other)) return Refusal::kName;
+  return node.kind == Kind::kNot ? Refusal::kExcluded : Refusal::kNeither;
 }
 
 namespace {
 
 using Made = Result<std::unique_ptr<FileSearch::FindComp>>;
 
+Made Make(QueryNode node) { return Made(std::make_unique<NodeComp>(std::move(node))); }
+
 Made MakePattern(const char* text) {
-  auto pattern = NamePattern::Parse(text);
-  if (pattern) return Made(std::make_unique<PatternComp>(std::move(*pattern)));
-  syslog(LOG_NOTICE, "search pattern refused: %s", pattern.error().path.c_str());
-  return pattern.error();
+  auto query = Query::Parse(text);
+  if (query) return Make(query->root());
+  syslog(LOG_NOTICE, "search pattern refused: %s", query.error().path.c_str());
+  return query.error();
 }
 
+// An empty word restricts nothing.
 Made MakeKind(const char* word) {
-  auto comp = KindComp::Parse(word);
-  if (!comp) return Error{kErrorIllegal, EINVAL, word};
-  return Made(std::move(comp));
+  QueryNode node{.kind = Kind::kType};
+  if (*word == '\0') return Make(std::move(node));
+  const auto type = ParseFileType(word);
+  if (!type) return Error{kErrorIllegal, EINVAL, word};
+  node.types.push_back(*type);
+  return Make(std::move(node));
 }
 
 Made MakeOwner(const char* name) {
   const auto user = FindAccount(name);
   if (!user) return user.error();
-  return Made(std::make_unique<OwnerComp>(user->uid));
+  return Make(BoundsNode(Kind::kOwner, {user->uid, user->uid}));
 }
 
 Made MakeGroup(const char* name) {
   const auto group = FindGroup(name);
   if (!group) return group.error();
-  return Made(std::make_unique<GroupComp>(group->gid));
+  return Make(BoundsNode(Kind::kGroup, {group->gid, group->gid}));
 }
 
 Made MakeComp(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const char* text) {
@@ -114,7 +156,7 @@ Made MakeComp(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const char* text)
     case FindFactory::FIND_FILETYPE:
       return MakeKind(text);
     case FindFactory::FIND_EXTENSION:
-      return Made(std::make_unique<ExtensionComp>(text));
+      return Make(ExtensionNode(text));
     case FindFactory::FIND_OWNER:
       return MakeOwner(text);
     case FindFactory::FIND_GROUP:
@@ -127,46 +169,36 @@ Made MakeComp(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const char* text)
 }  // namespace nas
 
 namespace FileSearch {
+namespace {
+
+Criterion Bound(nas::QueryNode::Kind kind, bool least, std::int64_t value) {
+  nas::Bounds bounds;
+  (least ? bounds.from : bounds.to) = value;
+  return {nas::BoundsNode(kind, bounds)};
+}
+
+}  // namespace
 
 FindSizeComp::FindSizeComp(const char* op, long long bytes)
     : at_least_(std::strcmp(op, "greater") == 0), bytes_(bytes) {}
 
-bool FindSizeComp::match(const WalkEntry& entry) const {
-  if (entry.is_dir) return false;
-  const auto size = static_cast<long long>(entry.attributes->size);
-  return at_least_ ? size >= bytes_ : size <= bytes_;
-}
-
-Refusal FindSizeComp::refusal() const {
-  return at_least_ ? Refusal::kTooSmall : Refusal::kTooLarge;
+Criterion FindSizeComp::criterion() const {
+  return Bound(nas::QueryNode::Kind::kSize, at_least_, bytes_);
 }
 
 FindTimeComp::FindTimeComp(const char* op, long seconds)
     : after_(std::strcmp(op, "after") == 0), seconds_(seconds) {}
 
-bool FindTimeComp::InRange(std::int64_t file_seconds) const {
-  return after_ ? file_seconds >= seconds_ : file_seconds <= seconds_;
+Criterion FindMTimeComp::criterion() const {
+  return Bound(nas::QueryNode::Kind::kModified, after(), seconds());
 }
 
-bool FindMTimeComp::match(const WalkEntry& entry) const { return InRange(entry.attributes->mtime); }
-
-bool FindCRTimeComp::match(const WalkEntry& entry) const {
-  return entry.attributes->crtime != nas::FileAttributes::kNoTime &&
-         InRange(entry.attributes->crtime);
+Criterion FindCRTimeComp::criterion() const {
+  return Bound(nas::QueryNode::Kind::kCreated, after(), seconds());
 }
 
-bool FindATimeComp::match(const WalkEntry& entry) const { return InRange(entry.attributes->atime); }
-
-Refusal FindMTimeComp::refusal() const {
-  return OutOfRange(Refusal::kModifiedEarlier, Refusal::kModifiedLater);
-}
-
-Refusal FindCRTimeComp::refusal() const {
-  return OutOfRange(Refusal::kCreatedEarlier, Refusal::kCreatedLater);
-}
-
-Refusal FindATimeComp::refusal() const {
-  return OutOfRange(Refusal::kReadEarlier, Refusal::kReadLater);
+Criterion FindATimeComp::criterion() const {
+  return Bound(nas::QueryNode::Kind::kOpened, after(), seconds());
 }
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,

@@ -1,83 +1,45 @@
 #pragma once
-// The criteria on names, kinds, owners and groups. Those on sizes and times are part of
-// platform/filesearch.h, because the module makes them itself.
+// The criteria of a search as one tree. Those that a request gives in parameters of their own are
+// comparators (platform/filesearch.h), because the module makes them; each is a part of the tree,
+// and so is all of the pattern.
 
-#include <sys/types.h>
-
-#include <optional>
-#include <string>
-#include <string_view>
+#include <utility>
 #include <vector>
 
-#include "nas/match/file_kinds.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query.h"
+#include "nas/match/query_match.h"
 #include "nas/search/refusal.h"
 #include "platform/filesearch.h"
 
+namespace FileSearch {
+
+struct Criterion {
+  nas::QueryNode node;
+};
+
+}  // namespace FileSearch
+
 namespace nas {
 
-class PatternComp : public FileSearch::FindComp {
+class NodeComp : public FileSearch::FindComp {
  public:
-  explicit PatternComp(NamePattern pattern) : pattern_(std::move(pattern)) {}
-  Needs needs() const override { return Needs::kName; }
-  bool match(const FileSearch::WalkEntry& entry) const override;
-  Refusal refusal() const override { return Refusal::kName; }
-  const NamePattern& pattern() const { return pattern_; }
+  explicit NodeComp(QueryNode node) : node_(std::move(node)) {}
+  FileSearch::Criterion criterion() const override { return {node_}; }
 
  private:
-  NamePattern pattern_;
+  QueryNode node_;
 };
 
-// Names that end in one of several extensions; none given restricts nothing. Folders have a name
-// like files, so they can match.
-class ExtensionComp : public FileSearch::FindComp {
- public:
-  // A list separated by ",", ";" or spaces; a leading "." or "*." of each is dropped.
-  explicit ExtensionComp(std::string_view list);
-  Needs needs() const override { return Needs::kName; }
-  bool match(const FileSearch::WalkEntry& entry) const override;
-  Refusal refusal() const override { return Refusal::kExtension; }
+struct Criteria {
+  explicit Criteria(const std::vector<FileSearch::FindComp*>& comps);
 
- private:
-  std::vector<std::string> suffixes_;  // folded, each with its dot
+  QueryNode root;  // all of them, cheapest first
+  bool ask_attributes = false;
+  bool ask_paths = false;
 };
 
-class KindComp : public FileSearch::FindComp {
- public:
-  // "file", "dir", "image", "video", "audio", "document", "archive" in any letter case; an empty
-  // word restricts nothing. Null for any other.
-  static std::unique_ptr<KindComp> Parse(std::string_view word);
-  Needs needs() const override { return Needs::kName; }
-  bool match(const FileSearch::WalkEntry& entry) const override;
-  Refusal refusal() const override { return Refusal::kKind; }
-
- private:
-  KindComp() = default;
-  bool any_ = false;
-  bool dirs_ = false;
-  std::optional<FileCategory> category_;
-};
-
-class OwnerComp : public FileSearch::FindComp {
- public:
-  explicit OwnerComp(uid_t uid) : uid_(uid) {}
-  Needs needs() const override { return Needs::kAttributes; }
-  bool match(const FileSearch::WalkEntry& entry) const override;
-  Refusal refusal() const override { return Refusal::kOwner; }
-
- private:
-  uid_t uid_;
-};
-
-class GroupComp : public FileSearch::FindComp {
- public:
-  explicit GroupComp(gid_t gid) : gid_(gid) {}
-  Needs needs() const override { return Needs::kAttributes; }
-  bool match(const FileSearch::WalkEntry& entry) const override;
-  Refusal refusal() const override { return Refusal::kGroup; }
-
- private:
-  gid_t gid_;
-};
+// Why an entry that the tree refuses, as far as it is known, is left out: by the first criterion
+// that it does not meet.
+Refusal WhyNot(const QueryNode& node, const QuerySubject& subject);
 
 }  // namespace nas

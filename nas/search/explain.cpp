@@ -33,9 +33,10 @@ class Step {
   DirectoryReader reader_;  // holds the entry's name
 };
 
-Explanation JudgeEntry(SharedSearch& search, int folder, const DirectoryReader::Entry& entry) {
-  Judge judge(search);
-  judge.Enter(folder, 0, {});
+Explanation JudgeEntry(SharedSearch& search, const Location& location, int folder,
+                       std::string_view folder_path, const DirectoryReader::Entry& entry) {
+  Judge judge(search, true);
+  judge.Enter(folder, 0, location, folder_path);
   Explanation found;
   found.refusal = judge.Entry(entry);
   if (found.refusal == Refusal::kContentsUnread) {
@@ -54,7 +55,7 @@ Result<Explanation> Explain(const ExplainedSearch& asked, size_t number, std::st
   const int never = 0;
   NoRows sink;
   SharedSearch search(asked.comps, sink, never);
-  if (asked.search_content) search.AskContents();
+  search.AskContents(asked.search_content);
   const FolderGate gate(asked.locations, asked.recursive);
   const Location& location = asked.locations[number];
   std::string at = location.path;
@@ -63,10 +64,11 @@ Result<Explanation> Explain(const ExplainedSearch& asked, size_t number, std::st
     Step step;
     const std::string_view name = path.substr(0, path.find('/'));
     const auto entry = step.Find(folder.fd.get(), name);
+    const std::string folder_path = at;
     at.append(at.empty() ? "" : "/").append(name);
     if (!entry) return Error{entry.error().kind, entry.error().error_number, at};
     if (name.size() == path.size()) {
-      Explanation found = JudgeEntry(search, folder.fd.get(), *entry);
+      Explanation found = JudgeEntry(search, location, folder.fd.get(), folder_path, *entry);
       found.path = at;
       return found;
     }

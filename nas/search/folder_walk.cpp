@@ -11,7 +11,7 @@ namespace nas {
 static_assert(FolderStack::kMostThreads >= NameSource::kMostThreads);
 
 FolderWalk::FolderWalk(const std::vector<Location>& locations, bool recursive, SharedSearch& search)
-    : search_(search), gate_(locations, recursive) {
+    : locations_(locations), search_(search), gate_(locations, recursive) {
   std::set<std::pair<dev_t, ino_t>> known;
   for (size_t i = 0; i < locations.size(); ++i) {
     const bool added = known.emplace(locations[i].device, locations[i].inode).second;
@@ -54,7 +54,7 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
   std::uint64_t entries = 0;
   DirectoryReader::Entry entry;
   reading.reader.Start(fd.get());
-  reading.judge.Enter(fd.get(), location, path);
+  reading.judge.Enter(fd.get(), location, locations_[location], path);
   while (reading.reader.Next(entry) && !search_.stopping()) {
     ++entries;
     if (gate_.Below(entry.type) == Refusal::kNone) below->names.append(entry.name).push_back('\0');

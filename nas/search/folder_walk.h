@@ -35,6 +35,7 @@ class FolderWalk : public NameSource {
   void Push(std::uint16_t number, const Location& location);
   void ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading& reading);
 
+  const std::vector<Location>& locations_;
   SharedSearch& search_;
   const FolderGate gate_;
   FolderStack stack_;

@@ -1,9 +1,12 @@
 #include "nas/search/judge.h"
 
 #include <dirent.h>
+#include <fcntl.h>
 
 #include <algorithm>
 #include <cerrno>
+
+#include "nas/results/row_query.h"
 
 namespace nas {
 namespace {
@@ -13,54 +16,64 @@ constexpr size_t kCandidatesInRecord = 64;
 
 }  // namespace
 
-Criteria::Criteria(const std::vector<FileSearch::FindComp*>& comps) {
-  for (const FileSearch::FindComp* comp : comps) {
-    if (const auto* named = dynamic_cast<const PatternComp*>(comp);
-        named != nullptr && pattern == nullptr) {
-      pattern = named;
-    } else if (comp->needs() == FileSearch::FindComp::Needs::kAttributes) {
-      attribute.push_back({comp, comp->refusal()});
-    } else {
-      cheap.push_back({comp, comp->refusal()});
-    }
-  }
+void SharedSearch::AskContents(bool texts_too) {
+  content = ContentQuery::From(criteria.root, texts_too);
 }
 
-void SharedSearch::AskContents() {
-  if (criteria.pattern != nullptr) content = ContentQuery::From(criteria.pattern->pattern());
-}
-
-void SharedSearch::SearchContents(const std::string& temporary_folder) {
-  AskContents();
+void SharedSearch::SearchContents(const std::string& temporary_folder, bool texts_too) {
+  AskContents(texts_too);
   if (content) candidates = std::make_unique<CandidateList>(temporary_folder);
 }
 
-void Judge::Enter(int fd, std::uint16_t location, std::string_view path) {
-  folder_ = {fd, location, path, false};
+void Judge::Enter(int fd, std::uint16_t number, const Location& location, std::string_view path) {
+  folder_ = {fd, number, path, false};
+  if (!search_.criteria.ask_paths) return;
+  if (path_base_ != number) {
+    const std::string below = location.path.empty() ? "" : "/" + location.path;
+    path_.SetBase({"/" + location.share.name + below, location.share.root + below, location.path});
+    path_base_ = number;
+  }
+  path_.SetFolder(path);
+}
+
+void Judge::Meet(std::string_view name, unsigned char type) {
+  folded_.Set(name);
+  subject_ = {};
+  subject_.name = &folded_;
+  subject_.is_folder = type == DT_DIR;
+  subject_.is_file = type == DT_REG;
+  if (!search_.criteria.ask_paths) return;
+  path_.SetEntry(name, subject_.is_folder);
+  subject_.path = &path_;
+}
+
+// By its name or, where that is enough, by its contents.
+Answer Judge::Ask() const {
+  if (!search_.content) return nas::Ask(search_.criteria.root, subject_);
+  const Answer named = nas::Ask(search_.content->root(), subject_);
+  if (named == Answer::kYes || !search_.content->texts_too()) return named;
+  QuerySubject inside = subject_;
+  inside.texts_in_contents = true;
+  return std::max(named, nas::Ask(search_.content->root(), inside));
+}
+
+Refusal Judge::Why() const {
+  return explain_ ? WhyNot(search_.criteria.root, subject_) : Refusal::kName;
 }
 
 Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
-  folded_.Set(entry.name);
-  entry_.name = &folded_;
-  entry_.is_dir = entry.type == DT_DIR;
-  const Criteria& criteria = search_.criteria;
-  const bool named = criteria.pattern == nullptr || criteria.pattern->match(entry_);
-  const bool candidate = !named && search_.content && entry.type == DT_REG;
-  if (!named && !candidate) return Refusal::kName;
-  for (const Criteria::Criterion& criterion : criteria.cheap) {
-    if (!criterion.comp->match(entry_)) return criterion.refusal;
-  }
+  Meet(entry.name, entry.type);
+  Answer answer = Ask();
+  if (answer == Answer::kNo) return Why();
   FileAttributes attributes;
-  if (named || !criteria.attribute.empty()) {
+  if (answer == Answer::kYes || search_.criteria.ask_attributes) {
     const Result<FileAttributes> read = Look(entry.name.data());
     if (!read) return Refusal::kVanished;
     attributes = *read;
-    entry_.attributes = &attributes;
-    for (const Criteria::Criterion& criterion : criteria.attribute) {
-      if (!criterion.comp->match(entry_)) return criterion.refusal;
-    }
+    if (answer != Answer::kYes) answer = Ask();
+    if (answer == Answer::kNo) return Why();
   }
-  if (candidate) {
+  if (answer == Answer::kMaybe) {
     candidates_.emplace_back(entry.inode, entry.name);
     return Refusal::kContentsUnread;
   }
@@ -68,9 +81,27 @@ Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
   return Refusal::kNone;
 }
 
+// One that cannot be read is not known to be empty.
+bool Judge::IsEmptyFolder(const char* name) {
+  constexpr int kFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC | O_NONBLOCK;
+  const UniqueFd folder(openat(folder_.fd, name, kFlags));
+  if (!folder) return false;
+  if (!emptiness_) emptiness_.emplace();
+  DirectoryReader::Entry entry;
+  emptiness_->Start(folder.get());
+  return !emptiness_->Next(entry) && emptiness_->failed() == 0;
+}
+
 Result<FileAttributes> Judge::Look(const char* name) {
   Result<FileAttributes> attributes = ReadAttributes(folder_.fd, name);
-  if (!attributes) Skip(attributes.error().error_number);
+  if (!attributes) {
+    Skip(attributes.error().error_number);
+    return attributes;
+  }
+  attributes_ = AttributesOf(*attributes);
+  subject_.attributes = &attributes_;
+  is_empty_folder_ = [this, name] { return IsEmptyFolder(name); };
+  subject_.is_empty_folder = &is_empty_folder_;
   return attributes;
 }
 
@@ -81,11 +112,20 @@ void Judge::Skip(int error_number) {
 
 Refusal Judge::Contents(const char* name) {
   if (!scanner_) scanner_.emplace(*search_.content, search_.stop_flag);
-  switch (scanner_->Scan(folder_.fd, name)) {
+  Meet(name, DT_REG);
+  if (search_.criteria.ask_attributes && !Look(name)) return Refusal::kVanished;
+  const auto decide = [this](const std::vector<bool>& found, bool all_read) {
+    subject_.found = &found;
+    subject_.all_read = all_read;
+    return Ask();
+  };
+  const ContentScanner::Outcome outcome = scanner_->Scan(folder_.fd, name, decide);
+  subject_.found = nullptr;
+  switch (outcome) {
     case ContentScanner::Outcome::kMatch:
       break;
     case ContentScanner::Outcome::kNoMatch:
-      return Refusal::kContents;
+      return search_.content->texts_too() ? Refusal::kContents : Refusal::kContentsAsked;
     case ContentScanner::Outcome::kBinary:
       search_.progress.AddNotText();
       return Refusal::kBinary;

@@ -1,10 +1,11 @@
 #pragma once
 // The judging of entries, apart from where they come from (name_source.h) and where the results go
 // (row_sink.h): names first, attributes only where a name has passed, contents last. Each rule that
-// leaves an entry out is one named return (refusal.h).
+// leaves an entry out has a name (refusal.h).
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -18,24 +19,11 @@
 #include "nas/results/row_sink.h"
 #include "nas/search/candidate_list.h"
 #include "nas/search/criteria.h"
+#include "nas/search/location.h"
 #include "nas/search/refusal.h"
-#include "nas/search/walk_entry.h"
 #include "nas/search/walk_progress.h"
 
 namespace nas {
-
-// The criteria of a search, cheapest first. Comparators are borrowed.
-struct Criteria {
-  explicit Criteria(const std::vector<FileSearch::FindComp*>& comps);
-
-  struct Criterion {
-    const FileSearch::FindComp* comp;
-    Refusal refusal;  // of what does not match it
-  };
-  const PatternComp* pattern = nullptr;  // judged on its own: contents can stand in
-  std::vector<Criterion> cheap;          // names and kinds
-  std::vector<Criterion> attribute;
-};
 
 // What the threads of one search share. Set up before the first of them starts; after that only
 // what is safe to use from several threads changes. Comparators, sink and flag are borrowed.
@@ -43,11 +31,12 @@ struct SharedSearch {
   SharedSearch(const std::vector<FileSearch::FindComp*>& comps, RowSink& row_sink, const int& flag)
       : criteria(comps), sink(row_sink), stop_flag(flag) {}
 
-  // Lets contents stand in for names, where the pattern is one that can be looked for in them.
-  void AskContents();
+  // Lets contents be judged where the criteria ask for them; with `texts_too` also in the place of
+  // names, where the pattern is one that can be looked for in them.
+  void AskContents(bool texts_too);
   // The same, with somebody to read them: the files to read wait in a file without a name in
   // `temporary_folder`. Throws std::system_error.
-  void SearchContents(const std::string& temporary_folder);
+  void SearchContents(const std::string& temporary_folder, bool texts_too);
   bool stopped() const { return __atomic_load_n(&stop_flag, __ATOMIC_RELAXED) != 0; }
   bool stopping() const { return stopped() || failed.load(std::memory_order_relaxed); }
 
@@ -64,11 +53,14 @@ struct SharedSearch {
 // Flush are for that thread alone. They throw what the sink and the list of candidates throw.
 class Judge {
  public:
-  explicit Judge(SharedSearch& search) : search_(search) {}
+  // Telling which criterion an entry does not meet takes asking them again: who does not `explain`
+  // is told kName of all of them.
+  explicit Judge(SharedSearch& search, bool explain = false)
+      : search_(search), explain_(explain) {}
 
   // The entries that follow lie in the folder open at `fd`, at `path` below the root of the share
-  // of location number `location`. Both are borrowed until Leave.
-  void Enter(int fd, std::uint16_t location, std::string_view path);
+  // of `location`, whose number is `number`. The path is borrowed until Leave.
+  void Enter(int fd, std::uint16_t number, const Location& location, std::string_view path);
   // Judges an entry by everything but contents; what passes has become a row, and what contents may
   // still decide (kContentsUnread) a candidate.
   Refusal Entry(const DirectoryReader::Entry& entry);
@@ -90,13 +82,23 @@ class Judge {
     bool named_in_rows = false;  // whether rows_ was told of this folder
   };
 
+  void Meet(std::string_view name, unsigned char type);
+  Answer Ask() const;
+  Refusal Why() const;
+  bool IsEmptyFolder(const char* name);
   Result<FileAttributes> Look(const char* name);
   void Skip(int error_number);
   void AddRow(std::string_view name, const FileAttributes& attributes);
 
   SharedSearch& search_;
+  const bool explain_;
   FoldedName folded_;
-  FileSearch::WalkEntry entry_;
+  EntryPath path_;
+  std::optional<std::uint16_t> path_base_;  // the location of which path_ knows
+  QueryAttributes attributes_;
+  QuerySubject subject_;
+  std::function<bool()> is_empty_folder_;
+  std::optional<DirectoryReader> emptiness_;  // that it asks
   Folder folder_;
   int error_number_ = 0;
   std::vector<std::pair<ino_t, std::string>> candidates_;

@@ -8,6 +8,12 @@ const char* Words(Refusal refusal) {
       return "matches";
     case Refusal::kName:
       return "has a name that does not match the pattern";
+    case Refusal::kPath:
+      return "has a path that does not match the pattern";
+    case Refusal::kExcluded:
+      return "is what the pattern leaves out";
+    case Refusal::kNeither:
+      return "matches none of what the pattern gives to choose from";
     case Refusal::kExtension:
       return "has none of the extensions asked for";
     case Refusal::kKind:
@@ -32,12 +38,18 @@ const char* Words(Refusal refusal) {
       return "is not owned by the user asked for";
     case Refusal::kGroup:
       return "is not of the group asked for";
+    case Refusal::kDepth:
+      return "does not lie as deep as asked for";
+    case Refusal::kNotEmpty:
+      return "is not empty";
     case Refusal::kVanished:
       return "cannot be looked at";
     case Refusal::kContentsUnread:
       return "may match by its contents";
     case Refusal::kContents:
       return "matches neither by its name nor by its contents";
+    case Refusal::kContentsAsked:
+      return "does not have the contents asked for";
     case Refusal::kBinary:
       return "does not match by its name, and is binary, so its contents are not searched";
     case Refusal::kFileUnreadable:

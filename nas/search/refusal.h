@@ -8,6 +8,9 @@ enum class Refusal {
   kNone,  // it is a result
   // By criteria on the entry.
   kName,
+  kPath,
+  kExcluded,
+  kNeither,
   kExtension,
   kKind,
   kTooSmall,  // or a folder, which has no size of its own, as with the next
@@ -20,10 +23,13 @@ enum class Refusal {
   kReadLater,
   kOwner,
   kGroup,
+  kDepth,
+  kNotEmpty,
   kVanished,        // it went away, or cannot be looked at, after its folder had named it
   kContentsUnread,  // not decided yet: its contents can stand in for its name
   // By its contents.
   kContents,
+  kContentsAsked,
   kBinary,
   kFileUnreadable,
   kStopped,  // the search was stopped before it was decided

@@ -13,6 +13,7 @@
 
 #include "nas/base/error.h"
 #include "nas/match/file_kinds.h"
+#include "nas/match/query_match.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
 #include "nas/system/identity.h"
@@ -43,6 +44,12 @@ std::string RealPath(const nas::ResultRow& row) {
 bool HasVanished(const std::string& path) {
   struct stat info;
   return lstat(path.c_str(), &info) != 0 && (errno == ENOENT || errno == ENOTDIR);
+}
+
+// What is written of a file holds neither its contents nor how deep it lies in what was searched.
+bool AsksMoreThanRows(const nas::QueryNode& leaf) {
+  using Kind = nas::QueryNode::Kind;
+  return leaf.kind == Kind::kContent || leaf.kind == Kind::kDepth || leaf.kind == Kind::kEmpty;
 }
 
 // Lends rows to a callback in the platform's form, row after row from the same memory.
@@ -207,9 +214,9 @@ bool WfmSearchDBTask::queryResult(unsigned long offset, unsigned long limit, con
   selection.ascending = ascending == nullptr || *ascending;
   if (type != nullptr && *type != DIR_ENTRY_ALL) selection.directories = *type == DIR_ENTRY_DIR;
   if (pattern != nullptr) {
-    auto parsed = nas::NamePattern::Parse(pattern);
-    if (!parsed) return false;
-    if (!parsed->terms().empty()) selection.pattern = std::move(*parsed);
+    auto parsed = nas::Query::Parse(pattern);
+    if (!parsed || nas::AnyLeaf(parsed->root(), AsksMoreThanRows)) return false;
+    if (parsed->restricts()) selection.pattern = std::move(*parsed);
   }
   return impl_->Query(offset, limit, selection, callback, context, total);
 } catch (const std::bad_alloc&) {

@@ -210,7 +210,7 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
 
 bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch& search) {
   for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
-  if (options.get("search_content", false).asBool()) search.SearchContents(folder_);
+  search.SearchContents(folder_, options.get("search_content", false).asBool());
   nas::FolderWalk walk(locations_, !current_only_, search);
   nas::ContentReading contents(locations_, search);
   nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },

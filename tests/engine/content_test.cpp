@@ -24,7 +24,7 @@ class Contents : public testing::Test {
   ~Contents() override { std::filesystem::remove_all(folder_); }
 
   ContentScanner::Outcome Scan(const std::string& pattern_text, const std::string& content) {
-    const auto query = ContentQuery::From(*NamePattern::Parse(pattern_text));
+    const auto query = ContentQuery::From(Query::Parse(pattern_text)->root(), true);
     EXPECT_TRUE(query) << pattern_text;
     std::ofstream(folder_ + "/file", std::ios::binary) << content;
     return ContentScanner(*query, stop_).Scan(fd_.get(), "file");
@@ -92,7 +92,7 @@ TEST_F(Contents, Table) {
 
 TEST_F(Contents, WhatAsksForNoContents) {
   for (const char* pattern : {"", "*.txt", "a ?b", "!a", "!a !b", "a|!b"}) {
-    EXPECT_FALSE(ContentQuery::From(*NamePattern::Parse(pattern))) << pattern;
+    EXPECT_FALSE(ContentQuery::From(Query::Parse(pattern)->root(), true)) << pattern;
   }
 }
 
@@ -168,7 +168,7 @@ TEST_F(Contents, FirstLine) {
       {"é", "\xff\xfe\n\0c\0a\0\xe9\0"s, 2, "ca[é]"},
   };
   for (const auto& row : rows) {
-    const auto query = ContentQuery::From(*NamePattern::Parse(row.pattern));
+    const auto query = ContentQuery::From(Query::Parse(row.pattern)->root(), true);
     std::ofstream(folder_ + "/file", std::ios::binary) << row.content;
     const auto line = ContentScanner(*query, stop_).FirstLine(fd_.get(), "file", kMost);
     EXPECT_EQ(line ? line->number : 0, row.number) << row.pattern;
@@ -188,7 +188,7 @@ TEST_F(Contents, StopsAndFails) {
   stop_ = 0;
   std::filesystem::remove(folder_ + "/file");
   std::filesystem::create_symlink("/etc/passwd", folder_ + "/file");
-  const auto query = ContentQuery::From(*NamePattern::Parse("root"));
+  const auto query = ContentQuery::From(Query::Parse("root")->root(), true);
   EXPECT_EQ(ContentScanner(*query, stop_).Scan(fd_.get(), "file"), ContentScanner::Outcome::kFailed)
       << "links are not followed";
 }

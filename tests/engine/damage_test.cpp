@@ -57,7 +57,7 @@ void ReadAll(const std::string& path) {
     for (const bool filtered : {false, true}) {
       if (filtered) {
         selection.directories = false;
-        selection.pattern = *NamePattern::Parse("a");
+        selection.pattern = *Query::Parse("a");
       }
       for (const std::uint32_t number : reader.Select(selection, 0, kAllRows).numbers) {
         EXPECT_LT(reader.Row(number).name.size(), 512u);

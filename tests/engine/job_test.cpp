@@ -40,7 +40,7 @@ class Job : public nas_test::PlatformTest {
                              bool content = false) {
     std::vector<Location> locations;
     for (const std::string& text : texts) locations.push_back(std::move(*OpenLocation(text)));
-    PatternComp pattern(*NamePattern::Parse(pattern_text));
+    NodeComp pattern(Query::Parse(pattern_text)->root());
     const std::string path = ResultPath(base_ + "/results", NewResultId());
     {
       ResultWriter writer(path);
@@ -49,7 +49,7 @@ class Job : public nas_test::PlatformTest {
                            locations[i].share.root);
       }
       SharedSearch search({&pattern}, writer, stop_);
-      if (content) search.SearchContents(base_ + "/results");
+      search.SearchContents(base_ + "/results", content);
       FolderWalk walk(locations, true, search);
       ContentReading contents(locations, search);
       SearchJob job(search, {.report = [this](const WalkProgress&) { ++reports_; },

@@ -11,9 +11,9 @@
 
 #include "nas/match/folded_name.h"
 #include "nas/match/glob.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query.h"
+#include "nas/match/query_match.h"
 #include "nas/search/criteria.h"
-#include "nas/search/walk_entry.h"
 
 namespace nas {
 namespace {
@@ -21,15 +21,17 @@ namespace {
 using std::string_literals::operator""s;
 
 bool Matches(const std::string& pattern_text, const std::string& name) {
-  const auto pattern = NamePattern::Parse(pattern_text);
-  EXPECT_TRUE(pattern) << pattern_text;
+  const auto query = Query::Parse(pattern_text);
+  EXPECT_TRUE(query) << pattern_text;
   FoldedName folded;
   folded.Set(name);
-  return pattern && pattern->Matches(folded);
+  QuerySubject subject;
+  subject.name = &folded;
+  return query && Ask(query->root(), subject) == Answer::kYes;
 }
 
 // The cases are the page's too, which marks in a name what the pattern found: one table for both.
-TEST(NamePattern, Table) {
+TEST(Patterns, Table) {
   std::ifstream file(ARBORY_SOURCE_DIR "/tests/patterns.json");
   Json::Value rows;
   file >> rows;
@@ -40,7 +42,7 @@ TEST(NamePattern, Table) {
   }
 }
 
-TEST(NamePattern, NamesThatAreNotUtf8) {
+TEST(Patterns, NamesThatAreNotUtf8) {
   const struct Row {
     std::string pattern, name;
     bool matches;
@@ -68,17 +70,17 @@ TEST(NamePattern, NamesThatAreNotUtf8) {
   }
 }
 
-TEST(NamePattern, RefusesWhatIsBroken) {
+TEST(Patterns, RefusesWhatIsBroken) {
   for (const std::string& pattern :
        {"regex:("s, "regex:[a"s, "a regex:*"s, "nul\0l"s, std::string((64 << 10) + 1, 'a')}) {
-    const auto parsed = NamePattern::Parse(pattern);
+    const auto parsed = Query::Parse(pattern);
     ASSERT_FALSE(parsed) << pattern.substr(0, 20);
     EXPECT_EQ(parsed.error().kind, kErrorIllegal);
     EXPECT_FALSE(parsed.error().path.empty()) << pattern.substr(0, 20);
   }
 }
 
-TEST(NamePattern, HostilePatternsEnd) {
+TEST(Patterns, HostilePatternsEnd) {
   EXPECT_FALSE(Matches("*a*a*a*a*a*a*a*a*a*a*b", std::string(255, 'a')));
   EXPECT_FALSE(Matches("regex:^(a+)+$", std::string(255, 'a') + "b"));
   EXPECT_FALSE(Matches(std::string(5'000, '?'), std::string(255, 'a')));
@@ -104,18 +106,17 @@ TEST(FoldedName, OnlyKnownCharactersFoldToAscii) {
   EXPECT_GT(checked, 2'000'000);
 }
 
-struct Judged {
-  explicit Judged(std::string text, bool is_dir = false) : name(std::move(text)) {
-    folded.Set(name);
-    entry.name = &folded;
-    entry.is_dir = is_dir;
-    entry.attributes = &attributes;
-  }
-  const std::string name;
+Answer AskOf(const QueryNode& node, const std::string& name, bool is_folder,
+             const QueryAttributes* attributes = nullptr) {
   FoldedName folded;
-  FileAttributes attributes;
-  FileSearch::WalkEntry entry;
-};
+  folded.Set(name);
+  QuerySubject subject;
+  subject.name = &folded;
+  subject.is_folder = is_folder;
+  subject.is_file = !is_folder;
+  subject.attributes = attributes;
+  return Ask(node, subject);
+}
 
 TEST(Criteria, Extensions) {
   const struct {
@@ -138,8 +139,7 @@ TEST(Criteria, Extensions) {
       {"é", "x.e\u0301", true},
   };
   for (const auto& row : rows) {
-    const Judged judged(row.name);
-    EXPECT_EQ(ExtensionComp(row.list).match(judged.entry), row.matches)
+    EXPECT_EQ(AskOf(ExtensionNode(row.list), row.name, false) == Answer::kYes, row.matches)
         << row.list << " " << row.name;
   }
 }
@@ -149,7 +149,6 @@ TEST(Criteria, Kinds) {
     const char *word, *name;
     bool is_dir, matches;
   } rows[] = {
-      {"", "a", true, true},
       {"file", "a", false, true},
       {"file", "a", true, false},
       {"DIR", "a", true, true},
@@ -163,12 +162,14 @@ TEST(Criteria, Kinds) {
       {"archive", "gz", false, false},
   };
   for (const auto& row : rows) {
-    const Judged judged(row.name, row.is_dir);
-    const auto comp = KindComp::Parse(row.word);
-    ASSERT_TRUE(comp) << row.word;
-    EXPECT_EQ(comp->match(judged.entry), row.matches) << row.word << " " << row.name;
+    const auto type = ParseFileType(row.word);
+    ASSERT_TRUE(type) << row.word;
+    QueryNode node{.kind = QueryNode::Kind::kType};
+    node.types.push_back(*type);
+    EXPECT_EQ(AskOf(node, row.name, row.is_dir) == Answer::kYes, row.matches)
+        << row.word << " " << row.name;
   }
-  EXPECT_FALSE(KindComp::Parse("files"));
+  EXPECT_FALSE(ParseFileType("files"));
 }
 
 TEST(Criteria, BoundsAreInclusive) {
@@ -192,18 +193,18 @@ TEST(Criteria, BoundsAreInclusive) {
   };
   for (const auto& row : rows) {
     const auto judge = [&row](int value, bool is_dir) {
-      Judged judged("x", is_dir);
-      judged.attributes.size = static_cast<std::uint64_t>(value);
-      judged.attributes.atime = judged.attributes.mtime = judged.attributes.crtime = value;
-      return row.comp->match(judged.entry);
+      const QueryAttributes file{
+          .size = value, .modified = value, .created = value, .opened = value};
+      return AskOf(row.comp->criterion().node, "x", is_dir, &file) == Answer::kYes;
     };
     EXPECT_EQ(judge(99, false), row.below) << row.what;
     EXPECT_EQ(judge(100, false), row.at) << row.what;
     EXPECT_EQ(judge(101, false), row.above) << row.what;
     EXPECT_EQ(judge(100, true), row.folder) << row.what;
   }
-  Judged unknown("x");
-  EXPECT_FALSE(FileSearch::FindCRTimeComp("before", 100).match(unknown.entry))
+  const QueryAttributes unrecorded;
+  const FileSearch::FindCRTimeComp created("before", 100);
+  EXPECT_EQ(AskOf(created.criterion().node, "x", false, &unrecorded), Answer::kNo)
       << "a file whose creation time is not recorded";
 }
 

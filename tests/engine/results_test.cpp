@@ -83,7 +83,7 @@ TEST_F(Results, EveryColumnSorts) {
   files.directories = false;
   EXPECT_EQ(Names(reader, files), (std::vector<std::string>{a, b, d}));
   Selection pngs;
-  pngs.pattern = *NamePattern::Parse("*.png");
+  pngs.pattern = *Query::Parse("*.png");
   EXPECT_EQ(Names(reader, pngs), (std::vector<std::string>{a, b}));
 }
 

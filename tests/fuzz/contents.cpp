@@ -40,12 +40,33 @@ class PaddedFile {
 
 // Whether an expression's matches lie within a line, so that cutting between lines cannot change
 // them, and cost little, so that no length makes the library give up.
-bool IsTame(std::string_view pattern) {
-  constexpr std::string_view kTame = "abcdefghijklmnopqrstuvwxyz: ^$.?*+|";
-  if (pattern.find("regex:") == std::string_view::npos) return true;
-  const auto repeats = [](char byte) { return byte == '*' || byte == '+' || byte == '?'; };
-  return pattern.find_first_not_of(kTame) == std::string_view::npos &&
-         std::ranges::count_if(pattern, repeats) <= 1;
+bool IsTame(const std::string& expression) {
+  constexpr std::string_view kTame = "^$.?*+|";
+  bool repeated = false;
+  for (const char byte : expression) {
+    const bool repeats = byte == '*' || byte == '+' || byte == '?';
+    const bool letter = (byte >= 'a' && byte <= 'z') || byte == ' ';
+    if (!letter && kTame.find(byte) == std::string_view::npos) return false;
+    if (repeats && repeated) return false;
+    repeated |= repeats;
+  }
+  return true;
+}
+
+bool IsTame(const nas::QueryNode& root) {
+  return !AnyLeaf(root, [](const nas::QueryNode& leaf) {
+    return leaf.text != nullptr && leaf.text->is_regex() && !IsTame(leaf.text->text());
+  });
+}
+
+bool LooksForNewlines(const nas::QueryNode& root) {
+  return AnyLeaf(root, [](const nas::QueryNode& leaf) {
+    return leaf.text != nullptr && leaf.text->text().find('\n') != std::string::npos;
+  });
+}
+
+bool AsksOnlyTexts(const nas::QueryNode& root) {
+  return !AnyLeaf(root, [](const nas::QueryNode& leaf) { return leaf.text == nullptr; });
 }
 
 }  // namespace
@@ -56,10 +77,11 @@ int fuzz::Target(std::string_view text) {
   static PaddedFile file;
   const std::string_view written = fuzz::Take(&text, '\0');
   if (text.size() > kMostText || written.size() > kMostText) return fuzz::kUseless;
-  // One that looks for a line's end finds those that the file is filled with.
-  const auto pattern = nas::NamePattern::Parse(written);
-  if (!pattern || written.find('\n') != std::string_view::npos) return fuzz::kUsed;
-  const auto query = nas::ContentQuery::From(*pattern);
+  const auto parsed = nas::Query::Parse(written);
+  if (!parsed || LooksForNewlines(parsed->root()) || !AsksOnlyTexts(parsed->root())) {
+    return fuzz::kUsed;
+  }
+  const auto query = nas::ContentQuery::From(parsed->root(), true);
   if (!query) return fuzz::kUsed;
 
   const int go_on = 0;
@@ -73,7 +95,7 @@ int fuzz::Target(std::string_view text) {
   // Far enough from the front that a NUL does not make it binary, and whole in the first piece.
   const Outcome whole = scan(kPieceBytes / 2);
   DEMAND(whole == Outcome::kMatch || whole == Outcome::kNoMatch);
-  if (!IsTame(written)) return fuzz::kUsed;
+  if (!IsTame(parsed->root())) return fuzz::kUsed;
   // Cut behind every byte where there are few, behind some where there are many.
   constexpr size_t kMostCuts = 24;
   const size_t step = 1 + text.size() / kMostCuts;

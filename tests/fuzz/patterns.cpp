@@ -1,15 +1,18 @@
-// Name patterns against names: the matcher with all its shortcuts must say what the language says.
+// Queries against names and paths: the matcher with all its shortcuts must say what the language
+// says, and no query may cost more than its length allows.
 
 #include <vector>
 
 #include "nas/base/utf8.h"
-#include "nas/match/name_pattern.h"
+#include "nas/match/query.h"
+#include "nas/match/query_match.h"
 #include "tests/fuzz/fuzz.h"
 
 namespace {
 
-using nas::FoldedName;
-using nas::NamePattern;
+using nas::Answer;
+using nas::Query;
+using nas::QueryNode;
 
 // Bytes that are no UTF-8 are characters of their own.
 std::u32string Characters(std::string_view text) {
@@ -94,57 +97,87 @@ bool MatchesSlowly(std::string_view pattern, std::string_view text) {
   return reached.back();
 }
 
-bool FindsSlowly(const NamePattern::Alternative& alternative, std::string_view name) {
+bool FindsSlowly(const nas::TextTerm& term, std::string_view name) {
   bool valid = false;
   const std::string folded = nas::FoldText(name, &valid);
-  const auto finds = [&](const std::string& wanted) {
-    return alternative.glob ? MatchesSlowly(wanted, folded)
-                            : folded.find(wanted) != std::string::npos;
+  const auto finds = [&](const std::string& wanted, std::string_view text) {
+    return term.has_wildcards() ? MatchesSlowly(wanted, text)
+                                : text.find(wanted) != std::string_view::npos;
   };
-  return finds(nas::FoldText(alternative.text)) ||
-         (!valid && finds(nas::AsciiLower(alternative.text)));
+  const std::string wanted = nas::FoldText(term.text());
+  if (finds(wanted, folded)) return true;
+  if (!valid) return finds(nas::AsciiLower(term.text()), folded);
+  return nas::WithoutAccents(wanted) == wanted && finds(wanted, nas::WithoutAccents(folded));
 }
 
-// Nothing where the language leaves it to the expressions' library.
-bool MatchesByTheLanguage(const NamePattern& pattern, std::string_view name, bool* known) {
+// Nothing where it is left to the expressions' library, or to a table of cases.
+bool MatchesByTheLanguage(const QueryNode& node, std::string_view name, bool* known) {
+  using Kind = QueryNode::Kind;
   bool all = true;
-  for (const NamePattern::Term& term : pattern.terms()) {
-    bool either = false;
-    for (const NamePattern::Alternative& alternative : term) {
-      if (alternative.regex) *known = false;
-      either |= FindsSlowly(alternative, name) != alternative.negated;
-    }
-    all &= either;
+  bool any = false;
+  for (const QueryNode& child : node.children) {
+    const bool matches = MatchesByTheLanguage(child, name, known);
+    all &= matches;
+    any |= matches;
   }
-  return all;
+  if (node.kind <= Kind::kNot) {
+    return node.kind == Kind::kAll ? all : node.kind == Kind::kAny ? any : !any;
+  }
+  if (node.kind != Kind::kText || node.text->is_regex() || node.text->exact() ||
+      node.text->of_path() || node.text->text().find_first_of("\\{") != std::string::npos) {
+    *known = false;
+    return false;
+  }
+  return FindsSlowly(*node.text, name);
 }
 
-bool Matches(const NamePattern& pattern, std::string_view name) {
-  FoldedName folded;
+Answer Matches(const Query& query, const std::string& name) {
+  nas::FoldedName folded;
   folded.Set(name);
-  return pattern.Matches(folded);
+  nas::EntryPath path;
+  path.SetBase({"/share", "/disk", ""});
+  path.SetFolder("a/folder");
+  path.SetEntry(name, false);
+  const nas::QueryAttributes attributes;
+  nas::QuerySubject subject;
+  subject.name = &folded;
+  subject.path = &path;
+  const Answer early = Ask(query.root(), subject);
+  subject.attributes = &attributes;
+  const Answer answer = Ask(query.root(), subject);
+  // What was sure stays so.
+  DEMAND(early == Answer::kMaybe || early == answer);
+  return answer;
 }
 
 }  // namespace
 
-// The pattern, a line's end, the name.
-int fuzz::Target(std::string_view name) {
-  const std::string_view text = fuzz::Take(&name, '\n');
+// The query, a line's end, the name.
+int fuzz::Target(std::string_view rest) {
+  constexpr std::time_t kNow = 1'784'548'800;
+  const std::string_view text = fuzz::Take(&rest, '\n');
+  const std::string name(rest);
   if (name.size() > 255) return fuzz::kUseless;
-  const auto pattern = NamePattern::Parse(text);
-  if (!pattern) return fuzz::kUsed;
-  // The bytes of a broken pattern may be part of a name's character.
+  const auto query = Query::Parse(text, kNow);
+  if (!query) {
+    DEMAND(!query.error().path.empty());
+    return fuzz::kUsed;
+  }
+  // The bytes of a broken query may be part of a name's character.
   bool known = fuzz::IsValidUtf8(text);
-  const bool expected = MatchesByTheLanguage(*pattern, name, &known);
-  const bool found = Matches(*pattern, name);
-  if (known) DEMAND(found == expected);
-  DEMAND(!pattern->terms().empty() || found);
-  // Another term only restricts, and an alternative only adds.
-  const bool open = text.find_first_of("\":|!") == std::string_view::npos;
+  const bool expected = MatchesByTheLanguage(query->root(), name, &known);
+  const Answer found = Matches(*query, name);
+  if (known) DEMAND(found == (expected ? Answer::kYes : Answer::kNo));
+  DEMAND(query->restricts() || found == Answer::kYes);
+  // Another term only restricts, and an alternative only adds; brackets change nothing.
+  const bool open = text.find_first_of("\":|!<>") == std::string_view::npos;
   if (!open) return fuzz::kUsed;
-  const auto narrower = NamePattern::Parse(std::string(text) + " e");
-  DEMAND(narrower && (found || !Matches(*narrower, name)));
-  const auto wider = NamePattern::Parse(std::string(text) + "|e");
-  DEMAND(wider && (pattern->terms().size() != 1 || !found || Matches(*wider, name)));
+  const std::string written(text);
+  const auto narrower = Query::Parse(written + " e", kNow);
+  DEMAND(narrower && Matches(*narrower, name) <= found);
+  const auto wider = Query::Parse("<" + written + " >|e", kNow);
+  DEMAND(wider && (!query->restricts() || Matches(*wider, name) >= found));
+  const auto other = Query::Parse("!< " + written + " >", kNow);
+  DEMAND(other && (!query->restricts() || Matches(*other, name) != found));
   return fuzz::kUsed;
 }

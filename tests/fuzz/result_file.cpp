@@ -87,7 +87,7 @@ void CheckFile() {
       selection.column = nas::ParseSortColumn(column).value_or(nas::SortColumn::kFound);
       selection.ascending = *column != 's';
       CheckPage(&reader, selection);
-      selection.pattern = *nas::NamePattern::Parse("img !2");
+      selection.pattern = *nas::Query::Parse("img !2");
       selection.directories = false;
       CheckPage(&reader, selection);
     });

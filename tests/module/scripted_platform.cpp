@@ -69,13 +69,17 @@ std::string& MadeWith(const FileSearch::FindComp* comp) {
   return arguments[~reinterpret_cast<std::uintptr_t>(comp)];
 }
 
+}  // namespace
+
+struct FileSearch::Criterion {};
+
+namespace {
+
 class TextComp : public FileSearch::FindComp {
  public:
   explicit TextComp(const std::string& text) { MadeWith(this) = text; }
   ~TextComp() override { Note("~" + MadeWith(this)); }
-  Needs needs() const override { return Needs::kName; }
-  FileSearch::Refusal refusal() const override { return {}; }
-  bool match(const FileSearch::WalkEntry& /*entry*/) const override { return true; }
+  FileSearch::Criterion criterion() const override { return {}; }
 };
 
 template <class Comps>
@@ -448,20 +452,13 @@ namespace FileSearch {
 FindSizeComp::FindSizeComp(const char* op, long long bytes) : at_least_(*op == 'g'), bytes_(bytes) {
   MadeWith(this) = std::string("size ") + op + " " + std::to_string(bytes);
 }
-bool FindSizeComp::match(const WalkEntry& /*entry*/) const { return at_least_ && bytes_ != 0; }
-Refusal FindSizeComp::refusal() const { return {}; }
+Criterion FindSizeComp::criterion() const { return {}; }
 FindTimeComp::FindTimeComp(const char* op, long seconds) : after_(*op == 'a'), seconds_(seconds) {
   MadeWith(this) = std::string(op) + " " + std::to_string(seconds);
 }
-bool FindTimeComp::InRange(std::int64_t file_seconds) const {
-  return after_ == (file_seconds >= seconds_);
-}
-bool FindMTimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
-Refusal FindMTimeComp::refusal() const { return {}; }
-bool FindCRTimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
-Refusal FindCRTimeComp::refusal() const { return {}; }
-bool FindATimeComp::match(const WalkEntry& /*entry*/) const { return InRange(0); }
-Refusal FindATimeComp::refusal() const { return {}; }
+Criterion FindMTimeComp::criterion() const { return {}; }
+Criterion FindCRTimeComp::criterion() const { return {}; }
+Criterion FindATimeComp::criterion() const { return {}; }
 
 int FindFactory::createFindOp(_tag_FIND_FIELD_ field, const char* arg1, const char* arg2,
                               std::vector<FindComp*>& comps) {

@@ -138,7 +138,7 @@ TEST_F(BadInput, CommandLine) {
       {{"search", "x", "file.txt"}, "not a folder"},
       {{"search", "x", "new\nline"}, "'new\\x0Aline'"},
       {{"search", "x", std::string(5000, 'p')}, "too long"},
-      {{"search", "regex:("}, "pattern"},
+      {{"search", "regex:("}, "'regex:(': missing"},
       {{"search", "-x"}, "-- before"},
       {{"search", "x", "-t", "spoon"}, "no file type"},
       {{"search", "x", "--owner", "nob0dy"}, "no user 'nob0dy'"},

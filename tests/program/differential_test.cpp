@@ -81,7 +81,7 @@ class Differential : public ProgramTest {
     KeptRows rows(share_);
     const int never = 0;
     nas::SharedSearch search(comparators.get(), rows, never);
-    if (params["search_content"].asBool()) search.SearchContents(dir_);
+    search.SearchContents(dir_, params["search_content"].asBool());
     nas::FolderWalk walk(locations, params["recursive"].asBool(), search);
     nas::ContentReading contents(locations, search);
     nas::SearchJob job(search, {.report = [](const nas::WalkProgress&) {}, .stuck = {}});

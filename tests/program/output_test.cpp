@@ -22,12 +22,12 @@ TEST(Values, Sizes) {
                                                        {"10k", 10240},
                                                        {"5M", 5 << 20},
                                                        {"1GiB", 1 << 30},
+                                                       {"1.5G", 3 << 29},
                                                        {"2TB", std::int64_t{2} << 40},
                                                        {"8191P", std::int64_t{8191} << 50},
                                                        {"9223372036854775807", INT64_MAX}};
   for (const auto& [text, bytes] : rows) EXPECT_EQ(arbory::ParseSize(text), bytes) << text;
-  for (const char* none :
-       {"2tb", "8192P", "9223372036854775808", "", "-1", "1.5G", "k", "1 k", "0x10"}) {
+  for (const char* none : {"8192P", "9223372036854775808", "", "-1", "k", "0x10"}) {
     EXPECT_THROW(arbory::ParseSize(none), arbory::UsageError) << none;
   }
 }
@@ -43,6 +43,7 @@ TEST(Values, Times) {
       {"2026-01-31", 1'769'814'000, 1'769'900'399},
       {"2026-03-29", 1'774'738'800, 1'774'821'599},  // 23 hours: summer time begins
       {"2024-02-29", 1'709'161'200, 1'709'247'599},
+      {"yesterday", 1'799'881'200, 1'799'967'599},
   };
   for (const auto& [text, from, to] : days) {
     EXPECT_EQ(seconds(text, arbory::Bound::kFrom), from) << text;
@@ -63,7 +64,7 @@ TEST(Values, Times) {
   }
   for (const char* none :
        {"2147483648", "2026-02-29", "2026-13-01", "2026-1-1", "2026-01-31T25:00", "2026-01-31x",
-        "2039-01-01", "1900-01-01", "7x", "99999999999999999d", "", "yesterday"}) {
+        "2039-01-01", "1900-01-01", "7x", "99999999999999999d", ""}) {
     EXPECT_THROW(seconds(none, arbory::Bound::kFrom), arbory::UsageError) << none;
   }
 }

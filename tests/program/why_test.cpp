@@ -96,7 +96,7 @@ TEST_F(Why, EachWayToAFile) {
       {{"none", ""}, 2, "there is no 'none'"},
       {{"plan.txt/x", ""}, 2, "there is no 'plan.txt/x'"},
       {{"plan.txt", "", "none"}, 2, "cannot search 'none'"},
-      {{"plan.txt", "regex:("}, 2, "'regex:(' is no pattern"},
+      {{"plan.txt", "regex:("}, 2, "'regex:(': missing closing parenthesis"},
       {{"plan.txt", "", "-t", "song"}, 2, "'song' is no file type"},
       {{"plan.txt"}, 2, "PATTERN is required"},
   });

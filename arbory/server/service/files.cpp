@@ -174,11 +174,11 @@ void ServeFirstLine(const FileRequest& request, const std::string& pattern, int 
   if (!BecomeForGood(request.user)) {
     return SendError(pipe, kUnavailable, "The server cannot act as this user.");
   }
-  const auto parsed = nas::NamePattern::Parse(pattern);
+  const auto parsed = nas::Query::Parse(pattern);
   if (!parsed) return SendError(pipe, kBadRequest, "The pattern cannot be understood.");
   const auto file = OpenFile(request);
   if (!file) return SendOpenError(pipe, file.error().error_number);
-  const auto query = nas::ContentQuery::From(*parsed);
+  const auto query = nas::ContentQuery::From(parsed->root(), true);
   const int never = 0;
   std::optional<nas::MatchingLine> line;
   if (query) line = nas::ContentScanner(*query, never).FirstLine(file->fd.get(), kMostLineBytes);

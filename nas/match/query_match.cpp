@@ -1,0 +1,122 @@
+#include "nas/match/query_match.h"
+
+#include <algorithm>
+
+namespace nas {
+namespace {
+
+using Kind = QueryNode::Kind;
+
+Answer Known(bool yes) { return yes ? Answer::kYes : Answer::kNo; }
+
+Answer AskContents(const QueryNode& node, const QuerySubject& subject) {
+  if (!subject.is_file || node.needle < 0) return Answer::kNo;
+  if (subject.found == nullptr) return Answer::kMaybe;
+  if ((*subject.found)[static_cast<size_t>(node.needle)]) return Answer::kYes;
+  return subject.all_read ? Answer::kNo : Answer::kMaybe;
+}
+
+Answer AskText(const QueryNode& node, const QuerySubject& subject) {
+  if (subject.texts_in_contents) return AskContents(node, subject);
+  if (subject.name == nullptr) return Answer::kMaybe;
+  if (!node.text->of_path()) return Known(node.text->FindsInName(*subject.name));
+  return subject.path == nullptr ? Answer::kMaybe : Known(node.text->FindsInPath(*subject.path));
+}
+
+bool HasExtension(const QueryNode& node, FoldedName& name) {
+  const std::string_view folded = name.folded();
+  return std::ranges::any_of(node.suffixes, [folded](const std::string& suffix) {
+    return folded.size() > suffix.size() && folded.ends_with(suffix);
+  });
+}
+
+bool IsOfType(const QueryNode& node, const QuerySubject& subject) {
+  return std::ranges::any_of(node.types, [&](const FileType& type) {
+    if (type.folder || subject.is_folder) return type.folder && subject.is_folder;
+    return !type.category || IsInCategory(ExtensionOf(subject.name->folded()), *type.category);
+  });
+}
+
+bool HoldsOne(const QueryNode& node, std::int64_t value) {
+  return std::ranges::any_of(node.bounds, [value](const Bounds& b) { return b.Hold(value); });
+}
+
+Answer AskEmpty(const QuerySubject& subject) {
+  if (!subject.is_folder) return Known(subject.is_file && subject.attributes->size == 0);
+  return subject.is_empty_folder == nullptr ? Answer::kMaybe : Known((*subject.is_empty_folder)());
+}
+
+// Of what an inode tells; folders have no size of their own.
+Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
+  if (node.kind == Kind::kSize && subject.is_folder) return Answer::kNo;
+  if (subject.attributes == nullptr) return Answer::kMaybe;
+  const QueryAttributes& file = *subject.attributes;
+  switch (node.kind) {
+    case Kind::kSize:
+      return Known(HoldsOne(node, file.size));
+    case Kind::kModified:
+      return Known(HoldsOne(node, file.modified));
+    case Kind::kCreated:
+      return Known(file.created != QueryAttributes::kNoTime && HoldsOne(node, file.created));
+    case Kind::kOpened:
+      return Known(HoldsOne(node, file.opened));
+    case Kind::kOwner:
+      return Known(HoldsOne(node, file.uid));
+    case Kind::kGroup:
+      return Known(HoldsOne(node, file.gid));
+    default:
+      return AskEmpty(subject);
+  }
+}
+
+}  // namespace
+
+bool IsOfAttributes(QueryNode::Kind kind) { return kind >= Kind::kSize && kind != Kind::kDepth; }
+
+Answer Ask(const QueryNode& node, const QuerySubject& subject) {
+  switch (node.kind) {
+    case Kind::kAll: {
+      Answer least = Answer::kYes;
+      for (const QueryNode& child : node.children) {
+        least = std::min(least, Ask(child, subject));
+        if (least == Answer::kNo) break;
+      }
+      return least;
+    }
+    case Kind::kAny: {
+      Answer most = Answer::kNo;
+      for (const QueryNode& child : node.children) {
+        most = std::max(most, Ask(child, subject));
+        if (most == Answer::kYes) break;
+      }
+      return most;
+    }
+    case Kind::kNot: {
+      const Answer answer = Ask(node.children.front(), subject);
+      return answer == Answer::kMaybe ? answer : Known(answer == Answer::kNo);
+    }
+    case Kind::kText:
+      return AskText(node, subject);
+    case Kind::kContent:
+      return AskContents(node, subject);
+    case Kind::kExtension:
+      if (subject.name == nullptr) return Answer::kMaybe;
+      return Known(node.suffixes.empty() || HasExtension(node, *subject.name));
+    case Kind::kType:
+      if (subject.name == nullptr) return Answer::kMaybe;
+      return Known(node.types.empty() || IsOfType(node, subject));
+    case Kind::kDepth:
+      return subject.path == nullptr ? Answer::kMaybe
+                                     : Known(HoldsOne(node, subject.path->depth()));
+    default:
+      return AskAttributes(node, subject);
+  }
+}
+
+bool AnyLeaf(const QueryNode& node, const std::function<bool(const QueryNode&)>& test) {
+  if (node.kind > Kind::kNot) return test(node);
+  return std::ranges::any_of(node.children,
+                             [&](const QueryNode& child) { return AnyLeaf(child, test); });
+}
+
+}  // namespace nas

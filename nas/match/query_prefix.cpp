@@ -1,0 +1,154 @@
+#include "nas/match/query_prefix.h"
+
+#include <algorithm>
+#include <cerrno>
+
+#include "nas/base/accounts.h"
+
+namespace nas {
+namespace {
+
+using Kind = QueryNode::Kind;
+using Value = QueryPrefix::Value;
+
+constexpr std::string_view kTimeHelp =
+    "write a time as in today, last-7-days, 2026, 2026-07-15, >2-weeks-ago or 2026-01..2026-06";
+
+constexpr QueryPrefix kPrefixes[] = {
+    {"ext:", Kind::kExtension, Value::kWords, "write extensions, as in ext:jpg,png"},
+    {"type:", Kind::kType, Value::kWords,
+     "there are file, dir, image, video, audio, document and archive"},
+    {"size:", Kind::kSize, Value::kSize, "write a size as in size:>10MB, size:1GB..2GB or size:0"},
+    {"modified:", Kind::kModified, Value::kTime, kTimeHelp},
+    {"created:", Kind::kCreated, Value::kTime, kTimeHelp},
+    {"opened:", Kind::kOpened, Value::kTime, kTimeHelp},
+    {"owner:", Kind::kOwner, Value::kWords, "write a user's name, as in owner:ann"},
+    {"group:", Kind::kGroup, Value::kWords, "write a group's name, as in group:staff"},
+    {"depth:", Kind::kDepth, Value::kNumber,
+     "write a number of levels, as in depth:1, depth:<3 or depth:2..4"},
+    {"empty:", Kind::kEmpty, Value::kNothing, "it takes no value, or yes or no"},
+    {"content:", Kind::kContent, Value::kText, "write a text, as in content:invoice"},
+    {"case:", Kind::kText, Value::kExact, "write a name, as in case:README"},
+    {"regex:", Kind::kText, Value::kRegex, ""},
+};
+
+ValueReader ReaderOf(Value value, std::time_t now) {
+  switch (value) {
+    case Value::kSize:
+      return ReadSize;
+    case Value::kTime:
+      return [now](std::string_view text) { return ReadTime(text, now); };
+    default:
+      return ReadNumber;
+  }
+}
+
+Error Wrong(const QueryPrefix& prefix) { return {kErrorIllegal, EINVAL, std::string(prefix.help)}; }
+
+Result<std::int64_t> AccountNumber(Kind kind, const std::string& name) {
+  const bool user = kind == Kind::kOwner;
+  Error error;
+  if (user) {
+    const auto account = FindAccount(name);
+    if (account) return std::int64_t{account->uid};
+    error = account.error();
+  } else {
+    const auto group = FindGroup(name);
+    if (group) return std::int64_t{group->gid};
+    error = group.error();
+  }
+  // Files of somebody who has left have but a number.
+  if (const auto number = ReadNumber(name); number) return number->span.from;
+  const bool unknown = error.kind == kErrorUnknownUser || error.kind == kErrorUnknownGroup;
+  return error.Of(unknown
+                      ? "there is no " + std::string(user ? "user" : "group") + " '" + name + "'"
+                      : "users and groups cannot be looked up just now");
+}
+
+Status AddWord(const QueryPrefix& prefix, std::string_view word, QueryNode& node) {
+  if (prefix.kind == Kind::kExtension) {
+    std::ranges::move(ExtensionNode(word).suffixes, std::back_inserter(node.suffixes));
+    return {};
+  }
+  if (prefix.kind == Kind::kType) {
+    const auto type = AsciiLower(word) == "folder" ? FileType{true} : ParseFileType(word);
+    if (!type) return Wrong(prefix);
+    node.types.push_back(*type);
+    return {};
+  }
+  const auto number = AccountNumber(prefix.kind, std::string(word));
+  if (!number) return number.error();
+  node.bounds.push_back({*number, *number});
+  return {};
+}
+
+Status AddValue(const QueryPrefix& prefix, std::string_view value, std::time_t now,
+                QueryNode& node) {
+  if (value.empty()) return Wrong(prefix);
+  if (prefix.value == Value::kWords) return AddWord(prefix, value, node);
+  const auto bounds = ReadBounds(value, ReaderOf(prefix.value, now));
+  if (!bounds) return Wrong(prefix);
+  node.bounds.push_back(*bounds);
+  return {};
+}
+
+Result<QueryNode> EmptyNode(const QueryPrefix& prefix, std::string_view value) {
+  const std::string word = AsciiLower(value);
+  QueryNode node{.kind = Kind::kEmpty};
+  if (word.empty() || word == "yes" || word == "true") return node;
+  if (word != "no" && word != "false") return Wrong(prefix);
+  QueryNode other{.kind = Kind::kNot};
+  other.children.push_back(std::move(node));
+  return other;
+}
+
+}  // namespace
+
+const QueryPrefix* FindPrefix(std::string_view text) {
+  constexpr size_t kLongest = 9;  // "modified:"
+  const size_t colon = text.substr(0, kLongest).find(':');
+  if (colon == std::string_view::npos) return nullptr;
+  const std::string word = AsciiLower(text.substr(0, colon + 1));
+  const auto* found = std::ranges::find(kPrefixes, word, &QueryPrefix::name);
+  return found == std::end(kPrefixes) ? nullptr : found;
+}
+
+bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
+  return ReadBounds(value, ReaderOf(prefix.value, now)).has_value();
+}
+
+Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
+  if (prefix.value == Value::kNothing) return EmptyNode(prefix, value);
+  QueryNode node{.kind = prefix.kind};
+  for (size_t at = 0; at <= value.size();) {
+    const size_t end = std::min(value.find(',', at), value.size());
+    const Status added = AddValue(prefix, value.substr(at, end - at), now, node);
+    if (!added) return added.error();
+    at = end + 1;
+  }
+  if (node.kind == Kind::kExtension && node.suffixes.empty()) return Wrong(prefix);
+  return node;
+}
+
+QueryNode ExtensionNode(std::string_view list) {
+  constexpr std::string_view kSeparators = ",; ";
+  QueryNode node{.kind = Kind::kExtension};
+  size_t at = 0;
+  while ((at = list.find_first_not_of(kSeparators, at)) != std::string_view::npos) {
+    const size_t end = std::min(list.find_first_of(kSeparators, at), list.size());
+    std::string_view extension = list.substr(at, end - at);
+    at = end;
+    if (extension.starts_with("*.")) extension.remove_prefix(1);
+    if (extension.starts_with(".")) extension.remove_prefix(1);
+    if (!extension.empty()) node.suffixes.push_back("." + FoldText(extension));
+  }
+  return node;
+}
+
+QueryNode BoundsNode(QueryNode::Kind kind, Bounds bounds) {
+  QueryNode node{.kind = kind};
+  node.bounds.push_back(bounds);
+  return node;
+}
+
+}  // namespace nas

@@ -1,0 +1,31 @@
+#pragma once
+// The prefixes of the query language: their names, and what becomes of their values.
+
+#include <ctime>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "nas/base/error.h"
+#include "nas/match/query.h"
+
+namespace nas {
+
+struct QueryPrefix {
+  // How its value is written: a text is one; others are lists.
+  enum class Value { kText, kRegex, kExact, kWords, kSize, kTime, kNumber, kNothing };
+  std::string_view name;  // with its colon
+  QueryNode::Kind kind;
+  Value value;
+  std::string_view help;  // what would be right
+};
+
+// The prefix that `text` begins with, or null.
+const QueryPrefix* FindPrefix(std::string_view text);
+// Whether `value` can be read; for values in which spaces may stand.
+bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t now);
+// The leaf for a value that is not a text. Fails as Query::Parse does, with a sentence that does
+// not name the term yet.
+Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now);
+
+}  // namespace nas

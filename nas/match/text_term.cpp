@@ -1,0 +1,103 @@
+#include "nas/match/text_term.h"
+
+#include <algorithm>
+#include <cerrno>
+
+namespace nas {
+
+Result<std::shared_ptr<const TextTerm>> TextTerm::Make(std::string_view text, Form form,
+                                                       bool exact) {
+  std::shared_ptr<TextTerm> term(new TextTerm);
+  term->exact_ = exact;
+  term->text_ = text;
+  if (form == Form::kRegex) {
+    // Names are compared composed, so the expression has to be.
+    auto regex = Regex::Compile(ComposeText(text), Regex::Kind::kName, exact);
+    if (!regex) return regex.error();
+    term->regex_ = std::move(*regex);
+    term->forms_.emplace_back();
+    return std::shared_ptr<const TextTerm>(std::move(term));
+  }
+  const bool speaks = form == Form::kPlain && Wildcards::Speak(text);
+  const bool wild = speaks && Wildcards::Remain(text);
+  if (speaks && !wild) term->text_ = Wildcards::Unescaped(text);
+  term->of_path_ = text.find('/') != std::string_view::npos;
+  // Who looks for "a{b,c}" in contents means these very bytes.
+  term->literal_ = !wild || !Glob::HasWildcard(text);
+  const std::string folded = FoldText(term->text_);
+  term->plain_ = !exact && WithoutAccents(folded) == folded;
+  std::vector<std::string> forms = {exact ? ComposeText(term->text_) : folded};
+  // Byte by byte, what was typed is what a broken name may hold.
+  if (const std::string bytes = exact ? term->text_ : AsciiLower(term->text_);
+      bytes != forms.front()) {
+    forms.push_back(bytes);
+  }
+  for (std::string& one : forms) {
+    Comparand comparand{std::move(one), std::nullopt};
+    if (wild) {
+      comparand.wildcards = Wildcards::Make(comparand.text, term->of_path_);
+      if (!comparand.wildcards) return Error{kErrorIllegal, EINVAL, "stands for too many names"};
+    }
+    term->forms_.push_back(std::move(comparand));
+  }
+  const Comparand& compared = term->forms_.front();
+  const std::string_view required = wild ? compared.wildcards->Required() : compared.text;
+  if (!required.empty() && IsAscii(required)) term->required_.emplace(required);
+  return std::shared_ptr<const TextTerm>(std::move(term));
+}
+
+// Whether one of the forms in which `text` is compared passes the test with the term's own.
+template <class Test>
+bool TextTerm::AnyForm(FoldedName& text, const Test& test) const {
+  if (exact_) {
+    if (test(text.ascii() ? text.name() : std::string_view(ComposeText(text.name())),
+             forms_.front())) {
+      return true;
+    }
+    return !text.valid_utf8() && test(text.name(), forms_.back());
+  }
+  if (test(text.folded(), forms_.front())) return true;
+  if (!text.valid_utf8()) return forms_.size() > 1 && test(text.folded(), forms_.back());
+  return plain_ && !text.ascii() && test(text.plain(), forms_.front());
+}
+
+bool TextTerm::Fits(std::string_view text, const Comparand& form) const {
+  const bool anywhere = literal_ && text.find(form.text) != std::string_view::npos;
+  if (anywhere || !form.wildcards) return anywhere;
+  return form.wildcards->Matches(text);
+}
+
+bool TextTerm::FindsIn(FoldedName& text) const {
+  if (required_) {
+    const bool there = required_->Finds(text.name());
+    if (!there && !MayFoldToAscii(text.name())) return false;
+    const bool enough = there && !has_wildcards() && !exact_;
+    if (enough && IsAscii(text.name())) return true;
+  }
+  return AnyForm(text,
+                 [this](std::string_view in, const Comparand& form) { return Fits(in, form); });
+}
+
+bool TextTerm::FindsInName(FoldedName& name) const {
+  if (regex_) return regex_->Finds(name.ascii() ? name.name() : ComposeText(name.name()));
+  return FindsIn(name);
+}
+
+// A pasted path names the folder that is searched too, or begins within it.
+bool TextTerm::Begins(FoldedName& path, std::string_view root) const {
+  return AnyForm(path, [&](std::string_view in, const Comparand& form) {
+    if (form.wildcards) return form.wildcards->Matches(in);
+    if (!in.starts_with(form.text)) return false;
+    const bool whole_name =
+        form.text.ends_with('/') || in.size() == form.text.size() || in[form.text.size()] == '/';
+    return whole_name || form.text.size() > root.size() + 1;
+  });
+}
+
+bool TextTerm::FindsInPath(EntryPath& path) const {
+  if (!text_.starts_with('/')) return FindsIn(path.below());
+  return Begins(path.below(), "") || Begins(path.in_share(), path.base().in_share) ||
+         Begins(path.on_disk(), path.base().on_disk);
+}
+
+}  // namespace nas
