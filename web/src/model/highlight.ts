@@ -1,43 +1,42 @@
 // Which part of a name a pattern matched. The server decides what matches; this only finds where, by
-// the same language: terms separated by spaces, "a|b", "!a", "quoted text", globs and "regex:". The
-// cases of tests/patterns.json are asked of both. What it cannot find is simply not highlighted.
-// Takes at most name length x pattern length steps, save for regular expressions, where only those
-// are tried that cannot run away.
+// the words of the same language (words.ts). The cases of tests/patterns.json are asked of both. What
+// it cannot find is simply not highlighted. Takes at most name length x pattern length steps, save
+// for regular expressions, where only those are tried that cannot run away.
 import type { Range } from './text.ts';
-
-interface Term {
-  text: string;
-  kind: 'literal' | 'glob' | 'regex';
-}
+import { expand, isWild, type Word, wordsOf } from './words.ts';
 
 // A repeated group, or a back reference, is what makes a backtracking engine run away; a named class
 // is none to the browser.
 const NOT_TRIED = /\)[*+?{]|\\[1-9]|\\k|\[[:=.]/;
 
 export class Highlighter {
-  private readonly terms: Term[];
+  private readonly words: Word[];
   private readonly regexes: RegExp[];
 
   // As the server does, a name is taken as one text, and contents line by line.
   constructor(pattern: string, where: 'name' | 'contents' = 'name') {
-    const terms = parse(pattern);
-    this.terms = terms
-      .filter((term) => term.kind !== 'regex')
-      .map((term) => ({ ...term, text: fold(term.text).text }));
-    this.regexes = terms.flatMap((term) => (term.kind === 'regex' ? compile(term.text, where) : []));
+    const words = wordsOf(pattern).flatMap((word) => (where === 'name' ? inName(word) : inContents(word)));
+    this.regexes = words.flatMap((word) => (word.kind === 'regex' ? compile(word, where) : []));
+    const changed = (word: Word) => (word.exact ? compose : fold)(word.text).text;
+    this.words = words
+      .filter((word) => word.kind !== 'regex')
+      .map((word) => ({ ...word, text: changed(word) }));
   }
 
   // Ordered, not overlapping.
   ranges(name: string): Range[] {
-    if (this.terms.length === 0 && this.regexes.length === 0) return [];
+    if (this.words.length === 0 && this.regexes.length === 0) return [];
     const folded = fold(name);
+    const composed = compose(name);
+    const plain = form(name, (letter) => withoutAccents(folding(letter)));
     const found: Range[] = [];
-    for (const term of this.terms) {
-      const places =
-        term.kind === 'glob' ? globPlaces(folded.text, term.text) : literalPlaces(folded.text, term.text);
-      found.push(...places.map((place) => original(folded, place)));
+    for (const word of this.words) {
+      // Whoever types no accent finds any.
+      const bare = !word.exact && withoutAccents(word.text) === word.text;
+      for (const formed of word.exact ? [composed] : bare ? [folded, plain] : [folded]) {
+        found.push(...placesOf(formed.text, word).map((place) => original(formed, place)));
+      }
     }
-    const composed = this.regexes.length > 0 ? compose(name) : folded;
     for (const regex of this.regexes) {
       for (const match of composed.text.matchAll(regex)) {
         if (match[0]) found.push(original(composed, [match.index, match.index + match[0].length]));
@@ -47,22 +46,34 @@ export class Highlighter {
   }
 }
 
-function parse(pattern: string): Term[] {
-  const terms: Term[] = [];
-  const piece = /(!(?=[^ |]))?(?:regex:(.*)$|"([^"]*)"?|([^ |]+))|[ |]/gsy;
-  for (const [, negated, regex, quoted, plain] of pattern.matchAll(piece)) {
-    const text = regex ?? quoted ?? plain;
-    if (negated || !text) continue;
-    const kind = regex !== undefined ? 'regex' : plain && unitsOf(plain).some((u) => !u.plain) ? 'glob' : 'literal';
-    terms.push({ text, kind });
-  }
-  return terms;
+// Of a path only the last name is seen.
+function inName(word: Word): Word[] {
+  if (word.kind === 'content') return [];
+  if (word.kind === 'regex') return [word];
+  const text = word.text.slice(word.text.lastIndexOf('/') + 1);
+  const globs = word.kind === 'glob' ? expand(text) : [text];
+  const path = text !== word.text;
+  return globs
+    .filter((one) => one !== '')
+    .map((one) => ({ ...word, text: one, kind: path && word.kind === 'literal' ? 'first' : word.kind }));
 }
 
-function compile(source: string, where: 'name' | 'contents'): RegExp[] {
-  if (NOT_TRIED.test(source)) return [];
+function inContents(word: Word): Word[] {
+  if (word.kind === 'glob' && isWild(word.text)) return [];
+  return [word.kind === 'regex' ? word : { ...word, kind: 'literal' }];
+}
+
+function placesOf(text: string, word: Word): Range[] {
+  if (word.kind === 'glob') return globPlaces(text, word.text);
+  if (word.kind === 'first') return text.startsWith(word.text) ? [[0, word.text.length]] : [];
+  return literalPlaces(text, word.text);
+}
+
+function compile({ text, exact }: Word, where: 'name' | 'contents'): RegExp[] {
+  if (NOT_TRIED.test(text)) return [];
+  const flags = (where === 'name' ? 'gsu' : 'gmu') + (exact ? '' : 'i');
   try {
-    return [new RegExp(source.normalize('NFC'), where === 'name' ? 'gisu' : 'gimu')];
+    return [new RegExp(text.normalize('NFC'), flags)];
   } catch {
     return [];
   }
@@ -94,7 +105,11 @@ function form(original: string, change: (letter: string) => string): Formed {
 
 const compose = (text: string) => form(text, (letter) => letter.normalize('NFC'));
 // As names are compared.
-const fold = (text: string) => form(text, (letter) => letter.normalize('NFC').toUpperCase().toLowerCase());
+const folding = (letter: string) => letter.normalize('NFC').toUpperCase().toLowerCase();
+const fold = (text: string) => form(text, folding);
+// The marks on Latin, Greek and Cyrillic letters; in other scripts they are vowels.
+const ACCENTS = /([\p{Script=Latin}\p{Script=Greek}\p{Script=Cyrillic}])[\u0300-\u036f\u0483-\u0487\u1ab0-\u1aff\u1dc0-\u1dff\ufe20-\ufe2f]+/gu;
+const withoutAccents = (text: string) => text.normalize('NFD').replace(ACCENTS, '$1').normalize('NFC');
 
 function original({ from, to }: Formed, [start, end]: Range): Range {
   return [from[start]!, to[end - 1]!];
