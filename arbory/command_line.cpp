@@ -39,14 +39,16 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
 }  // namespace
 
 const char kQueryHelp[] =
-    "PATTERN is compared with names, letter case ignored: a word matches anywhere in\n"
-    "the name, with *, ? or [ ] the whole name. Several words must all match; a|b is\n"
-    "either, !a is not, \"a b\" is one word, regex: begins a regular expression and ''\n"
-    "is every name. A -- ends the options.\n"
+    "PATTERN is compared with names, letter case and accents ignored: a word matches\n"
+    "anywhere in the name, with *, ?, [ ] or {a,b} the whole name, with / the path.\n"
+    "Several words must all match; a|b is either, !a is not, <a b> a group, \"a b\" one\n"
+    "word, regex: begins a regular expression and '' is every name. ext:jpg,png\n"
+    "type:image size:>1GB modified:last-7-days owner:ann depth:<3 empty: content:word\n"
+    "case:Word ask for more than a name. A -- ends the options.\n"
     "\n"
-    "SIZE is bytes, or 10k, 5M, 1G (1024-based). TIME is 2026-01-31,\n"
-    "2026-01-31T12:00, an age such as 30m, 12h or 7d, or seconds since 1970. Bounds\n"
-    "are inclusive; a date alone means the whole day.\n";
+    "SIZE is bytes, or 10k, 5M, 1.5G (1024-based). TIME is 2026-01-31, 2026-07,\n"
+    "yesterday, last-7-days, 2026-01-31T12:00, an age such as 30m, 12h or 7d, or\n"
+    "seconds since 1970. Bounds are inclusive; a date alone means the whole day.\n";
 
 std::vector<std::string> MarkedArguments(int argc, char** argv) {
   std::vector<std::string> arguments;

@@ -37,7 +37,13 @@ ValueReader ReaderOf(Value value, std::time_t now) {
     case Value::kSize:
       return ReadSize;
     case Value::kTime:
-      return [now](std::string_view text) { return ReadTime(text, now); };
+      return [now](std::string_view text) -> std::optional<WrittenValue> {
+        // So few seconds after 1970 are an age that lacks its unit.
+        constexpr size_t kFewDigits = 3;
+        const bool digits = text.find_first_not_of("0123456789") == std::string_view::npos;
+        if (digits && text.size() <= kFewDigits) return std::nullopt;
+        return ReadTime(text, now);
+      };
     default:
       return ReadNumber;
   }

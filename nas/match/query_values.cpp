@@ -313,9 +313,9 @@ std::optional<WrittenValue> ReadTime(std::string_view text, std::time_t now) {
   const std::string words = Joined(Trimmed(text));
   if (const auto calendar = CalendarTime(words); calendar) return calendar;
   if (IsDigits(words, kMostDigits)) {
-    // Four digits are a year, and fewer lack their unit.
+    // Four digits are a year.
     const std::int64_t second = NumberOf(words);
-    if ((words.size() <= kYearDigits && words != "0") || second < 0) return {};
+    if (words.size() == kYearDigits || second < 0) return {};
     return Exactly(second);
   }
   const Now present = NowOf(now);

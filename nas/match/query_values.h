@@ -7,7 +7,7 @@
 //   day     2026-07-15, 2026-07 (the month), 2026 (the year), today, yesterday, 3 days ago,
 //           this-week, last-month, last-year, ... , before-last-year
 //   since   last-7-days (today is one of them), last 3 months; an age: 30m, 12h, 7d, 2 weeks
-//   second  2026-07-15T12:30[:15], now, 5 minutes ago, seconds since 1970 (0, or more than four digits)
+//   second  2026-07-15T12:30[:15], now, 5 minutes ago, seconds since 1970 (four digits are a year)
 //   bounds  VALUE, >VALUE, >=VALUE, <VALUE, <=VALUE, VALUE..VALUE, VALUE.., ..VALUE
 //
 // Words of a time may be joined by "-" or by spaces. Days are those of the process's time zone.
