@@ -30,6 +30,7 @@ bool MatchesRegex(const std::string& name, const char* expression) {
 bool IsCafe(const std::string& name) {
   return name.starts_with("caf\u00e9") || name.starts_with("cafe\u0301");
 }
+bool IsRegular(const Entry& entry) { return S_ISREG(entry.info.st_mode); }
 long Modified(const Entry& entry) { return entry.info.st_mtim.tv_sec; }
 long Read(const Entry& entry) { return entry.info.st_atim.tv_sec; }
 
@@ -99,6 +100,34 @@ const std::vector<Case>& Cases() {
        [](const Entry& e) {
          return Glob(e, "a*") && Ends(e.name, ".txt") && !e.is_dir() && e.info.st_size >= 1 &&
                 Modified(e) >= 1700000030;
+       }},
+      {"a group, a bar and prefixes",
+       R"({"pattern": "<ext:jpg,pdf size:>1kb>|<modified:1700000010..1700000020 !star>"})",
+       [](const Entry& e) {
+         const bool picture = Ends(e.name, ".jpg") || Ends(e.name, ".pdf");
+         return (picture && !e.is_dir() && e.info.st_size > 1024) ||
+                (Modified(e) >= 1700000010 && Modified(e) <= 1700000020 && !Holds(e.name, "star"));
+       }},
+      {"a prefix and a parameter", R"({"pattern": "size:>=1", "size_to": 1023})",
+       [](const Entry& e) { return !e.is_dir() && e.info.st_size >= 1 && e.info.st_size <= 1023; }},
+      {"a path with wildcards", R"({"pattern": "docs/**/*.{jpg,pdf} !case:img"})",
+       [](const Entry& e) {
+         return Holds(e.path, "/docs/") && (Ends(e.name, ".jpg") || Ends(e.name, ".pdf"));
+       }},
+      {"a path", R"({"pattern": "er/img1"})",
+       [](const Entry& e) { return Holds(e.path, "er/img1"); }},
+      {"no accent finds any", R"({"pattern": "cafe"})",
+       [](const Entry& e) { return IsCafe(e.name); }},
+      {"empty ones", R"({"pattern": "empty:"})",
+       [](const Entry& e) {
+         return e.is_dir() ? e.name == "empty" : IsRegular(e) && e.info.st_size == 0;
+       }},
+      {"contents by a prefix, among other criteria",
+       R"({"pattern": "content:\"the needle\"|ext:gz !content:regex:\"^q{1025}\" !*.txt"})",
+       [](const Entry& e) {
+         const std::string text = TextOf(e.path);
+         return (Holds(text, "the needle") || Ends(e.name, ".gz")) &&
+                !text.starts_with(std::string(1025, 'q')) && !Ends(e.name, ".txt");
        }},
       {"contents", R"({"pattern": "the needle", "search_content": true})",
        [](const Entry& e) {
