@@ -15,9 +15,9 @@ namespace arbory {
 std::int64_t ParseSize(const std::string& text);
 
 enum class Bound { kFrom, kTo };
-// A time of nas/match/query_values.h, as seconds since the epoch: what has a length, as a day, is its
-// first second as a lower bound and its last as an upper one. Refuses what a search cannot compare,
-// before 1901-12-13 or after 2038-01-19.
+// A time of nas/match/query_values.h, as seconds since the epoch: what has a length, as a day, is
+// its first second as a lower bound and its last as an upper one. Refuses what a search cannot
+// compare, before 1901-12-13 or after 2038-01-19.
 std::int64_t ParseTime(const std::string& text, Bound bound, std::time_t now);
 
 // NAME=DIR, the directory made absolute.

@@ -11,10 +11,10 @@
 namespace nas {
 
 bool IsAscii(std::string_view text);
-// Whether folding, or taking accents away, may turn something in `text` that is not ASCII into ASCII
-// characters, or bring some together: the Kelvin sign into "k", the sharp s into "ss", a ligature
-// into its letters, "\u00e9" into "e". May say yes for others. Where the answer is no, the ASCII
-// parts of both forms are those of the text itself.
+// Whether folding, or taking accents away, may turn something in `text` that is not ASCII into
+// ASCII characters, or bring some together: the Kelvin sign into "k", the sharp s into "ss", a
+// ligature into its letters, "\u00e9" into "e". May say yes for others. Where the answer is no, the
+// ASCII parts of both forms are those of the text itself.
 bool MayFoldToAscii(std::string_view text);
 std::string AsciiLower(std::string_view text);
 // The text as it is compared; `valid` (may be null) receives whether it was valid UTF-8.

@@ -1,7 +1,7 @@
 #pragma once
 // Regular expressions (PCRE2, compiled to machine code). Case is ignored unless it is asked for,
-// texts are UTF-8 and may hold bytes that are not: those match nothing. A search that would take exponentially long is
-// given up and counts as not matching.
+// texts are UTF-8 and may hold bytes that are not: those match nothing. A search that would take
+// exponentially long is given up and counts as not matching.
 
 #include <memory>
 #include <optional>

@@ -111,7 +111,8 @@ void ResultReader::FilterByQuery(const Query& query, std::vector<bool>& passes) 
     blocks_.ForEachNames([&](std::uint64_t first, const BlockReader::Names& block) {
       for (size_t i = 0; i < block.names.size(); ++i) {
         folded.Set(block.names[i]);
-        if (passes[first + i] && Ask(query.root(), subject) != Answer::kYes) passes[first + i] = false;
+        if (passes[first + i] && Ask(query.root(), subject) != Answer::kYes)
+          passes[first + i] = false;
       }
     });
     return;

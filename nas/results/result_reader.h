@@ -24,7 +24,7 @@ struct Selection {
   SortColumn column = SortColumn::kFound;
   bool ascending = true;
   std::optional<bool> directories;  // only folders, or only others
-  std::optional<Query> pattern;  // judged by what a row holds
+  std::optional<Query> pattern;     // judged by what a row holds
   bool filters() const { return directories || pattern; }
 };
 

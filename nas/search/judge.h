@@ -55,8 +55,7 @@ class Judge {
  public:
   // Telling which criterion an entry does not meet takes asking them again: who does not `explain`
   // is told kName of all of them.
-  explicit Judge(SharedSearch& search, bool explain = false)
-      : search_(search), explain_(explain) {}
+  explicit Judge(SharedSearch& search, bool explain = false) : search_(search), explain_(explain) {}
 
   // The entries that follow lie in the folder open at `fd`, at `path` below the root of the share
   // of `location`, whose number is `number`. The path is borrowed until Leave.

@@ -104,7 +104,8 @@ TEST_F(Queries, Table) {
       {"< a jpg > | png", "a.jpg c.png", "with spaces"},
       {"<a jpg>|", "a.jpg", ""},
       {"<\"\"> a.jpg", "a.jpg", "a group of nothing asks nothing"},
-      {"<size:>1k jpg>|<regex:^c\\.>", "c.png", "a value may begin with the sign that ends a group"},
+      {"<size:>1k jpg>|<regex:^c\\.>", "c.png",
+       "a value may begin with the sign that ends a group"},
       // Braces and backslashes.
       {"?.{jpg,png}", "a.jpg b.JPG c.png", ""},
       {"{a,c}.{jpg,png}", "a.jpg c.png", "each with each"},
@@ -290,9 +291,8 @@ TEST_F(Queries, Times) {
     EXPECT_EQ(value->alone.from, *row.from == '\0' ? Bounds::kLeast : at(row.from)) << row.text;
     EXPECT_EQ(value->alone.to, *row.to == '\0' ? Bounds::kMost : at(row.to)) << row.text;
   }
-  for (const char* text :
-       {"", "-", "2026-13", "26-01-01", "2026-01-01T12", "last-0-days", "0000", "ago",
-        "3 ago", "99999999 years ago", "next-week", "3 dys"}) {
+  for (const char* text : {"", "-", "2026-13", "26-01-01", "2026-01-01T12", "last-0-days", "0000",
+                           "ago", "3 ago", "99999999 years ago", "next-week", "3 dys"}) {
     EXPECT_FALSE(ReadTime(text, now)) << text;
   }
 }
