@@ -17,6 +17,7 @@
 
 #include "arbory/caller.h"
 #include "arbory/interrupt.h"
+#include "arbory/nothing_found.h"
 #include "arbory/page_reader.h"
 #include "arbory/rows.h"
 #include "arbory/running_search.h"
@@ -42,6 +43,11 @@ constexpr std::chrono::milliseconds kMostUnasked{1000};
 // found and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
+// Saying why nothing was found takes a part of the time that the search took, or that of a small
+// tree.
+constexpr int kHintShare = 4;
+constexpr std::chrono::milliseconds kLeastHint{100};
+constexpr std::chrono::milliseconds kMostHint{1000};
 
 // Null for a pattern that asks for no contents.
 std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
@@ -74,6 +80,8 @@ class Search {
       throw;
     }
     CleanUp();
+    if (found_nothing_)
+      ExplainNothing(params, std::clamp(ran_ / kHintShare, kLeastHint, kMostHint));
     return exit_code;
   }
 
@@ -193,6 +201,8 @@ class Search {
     }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
     TellOfSkipped(state);
+    found_nothing_ = ending == Ending::kComplete && state.exists && state.matches == 0;
+    ran_ = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
 
@@ -242,6 +252,8 @@ class Search {
   std::uint64_t printed_ = 0;
   int failure_ = 0;  // the code of kFailed, errno of kUnwritable
   bool running_ = true;
+  bool found_nothing_ = false;
+  std::chrono::milliseconds ran_{0};
 };
 
 }  // namespace

@@ -23,7 +23,7 @@ struct Piece {
   Form form = Form::kPlain;
   bool exact = false;
   std::string value = {};
-  std::string_view written = {};  // the whole term, for messages
+  std::string_view written = {};  // the whole term; of a sign that opens or closes, that sign
 };
 
 class Scanner {
@@ -82,6 +82,7 @@ void Scanner::ScanEither() {
   if (groups_ && text_[at_] == '<' && at_ + 1 < text_.size() && text_[at_ + 1] != '>') {
     piece.kind = Piece::Kind::kOpen;
     ++at_;
+    piece.written = text_.substr(from, at_ - from);
     deepest_ = std::max(deepest_, ++open_);
     pieces_.push_back(std::move(piece));
     return;
@@ -92,7 +93,9 @@ void Scanner::ScanEither() {
   term.written = text_.substr(from, at_ - closing_ - from);
   if (term.value.empty() && term.prefix == nullptr) pieces_.pop_back();
   open_ -= closing_;
-  for (; closing_ > 0; --closing_) pieces_.push_back({.kind = Piece::Kind::kClose});
+  for (; closing_ > 0; --closing_) {
+    pieces_.push_back({.kind = Piece::Kind::kClose, .written = text_.substr(at_ - closing_, 1)});
+  }
 }
 
 void Scanner::ScanTerm(Piece piece) {
@@ -236,12 +239,16 @@ class Builder {
         return {};
       case Piece::Kind::kOpen:
         groups_.emplace_back().negated = piece.negated;
+        groups_.back().opened = piece.written;
         return {};
       case Piece::Kind::kClose: {
         const bool negated = groups_.back().negated;
+        const char* const opened = groups_.back().opened.data();
         QueryNode all = Finish();
         groups_.pop_back();
-        if (!all.children.empty()) AddEither(std::move(all), negated);
+        const char* const end = piece.written.data() + piece.written.size();
+        const std::string_view written(opened, static_cast<size_t>(end - opened));
+        if (!all.children.empty()) AddEither(std::move(all), negated, written);
         return {};
       }
       case Piece::Kind::kTerm:
@@ -251,7 +258,7 @@ class Builder {
     if (!leaf) {
       return leaf.error().Of("'" + std::string(piece.written) + "': " + leaf.error().path);
     }
-    AddEither(std::move(*leaf), piece.negated);
+    AddEither(std::move(*leaf), piece.negated, piece.written);
     return {};
   }
 
@@ -267,6 +274,7 @@ class Builder {
     std::vector<QueryNode> terms;
     bool joined = false;  // a bar stands before the next
     bool negated = false;
+    std::string_view opened = {};
   };
 
   // A node of one child says what the child says.
@@ -274,13 +282,16 @@ class Builder {
     const bool list = node.kind == Kind::kAll || node.kind == Kind::kAny;
     if (!list || node.children.size() != 1) return node;
     QueryNode child = std::move(node.children.front());
+    if (!node.written.empty()) child.written = std::move(node.written);
     return child;
   }
 
-  void AddEither(QueryNode node, bool negated) {
+  void AddEither(QueryNode node, bool negated, std::string_view written) {
     Group& group = groups_.back();
     if (!group.joined || group.terms.empty()) group.terms.push_back({.kind = Kind::kAny});
     group.joined = false;
+    std::string& term = group.terms.back().written;
+    term.append(term.empty() ? "" : "|").append(written);
     node = Only(std::move(node));
     if (negated) {
       QueryNode other{.kind = Kind::kNot};

@@ -54,7 +54,8 @@ struct QueryNode {
   std::vector<std::string> suffixes = {};  // of kExtension: folded, each with its dot
   std::vector<FileType> types = {};
   std::vector<Bounds> bounds = {};
-  int needle = -1;  // where contents are looked into: which of their needles `text` is
+  std::string written = {};  // of a term of the query, as it stands there
+  int needle = -1;           // where contents are looked into: which of their needles `text` is
 };
 
 // The leaves of single criteria, for whoever has a value without a prefix.

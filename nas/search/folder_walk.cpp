@@ -37,6 +37,8 @@ void FolderWalk::Feed(size_t thread, Judge& judge) {
       ReadFolder(item, std::move(folder.fd), reading);
     } else if (folder.refusal == Refusal::kFolderUnreadable) {
       search_.progress.AddSkipped(folder.error_number);
+    } else if (folder.refusal != Refusal::kOtherLocation) {
+      search_.progress.AddLeftOut();
     }
     if (search_.stopping()) stack_.Abort();
   }

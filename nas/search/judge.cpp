@@ -57,21 +57,25 @@ Answer Judge::Ask() const {
   return std::max(named, nas::Ask(search_.content->root(), inside));
 }
 
-Refusal Judge::Why() const {
+Refusal Judge::Refuse(const char* name) {
+  if (search_.misses != nullptr) {
+    const bool known = subject_.attributes != nullptr || !search_.criteria.ask_attributes;
+    if (known || Look(name)) search_.misses->See(subject_);
+  }
   return explain_ ? WhyNot(search_.criteria.root, subject_) : Refusal::kName;
 }
 
 Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
   Meet(entry.name, entry.type);
   Answer answer = Ask();
-  if (answer == Answer::kNo) return Why();
+  if (answer == Answer::kNo) return Refuse(entry.name.data());
   FileAttributes attributes;
   if (answer == Answer::kYes || search_.criteria.ask_attributes) {
     const Result<FileAttributes> read = Look(entry.name.data());
     if (!read) return Refusal::kVanished;
     attributes = *read;
     if (answer != Answer::kYes) answer = Ask();
-    if (answer == Answer::kNo) return Why();
+    if (answer == Answer::kNo) return Refuse(entry.name.data());
   }
   if (answer == Answer::kMaybe) {
     candidates_.emplace_back(entry.inode, entry.name);

@@ -25,6 +25,14 @@
 
 namespace nas {
 
+// Is told of entries that a search leaves out, by whoever wants to know what it came close to.
+class MissSink {
+ public:
+  virtual ~MissSink() = default;
+  // With everything known of the entry but its contents. Callable from any thread.
+  virtual void See(const QuerySubject& subject) = 0;
+};
+
 // What the threads of one search share. Set up before the first of them starts; after that only
 // what is safe to use from several threads changes. Comparators, sink and flag are borrowed.
 struct SharedSearch {
@@ -45,6 +53,7 @@ struct SharedSearch {
   const int& stop_flag;
   std::optional<ContentQuery> content;
   std::unique_ptr<CandidateList> candidates;  // of SearchContents
+  MissSink* misses = nullptr;                 // borrowed; null: nobody asks
   WalkProgress progress;
   std::atomic<bool> failed = false;  // a thread has thrown: the others shall end
 };
@@ -83,7 +92,7 @@ class Judge {
 
   void Meet(std::string_view name, unsigned char type);
   Answer Ask() const;
-  Refusal Why() const;
+  Refusal Refuse(const char* name);
   bool IsEmptyFolder(const char* name);
   Result<FileAttributes> Look(const char* name);
   void Skip(int error_number);

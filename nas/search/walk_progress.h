@@ -39,7 +39,13 @@ class WalkProgress {
   }
   // A file's contents were not looked into, because they are no text.
   void AddNotText() { not_text_.fetch_add(1, std::memory_order_relaxed); }
+  // A folder that is never searched.
+  void AddLeftOut() { left_out_.fetch_add(1, std::memory_order_relaxed); }
   void SetPhase(Phase phase) { phase_ = phase; }
+
+  std::uint64_t folders() const { return folders_; }
+  std::uint64_t entries() const { return entries_; }
+  std::uint64_t left_out() const { return left_out_; }
 
   Json::Value ToJson() const {
     using namespace task_record;
@@ -71,6 +77,7 @@ class WalkProgress {
   std::atomic<std::uint64_t> other_ = 0;
   std::atomic<std::uint64_t> unreadable_files_ = 0;
   std::atomic<std::uint64_t> not_text_ = 0;
+  std::atomic<std::uint64_t> left_out_ = 0;
 };
 
 }  // namespace nas

@@ -2,13 +2,16 @@
 // refused in which words.
 
 #include <gtest/gtest.h>
+#include <json/json.h>
 
 #include <algorithm>
 #include <ctime>
-#include <map>
-#include <set>
+#include <fstream>
+#include <optional>
+#include <random>
 #include <string>
 
+#include "nas/match/near_text.h"
 #include "nas/match/query.h"
 #include "nas/match/query_match.h"
 #include "nas/match/query_values.h"
@@ -294,6 +297,61 @@ TEST_F(Queries, Times) {
   for (const char* text : {"", "-", "2026-13", "26-01-01", "2026-01-01T12", "last-0-days", "0000",
                            "ago", "3 ago", "99999999 years ago", "next-week", "3 dys"}) {
     EXPECT_FALSE(ReadTime(text, now)) << text;
+  }
+}
+
+// The page has fields for sizes and times, whose values it sends as numbers: one table for both.
+TEST_F(Queries, ValuesAsThePageReadsThem) {
+  std::ifstream file(ARBORY_SOURCE_DIR "/tests/values.json");
+  Json::Value rows;
+  file >> rows;
+  setenv("TZ", "Europe/Berlin", 1);
+  tzset();
+  const auto midnight = [](const std::string& day) {
+    return day.empty() ? std::nullopt : std::optional(ReadTime(day, kNow)->span.from);
+  };
+  const std::time_t now = *midnight("2026-03-31") + 12 * 60 * 60;
+  for (const Json::Value& row : rows) {
+    const std::string text = row["text"].asString();
+    const bool is_size = row["kind"] == "size";
+    const auto size = ReadSize(text);
+    const auto time = ReadBounds(text, [now](std::string_view t) { return ReadTime(t, now); });
+    ASSERT_EQ(is_size ? size.has_value() : time.has_value(), row.isMember("from")) << text;
+    if (!row.isMember("from")) continue;
+    if (is_size) {
+      EXPECT_EQ(size->span.from, row["from"].asInt64()) << text;
+    } else {
+      EXPECT_EQ(time->from, midnight(row["from"].asString()).value_or(Bounds::kLeast)) << text;
+      const auto end = midnight(row["to"].asString());
+      EXPECT_EQ(time->to, end ? *end - 1 : Bounds::kMost) << text;
+    }
+  }
+}
+
+// Against the table that the distance is defined by.
+TEST(NearText, IsTheLeastDistanceToAnyPart) {
+  std::mt19937 random(3);
+  const auto letters = [&random](size_t count) {
+    std::string text;
+    while (text.size() < count) text.push_back("abc"[random() % 3]);
+    return text;
+  };
+  for (int round = 0; round < 3'000; ++round) {
+    const std::string word = letters(1 + random() % NearText::kLongest);
+    const std::string text = letters(random() % 90);
+    std::vector<size_t> column(word.size() + 1);
+    for (size_t i = 0; i <= word.size(); ++i) column[i] = i;
+    size_t least = word.size();
+    for (const char c : text) {
+      size_t diagonal = 0;
+      for (size_t i = 1; i <= word.size(); ++i) {
+        const size_t changed = diagonal + (word[i - 1] == c ? 0 : 1);
+        diagonal = column[i];
+        column[i] = std::min({changed, column[i] + 1, column[i - 1] + 1});
+      }
+      least = std::min(least, column.back());
+    }
+    ASSERT_EQ(NearText(word).Distance(text), least) << word << " in " << text;
   }
 }
 

@@ -112,10 +112,12 @@ class Differential : public ProgramTest {
     const Output output = Run(Arguments(params, folder));
     Found found{Pieces(output.out, '\0')};
     EXPECT_EQ(output.exit_code, found.paths.empty() ? 1 : 0) << output.err;
+    const size_t nothing = output.err.find("arbory: nothing found among ");
+    EXPECT_EQ(nothing != std::string::npos, found.paths.empty()) << output.err;
     static const std::regex kFiles("arbory: [0-9,]+ files? (could not be read|(is|are) not text)");
     static const std::regex kFolders(
         "arbory: ([0-9]+) folders? could not be read \\(permission denied\\)");
-    for (const std::string& line : Pieces(output.err, '\n')) {
+    for (const std::string& line : Pieces(output.err.substr(0, nothing), '\n')) {
       std::smatch parts;
       if (std::regex_match(line, kFiles)) continue;
       EXPECT_TRUE(std::regex_match(line, parts, kFolders)) << line;

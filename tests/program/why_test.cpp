@@ -102,6 +102,33 @@ TEST_F(Why, EachWayToAFile) {
   });
 }
 
+TEST_F(Why, SearchThatFindsNothing) {
+  const struct {
+    std::vector<std::string> words;  // after "search"
+    const char* says;
+  } rows[] = {
+      {{"zz"}, "nothing found among 7 names in 3 folders\n"},
+      {{"plam"}, "near to 'plam': plan.txt\n"},
+      {{"Pl\u00e0n|zz"}, "near to 'Pl\u00e0n|zz': plan.txt\n"},
+      {{"plan size:>1kb"}, "without 'size:>1kb' there would be 1 file\n"},
+      {{"<ext:pdf | ext:doc >|zz plan"},
+       "without '<ext:pdf | ext:doc >|zz' there would be 1 file\n"},
+      {{"plan", "--size-from", "1k"}, "without one of the options there would be 1 file\n"},
+      {{"plan content:hay"}, "without 'content:hay' there would be 1 file\n"},
+      {{"zz", dir_ + "/volume1"},
+       "1 folder of the system's own or of its temporary files is never"},
+  };
+  for (const auto& row : rows) {
+    std::vector<std::string> words = {"search"};
+    words.insert(words.end(), row.words.begin(), row.words.end());
+    const Output output = Run(words);
+    EXPECT_EQ(output.exit_code, 1);
+    EXPECT_EQ(output.out, "");
+    EXPECT_THAT(output.err, HasSubstr(row.says));
+  }
+  EXPECT_THAT(Run({"search", "plan", "--offset", "1"}).err, "");
+}
+
 TEST_F(Why, WhatAnOrdinaryUserMayNotRead) {
   ASSERT_EQ(chmod((share_ + "/docs").c_str(), 0711), 0);
   MakeFolder("volume1/share/listed");

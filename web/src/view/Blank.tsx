@@ -11,6 +11,9 @@ const WAYS = [
   ['jpg|png', 'one or the other'],
   ['invoice !draft', 'without the second word'],
   ['"final version"', 'exactly this, spaces and signs included'],
+  ['*.{jpg,png} size:>1MB', 'one of several, and larger than that'],
+  ['modified:last-7-days type:document', 'what a file is, beside its name'],
+  ['holiday/img', 'the path, not the name alone'],
   ['regex:^img_\\d{4}', 'a regular expression'],
 ] as const;
 
@@ -37,7 +40,8 @@ export function Welcome({ app }: { app: App }) {
           </tbody>
         </table>
         <p class="hint">
-          Upper and lower case are the same.
+          Upper and lower case are the same, and so are letters with and without an accent that you do
+          not type.
           <span class="keyed">
             {' '}
             Press <kbd>?</kbd> for the keyboard.

@@ -1,0 +1,55 @@
+#include "arbory/nothing_found.h"
+
+#include <exception>
+#include <string>
+#include <vector>
+
+#include "arbory/comparators.h"
+#include "arbory/search_text.h"
+#include "arbory/terminal.h"
+#include "nas/search/near_misses.h"
+
+namespace arbory {
+namespace {
+
+void ComplainOfTerm(const nas::NearMisses::Term& term) {
+  const std::string what = term.written.empty() ? "one of the options" : "'" + term.written + "'";
+  if (term.without > 0) {
+    Complain("without " + what + " there would be " + Counted(term.without, "file", "files"));
+  }
+  if (term.names.empty()) return;
+  std::string names;
+  for (const std::string& name : term.names) names += (names.empty() ? "" : ", ") + name;
+  Complain("near to " + what + ": " + names);
+}
+
+void Explain(const Json::Value& params, std::chrono::milliseconds most) {
+  std::vector<nas::Location> locations;
+  for (const Json::Value& text : params["folder_path"]) {
+    auto location = nas::OpenLocation(text.asString());
+    if (location) locations.push_back(std::move(*location));
+  }
+  if (locations.empty()) return;
+  const Comparators comparators(params);
+  const nas::NearMisses near =
+      nas::LookForNearMisses(locations, comparators.get(), params["recursive"].asBool(), most);
+  Complain("nothing found among " + std::string(near.complete ? "" : "more than ") +
+           Counted(near.entries, "name", "names") + " in " +
+           Counted(near.folders, "folder", "folders"));
+  if (near.left_out > 0) {
+    Complain(Counted(near.left_out, "folder", "folders") +
+             " of the system's own or of its temporary files " +
+             (near.left_out == 1 ? "is" : "are") + " never searched");
+  }
+  for (const auto& term : near.terms) ComplainOfTerm(term);
+}
+
+}  // namespace
+
+void ExplainNothing(const Json::Value& params, std::chrono::milliseconds most) try {
+  Explain(params, most);
+} catch (const std::exception&) {
+  // The search itself has said what it had to say.
+}
+
+}  // namespace arbory
