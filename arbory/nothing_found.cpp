@@ -12,9 +12,9 @@
 namespace arbory {
 namespace {
 
-void ComplainOfTerm(const nas::NearMisses::Term& term) {
+void ComplainOfTerm(const nas::NearMisses::Term& term, bool one_of_several) {
   const std::string what = term.written.empty() ? "one of the options" : "'" + term.written + "'";
-  if (term.without > 0) {
+  if (term.without > 0 && one_of_several) {
     Complain("without " + what + " there would be " + Counted(term.without, "file", "files"));
   }
   if (term.names.empty()) return;
@@ -41,7 +41,7 @@ void Explain(const Json::Value& params, std::chrono::milliseconds most) {
              " of the system's own or of its temporary files " +
              (near.left_out == 1 ? "is" : "are") + " never searched");
   }
-  for (const auto& term : near.terms) ComplainOfTerm(term);
+  for (const auto& term : near.terms) ComplainOfTerm(term, near.terms.size() > 1);
 }
 
 }  // namespace

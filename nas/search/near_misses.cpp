@@ -28,7 +28,7 @@ class NearNames {
 
   void See(FoldedName& name) {
     const size_t distance = near_.Distance(name.plain());
-    if (distance == 0 || distance > near_.farthest()) return;
+    if (distance > near_.farthest()) return;
     const std::lock_guard lock(mutex_);
     const std::tuple one(distance, name.name().size(), std::string(name.name()));
     const auto at = std::ranges::lower_bound(nearest_, one);
