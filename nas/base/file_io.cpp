@@ -6,7 +6,10 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <ctime>
 
+#include "nas/base/keeping.h"
+#include "nas/base/paths.h"
 #include "nas/base/random_name.h"
 #include "nas/base/system_call.h"
 #include "nas/base/unique_fd.h"
@@ -109,6 +112,18 @@ Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, m
   if (done) done = SyncFolder(dir_fd, FolderOf(name));
   if (done) return done;
   return done.error().Of(name);
+}
+
+void SweepTemporaryFiles(const std::string& folder) {
+  const time_t now = time(nullptr);
+  for (const std::string& name : NamesIn(AT_FDCWD, folder).value_or({})) {
+    struct stat info;
+    const std::string path = folder + "/" + name;
+    if (name.starts_with(kTemporaryPrefix) && lstat(path.c_str(), &info) == 0 &&
+        now - info.st_mtime > kKeepSeconds) {
+      unlink(path.c_str());
+    }
+  }
 }
 
 Status SyncFolder(int dir_fd, const std::string& name) {

@@ -33,6 +33,10 @@ Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, 
 // The same for a file that must not exist yet, always durable: EEXIST where it does.
 Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode);
 
+// Takes away what a write to a file in the folder has left half done, once it is as old as what is
+// kept of searches (keeping.h). Not while a write may take so long.
+void SweepTemporaryFiles(const std::string& folder);
+
 // Syncs the folder `name` itself to the disk: what was made, renamed or removed in it.
 Status SyncFolder(int dir_fd, const std::string& name);
 

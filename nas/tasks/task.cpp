@@ -7,11 +7,13 @@
 #include <optional>
 #include <stdexcept>
 
+#include "nas/base/file_io.h"
 #include "nas/base/pause.h"
 #include "nas/base/random_name.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
 #include "nas/system/lease.h"
+#include "nas/system/user_state.h"
 #include "nas/system/volumes.h"
 #include "nas/tasks/task_files.h"
 
@@ -47,6 +49,7 @@ class Task::Record {
       life_ = std::move(task.life);
       if (nas::NewTasksAreLeased()) lease_.emplace(nas::CurrentConfig().lease_seconds);
       LeaveRoot(owner);
+      nas::SweepTemporaryFiles(nas::PreferenceFolder(owner));
       return;
     }
     if (!nas::IsRandomName(id)) throw std::runtime_error("not a task id");

@@ -21,6 +21,7 @@ import struct
 import subprocess
 import tempfile
 import time
+import traceback
 
 from attack import Outcome
 from house import HISTORY, SEARCH, Server, become_subreaper
@@ -168,7 +169,8 @@ def in_a_process(act):
             signal.alarm(60)
             act()
         except BaseException as broken:
-            os.write(theirs, str(broken if isinstance(broken, Broken) else repr(broken)).encode())
+            os.write(theirs, (str(broken) if isinstance(broken, Broken) else
+                              traceback.format_exc()).encode())
         finally:
             os._exit(0)
     os.close(theirs)
