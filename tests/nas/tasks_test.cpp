@@ -75,26 +75,30 @@ TEST_F(TasksTest, ProcessesAndThreadsMergeTheirWrites) {
   constexpr int kRounds = 20;
   const auto task = New();
   const std::string id = task->getTaskId();
-  std::atomic<bool> writing = true;
-  std::thread client([&] {
-    const auto reader = Open(id);
-    while (writing) ASSERT_TRUE(reader->reload()) << "a reader always finds a whole record";
-  });
-  std::thread walker([&] {
-    for (int round = 0; round <= kRounds; ++round) task->setProperty("walk", round);
-  });
-  EXPECT_TRUE(InChildren(kWriters, [&](int writer) {
+  const auto write = [](OKT::Task& to, const std::string& name) {
     bool good = true;
-    const auto mine = Open(id);
-    const std::string name = "w" + std::to_string(writer);
     for (int round = 0; round <= kRounds; ++round) {
-      good = mine->setProperty(name.c_str(), round) && good;
+      good = to.setProperty(name.c_str(), round) && good;
     }
-    return writer == 0 ? mine->finish(false) && good : good;
+    return good;
+  };
+  // Threads are started behind the forks, as a lock taken by one would be the children's as well.
+  EXPECT_TRUE(InChildren(kWriters, [&](int writer) {
+    const auto mine = Open(id);
+    if (writer > 0) return write(*mine, "w" + std::to_string(writer));
+    std::atomic<bool> writing = true;
+    std::atomic<bool> good = true;  // a reader always finds a whole record
+    std::thread client([&] {
+      const auto reader = Open(id);
+      while (writing) good = reader->reload() && good;
+    });
+    std::thread walker([&] { good = write(*task, "walk") && good; });
+    good = write(*mine, "w0") && good;
+    walker.join();
+    writing = false;
+    client.join();
+    return mine->finish(false) && good;
   }));
-  walker.join();
-  writing = false;
-  client.join();
   ASSERT_TRUE(task->reload());
   for (const char* name : {"w0", "w1", "w2", "w3", "walk"}) {
     EXPECT_EQ(task->getProperty(name), kRounds) << name;
