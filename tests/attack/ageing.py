@@ -68,8 +68,9 @@ def finished(client, task):
 
 
 def memory(process):
-    """In KiB, of the server: all that it has in memory, and its share of what others have too."""
-    wanted = {"Rss": 0, "Pss": 0, "Private_Dirty": 0}
+    """In KiB, of the server: all that it has in memory, and what is its own. Its share of what others
+    have too says more of the others."""
+    wanted = {"Rss": 0, "Private_Dirty": 0}
     with open(f"/proc/{process}/smaps_rollup") as file:
         for line in file:
             name = line.partition(":")[0]
@@ -92,9 +93,8 @@ def look(house, server):
 
 def check(outcome, middle, end, noise):
     repeat = "scripts/attack ageing"
-    for name in ("Rss", "Pss", "Private_Dirty"):
-        # What is shared counts by how many share it, which is other processes' doing as well.
-        if end[name] - middle[name] > (NOISE_KIB if name == "Pss" else noise):
+    for name in ("Rss", "Private_Dirty"):
+        if end[name] - middle[name] > noise:
             outcome.breaks(f"{name} grew from {middle[name]} to {end[name]} KiB", repeat)
     # One connection may be opened anew meanwhile.
     for name in ("descriptors", "children", "files"):
