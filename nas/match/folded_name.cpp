@@ -2,6 +2,7 @@
 
 #include <utf8proc.h>
 
+#include <array>
 #include <cstdint>
 #include <cstring>
 #include <vector>
@@ -124,6 +125,53 @@ bool MayFoldToAscii(std::string_view text) {
     }
   }
   return false;
+}
+
+namespace {
+
+constexpr char kOtherLetter = '\x80';
+
+// What becomes of each character from U+00C0 to U+017F, which two bytes stand for.
+using Skeletons = std::array<std::string, 0x180 - 0xc0>;
+
+Skeletons MakeSkeletons() {
+  Skeletons all;
+  for (size_t i = 0; i < all.size(); ++i) {
+    const size_t point = 0xc0 + i;
+    const char bytes[] = {static_cast<char>(0xc0 | (point >> 6)),
+                          static_cast<char>(0x80 | (point & 0x3f))};
+    for (const char c : WithoutAccents(FoldText({bytes, sizeof bytes}))) {
+      all[i] += static_cast<signed char>(c) < 0 ? kOtherLetter : c;
+    }
+  }
+  return all;
+}
+
+}  // namespace
+
+bool AsciiSkeleton(std::string_view text, std::string& out) {
+  static const Skeletons skeletons = MakeSkeletons();
+  out.clear();
+  for (size_t i = 0; i < text.size(); ++i) {
+    const auto c = static_cast<unsigned char>(text[i]);
+    if (c < 0x80) {
+      out += static_cast<char>(c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c);
+      continue;
+    }
+    const auto next = static_cast<unsigned char>(i + 1 < text.size() ? text[i + 1] : 0);
+    const bool pair = (next & 0xc0) == 0x80;
+    if (pair && c >= 0xc3 && c <= 0xc5) {
+      out += skeletons[static_cast<size_t>(((c & 0x1f) << 6) + (next & 0x3f) - 0xc0)];
+      ++i;
+    } else if (pair && (c == 0xcc || (c == 0xcd && next < 0xb0))) {
+      ++i;  // a mark
+    } else if (MayFoldToAscii(text.substr(i, 3))) {
+      return false;
+    } else {
+      out += kOtherLetter;
+    }
+  }
+  return true;
 }
 
 std::string AsciiLower(std::string_view text) {

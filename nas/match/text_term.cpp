@@ -67,10 +67,16 @@ bool TextTerm::Fits(std::string_view text, const Comparand& form) const {
   return form.wildcards->Matches(text);
 }
 
+// Whether what is required may be in one of the forms of a name that has it not.
+bool TextTerm::MayHold(std::string_view name) const {
+  thread_local std::string skeleton;
+  return !AsciiSkeleton(name, skeleton) || required_->Finds(skeleton);
+}
+
 bool TextTerm::FindsIn(FoldedName& text) const {
   if (required_) {
     const bool there = required_->Finds(text.name());
-    if (!there && !MayFoldToAscii(text.name())) return false;
+    if (!there && (!MayFoldToAscii(text.name()) || !MayHold(text.name()))) return false;
     const bool enough = there && !has_wildcards() && !exact_;
     if (enough && IsAscii(text.name())) return true;
   }

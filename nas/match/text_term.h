@@ -49,6 +49,7 @@ class TextTerm {
   TextTerm() = default;
   bool AddForm(std::string text);
   bool Fits(std::string_view text, const Comparand& form) const;
+  bool MayHold(std::string_view name) const;
   bool FindsIn(FoldedName& text) const;
   // Of a path term that begins at the root.
   bool Begins(FoldedName& path, std::string_view root) const;
