@@ -11,6 +11,7 @@
 #include <system_error>
 #include <utility>
 
+#include "nas/base/file_lock.h"
 #include "nas/base/keeping.h"
 #include "nas/base/paths.h"
 #include "nas/base/random_name.h"
@@ -36,20 +37,11 @@ time_t LastWritten(const std::string& path) {
 // Beyond every byte of a database, those that SQLite locks among them.
 constexpr off_t kClaimByte = off_t{1} << 60;
 
-struct flock ClaimLock() {
-  struct flock lock = {};
-  lock.l_type = F_WRLCK;
-  lock.l_whence = SEEK_SET;
-  lock.l_start = kClaimByte;
-  lock.l_len = 1;
-  return lock;
-}
-
 // What cannot be asked counts as claimed.
 bool IsClaimed(const std::string& path) {
   const UniqueFd file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
   if (!file) return errno != ENOENT;
-  struct flock lock = ClaimLock();
+  struct flock lock = WriteLockOn(kClaimByte);
   return fcntl(file.get(), F_OFD_GETLK, &lock) != 0 || lock.l_type != F_UNLCK;
 }
 
@@ -58,7 +50,7 @@ bool IsClaimed(const std::string& path) {
 ResultClaim::ResultClaim(const std::string& path)
     : file_(open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
                  S_IRUSR | S_IWUSR)) {
-  struct flock lock = ClaimLock();
+  struct flock lock = WriteLockOn(kClaimByte);
   if (!file_ || fcntl(file_.get(), F_OFD_SETLK, &lock) != 0) {
     throw std::system_error(errno, std::generic_category(), path);
   }

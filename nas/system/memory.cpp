@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "nas/base/file_lock.h"
 #include "nas/base/pause.h"
 #include "nas/base/unique_fd.h"
 #include "nas/system/config.h"
@@ -28,15 +29,6 @@ UniqueFd g_permit;
 bool IsLimited() {
   rlimit limit;
   return getrlimit(RLIMIT_DATA, &limit) == 0 && limit.rlim_cur != limit.rlim_max;
-}
-
-bool TakeByte(int fd, off_t byte) {
-  struct flock lock = {};
-  lock.l_type = F_WRLCK;
-  lock.l_whence = SEEK_SET;
-  lock.l_start = byte;
-  lock.l_len = 1;
-  return fcntl(fd, F_OFD_SETLK, &lock) == 0;
 }
 
 }  // namespace
@@ -63,7 +55,8 @@ Status TakeLargePermit(const std::string& user) {
   GrowingPause pause(kPermitTenths);
   do {
     for (int byte = 0; byte < CurrentConfig().large_calls_per_user; ++byte) {
-      if (!TakeByte(permit.get(), byte)) continue;
+      struct flock lock = WriteLockOn(byte);
+      if (fcntl(permit.get(), F_OFD_SETLK, &lock) != 0) continue;
       LimitMemory(CurrentConfig().large_call_memory_bytes());
       g_permit = std::move(permit);
       return {};

@@ -10,6 +10,7 @@
 
 #include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
+#include "nas/base/file_lock.h"
 #include "nas/base/json_text.h"
 #include "nas/base/keeping.h"
 #include "nas/base/paths.h"
@@ -54,15 +55,6 @@ std::string IdOf(std::string_view name, std::string_view suffix) {
   if (!name.ends_with(suffix)) return {};
   name.remove_suffix(suffix.size());
   return IsRandomName(name) ? std::string(name) : std::string();
-}
-
-struct flock WriteLockOn(off_t byte) {
-  struct flock lock = {};
-  lock.l_type = F_WRLCK;
-  lock.l_whence = SEEK_SET;
-  lock.l_start = byte;
-  lock.l_len = 1;
-  return lock;
 }
 
 Status TakeLock(int fd, off_t byte) {
