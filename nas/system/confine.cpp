@@ -11,10 +11,13 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
@@ -105,51 +108,56 @@ int Reported(const std::string& report, const char* name) {
   return -1;
 }
 
-// False when it did not end in time.
-bool ReadToEnd(int fd, std::string* all) {
-  constexpr size_t kReadBytes = 4096;
-  char bytes[kReadBytes];
+// Waits until `child` has ended; false when it did not in time.
+bool WaitForEnd(pid_t child) {
+  const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, child, 0)));
   const auto end = std::chrono::steady_clock::now() + kPatience;
   for (;;) {
     const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
         end - std::chrono::steady_clock::now());
-    pollfd ready{fd, POLLIN, 0};
-    const int polled = left.count() > 0 ? poll(&ready, 1, static_cast<int>(left.count())) : 0;
+    pollfd ended{process.get(), POLLIN, 0};
+    const int polled = left.count() > 0 ? poll(&ended, 1, static_cast<int>(left.count())) : 0;
     if (polled < 0 && errno == EINTR) continue;
-    if (polled == 0) return false;
-    const ssize_t count = Uninterrupted([&] { return read(fd, bytes, sizeof bytes); });
-    if (count <= 0) return true;
-    all->append(bytes, static_cast<size_t>(count));
+    return polled > 0;
   }
 }
 
+std::string ReadAll(int fd) {
+  std::string text(static_cast<size_t>(std::max<off_t>(0, lseek(fd, 0, SEEK_END))), '\0');
+  const ssize_t count = Uninterrupted([&] { return pread(fd, text.data(), text.size(), 0); });
+  text.resize(static_cast<size_t>(std::max<ssize_t>(0, count)));
+  return text;
+}
+
+// Both of bubblewrap's processes: the outer one, and the inner one, which waits for ever where the
+// outer one is killed while they begin, and leaves its process group only after that.
 void Kill(pid_t child, const std::string& report) {
   const int inner = Reported(report, kInnerProcess);
   if (inner > 0) kill(inner, SIGKILL);
-  kill(child, SIGKILL);
+  kill(-child, SIGKILL);
 }
 
 Result<int> RunConfined(const std::vector<const char*>& command) {
-  int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) return ErrnoError();
-  const UniqueFd report(ends[0]);
-  UniqueFd status(ends[1]);
+  // Not a pipe: should this process be killed, bubblewrap would fail to write to it and end while
+  // its inner half waits for it.
+  const UniqueFd status(memfd_create("status", MFD_CLOEXEC));
+  if (!status) return ErrnoError();
   CommandLine line = Confine(command, status.get());
   const std::vector<char*> words = line.Pointers();
   const pid_t child = fork();
   if (child < 0) return ErrnoError();
+  // By both, since neither knows which of them runs first.
+  setpgid(child, child);
   if (child == 0) {
     GiveUpRoot();
     // Kept open for bubblewrap alone, which closes it before it runs the command.
     if (fcntl(status.get(), F_SETFD, 0) == 0) execv(kBubblewrap, words.data());
     _exit(EXIT_FAILURE);
   }
-  status.Reset();
-  std::string text;
-  if (!ReadToEnd(report.get(), &text)) Kill(child, text);
-  int ended = 0;
-  while (waitpid(child, &ended, 0) < 0 && errno == EINTR) {
-  }
+  const bool ended = WaitForEnd(child);
+  const std::string text = ReadAll(status.get());
+  if (!ended || Reported(text, kExitCode) < 0) Kill(child, text);
+  Uninterrupted([&] { return waitpid(child, nullptr, 0); });
   const int code = Reported(text, kExitCode);
   if (code < 0) return Error{kErrorOther, 0, kBubblewrap};
   return code;
