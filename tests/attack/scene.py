@@ -136,5 +136,8 @@ def check_goes_on(scene, left):
     tasks = sorted(scene.house.task_ids())
     scene.call(SEARCH + "clean", {"taskid": tasks})
     gone = lambda: not scene.house.task_ids() and not scene.house.result_ids()
-    demand(eventually(gone), "a clean without faults leaves something")
+    if not eventually(gone):
+        left = scene.house.task_ids() | scene.house.result_ids()
+        raise Broken(f"a clean of {tasks} without faults leaves {left}; cleaned again: "
+                     f"{scene.call(SEARCH + 'clean', {'taskid': tasks})}, {eventually(gone)}")
     demand(eventually(lambda: not children(scene.checker.process)), "a process is left")
