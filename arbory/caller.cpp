@@ -58,13 +58,8 @@ void Caller::BecomeUser() const {
 
 nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
-  return nas::FinishCall(Begin(row, method, params, encode), encode);
-}
-
-nas::Child Caller::Begin(const NUVA::APIMethod& row, const std::string& method,
-                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
-  return nas::StartCall(row, {method, params, user_, "terminal", leased_}, encode);
+  return nas::RunCall(row, {method, params, user_, "terminal", leased_}, encode);
 }
 
 }  // namespace arbory

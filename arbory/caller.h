@@ -34,7 +34,7 @@ class Caller {
   // The search API's row for `method`. Throws std::runtime_error when the module has none.
   const NUVA::APIMethod& Method(const char* method);
 
-  // Makes the process the user's, for good: what it then looks at is what the user may see. Root
+  // Makes the process the user's: what it then looks at is what the user may see. Root
   // stays the saved identity, with which calls make folders where users may not. Throws
   // std::runtime_error.
   void BecomeUser() const;
@@ -45,9 +45,6 @@ class Caller {
   // Makes one call as this user; see nas::RunCall.
   nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
                   const nas::ReplyEncoder& encode) const;
-  // Begins one; see nas::StartCall.
-  nas::Child Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
-                   const nas::ReplyEncoder& encode) const;
 
  private:
   nas::Config config_;

@@ -3,53 +3,54 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+#include <array>
+#include <charconv>
 #include <cstdio>
 #include <ctime>
-#include <optional>
 
 #include "arbory/terminal.h"
 #include "nas/base/json_text.h"
 #include "nas/base/utf8.h"
-#include "nas/match/content_scanner.h"
+#include "nas/match/file_kinds.h"
 
 namespace arbory {
 namespace {
 
-constexpr int kCodeNoListing = 600;  // the API's for results that cannot be listed
+constexpr mode_t kPermissions = 07777;
 
-std::string_view TextOf(const Json::Value& value) {
-  const char* begin = nullptr;
-  const char* end = nullptr;
-  if (!value.isString() || !value.getString(&begin, &end)) return {};
-  return {begin, static_cast<size_t>(end - begin)};
+void AppendNumber(std::int64_t number, std::string* out) {
+  std::array<char, sizeof("-9223372036854775808")> text;
+  out->append(text.data(), std::to_chars(text.begin(), text.end(), number).ptr);
 }
 
-void AppendName(std::string_view name, const RowFormat& format, std::string* out) {
-  if (format.escape) {
-    AppendEscaped(name, out);
-  } else {
-    *out += name;
+char LetterOf(mode_t mode) {
+  switch (mode & S_IFMT) {
+    case S_IFDIR:
+      return 'd';
+    case S_IFLNK:
+      return 'l';
+    case S_IFIFO:
+      return 'p';
+    case S_IFSOCK:
+      return 's';
+    case S_IFCHR:
+      return 'c';
+    case S_IFBLK:
+      return 'b';
+    default:
+      return '-';
   }
 }
 
-// "drwxr-xr-x" from the listing's decimal number whose digits are the octal ones.
-std::string ModeText(const Json::Value& file, const std::string& real_path) {
-  constexpr int kTen = 10;
-  std::string text = "-";
-  struct stat info;
-  if (file["is_dir"].asBool()) {
-    text = "d";
-  } else if (lstat(real_path.c_str(), &info) == 0 && S_ISLNK(info.st_mode)) {
-    text = "l";
+// "drwxr-xr-x", as ls shows it.
+void AppendMode(mode_t mode, std::string* out) {
+  *out += LetterOf(mode);
+  constexpr char kLetters[] = "rwx";
+  constexpr int kBits = 9;
+  for (int bit = 0; bit < kBits; ++bit) {
+    const bool set = (mode >> (kBits - 1 - bit) & 1) != 0;
+    *out += set ? kLetters[bit % 3] : '-';
   }
-  const int mode = file["perm"]["mode"].asInt();
-  for (int divisor = kTen * kTen; divisor > 0; divisor /= kTen) {
-    const int digit = mode / divisor % kTen;
-    text += (digit & S_IROTH) != 0 ? 'r' : '-';
-    text += (digit & S_IWOTH) != 0 ? 'w' : '-';
-    text += (digit & S_IXOTH) != 0 ? 'x' : '-';
-  }
-  return text;
 }
 
 std::string LocalTime(std::time_t seconds) {
@@ -65,29 +66,111 @@ void AppendPadded(const std::string& text, size_t width, std::string* out) {
   *out += ' ';
 }
 
-// Columns have fixed least widths, as rows are printed before the next ones are known.
-void AppendLong(const Json::Value& file, const RowFormat& format, std::string* out) {
-  constexpr size_t kNameWidth = 8;
-  constexpr size_t kSizeWidth = 12;
-  const std::string path(TextOf(file["real_path"]));
-  *out += ModeText(file, path) + " ";
-  AppendPadded(Escaped(TextOf(file["owner"]["user"])), kNameWidth, out);
-  AppendPadded(Escaped(TextOf(file["owner"]["group"])), kNameWidth, out);
-  const std::string size = std::to_string(file["size"].asUInt64());
-  if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
-  *out += size + " " + LocalTime(file["time"]["mtime"].asInt64()) + " ";
-  AppendName(path, format, out);
+// Whether the JSON text holds a control character at that place, as only DEL and those of the
+// second set still stand in one; how many bytes it has.
+size_t ControlAt(std::string_view text, size_t at) {
+  constexpr unsigned char kLead = 0xC2;
+  constexpr unsigned char kBehindLast = 0xA0;
+  const auto byte = static_cast<unsigned char>(text[at]);
+  if (nas::IsControl(byte)) return 1;
+  const bool second_set = byte == kLead && at + 1 < text.size() &&
+                          static_cast<unsigned char>(text[at + 1]) < kBehindLast;
+  return second_set ? 2 : 0;
 }
 
-using Line = std::optional<nas::MatchingLine>;
+void AppendEscapedJson(std::string_view text, std::string* out) {
+  for (size_t at = 0; at < text.size();) {
+    const size_t length = ControlAt(text, at);
+    if (length == 0) {
+      *out += text[at++];
+      continue;
+    }
+    char escape[sizeof("\\u009b")];
+    std::snprintf(escape, sizeof escape, "\\u%04x",
+                  static_cast<unsigned char>(text[at + length - 1]));
+    *out += escape;
+    at += length;
+  }
+}
+
+// The members of an object, one after the other.
+class JsonMembers {
+ public:
+  explicit JsonMembers(std::string* out) : out_(*out) {}
+  std::string* Name(const char* name) {
+    out_ += first_ ? "{\"" : ",\"";
+    out_ += name;
+    out_ += "\":";
+    first_ = false;
+    return &out_;
+  }
+  void Text(const char* name, std::string_view text) {
+    nas::AppendJsonString(text, nas::JsonBytes::kClean, Name(name));
+  }
+  void Number(const char* name, std::int64_t number) { AppendNumber(number, Name(name)); }
+  void End() { out_ += '}'; }
+
+ private:
+  std::string& out_;
+  bool first_ = true;
+};
+
+void AppendTimes(const nas::FileAttributes& file, std::string* out) {
+  JsonMembers time(out);
+  time.Number("atime", file.atime);
+  if (file.crtime == nas::FileAttributes::kNoTime) {
+    *time.Name("crtime") += "null";
+  } else {
+    time.Number("crtime", file.crtime);
+  }
+  time.Number("ctime", file.ctime);
+  time.Number("mtime", file.mtime);
+  time.End();
+}
+
+std::string UpperCase(std::string_view text) {
+  std::string upper(text);
+  for (char& c : upper) c = static_cast<char>(toupper(static_cast<unsigned char>(c)));
+  return upper;
+}
+
+}  // namespace
+
+RowWriter::RowWriter(const RowFormat& format, nas::ResultReader& reader)
+    : format_(format), reader_(reader) {
+  static const int never = 0;
+  if (format.lines) scanner_.emplace(*format.lines, never);
+}
+
+void RowWriter::AppendName(std::string* out) const {
+  if (format_.escape) {
+    AppendEscaped(path_, out);
+  } else {
+    *out += path_;
+  }
+}
+
+// Columns have fixed least widths, as rows are printed before the next ones are known.
+void RowWriter::AppendLong(const nas::FileAttributes& file, std::string* out) {
+  constexpr size_t kNameWidth = 8;
+  constexpr size_t kSizeWidth = 12;
+  AppendMode(file.mode, out);
+  *out += ' ';
+  AppendPadded(Escaped(reader_.UserName(file.uid)), kNameWidth, out);
+  AppendPadded(Escaped(reader_.GroupName(file.gid)), kNameWidth, out);
+  const std::string size = std::to_string(file.size);
+  if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
+  *out += size + " " + LocalTime(file.mtime) + " ";
+  AppendName(out);
+}
 
 // ":NUMBER:TEXT", on a terminal with what was found in bold red.
-void AppendLine(const nas::MatchingLine& line, const RowFormat& format, std::string* out) {
+void RowWriter::AppendLine(const nas::MatchingLine& line, std::string* out) const {
   constexpr char kMarked[] = "\033[1;31m";
   constexpr char kUnmarked[] = "\033[m";
   const std::string_view text = line.text;
   *out += ":" + std::to_string(line.number) + ":";
-  if (!format.escape) {
+  if (!format_.escape) {
     *out += text;
     return;
   }
@@ -102,98 +185,64 @@ void AppendLine(const nas::MatchingLine& line, const RowFormat& format, std::str
   AppendEscaped(text.substr(at), out);
 }
 
-// Control characters are escaped by JSON itself, all but DEL and those of the second set.
-void AppendJsonRow(Json::Value file, const Line& line, const RowFormat& format, std::string* out) {
+void RowWriter::AppendJson(const nas::ResultRow& row, const Line& line, std::string* out) {
+  const nas::FileAttributes& file = *row.attributes;
+  const bool is_folder = S_ISDIR(file.mode);
+  json_.clear();
+  JsonMembers members(&json_);
+  *members.Name("is_dir") += is_folder ? "true" : "false";
   if (line) {
-    file["line"]["number"] = Json::UInt64{line->number};
-    file["line"]["text"] = line->text;
+    JsonMembers found(members.Name("line"));
+    found.Number("number", static_cast<std::int64_t>(line->number));
+    found.Text("text", line->text);
+    found.End();
   }
-  std::string text = nas::JsonText(file, nas::JsonBytes::kClean);
-  if (format.escape) {
-    for (size_t at = 0; at < text.size(); ++at) {
-      const auto byte = static_cast<unsigned char>(text[at]);
-      const bool second_set =
-          byte == 0xC2 && at + 1 < text.size() && static_cast<unsigned char>(text[at + 1]) < 0xA0;
-      if (!nas::IsControl(byte) && !second_set) continue;
-      const unsigned code = second_set ? static_cast<unsigned char>(text[at + 1]) : byte;
-      char escape[sizeof("\\u009b")];
-      std::snprintf(escape, sizeof escape, "\\u%04x", code);
-      text.replace(at, second_set ? 2 : 1, escape);
-    }
+  members.Text("name", row.name);
+  JsonMembers owner(members.Name("owner"));
+  owner.Number("gid", file.gid);
+  owner.Text("group", reader_.GroupName(file.gid));
+  owner.Number("uid", file.uid);
+  owner.Text("user", reader_.UserName(file.uid));
+  owner.End();
+  members.Text("path", "/" + std::string(row.share_name) + path_.substr(row.share_root.size()));
+  char mode[sizeof("\"07777\"")];
+  std::snprintf(mode, sizeof mode, "\"%04o\"", file.mode & kPermissions);
+  JsonMembers permissions(members.Name("perm"));
+  *permissions.Name("mode") += mode;
+  permissions.End();
+  members.Text("real_path", path_);
+  members.Number("size", static_cast<std::int64_t>(file.size));
+  AppendTimes(file, members.Name("time"));
+  members.Text("type", is_folder ? "" : UpperCase(nas::ExtensionOf(row.name)));
+  members.End();
+  if (format_.escape) {
+    AppendEscapedJson(json_, out);
+  } else {
+    *out += json_;
   }
-  *out += text;
 }
 
-void AppendRow(const Json::Value& file, const Line& line, const RowFormat& format,
-               std::string* out) {
-  switch (format.kind) {
+void RowWriter::Append(const nas::ResultRow& row, std::string* out) {
+  constexpr size_t kMostLineBytes = 4096;
+  path_.assign(row.share_root).append("/").append(row.folder);
+  path_.append(row.folder.empty() ? "" : "/").append(row.name);
+  Line line;
+  if (scanner_ && S_ISREG(row.attributes->mode)) {
+    line = scanner_->FirstLine(AT_FDCWD, path_.c_str(), kMostLineBytes);
+  }
+  switch (format_.kind) {
     case RowFormat::Kind::kPath:
-      AppendName(TextOf(file["real_path"]), format, out);
+      AppendName(out);
       break;
     case RowFormat::Kind::kLong:
-      AppendLong(file, format, out);
+      AppendLong(*row.attributes, out);
       break;
     case RowFormat::Kind::kJson:
-      AppendJsonRow(file, line, format, out);
+      AppendJson(row, line, out);
       break;
   }
-  if (line && format.kind != RowFormat::Kind::kJson) AppendLine(*line, format, out);
-  *out += format.end;
-}
-
-}  // namespace
-
-Json::Value RowFormat::Additional() const {
-  Json::Value names(Json::arrayValue);
-  names.append("real_path");
-  if (kind == Kind::kPath) return names;
-  for (const char* name : {"size", "owner", "time", "perm", "type"}) names.append(name);
-  return names;
-}
-
-nas::ReplyEncoder PageEncoder(const RowFormat& format) {
-  return [format](int code, const Json::Value& data) {
-    const bool listed = data.isObject();
-    const Json::Value& files = listed ? data["files"] : Json::Value::nullSingleton();
-    const bool finished = listed && data["finished"].asBool();
-    const Json::Value& total = listed ? data["total"] : Json::Value::nullSingleton();
-    // Without a total it is that of a search whose record is gone, or could not be read this time.
-    const bool gone = code == 0 && !total.isNumeric();
-    nas::Reply reply{{.code = gone ? kCodeNoListing : code},
-                     (finished ? "1 " : "0 ") + std::to_string(files.size()) + " " +
-                         std::to_string(gone ? 0 : total.asUInt()) + "\n"};
-    constexpr size_t kUsualRowBytes = 128;
-    reply.body.reserve(reply.body.size() + files.size() * kUsualRowBytes);
-    constexpr size_t kMostLineBytes = 4096;
-    const int never = 0;
-    std::optional<nas::ContentScanner> scanner;
-    if (format.lines) scanner.emplace(*format.lines, never);
-    for (const Json::Value& file : files) {
-      Line line;
-      if (scanner && !file["is_dir"].asBool()) {
-        const std::string path(TextOf(file["real_path"]));
-        line = scanner->FirstLine(AT_FDCWD, path.c_str(), kMostLineBytes);
-      }
-      AppendRow(file, line, format, &reply.body);
-    }
-    return reply;
-  };
-}
-
-Page::Page(nas::Reply reply) : body_(std::move(reply.body)) {
-  int finished = 0;
-  unsigned long long rows = 0;
-  unsigned long long total = 0;
-  int used = 0;
-  constexpr int kNumbers = 3;
-  if (std::sscanf(body_.c_str(), "%d %llu %llu%n", &finished, &rows, &total, &used) != kNumbers) {
-    return;
-  }
-  code_ = reply.head.code;
-  finished_ = finished != 0;
-  rows_ = rows;
-  total_ = total;
-  text_at_ = static_cast<size_t>(used) + 1;
+  if (line && format_.kind != RowFormat::Kind::kJson) AppendLine(*line, out);
+  *out += format_.end;
 }
 
 }  // namespace arbory

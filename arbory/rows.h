@@ -1,16 +1,13 @@
 #pragma once
-// Pages of a search's listing, turned in the request child into the bytes to print: the parent then
-// only writes them, and a large page is never encoded and parsed as JSON on the way.
-//
-// A page's body is "FINISHED ROWS TOTAL\n" and the rows as they are printed.
+// The rows of a search as they are printed.
 
-#include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
-#include <string_view>
 
 #include "nas/match/content_query.h"
-#include "nas/webapi/runner.h"
+#include "nas/match/content_scanner.h"
+#include "nas/results/result_reader.h"
 
 namespace arbory {
 
@@ -21,30 +18,30 @@ struct RowFormat {
   bool escape = false;  // for a terminal
   // Where given, the first line is told of each file whose contents hold what it asks for.
   std::shared_ptr<const nas::ContentQuery> lines;
-
-  // What the listing must be asked for: names of additional attributes.
-  Json::Value Additional() const;
 };
 
-class Page {
+// For one thread. Borrows both.
+class RowWriter {
  public:
-  explicit Page(nas::Reply reply);
-  int code() const { return code_; }
-  bool finished() const { return finished_; }
-  std::uint64_t rows() const { return rows_; }
-  // How many rows the search has in all.
-  std::uint64_t total() const { return total_; }
-  std::string_view text() const { return std::string_view(body_).substr(text_at_); }
+  // `reader` knows the owners' names.
+  RowWriter(const RowFormat& format, nas::ResultReader& reader);
+
+  // Appends the row with its end.
+  void Append(const nas::ResultRow& row, std::string* out);
 
  private:
-  std::string body_;
-  int code_ = nas::kCodeUnknownFailure;
-  bool finished_ = false;
-  std::uint64_t rows_ = 0;
-  std::uint64_t total_ = 0;
-  size_t text_at_ = 0;
-};
+  using Line = std::optional<nas::MatchingLine>;
 
-nas::ReplyEncoder PageEncoder(const RowFormat& format);
+  void AppendName(std::string* out) const;
+  void AppendLong(const nas::FileAttributes& file, std::string* out);
+  void AppendJson(const nas::ResultRow& row, const Line& line, std::string* out);
+  void AppendLine(const nas::MatchingLine& line, std::string* out) const;
+
+  const RowFormat& format_;
+  nas::ResultReader& reader_;
+  std::optional<nas::ContentScanner> scanner_;
+  std::string path_;  // of the row, on disk
+  std::string json_;
+};
 
 }  // namespace arbory

@@ -18,7 +18,7 @@
 #include "arbory/caller.h"
 #include "arbory/interrupt.h"
 #include "arbory/nothing_found.h"
-#include "arbory/page_reader.h"
+#include "arbory/row_reader.h"
 #include "arbory/rows.h"
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
@@ -26,6 +26,7 @@
 #include "arbory/terminal.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
+#include "nas/system/identity.h"
 #include "nas/webapi/runner.h"
 
 namespace arbory {
@@ -100,6 +101,8 @@ class Search {
     const nas::Reply reply = Call("start", params, encode);
     if (reply.head.code == 0) {
       task_id_ = reply.body;
+      // What is read of the search from here on, a database among it, is its user's to write.
+      nas::GiveUpRoot();
       asking_ = AskAfter(caller_.user(), task_id_);
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
@@ -114,29 +117,30 @@ class Search {
                              (why.empty() ? "code " + std::to_string(reply.head.code) : why));
   }
 
-  // Prints rows in the order they are found.
-  Ending Stream() {
-    PageReader pages(&caller_, options_, format_, task_id_);
-    while (!pages.AtEnd()) {
-      const bool walked = HasWalked();
-      const Page page = pages.Next(walked, [this] {
-        ShowProgress();
-        return !Interrupted();
-      });
+  // Prints rows as far as they have been found, until there are no more.
+  Ending Stream() try {
+    std::optional<RowReader> rows;
+    while (!rows || !rows->AtEnd()) {
+      ShowProgress();
+      const RunningSearch state = Look();
+      const bool ended = state.all_found || state.finished || !state.exists;
       if (Interrupted()) return Ending::kInterrupted;
-      if (page.code() != 0) {
-        // No results to be had: because the search failed, or because it has not come so far yet.
-        const RunningSearch state = ReadSearch(caller_.user(), task_id_);
-        failure_ = page.code();
-        if (state.finished || !state.exists) return Ending::kFailed;
+      if (!rows && !state.results.empty() && state.exists) {
+        rows.emplace(state.results, options_, format_);
       }
-      if (!Print(page)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
-      if (!pages.caught_up()) continue;
-      if (page.code() == 0 && (page.finished() || walked)) return Ending::kComplete;
-      if (page.rows() >= kManyRows) busy_ = Clock::now();
+      if (rows) {
+        const RowReader::Rows found = rows->Next();
+        if (!Print(found)) return Interrupted() ? Ending::kInterrupted : Ending::kUnwritable;
+        if (!found.caught_up) continue;
+        if (found.count >= kManyRows) busy_ = Clock::now();
+      }
+      if (ended) return rows ? Ending::kComplete : Ending::kFailed;
       Wait();
     }
     return Ending::kEnough;
+  } catch (const std::exception& error) {
+    failure_text_ = error.what();
+    return Ending::kFailed;
   }
 
   // Prints the rows of the finished search.
@@ -151,11 +155,11 @@ class Search {
   }
 
   // False when standard output does not take it.
-  bool Print(const Page& page) {
-    if (page.rows() == 0) return true;
+  bool Print(const RowReader::Rows& rows) {
+    if (rows.count == 0) return true;
     progress_.Clear();
-    printed_ += page.rows();
-    if (WriteOut(STDOUT_FILENO, page.text())) return true;
+    printed_ += rows.count;
+    if (WriteOut(STDOUT_FILENO, rows.text)) return true;
     failure_ = errno;
     return false;
   }
@@ -173,12 +177,11 @@ class Search {
     }
   }
 
-  // Whether no more rows will come, though the worker may still be sorting what it has found. Rows
-  // that do come after this are noticed, however early the search is.
-  bool HasWalked() {
-    const RunningSearch state = ReadSearch(caller_.user(), task_id_);
+  // Rows that come after this are noticed, however early the search is.
+  RunningSearch Look() {
+    RunningSearch state = ReadSearch(caller_.user(), task_id_);
     if (!watch_ && !state.results.empty()) watch_.emplace(state.results);
-    return state.all_found;
+    return state;
   }
 
   void ShowProgress() {
@@ -212,7 +215,7 @@ class Search {
     } else if (!state.exists || (state.finished && state.progress == 0)) {
       Complain("the search was stopped before it was complete");
     } else if (ending == Ending::kFailed) {
-      Complain("the results cannot be read (code " + std::to_string(failure_) + ")");
+      Complain("the results cannot be read" + (failure_text_.empty() ? "" : ": " + failure_text_));
     } else {
       return true;
     }
@@ -250,7 +253,8 @@ class Search {
   std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows
   std::uint64_t printed_ = 0;
-  int failure_ = 0;  // the code of kFailed, errno of kUnwritable
+  int failure_ = 0;           // errno of kUnwritable
+  std::string failure_text_;  // of kFailed
   bool running_ = true;
   bool found_nothing_ = false;
   std::chrono::milliseconds ran_{0};

@@ -60,7 +60,9 @@ constexpr Bytes CareFor(JsonBytes bytes) {
 constexpr Bytes kCareWhenRaw = CareFor(JsonBytes::kRaw);
 constexpr Bytes kCareWhenClean = CareFor(JsonBytes::kClean);
 
-void AppendString(std::string_view text, JsonBytes bytes, std::string* out) {
+}  // namespace
+
+void AppendJsonString(std::string_view text, JsonBytes bytes, std::string* out) {
   const Bytes& care = bytes == JsonBytes::kRaw ? kCareWhenRaw : kCareWhenClean;
   *out += '"';
   while (!text.empty()) {
@@ -81,6 +83,8 @@ void AppendString(std::string_view text, JsonBytes bytes, std::string* out) {
   }
   *out += '"';
 }
+
+namespace {
 
 template <typename Number>
 void AppendNumber(Number number, std::string* out) {
@@ -129,7 +133,7 @@ void AppendObject(const Json::Value& value, JsonBytes bytes, std::string* out,
     first = false;
     const char* end = nullptr;
     const char* begin = member.memberName(&end);
-    AppendString({begin, static_cast<size_t>(end - begin)}, bytes, out);
+    AppendJsonString({begin, static_cast<size_t>(end - begin)}, bytes, out);
     *out += ':';
     AppendJson(*member, bytes, out, spill);
     if (spill) spill(out);
@@ -182,7 +186,7 @@ void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out,
     case Json::realValue:
       return AppendReal(value.asDouble(), out);
     case Json::stringValue:
-      return AppendString(StringOf(value), bytes, out);
+      return AppendJsonString(StringOf(value), bytes, out);
     case Json::booleanValue:
       *out += value.asBool() ? "true" : "false";
       return;

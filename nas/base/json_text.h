@@ -25,6 +25,8 @@ using JsonSpill = std::function<void(std::string* out)>;
 void AppendJson(const Json::Value& value, JsonBytes bytes, std::string* out,
                 const JsonSpill& spill = {});
 std::string JsonText(const Json::Value& value, JsonBytes bytes);
+// Appends the text as a JSON string.
+void AppendJsonString(std::string_view text, JsonBytes bytes, std::string* out);
 
 // Far above any request or record, and low enough for the recursion to fit every stack.
 inline constexpr int kJsonMaxDepth = 200;

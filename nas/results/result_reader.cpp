@@ -28,6 +28,8 @@ Database OpenResultFile(const std::string& path) {
 
 ResultReader::ResultReader(const std::string& path) : path_(path), db_(OpenResultFile(path)) {}
 
+ResultReader::~ResultReader() = default;
+
 void ResultReader::Begin() {
   blocks_.Close();
   transaction_.emplace(db_, Transaction::Kind::kRead);

@@ -32,6 +32,9 @@ class ResultReader {
  public:
   // Throws SqliteError, or std::runtime_error for a file of another version.
   explicit ResultReader(const std::string& path);
+  ~ResultReader();
+  ResultReader(const ResultReader&) = delete;
+  ResultReader& operator=(const ResultReader&) = delete;
 
   // Begin throws SqliteError too where another holds the file for longer than
   // kResultBusyMilliseconds. What lies in between is asked only between the two.

@@ -2,7 +2,6 @@
 
 #include <malloc.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -65,24 +64,17 @@ class Incoming {
   Reply reply_;
 };
 
-// Collects the reply; false when `go_on` ended the wait. What the child wrote before it died is
-// still read.
-bool Collect(const Child& child, int process_fd, const std::function<bool()>& go_on,
-             Incoming* incoming) {
-  bool dead = false;
-  for (;;) {
+// Collects the reply. What the child wrote before it died is still read.
+void Collect(const Child& child, int process_fd, Incoming* incoming) {
+  for (bool dead = false;;) {
     pollfd watched[] = {{child.fd.get(), POLLIN, 0}, {process_fd, POLLIN, 0}};
-    const int patience = dead ? 0 : go_on ? kAskMilliseconds : kForever;
-    const int ready = poll(watched, process_fd < 0 || dead ? 1 : 2, patience);
-    if (ready < 0 && errno != EINTR) return true;
-    if (!dead && ready <= 0) {
-      if (go_on && !go_on()) return false;
-    } else if (watched[0].revents != 0) {
-      if (!incoming->ReadSome(child.fd.get())) return true;
-    } else if (dead) {
-      if (ready == 0) return true;
-    } else {
+    const int ready = poll(watched, process_fd < 0 || dead ? 1 : 2, dead ? 0 : kForever);
+    if (ready < 0 && errno == EINTR) continue;
+    if (ready < 0 || (dead && ready == 0)) return;
+    if (watched[0].revents == 0) {
       dead = watched[1].revents != 0;
+    } else if (!incoming->ReadSome(child.fd.get())) {
+      return;
     }
   }
 }
@@ -133,24 +125,15 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
       CurrentConfig().call_memory_bytes());
 }
 
-Reply FinishCall(Child child, const ReplyEncoder& encode, const std::function<bool()>& go_on) {
+Reply FinishCall(Child child, const ReplyEncoder& encode) {
   Incoming incoming;
   if (child.pid > 0) {
     const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, child.pid, 0)));
-    if (!Collect(child, process.get(), go_on, &incoming)) {
-      AbandonCall(std::move(child));
-      return {{.code = kCodeUnknownFailure}, {}};
-    }
+    Collect(child, process.get(), &incoming);
     child.fd.Reset();
     Reap(child.pid);
   }
   return incoming.whole() ? incoming.Take() : encode(kCodeUnknownFailure, Json::Value());
-}
-
-void AbandonCall(Child child) {
-  if (child.pid <= 0) return;
-  kill(child.pid, SIGKILL);
-  Reap(child.pid);
 }
 
 Reply RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {

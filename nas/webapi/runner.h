@@ -48,12 +48,7 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
 // be made or answers nothing yields encode(kCodeUnknownFailure, null).
 Reply RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
-// The second half of RunCall, for a call begun with StartCall. `go_on`, where given, is asked every
-// kAskMilliseconds while the call is waited for; when it answers false the request child is killed
-// and the result is kCodeUnknownFailure without a body.
-constexpr int kAskMilliseconds = 50;  // soon enough for a person's interrupt
-Reply FinishCall(Child child, const ReplyEncoder& encode, const std::function<bool()>& go_on = {});
-// Ends a call that nobody waits for any more.
-void AbandonCall(Child child);
+// The second half of RunCall, for a call begun with StartCall.
+Reply FinishCall(Child child, const ReplyEncoder& encode);
 
 }  // namespace nas

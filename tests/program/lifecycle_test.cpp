@@ -396,7 +396,7 @@ TEST_F(Lifecycle, RootsProgramForAUserIsTheUser) {
   const passwd* user = getpwnam(nas_test::kOtherUser);
   const std::string uid = std::to_string(user->pw_uid);
   const std::string gid = std::to_string(user->pw_gid);
-  EXPECT_THAT(status, HasSubstr("Uid:\t" + uid + "\t" + uid + "\t0\t" + uid + "\n"));
+  EXPECT_THAT(status, HasSubstr("Uid:\t" + uid + "\t" + uid + "\t" + uid + "\t" + uid + "\n"));
   EXPECT_THAT(status, HasSubstr("Gid:\t" + gid + "\t" + gid + "\t" + gid + "\t" + gid + "\n"));
   EXPECT_THAT(status, HasSubstr("Groups:\t" + gid + " \n"));
   EXPECT_TRUE(Eventually([&] { return Remains(nas_test::kOtherUser).empty(); }));
