@@ -88,25 +88,34 @@ int ContentScanner::Open(int folder, const char* name) {
 
 ContentScanner::Outcome ContentScanner::Scan(int folder, const char* name, const Decide& decide) {
   const UniqueFd fd(Open(folder, name));
-  return fd ? ScanOpen(fd.get(), decide) : Outcome::kFailed;
+  return fd ? ScanOpen(fd.get(), decide, nullptr) : Outcome::kFailed;
 }
 
-ContentScanner::Outcome ContentScanner::ScanOpen(int fd, const Decide& decide) {
+ContentScanner::Outcome ContentScanner::ScanOpen(int fd, const Decide& decide, LineSearch* lines) {
   std::fill(found_.begin(), found_.end(), false);
   reader_.Start(fd);
-  Outcome outcome = Read(decide);
+  Outcome outcome = Read(decide, lines);
   // What stands there in either reading is there: the guess may be wrong.
   const bool open = outcome == Outcome::kNoMatch && decide(found_, false) == Answer::kMaybe;
-  if (open && reader_.StartGuessed()) outcome = Read(decide);
+  if (open && reader_.StartGuessed()) outcome = Read(decide, lines);
   const bool told = outcome == Outcome::kNoMatch || outcome == Outcome::kBinary;
   return told && decide(found_, true) == Answer::kYes ? Outcome::kMatch : outcome;
 }
 
 // kNoMatch for a file that was read as far as is needed to tell.
-ContentScanner::Outcome ContentScanner::Read(const Decide& decide) {
-  return EachPiece(query_.by_lines_ ? Units::kLines : Units::kBytes,
-                   [&](std::string_view text, size_t /*done*/) {
-                     Search(text);
+ContentScanner::Outcome ContentScanner::Read(const Decide& decide, LineSearch* lines) {
+  if (lines != nullptr) {
+    lines->lines_before = 0;
+    lines->at_line_start = true;
+  }
+  const bool by_lines = query_.by_lines_ || lines != nullptr;
+  return EachPiece(by_lines ? Units::kLines : Units::kBytes,
+                   [&](std::string_view text, size_t done) {
+                     if (lines != nullptr && !lines->line) {
+                       SearchLine(text, done, *lines);
+                     } else {
+                       Search(text);
+                     }
                      return decide(found_, false) != Answer::kMaybe;
                    });
 }
@@ -156,34 +165,33 @@ std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* na
 }
 
 std::optional<MatchingLine> ContentScanner::FirstLine(int fd, size_t most_bytes) {
-  if (ScanOpen(fd, texts_) != Outcome::kMatch || lseek(fd, 0, SEEK_SET) != 0) return std::nullopt;
-  reader_.Start(fd);
-  std::optional<MatchingLine> line;
-  do {
-    std::uint64_t lines_before = 0;
-    bool at_line_start = true;
-    EachPiece(Units::kLines, [&](std::string_view text, size_t done) {
-      line = LineIn(text, at_line_start, most_bytes);
-      if (line) line->number += lines_before;
-      const std::string_view gone = text.substr(0, done);
-      lines_before += static_cast<std::uint64_t>(std::ranges::count(gone, '\n'));
-      if (!gone.empty()) at_line_start = gone.back() == '\n';
-      return line.has_value();
-    });
-  } while (!line && reader_.StartGuessed());
-  return line;
+  LineSearch lines{.most_bytes = most_bytes};
+  if (ScanOpen(fd, texts_, &lines) != Outcome::kMatch) return std::nullopt;
+  return std::move(lines.line);
 }
 
-// The first line of the text that has one of the needles, with all that it has of them.
-std::optional<MatchingLine> ContentScanner::LineIn(std::string_view text, bool at_line_start,
-                                                   size_t most_bytes) {
+void ContentScanner::SearchLine(std::string_view text, size_t done, LineSearch& lines) {
   TextPlace first{npos, 0};
-  for (const auto& needle : query_.needles_) {
-    if (needle.negated) continue;
+  for (size_t i = 0; i < found_.size(); ++i) {
+    const ContentQuery::Needle& needle = query_.needles_[i];
+    if (found_[i] && needle.negated) continue;
     const auto place = needle.Find(text, 0);
-    if (place && place->at < first.at) first = *place;
+    if (!place) continue;
+    found_[i] = true;
+    if (!needle.negated && place->at < first.at) first = *place;
   }
-  if (first.at == npos) return std::nullopt;
+  if (first.at != npos) {
+    lines.line = LineAt(first, text, lines);
+    return;
+  }
+  const std::string_view gone = text.substr(0, done);
+  lines.lines_before += static_cast<std::uint64_t>(std::ranges::count(gone, '\n'));
+  if (!gone.empty()) lines.at_line_start = gone.back() == '\n';
+}
+
+// The line that `first` lies in, with all that it has of the needles.
+MatchingLine ContentScanner::LineAt(TextPlace first, std::string_view text,
+                                    const LineSearch& lines) const {
   const size_t before = first.at == 0 ? npos : text.rfind('\n', first.at - 1);
   const size_t from = before == npos ? 0 : before + 1;
   size_t end = std::min(text.find('\n', first.at), text.size());
@@ -201,8 +209,10 @@ std::optional<MatchingLine> ContentScanner::LineIn(std::string_view text, bool a
     }
   }
   Merge(&marks);
-  MatchingLine found = Cut(line, std::move(marks), most_bytes, before != npos || at_line_start);
-  found.number = 1 + static_cast<std::uint64_t>(std::ranges::count(text.substr(0, from), '\n'));
+  MatchingLine found =
+      Cut(line, std::move(marks), lines.most_bytes, before != npos || lines.at_line_start);
+  found.number = lines.lines_before + 1 +
+                 static_cast<std::uint64_t>(std::ranges::count(text.substr(0, from), '\n'));
   return found;
 }
 

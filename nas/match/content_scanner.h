@@ -39,22 +39,32 @@ class ContentScanner {
   Outcome Scan(int folder, const char* name) { return Scan(folder, name, texts_); }
 
   // Where the regular file of that name matches; nothing where it does not, as when it has changed
-  // since, is something else, or cannot be read.
+  // since, is something else, or cannot be read. Reads once, as far as Scan does.
   std::optional<MatchingLine> FirstLine(int folder, const char* name, size_t most_bytes);
   // The same of a file that is open at its beginning.
   std::optional<MatchingLine> FirstLine(int fd, size_t most_bytes);
 
  private:
   enum class Units { kBytes, kLines };
+  // The line that is looked for while a file is read.
+  struct LineSearch {
+    size_t most_bytes = 0;
+    std::uint64_t lines_before = 0;
+    bool at_line_start = true;
+    std::optional<MatchingLine> line = {};
+  };
   int Open(int folder, const char* name);
-  Outcome ScanOpen(int fd, const Decide& decide);
-  Outcome Read(const Decide& decide);
+  // `lines` may be null, here and below.
+  Outcome ScanOpen(int fd, const Decide& decide, LineSearch* lines);
+  Outcome Read(const Decide& decide, LineSearch* lines);
   // Hands the text over, in pieces that overlap so that nothing is cut in two: `look` is told a
   // piece and how much of it is not yet handed over again, and answers whether it has seen enough.
   template <typename Look>
   Outcome EachPiece(Units units, const Look& look);
   void Search(std::string_view text);
-  std::optional<MatchingLine> LineIn(std::string_view text, bool at_line_start, size_t most_bytes);
+  // As Search, while no line is known; `done` of the text are not handed over again.
+  void SearchLine(std::string_view text, size_t done, LineSearch& lines);
+  MatchingLine LineAt(TextPlace first, std::string_view text, const LineSearch& lines) const;
 
   const ContentQuery& query_;
   const int& stop_flag_;

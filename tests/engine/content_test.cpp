@@ -182,6 +182,19 @@ TEST_F(Contents, FirstLine) {
   }
 }
 
+// What is found is told by the reading that found it: a pipe can be read but once.
+TEST_F(Contents, FirstLineReadsOnce) {
+  int ends[2];
+  ASSERT_EQ(pipe2(ends, O_CLOEXEC), 0);
+  const UniqueFd out(ends[0]);
+  ASSERT_EQ(write(ends[1], "hay\none\ntwo", 11), 11);
+  close(ends[1]);
+  const auto query = ContentQuery::From(Query::Parse("two one")->root(), true);
+  const auto line = ContentScanner(*query, stop_).FirstLine(out.get(), 100);
+  ASSERT_TRUE(line);
+  EXPECT_EQ(line->number, 2U);
+}
+
 TEST_F(Contents, StopsAndFails) {
   stop_ = 1;
   EXPECT_EQ(Scan("x", "x"), ContentScanner::Outcome::kStopped);
