@@ -26,28 +26,29 @@ class NearNames {
  public:
   explicit NearNames(std::string_view word) : near_(word) {}
 
-  void See(FoldedName& name) {
+  // `others`: how many other terms the entry fails, which is worse than being less near.
+  void See(FoldedName& name, size_t others) {
     const size_t distance = near_.Distance(name.plain());
     if (distance > near_.farthest()) return;
     const std::lock_guard lock(mutex_);
-    const std::tuple one(distance, name.name().size(), std::string(name.name()));
+    const std::tuple one(others, distance, name.name().size(), std::string(name.name()));
     const auto at = std::ranges::lower_bound(nearest_, one);
     const bool known = std::ranges::any_of(
-        nearest_, [&](const auto& other) { return std::get<2>(other) == std::get<2>(one); });
+        nearest_, [&](const auto& other) { return std::get<3>(other) == std::get<3>(one); });
     if (known || (at == nearest_.end() && nearest_.size() == NearMisses::kMostNames)) return;
     nearest_.insert(at, one);
     if (nearest_.size() > NearMisses::kMostNames) nearest_.pop_back();
   }
   std::vector<std::string> names() const {
     std::vector<std::string> names;
-    for (const auto& [distance, length, name] : nearest_) names.push_back(name);
+    for (const auto& [others, distance, length, name] : nearest_) names.push_back(name);
     return names;
   }
 
  private:
   const NearText near_;
   std::mutex mutex_;  // guards nearest_
-  std::vector<std::tuple<size_t, size_t, std::string>> nearest_;
+  std::vector<std::tuple<size_t, size_t, size_t, std::string>> nearest_;
 };
 
 bool IsWord(const QueryNode& node) {
@@ -71,15 +72,14 @@ class MissCounter : public MissSink {
   }
 
   void See(const QuerySubject& subject) override {
-    size_t failed = 0;
-    size_t count = 0;
+    std::vector<size_t> failed;
     for (size_t i = 0; i < root_.children.size(); ++i) {
-      if (Ask(root_.children[i], subject) == Answer::kYes) continue;
-      failed = i;
-      ++count;
-      if (names_[i]) names_[i]->See(*subject.name);
+      if (Ask(root_.children[i], subject) != Answer::kYes) failed.push_back(i);
     }
-    if (count == 1) without_[failed].fetch_add(1, std::memory_order_relaxed);
+    if (failed.size() == 1) without_[failed[0]].fetch_add(1, std::memory_order_relaxed);
+    for (const size_t i : failed) {
+      if (names_[i]) names_[i]->See(*subject.name, failed.size() - 1);
+    }
   }
 
   std::vector<NearMisses::Term> Terms() const {
