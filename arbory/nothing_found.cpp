@@ -24,27 +24,32 @@ void ComplainOfTerm(const nas::NearMisses::Term& term, bool one_of_several) {
 }
 
 void Explain(const Json::Value& params, std::chrono::milliseconds most) {
+  const auto near = NearMissesOf(params, most);
+  if (!near) return;
+  Complain("nothing found among " + std::string(near->complete ? "" : "more than ") +
+           Counted(near->entries, "name", "names") + " in " +
+           Counted(near->folders, "folder", "folders"));
+  if (near->left_out > 0) {
+    Complain(Counted(near->left_out, "folder", "folders") +
+             " of the system's own or of its temporary files " +
+             (near->left_out == 1 ? "is" : "are") + " never searched");
+  }
+  for (const auto& term : near->terms) ComplainOfTerm(term, near->terms.size() > 1);
+}
+
+}  // namespace
+
+std::optional<nas::NearMisses> NearMissesOf(const Json::Value& params,
+                                            std::chrono::milliseconds most) {
   std::vector<nas::Location> locations;
   for (const Json::Value& text : params["folder_path"]) {
     auto location = nas::OpenLocation(text.asString());
     if (location) locations.push_back(std::move(*location));
   }
-  if (locations.empty()) return;
+  if (locations.empty()) return std::nullopt;
   const Comparators comparators(params);
-  const nas::NearMisses near =
-      nas::LookForNearMisses(locations, comparators.get(), params["recursive"].asBool(), most);
-  Complain("nothing found among " + std::string(near.complete ? "" : "more than ") +
-           Counted(near.entries, "name", "names") + " in " +
-           Counted(near.folders, "folder", "folders"));
-  if (near.left_out > 0) {
-    Complain(Counted(near.left_out, "folder", "folders") +
-             " of the system's own or of its temporary files " +
-             (near.left_out == 1 ? "is" : "are") + " never searched");
-  }
-  for (const auto& term : near.terms) ComplainOfTerm(term, near.terms.size() > 1);
+  return nas::LookForNearMisses(locations, comparators.get(), params["recursive"].asBool(), most);
 }
-
-}  // namespace
 
 void ExplainNothing(const Json::Value& params, std::chrono::milliseconds most) try {
   Explain(params, most);

@@ -5,12 +5,19 @@
 #include <json/value.h>
 
 #include <chrono>
+#include <optional>
+
+#include "nas/search/near_misses.h"
 
 namespace arbory {
 
-// On standard error, for a search of these parameters (search_request.h). Asks the engine itself,
-// in this process, which must have the user's identity and ends soon, and takes `most` for it. Says
-// less where something fails.
+// Asks the engine itself, in this process, which must have the user's identity and ends soon, what
+// a search of these parameters (search_request.h) came close to, and takes `most` for it. Nothing
+// where no folder can be opened. Throws for parameters that a search would not take.
+std::optional<nas::NearMisses> NearMissesOf(const Json::Value& params,
+                                            std::chrono::milliseconds most);
+
+// The same on standard error. Says less where something fails.
 void ExplainNothing(const Json::Value& params, std::chrono::milliseconds most);
 
 }  // namespace arbory

@@ -22,6 +22,18 @@ class UsageError : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
+// The same of what a search asks for.
+class CriterionError : public UsageError {
+ public:
+  CriterionError(std::string criterion, const std::string& sentence)
+      : UsageError(sentence), criterion_(std::move(criterion)) {}
+  // The parameter of a search's start that it would have become, of times without its ending.
+  const std::string& criterion() const { return criterion_; }
+
+ private:
+  std::string criterion_;
+};
+
 struct CommonOptions {
   std::string config;               // path; empty: the usual places
   std::string user;                 // empty: the caller
@@ -45,6 +57,7 @@ struct ServeOptions {
 struct TimeRange {
   std::string from;
   std::string to;
+  std::string within;  // bounds in one text, as behind "modified:"; in the place of the others
 };
 
 // What is searched for and where.

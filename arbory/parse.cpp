@@ -4,9 +4,18 @@
 #include <filesystem>
 
 #include "arbory/options.h"
-#include "nas/match/query_values.h"
+#include "nas/match/query_prefix.h"
 
 namespace arbory {
+namespace {
+
+// Searches compare times of 32 bits; a later one would silently become a time long past.
+[[noreturn]] void ThrowBeyond(const std::string& text) {
+  throw UsageError("'" + text + "' lies outside 1901-12-13 to 2038-01-19, which is what a " +
+                   "search can compare");
+}
+
+}  // namespace
 
 std::int64_t ParseSize(const std::string& text) {
   const auto size = nas::ReadSize(text);
@@ -24,12 +33,23 @@ std::int64_t ParseTime(const std::string& text, Bound bound, std::time_t now) {
   const bool from = bound == Bound::kFrom;
   const std::int64_t seconds = from ? time->span.from : time->span.to;
   if (from && seconds == nas::Bounds::kLeast) return INT32_MIN;
-  // Searches compare times of 32 bits; a later one would silently become a time long past.
-  if (seconds > INT32_MAX || seconds < INT32_MIN) {
-    throw UsageError("'" + text + "' lies outside 1901-12-13 to 2038-01-19, which is what a " +
-                     "search can compare");
-  }
+  if (seconds > INT32_MAX || seconds < INT32_MIN) ThrowBeyond(text);
   return seconds;
+}
+
+nas::Bounds ParseTimeBounds(const std::string& text, std::time_t now) {
+  const auto node = nas::PrefixNode(*nas::FindPrefix("modified:"), text, now);
+  if (!node) throw UsageError("'" + text + "': " + node.error().path);
+  if (node->bounds.size() != 1) {
+    throw UsageError("'" + text + "' are several times; write them as one, as in A..B");
+  }
+  nas::Bounds bounds = node->bounds.front();
+  if (bounds.from > INT32_MAX || bounds.to < INT32_MIN) ThrowBeyond(text);
+  if (bounds.from != nas::Bounds::kLeast) {
+    bounds.from = std::max(bounds.from, std::int64_t{INT32_MIN});
+  }
+  if (bounds.to != nas::Bounds::kMost) bounds.to = std::min(bounds.to, std::int64_t{INT32_MAX});
+  return bounds;
 }
 
 nas::ShareSetting ParseShare(const std::string& text) {

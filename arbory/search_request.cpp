@@ -28,13 +28,30 @@ void CheckText(FileSearch::FindFactory::_tag_FIND_FIELD_ field, const std::strin
   if (!made) throw UsageError("'" + text + "' is no " + what);
 }
 
+void SetBounds(const nas::Bounds& bounds, const std::string& name, Json::Value* params) {
+  if (bounds.from != nas::Bounds::kLeast) (*params)[name + "_from"] = Json::Int64{bounds.from};
+  if (bounds.to != nas::Bounds::kMost) (*params)[name + "_to"] = Json::Int64{bounds.to};
+}
+
 void SetTimes(const TimeRange& range, const std::string& name, std::time_t now,
               Json::Value* params) {
-  if (!range.from.empty()) {
-    (*params)[name + "_from"] = Json::Int64{ParseTime(range.from, Bound::kFrom, now)};
+  nas::Bounds bounds;
+  if (!range.within.empty()) bounds = ParseTimeBounds(range.within, now);
+  if (!range.from.empty()) bounds.from = ParseTime(range.from, Bound::kFrom, now);
+  if (!range.to.empty()) bounds.to = ParseTime(range.to, Bound::kTo, now);
+  if (bounds.from > bounds.to) {
+    throw UsageError("'" + range.to + "' is before '" + range.from + "'");
   }
-  if (!range.to.empty()) {
-    (*params)[name + "_to"] = Json::Int64{ParseTime(range.to, Bound::kTo, now)};
+  SetBounds(bounds, name, params);
+}
+
+// What `set` throws is said of this criterion.
+template <class Set>
+void Of(const char* criterion, const Set& set) {
+  try {
+    set();
+  } catch (const UsageError& error) {
+    throw CriterionError(criterion, error.what());
   }
 }
 
@@ -44,40 +61,61 @@ std::string Joined(const std::vector<std::string>& words) {
   return text;
 }
 
+void SetSizes(const SearchQuery& query, Json::Value* params) {
+  nas::Bounds bounds;
+  Of("size_from", [&] {
+    if (!query.size_from.empty()) bounds.from = ParseSize(query.size_from);
+  });
+  Of("size_to", [&] {
+    if (!query.size_to.empty()) bounds.to = ParseSize(query.size_to);
+    if (bounds.from <= bounds.to) return;
+    throw UsageError("'" + query.size_to + "' is less than '" + query.size_from + "'");
+  });
+  SetBounds(bounds, "size", params);
+}
+
+void SetWords(const SearchQuery& query, Json::Value* params) {
+  using Factory = FileSearch::FindFactory;
+  const std::string extensions = Joined(query.extensions);
+  Of("extension", [&] {
+    if (extensions.empty()) return;
+    CheckText(Factory::FIND_EXTENSION, extensions, "list of extensions");
+    (*params)["extension"] = extensions;
+  });
+  Of("filetype", [&] {
+    if (query.type.empty()) return;
+    CheckText(Factory::FIND_FILETYPE, query.type,
+              "file type; there are file, dir, image, video, audio, document and archive");
+    (*params)["filetype"] = query.type;
+  });
+  Of("owner", [&] {
+    if (query.owner.empty()) return;
+    CheckOwner(query.owner);
+    (*params)["owner"] = query.owner;
+  });
+  Of("group", [&] {
+    if (query.group.empty()) return;
+    CheckGroup(query.group);
+    (*params)["group"] = query.group;
+  });
+}
+
 }  // namespace
 
 Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::string>& locations,
                           std::time_t now) {
-  using Factory = FileSearch::FindFactory;
   Json::Value params(Json::objectValue);
   for (const std::string& location : locations) params["folder_path"].append(location);
-  if (const auto parsed = nas::Query::Parse(query.pattern, now); !parsed) {
-    throw UsageError(parsed.error().path);
-  }
+  Of("pattern", [&] {
+    const auto parsed = nas::Query::Parse(query.pattern, now);
+    if (!parsed) throw UsageError(parsed.error().path);
+  });
   params["pattern"] = query.pattern;
-  const std::string extensions = Joined(query.extensions);
-  if (!extensions.empty()) {
-    CheckText(Factory::FIND_EXTENSION, extensions, "list of extensions");
-    params["extension"] = extensions;
-  }
-  if (!query.type.empty()) {
-    CheckText(Factory::FIND_FILETYPE, query.type,
-              "file type; there are file, dir, image, video, audio, document and archive");
-    params["filetype"] = query.type;
-  }
-  if (!query.size_from.empty()) params["size_from"] = Json::Int64{ParseSize(query.size_from)};
-  if (!query.size_to.empty()) params["size_to"] = Json::Int64{ParseSize(query.size_to)};
-  SetTimes(query.mtime, "mtime", now, &params);
-  SetTimes(query.crtime, "crtime", now, &params);
-  SetTimes(query.atime, "atime", now, &params);
-  if (!query.owner.empty()) {
-    CheckOwner(query.owner);
-    params["owner"] = query.owner;
-  }
-  if (!query.group.empty()) {
-    CheckGroup(query.group);
-    params["group"] = query.group;
-  }
+  SetWords(query, &params);
+  SetSizes(query, &params);
+  Of("mtime", [&] { SetTimes(query.mtime, "mtime", now, &params); });
+  Of("crtime", [&] { SetTimes(query.crtime, "crtime", now, &params); });
+  Of("atime", [&] { SetTimes(query.atime, "atime", now, &params); });
   params["recursive"] = query.recursive;
   params["search_content"] = query.content;
   return params;

@@ -1,5 +1,6 @@
 #pragma once
-// The parameters of a search's start, from what the command line says.
+// The parameters of a search's start, from what was typed: on a command line, or in the page's
+// form.
 
 #include <json/value.h>
 
@@ -12,9 +13,10 @@
 
 namespace arbory {
 
-// `now` is what ages count back from. Throws UsageError for a value that cannot be understood and
-// for what a search would otherwise leave out silently or refuse without saying which part was
-// wrong: an unknown owner or group, an illegal pattern, extension or file type.
+// `now` is what ages count back from. Throws CriterionError for a value that cannot be understood
+// and for what a search would otherwise leave out silently or refuse without saying which part was
+// wrong: an unknown owner or group, an illegal pattern, extension or file type, bounds that nothing
+// can lie between. Asks the engine for all of that.
 Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::string>& locations,
                           std::time_t now);
 

@@ -88,12 +88,23 @@ Status AddWord(const QueryPrefix& prefix, std::string_view word, QueryNode& node
   return {};
 }
 
+Error WrongBounds(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
+  constexpr std::string_view kDots = "..";
+  const size_t dots = value.find(kDots);
+  if (dots == std::string_view::npos) return Wrong(prefix);
+  const std::string first(value.substr(0, dots));
+  const std::string last(value.substr(dots + kDots.size()));
+  const std::string swapped = last + std::string(kDots) + first;
+  if (!IsValueOf(prefix, swapped, now)) return Wrong(prefix);
+  return {kErrorIllegal, EINVAL, "it ends before it begins; write " + swapped};
+}
+
 Status AddValue(const QueryPrefix& prefix, std::string_view value, std::time_t now,
                 QueryNode& node) {
   if (value.empty()) return Wrong(prefix);
   if (prefix.value == Value::kWords) return AddWord(prefix, value, node);
   const auto bounds = ReadBounds(value, ReaderOf(prefix.value, now));
-  if (!bounds) return Wrong(prefix);
+  if (!bounds) return WrongBounds(prefix, value, now);
   node.bounds.push_back(*bounds);
   return {};
 }

@@ -325,20 +325,42 @@ test('folders are chosen from a tree', async () => {
 
 test('failures are sentences that say what to do', async () => {
   const rows: [string, string][] = [
-    ['#q=regex%3A(', 'Check its brackets'],
+    ['#q=regex%3A(', "'regex:(': missing"],
+    ['#q=x+size:>1xb', 'write a size as in'],
+    ['#q=x&owner=nob0dy', "There is no user 'nob0dy'"],
     ['#q=x&in=/nowhere', 'Choose others'],
     ['#q=x&in=/files/locked', 'ask their owner for access'],
   ];
   for (const [hash, sentence] of rows) {
-    const tab = await openTab(hash);
+    const tab = await openTab();
+    await tab.page.goto(`${server.origin}/${hash}`);
     await tab.page.getByText(sentence).waitFor();
     await tab.close();
   }
   const tab = await openTab();
   await tab.page.click('text=Criteria');
+  await tab.search('plan');
   await tab.page.getByLabel('Size from').fill('huge');
   await tab.page.press('#pattern', 'Enter');
-  await tab.page.getByText('Write a size as a number with a unit').waitFor();
+  await tab.page.getByText("'huge' is not a size").waitFor();
+  assert.equal(await tab.page.getByLabel('Size from').getAttribute('aria-invalid'), 'true');
+  assert.equal(await tab.count(), '4 matches', 'what was found before is shown still');
+  // Whatever the server reads may be written.
+  await tab.page.getByLabel('Size from').fill('');
+  await tab.page.getByRole('combobox', { name: 'Modified' }).selectOption('As written …');
+  await tab.page.getByLabel('Modified, as written').fill('2026-01-02..2026-01');
+  await tab.search('plan');
+  assert.equal(await tab.count(), '2 matches');
+  await tab.close();
+});
+
+test('what finds nothing tells what is in the way, and what is near', async () => {
+  const tab = await openTab();
+  await tab.search('plam ext:txt');
+  await tab.page.getByText('Without plam there would be').waitFor();
+  await tab.page.getByRole('button', { name: 'plan large.txt' }).click();
+  await tab.page.locator('.figures strong', { hasText: '1 match' }).waitFor();
+  assert.equal(await tab.page.inputValue('#pattern'), '"plan large.txt" ext:txt');
   await tab.close();
 });
 

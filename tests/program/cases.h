@@ -24,6 +24,7 @@ struct Found {
   std::vector<std::string> paths;  // each as often as it was found
   size_t unreadable = 0;           // folders
   bool cleaned = false;            // whether bytes that are no UTF-8 became U+FFFD
+  bool refused = false;            // as a search that can find nothing
 };
 // Searches the folder; `params` hold "recursive" and "search_content" in every case.
 using Way = std::function<Found(const Json::Value& params, const std::string& folder)>;

@@ -37,7 +37,7 @@ function begin(change: Script): void {
     const headers = { 'Content-Type': 'application/json', 'Retry-After': '0.01' };
     return new Response(JSON.stringify(reply.body), { status: reply.status ?? 200, headers });
   }) as typeof fetch;
-  search = new Search(NO_CRITERIA, {}, null, () => {}, () => ++signedOut);
+  search = new Search(NO_CRITERIA, Promise.resolve({}), null, () => {}, () => ++signedOut);
 }
 const count = (key: string) => asked.filter((one) => one === key).length;
 const settle = () => new Promise((done) => setTimeout(done, 20));
@@ -126,6 +126,7 @@ test('a search that is left leaves nothing behind, whenever that is', async () =
   assert.equal(count('clean'), 1);
   begin({});
   const early = search.run();
+  await Promise.resolve();
   search.close(); // before the server has named it
   await early;
   assert.equal(count('clean'), 1);

@@ -175,7 +175,7 @@ void ServeFirstLine(const FileRequest& request, const std::string& pattern, int 
     return SendError(pipe, kUnavailable, "The server cannot act as this user.");
   }
   const auto parsed = nas::Query::Parse(pattern);
-  if (!parsed) return SendError(pipe, kBadRequest, "The pattern cannot be understood.");
+  if (!parsed) return SendError(pipe, kBadRequest, parsed.error().path.c_str());
   const auto file = OpenFile(request);
   if (!file) return SendOpenError(pipe, file.error().error_number);
   const auto query = nas::ContentQuery::From(parsed->root(), true);

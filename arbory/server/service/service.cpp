@@ -102,6 +102,15 @@ std::span<const Route> Service::Routes() {
                                 [&] { return StartReadSearch(request->user, path[1]); });
        },
        "How far a search has come", kJson},
+      {kPost, "/searches/{taskid}/misses", Access::kLoggedIn,
+       [](Self self, Request request, Path path) {
+         return self.Ask(*request, "misses",
+                         [&](const nas::ApiCall& call) { return StartNearMisses(call, path[1]); });
+       },
+       "What a search that found nothing came close to", kJson},
+      {kPost, "/query", Access::kLoggedIn,
+       [](Self self, Request request, Path) { return self.Ask(*request, "query", StartReadQuery); },
+       "What was typed, as the parameters of a search", kJson},
       {kGet, "/files/{share}/{path...}", Access::kLoggedIn,
        [](Self self, Request request, Path path) { return self.GetFile(*request, path); },
        "One file, as a download or with preview=1 to look at", "application/octet-stream"},
@@ -189,11 +198,24 @@ Answer Service::MetricsReply() {
 }
 
 Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
+  return WithRoom(request, [&] { return StartCall(request, path); });
+}
+
+Answer Service::Ask(const HttpRequest& request, const std::string& name,
+                    const std::function<nas::Child(const nas::ApiCall&)>& start) {
+  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server"};
+  if (!request.body.empty()) call.read_params = ReaderOf(request.body);
+  return WithRoom(request, [&] {
+    return calls_.Run(Calls::Kind::kCall, request.user, name, [&] { return start(call); });
+  });
+}
+
+Answer Service::WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of) {
   if (request.body.size() != request.body_bytes) {
     return BusyReply(kUnavailable, "Other requests of this size are being answered; try again.",
                      kRetrySeconds);
   }
-  Answer answer = StartCall(request, path);
+  Answer answer = answer_of();
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     // The child holds the body as long as it runs.
     child->token = std::make_shared<std::pair<std::shared_ptr<void>, std::shared_ptr<BodyRoom>>>(

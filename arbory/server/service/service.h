@@ -48,6 +48,10 @@ class Service : public HttpService {
  private:
   Answer MetricsReply();
   Answer CallApi(const HttpRequest& request, const RequestPath& path);
+  // The answer of a child that reads the request's body, which `start` makes of the call.
+  Answer Ask(const HttpRequest& request, const std::string& name,
+             const std::function<nas::Child(const nas::ApiCall&)>& start);
+  static Answer WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of);
   Answer StartCall(const HttpRequest& request, const RequestPath& path);
   Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
   HttpReply NoSuchRowReply(const RequestPath& path) const;

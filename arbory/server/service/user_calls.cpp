@@ -3,10 +3,15 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <climits>
+#include <ctime>
 #include <vector>
 
+#include "arbory/nothing_found.h"
+#include "arbory/options.h"
 #include "arbory/running_search.h"
+#include "arbory/search_request.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
 #include "nas/system/identity.h"
@@ -18,6 +23,7 @@ namespace arbory {
 namespace {
 
 constexpr char kTaskId[] = "taskid";
+constexpr char kNoSearch[] = "There is no such search; start a new one.";
 
 Json::Value Error(int status, const char* sentence) {
   Json::Value body;
@@ -62,7 +68,7 @@ void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   const std::string id = request->GetParam(kTaskId, "").asString();
   const RunningSearch search = ReadSearch(request->GetLoginUserName(), id);
   if (!search.exists) {
-    response->SetError(kNotFound, Error(kNotFound, "There is no such search; start a new one."));
+    response->SetError(kNotFound, Error(kNotFound, kNoSearch));
     return;
   }
   Json::Value body;
@@ -73,6 +79,83 @@ void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   body["location"] = search.location;
   body["walk"] = search.walk;
   response->SetError(kOk, body);
+}
+
+constexpr char kWrongType[] = "A field has a wrong type; docs/http.md names them.";
+
+SearchQuery TypedQuery(const NUVA::APIRequest& request) {
+  const auto text = [&](const char* name) { return request.GetParam(name, "").asString(); };
+  SearchQuery query;
+  query.pattern = text("pattern");
+  if (const std::string list = text("extension"); !list.empty()) query.extensions = {list};
+  query.type = text("filetype");
+  query.size_from = text("size_from");
+  query.size_to = text("size_to");
+  query.mtime.within = text("mtime");
+  query.crtime.within = text("crtime");
+  query.atime.within = text("atime");
+  query.owner = text("owner");
+  query.group = text("group");
+  query.recursive = request.GetParam("recursive", true).asBool();
+  query.content = request.GetParam("search_content", false).asBool();
+  return query;
+}
+
+void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
+  if (!Become(request, response)) return;
+  Json::Value body;
+  try {
+    body["params"] = SearchRequest(TypedQuery(*request), {}, std::time(nullptr));
+  } catch (const CriterionError& error) {
+    body["wrong"]["criterion"] = error.criterion();
+    body["wrong"]["sentence"] = error.what();
+  }
+  response->SetError(kOk, body);
+} catch (const Json::Exception&) {
+  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
+}
+
+Json::Value MissesJson(const nas::NearMisses& near) {
+  Json::Value body;
+  body["complete"] = near.complete;
+  body["entries"] = Json::UInt64{near.entries};
+  body["folders"] = Json::UInt64{near.folders};
+  body["left_out"] = Json::UInt64{near.left_out};
+  body["terms"] = Json::Value(Json::arrayValue);
+  for (const nas::NearMisses::Term& term : near.terms) {
+    Json::Value& told = body["terms"].append(Json::Value());
+    told["written"] = term.written;
+    told["without"] = Json::UInt64{term.without};
+    told["names"] = Json::Value(Json::arrayValue);
+    for (const std::string& name : term.names) told["names"].append(name);
+  }
+  return body;
+}
+
+void NearMissesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
+  // A person reads meanwhile that nothing was found.
+  constexpr std::chrono::milliseconds kMost{1000};
+  if (!Become(request, response)) return;
+  const RunningSearch search =
+      ReadSearch(request->GetLoginUserName(), request->GetParam(kTaskId, "").asString());
+  if (!search.exists) {
+    response->SetError(kNotFound, Error(kNotFound, kNoSearch));
+    return;
+  }
+  Json::Value params;
+  for (const char* name :
+       {"pattern", "filetype", "extension", "owner", "group", "size_from", "size_to", "mtime_from",
+        "mtime_to", "crtime_from", "crtime_to", "atime_from", "atime_to"}) {
+    if (request->HasParam(name)) params[name] = request->GetParam(name, Json::Value());
+  }
+  params["recursive"] = request->GetParam("recursive", true).asBool();
+  params["folder_path"] = search.location;
+  const auto near = NearMissesOf(params, kMost);
+  response->SetError(kOk, MissesJson(near.value_or(nas::NearMisses())));
+} catch (const UsageError& error) {
+  response->SetError(kBadRequest, Error(kBadRequest, error.what()));
+} catch (const Json::Exception&) {
+  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
 }
 
 // The same request as one for the method "stop" of these searches.
@@ -154,6 +237,22 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id) 
   Json::Value params;
   params[kTaskId] = task_id;
   return Start(ReadSearchEntry, user, params);
+}
+
+nas::Child StartReadQuery(const nas::ApiCall& call) {
+  return nas::StartCall({"arbory", 1, "", ReadQueryEntry}, call, EncodeOwnReply);
+}
+
+nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id) {
+  nas::ApiCall named = call;
+  // Which search it is, the address tells.
+  named.read_params = [&](Json::Value* params) {
+    std::optional<nas::Reply> wrong;
+    if (call.read_params) wrong = call.read_params(params);
+    if (!wrong) (*params)[kTaskId] = task_id;
+    return wrong;
+  };
+  return nas::StartCall({"arbory", 1, "", NearMissesEntry}, named, EncodeOwnReply);
 }
 
 nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop) {

@@ -17,6 +17,16 @@ nas::Child StartListShares(const std::string& user);
 // is none of that id.
 nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 
+// What was typed, as the parameters of a search's start: {"params"}, or {"wrong":{"criterion",
+// "sentence"}} where it cannot be understood. The call's parameters are those of a start, sizes and
+// times as texts: "size_from", "size_to", and bounds as "mtime", "crtime" and "atime".
+nas::Child StartReadQuery(const nas::ApiCall& call);
+
+// What the user's search, started with the call's parameters, came close to in its folders:
+// {"complete","entries","folders","left_out","terms":[{"written","without","names"}]}; 404 when
+// there is no such search.
+nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id);
+
 // Stops the user's running searches by the module's own method "stop". {"stopped":N}.
 nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop);
 

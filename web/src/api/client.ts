@@ -1,13 +1,15 @@
 // The server's routes as functions. Everything goes to the page's own origin.
-import { ApiError, callFailure, UNREACHABLE } from './errors.ts';
+import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
   HistoryKind,
   HistoryRecord,
+  Misses,
   Page,
   Progress,
   Session,
   Shares,
   Started,
+  Understood,
 } from './types.ts';
 
 const SEARCH = 'NUVA.Arbory.Search/2';
@@ -42,10 +44,7 @@ async function request(path: string, init: RequestInit = {}): Promise<unknown> {
 }
 
 function sentence(status: number, body: Record<string, unknown> | null): string {
-  if (typeof body?.error === 'string' && body.error) {
-    const text = body.error[0]!.toUpperCase() + body.error.slice(1);
-    return /[.!?]$/.test(text) ? text : text + '.';
-  }
+  if (typeof body?.error === 'string' && body.error) return asSentence(body.error);
   return status === 503 ? 'The server is busy. Try again in a moment.' : UNREACHABLE;
 }
 
@@ -62,6 +61,9 @@ async function call<T>(api: string, method: string, params: object, init?: Reque
 }
 
 export const startSearch = (params: object) => call<Started>(SEARCH, 'start', params);
+export const understand = (typed: object) => post('query', typed) as Promise<Understood>;
+export const nearMisses = (taskid: string, params: object) =>
+  post(`searches/${encodeURIComponent(taskid)}/misses`, params) as Promise<Misses>;
 export const stopSearch = (taskid: string) => call<null>(SEARCH, 'stop', { taskid: [taskid] });
 // Outlives the page, so that leaving it leaves nothing behind.
 export const cleanSearch = (taskid: string) =>

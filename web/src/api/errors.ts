@@ -23,42 +23,22 @@ export const UNREACHABLE =
 
 const WALK_FAILURES: Record<number, string> = {
   401: 'The search failed on the server: its disk may be full. Try again, or ask who runs it.',
-  405: 'There is no such owner or group, in the criteria or behind owner: or group:. Check the spelling.',
+  405: 'There is no such owner or group any more. Check the spelling.',
   407: 'You may not read these folders. Choose others, or ask their owner for access.',
   408: 'These folders are no longer there. Choose others.',
   418: 'The folders or a criterion could not be understood. A folder begins with the name of a share: /photos/2026.',
 };
 
-const BAD_REGEX =
-  'What follows regex: is not a complete regular expression. Check its brackets and repetitions.';
-// What a value looks like behind each prefix whose values can be wrong.
-const VALUES: Record<string, string> = {
-  'size:': 'size:>10MB, size:1GB..2GB or size:0',
-  'modified:': 'modified:today, modified:last-7-days, modified:2026-07 or modified:<2026',
-  'created:': 'created:today, created:last-7-days, created:2026-07 or created:<2026',
-  'opened:': 'opened:today, opened:last-7-days, opened:2026-07 or opened:<2026',
-  'type:': 'type:image; there are file, dir, image, video, audio, document and archive',
-  'depth:': 'depth:1 or depth:<3',
-  'ext:': 'ext:jpg,png',
-  'empty:': 'empty: or empty:no',
-  'content:': 'content:invoice',
-  'case:': 'case:README',
-};
-const CRITERION = 418;
 const STORE = 401;
 
-export function walkFailure(code: number, pattern: string): string {
-  if (code === CRITERION) {
-    if (pattern.includes('regex:')) return BAD_REGEX;
-    const lowered = pattern.toLowerCase();
-    const known = Object.keys(VALUES).filter((prefix) => lowered.includes(prefix));
-    if (known.length > 0) {
-      return `What stands behind ${known.join(' or ')} could not be understood. Write it as in ${known
-        .map((prefix) => VALUES[prefix])
-        .join('; ')}.`;
-    }
-  }
+export function walkFailure(code: number): string {
   return WALK_FAILURES[code] ?? `The search failed on the server (error ${code}). Try again.`;
+}
+
+// Of the server's own words.
+export function asSentence(words: string): string {
+  const text = words.slice(0, 1).toUpperCase() + words.slice(1);
+  return /[.!?]$/.test(text) ? text : text + '.';
 }
 
 export function callFailure(method: string, code: number): string {

@@ -38,6 +38,20 @@ export interface Progress {
   walk?: Partial<Walk>;
 }
 
+// What was typed, as the parameters of a start; or what about it cannot be understood.
+export type Understood =
+  | { params: Record<string, unknown>; wrong?: undefined }
+  | { wrong: { criterion: string; sentence: string } };
+
+// What a search that found nothing came close to.
+export interface Misses {
+  complete: boolean;
+  entries: number;
+  folders: number;
+  left_out: number;
+  terms: { written: string; without: number; names: string[] }[];
+}
+
 export interface Session {
   user: string;
   mode: 'single' | 'login';

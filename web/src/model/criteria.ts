@@ -1,9 +1,12 @@
-// What a person asks for, as the form and the address bar hold it, and what becomes of it: the
-// parameters of a search's start, what the server remembers of them, and words. Values stay as they
-// were typed until the search starts, so that "last 7 days" in a shared link means the seven days
-// before it is opened.
-import { exactSize, formatSize, parseSize } from './size.ts';
-import { customValue, describeTime, timeBounds } from './times.ts';
+// What a person asks for, as the form and the address bar hold it, and what becomes of it: what the
+// server is asked for, what it remembers of that, and words. Values stay as they were typed until
+// the search starts, so that "last 7 days" in a shared link means the seven days before it is
+// opened; what they mean the server alone knows.
+import { asSentence } from '../api/errors.ts';
+import type { Understood } from '../api/types.ts';
+import { exactSize } from './size.ts';
+import { plural } from './text.ts';
+import { customValue, describeTime } from './times.ts';
 
 export const KINDS = [
   ['', 'Anything'],
@@ -55,10 +58,9 @@ interface Criterion<F extends Field> {
   input: 'kind' | 'text' | 'time' | 'choice' | 'folders'; // 'folders': chosen beside them
   label: string;
   placeholder?: string;
+  sent: string; // under this name, as it was typed
   // The parameters of start that it becomes; also the members of a remembered search, see `recall`.
   params: readonly string[];
-  // The values of `params`; what is undefined is not sent. Throws the sentence about what is wrong.
-  send(value: Criteria[F], now: Date): readonly unknown[];
   // From the remembered values of `params`. Null: they do not tell what was asked for, so that the
   // search cannot be repeated.
   recall(values: readonly unknown[]): Criteria[F] | null;
@@ -73,8 +75,8 @@ function text(key: string, param: string, label: string, placeholder: string, ab
     input: 'text',
     label,
     placeholder,
+    sent: param,
     params: [param],
-    send: (value: string) => [value.trim() || undefined],
     recall: ([value]: readonly unknown[]) => (typeof value === 'string' ? value : ''),
     describe: (value: string) => value && about(value),
   } as const;
@@ -92,13 +94,6 @@ function account(param: string, placeholder: string, label: string) {
 function size(key: string, param: string, label: string, placeholder: string, about: Criterion<'sizeTo'>['describe']) {
   return {
     ...text(key, param, label, placeholder, () => ''),
-    send: (value: string) => {
-      const bytes = parseSize(value);
-      if (bytes === undefined && value.trim()) {
-        throw 'Write a size as a number with a unit: 500, 20 KB, 1.5 GB.';
-      }
-      return [bytes];
-    },
     recall: ([bytes]: readonly unknown[]) =>
       typeof bytes === 'number' && bytes >= 0 ? exactSize(bytes) : '',
     describe: (value: string, all: Criteria) => value && about(tidy(value), all),
@@ -111,18 +106,10 @@ function time(key: string, param: string, label: string, verb: string) {
     key,
     input: 'time',
     label,
+    sent: param,
     params: [`${param}_from`, `${param}_to`],
-    send: (value: string, now: Date) => {
-      const bounds = timeBounds(value, now);
-      if (!bounds) throw 'Choose a time from the list, or give two dates.';
-      if (bounds.from !== undefined && bounds.to !== undefined && bounds.from > bounds.to) {
-        throw 'The last day is before the first one.';
-      }
-      return [bounds.from, bounds.to];
-    },
     recall: ([from, to]: readonly unknown[]) => customValue(number(from), number(to)),
     describe: (value: string) => value && `${verb} ${describeTime(value)}`,
-    fits: (value: string) => timeBounds(value, new Date()) !== undefined,
   } as const;
 }
 
@@ -152,8 +139,8 @@ export const CRITERIA: { readonly [F in Field]: Criterion<F> } = {
     key: 'contents',
     input: 'choice',
     label: 'Also look inside files',
+    sent: 'search_content',
     params: ['search_content'],
-    send: (value) => [value],
     recall: ([value]) => value === true, // seldom remembered: see fromRecord
     describe: (value) => (value ? 'also inside files' : ''),
   },
@@ -162,8 +149,8 @@ export const CRITERIA: { readonly [F in Field]: Criterion<F> } = {
     key: 'subfolders',
     input: 'folders',
     label: 'Subfolders',
+    sent: 'recursive',
     params: ['recursive'],
-    send: (value) => [value],
     recall: ([value]) => value !== false,
     describe: (value) => (value ? '' : 'not in subfolders'),
   },
@@ -195,8 +182,24 @@ export function describe(c: Criteria): string[] {
   return FIELDS.map((field) => criterion(field).describe(valueOf(c, field), c)).filter(Boolean);
 }
 
-// Throws CriterionError. `everywhere` is what stands for no chosen folder.
-export function startParams(c: Criteria, everywhere: string[], now: Date): StartParams {
+// What was typed, as the server is asked to read it.
+export function typed(c: Criteria): StartParams {
+  const asked: StartParams = { pattern: c.pattern };
+  for (const field of FIELDS) {
+    const value = c[field];
+    const text = typeof value === 'string' ? value.trim() : value;
+    if (text !== '') asked[criterion(field).sent] = text;
+  }
+  return asked;
+}
+
+// What a search is started with; `understand` asks the server. Throws CriterionError. `everywhere`
+// is what stands for no chosen folder.
+export async function startParams(
+  c: Criteria,
+  everywhere: string[],
+  understand: (asked: StartParams) => Promise<Understood>,
+): Promise<StartParams> {
   const folders = c.folders.length > 0 ? c.folders : everywhere;
   if (folders.length === 0) {
     throw new CriterionError('folders', 'There is no folder that you may search. Ask for access.');
@@ -204,35 +207,23 @@ export function startParams(c: Criteria, everywhere: string[], now: Date): Start
   if (c.contents && c.pattern.trim() === '') {
     throw new CriterionError('contents', 'Type the words to look for inside the files.');
   }
-  const params: StartParams = {
+  const understood = await understand(typed(c));
+  if (understood.wrong) {
+    const { criterion: name, sentence } = understood.wrong;
+    const ofName = (field: Field) => criterion(field).sent === name;
+    throw new CriterionError(FIELDS.find(ofName) ?? 'pattern', asSentence(sentence));
+  }
+  return {
+    ...understood.params,
     folder_path: folders,
-    pattern: c.pattern,
     search_type: hasCriteria(c) ? 'advance' : 'simple',
   };
-  for (const field of FIELDS) {
-    const values = sent(c, field, now);
-    criterion(field).params.forEach((name, i) => {
-      if (values[i] !== undefined) params[name] = values[i];
-    });
-  }
-  if (Number(params.size_from) > Number(params.size_to)) {
-    throw new CriterionError('sizeTo', 'The largest size is below the smallest one.');
-  }
-  return params;
 }
 
-function sent(c: Criteria, field: Field, now: Date): readonly unknown[] {
-  try {
-    return criterion(field).send(valueOf(c, field), now);
-  } catch (sentence) {
-    throw typeof sentence === 'string' ? new CriterionError(field, sentence) : sentence;
-  }
+function tidy(size: string): string {
+  return size.trim().replace(/^\d+$/, (digits) => plural(Number(digits), 'byte'));
 }
 
 function number(value: unknown): number | undefined {
   return typeof value === 'number' ? value : undefined;
-}
-
-function tidy(value: string): string {
-  return /^\d+$/.test(value.trim()) ? formatSize(Number(value)) : value.trim();
 }

@@ -1,15 +1,7 @@
-// Sizes as people write and read them. Units are 1024-based, as the rest of the program counts.
+// Sizes as people read them. Units are 1024-based, as the rest of the program counts. What people
+// write is read by the server.
 const UNITS = ['B', 'KB', 'MB', 'GB', 'TB', 'PB'];
 const STEP = 1024;
-
-// Bytes, or undefined for what is no size. "20", "20 kb", "1.5G", "3 MiB", "1,5 GB".
-export function parseSize(text: string): number | undefined {
-  const match = /^\s*(\d+(?:[.,]\d+)?|[.,]\d+)\s*(?:([kmgtp])(?:i?b)?|b)?\s*$/i.exec(text);
-  if (!match) return undefined;
-  const power = match[2] ? 'kmgtp'.indexOf(match[2].toLowerCase()) + 1 : 0;
-  const bytes = Math.round(Number(match[1]!.replace(',', '.')) * STEP ** power);
-  return Number.isSafeInteger(bytes) ? bytes : undefined;
-}
 
 // Three digits at most: "0 B", "999 B", "1.2 KB", "35 MB".
 export function formatSize(bytes: number): string {

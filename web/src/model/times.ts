@@ -1,7 +1,5 @@
-// Times as words and as pairs of days. A time criterion is '' (any time), a word, or "FROM..TO" with
-// days as YYYY-MM-DD, either of which may be missing. Everything counts in whole days of the
-// browser's time zone, so that a criterion that comes back from the history as seconds can be shown
-// as the days it was made of.
+// Times as they are offered and told. What a time criterion holds is whatever the server reads as
+// one (docs/query.md): the page only makes texts of what is chosen, and never reckons with them.
 export const TIME_WORDS = [
   ['today', 'Today'],
   ['yesterday', 'Yesterday'],
@@ -13,92 +11,32 @@ export const TIME_WORDS = [
   ['before-last-year', 'Before last year'],
 ] as const;
 
-export interface Bounds {
-  from?: number; // seconds since the epoch, inclusive
-  to?: number;
-}
-
-// What a search can compare is held in 32 bits.
-export const LATEST_SECOND = 2 ** 31 - 1;
-const EARLIEST_SECOND = -(2 ** 31);
-
-// Undefined for what is neither a word nor a pair of days.
-export function timeBounds(value: string, now: Date): Bounds | undefined {
-  if (value === '') return {};
-  const days = wordDays(value, now) ?? customDays(value);
-  if (!days) return undefined;
-  const bounds: Bounds = {};
-  if (days.from) bounds.from = clamp(days.from.getTime() / 1000);
-  if (days.to) {
-    // The second before the next day; days are not all of the same length.
-    const next = new Date(days.to);
-    next.setDate(next.getDate() + 1);
-    bounds.to = clamp(next.getTime() / 1000 - 1);
-  }
-  return bounds;
-}
-
-interface Days {
-  from?: Date;
-  to?: Date;
-}
-
-function wordDays(word: string, now: Date): Days | undefined {
-  const y = now.getFullYear();
-  const m = now.getMonth();
-  const d = now.getDate();
-  switch (word) {
-    case 'today':
-      return { from: new Date(y, m, d) };
-    case 'yesterday':
-      return { from: new Date(y, m, d - 1), to: new Date(y, m, d - 1) };
-    case 'last-7-days':
-      return { from: new Date(y, m, d - 6) };
-    case 'last-30-days':
-      return { from: new Date(y, m, d - 29) };
-    case 'last-12-months':
-      return { from: new Date(y - 1, m, d) };
-    case 'this-year':
-      return { from: new Date(y, 0, 1) };
-    case 'last-year':
-      return { from: new Date(y - 1, 0, 1), to: new Date(y - 1, 11, 31) };
-    case 'before-last-year':
-      return { to: new Date(y - 2, 11, 31) };
-    default:
-      return undefined;
-  }
-}
-
-function customDays(value: string): Days | undefined {
-  const match = /^(\d{4}-\d\d-\d\d)?\.\.(\d{4}-\d\d-\d\d)?$/.exec(value);
-  if (!match) return undefined;
-  const from = parseDay(match[1]);
-  const to = parseDay(match[2]);
-  if ((match[1] && !from) || (match[2] && !to)) return undefined;
-  return { from, to };
-}
-
-function parseDay(text: string | undefined): Date | undefined {
-  if (!text) return undefined;
-  const [y, m, d] = text.split('-').map(Number) as [number, number, number];
-  const day = new Date(y, m - 1, d);
-  day.setFullYear(y); // a year below 100 would be taken for 19xx
-  return day.getMonth() === m - 1 && day.getDate() === d ? day : undefined;
-}
-
-function clamp(second: number): number {
-  return Math.min(Math.max(Math.floor(second), EARLIEST_SECOND), LATEST_SECOND);
-}
-
 export function dayOf(second: number): string {
   const day = new Date(second * 1000);
   return `${String(day.getFullYear()).padStart(4, '0')}-${two(day.getMonth() + 1)}-${two(day.getDate())}`;
 }
 
-// The pair of days that holds these seconds.
-export function customValue(from: number | undefined, to: number | undefined): string {
+// What a search can compare is held in 32 bits; beyond them there is no bound.
+const LATEST_SECOND = 2 ** 31 - 1;
+const EARLIEST_SECOND = -(2 ** 31);
+const FEWEST_DIGITS = 5; // of a second; fewer are a year
+
+// What holds exactly these seconds: a pair of days where they are whole days here, otherwise the
+// seconds themselves, which mean the same wherever the server is. Null where no text does.
+export function customValue(from: number | undefined, to: number | undefined): string | null {
+  if (from !== undefined && from <= EARLIEST_SECOND) from = undefined;
+  if (to !== undefined && to >= LATEST_SECOND) to = undefined;
   if (from === undefined && to === undefined) return '';
-  return `${from === undefined ? '' : dayOf(from)}..${to === undefined ? '' : dayOf(to)}`;
+  const midnight = (second: number) => new Date(second * 1000).toTimeString().startsWith('00:00:00');
+  const whole = (from === undefined || midnight(from)) && (to === undefined || midnight(to + 1));
+  const ends = [from, to].map((second) => (second === undefined ? '' : whole ? dayOf(second) : String(second)));
+  const told = ends.every((end) => end === '' || (end.length >= FEWEST_DIGITS && !end.startsWith('-')));
+  return told ? ends.join('..') : null;
+}
+
+// A day as a calendar's field takes it.
+export function isDay(text: string): boolean {
+  return /^\d{4}-\d\d-\d\d$/.test(text);
 }
 
 // The two days of a "FROM..TO"; both empty for a word.
@@ -110,10 +48,14 @@ export function splitCustom(value: string): [string, string] {
 export function describeTime(value: string): string {
   const word = TIME_WORDS.find(([key]) => key === value);
   if (word) return word[1].toLowerCase();
-  const [from, to] = splitCustom(value);
+  const [from, to] = splitCustom(value).map(shown) as [string, string];
   if (from && to) return from === to ? `on ${from}` : `${from} to ${to}`;
   if (from) return `since ${from}`;
-  return to ? `until ${to}` : 'any time';
+  return to ? `until ${to}` : value;
+}
+
+function shown(end: string): string {
+  return /^\d{5,}$/.test(end) ? formatTime(Number(end)) : end;
 }
 
 export function formatTime(second: number): string {

@@ -42,12 +42,14 @@ export class App {
   detailed: FileRow | null = null; // the row shown beside the table
   notice = '';
   problem = ''; // why the page cannot work, when it cannot
+  // The search before, while the server reads what the present one asks for.
+  private standing: Search | null | undefined;
   private noticeTimer = 0;
   private drawing = 0;
 
   constructor(private readonly draw: () => void) {
     addEventListener('popstate', () => this.followAddress());
-    addEventListener('pagehide', () => this.search?.close());
+    addEventListener('pagehide', () => this.closeSearches());
     addEventListener('pageshow', (event) => {
       if (event.persisted) this.followAddress();
     });
@@ -81,7 +83,7 @@ export class App {
   }
 
   private closeGate(error: unknown): void {
-    this.search?.close();
+    this.closeSearches();
     this.search = null;
     if (error instanceof ApiError && error.signedOut) {
       this.gate = error.mode === 'single' ? 'open-address' : 'sign-in';
@@ -102,7 +104,7 @@ export class App {
   }
 
   async signOut(): Promise<void> {
-    this.search?.close();
+    this.closeSearches();
     try {
       await client.logOut();
     } catch {
@@ -130,9 +132,11 @@ export class App {
     this.edit(change);
     const sort = this.search ? this.search.sort : parseSort(recall('sort'));
     const hash = toHash({ criteria: this.draft, sort });
-    if (!this.start(this.draft, sort)) return;
-    if (hash === location.hash) history.replaceState(null, '', hash);
-    else history.pushState(null, '', hash);
+    void this.start(this.draft, sort).then((started) => {
+      if (!started) return;
+      if (hash === location.hash) history.replaceState(null, '', hash);
+      else history.pushState(null, '', hash);
+    });
   }
 
   private followAddress(): void {
@@ -142,36 +146,51 @@ export class App {
       return;
     }
     this.draft = address.criteria;
-    this.start(address.criteria, address.sort);
+    void this.start(address.criteria, address.sort);
   }
 
   reset(): void {
-    this.search?.close();
+    this.closeSearches();
     Object.assign(this, { search: null, detailed: null, active: -1, draft: NO_CRITERIA });
     this.draftError = null;
     this.setTitle();
     this.changed();
   }
 
-  private start(criteria: Criteria, sort: Sort | null): boolean {
+  // The search before stays until the server has understood what this one asks for: where it does
+  // not, that one is shown again. False then, and where another was begun meanwhile.
+  private async start(criteria: Criteria, sort: Sort | null): Promise<boolean> {
     this.draftError = null;
-    try {
-      const params = startParams(criteria, this.everywhere, new Date());
-      this.search?.close();
-      this.search = new Search(criteria, params, sort, this.changed, this.signedOut);
-    } catch (error) {
-      if (!(error instanceof CriterionError)) throw error;
-      this.draftError = error;
-      if (error.field !== 'pattern') this.unfolded = true;
+    if (this.standing === undefined) this.standing = this.search;
+    else this.search?.close();
+    const params = startParams(criteria, this.everywhere, client.understand);
+    const search = new Search(criteria, params, sort, this.changed, this.signedOut);
+    this.search = search;
+    const ended = search.run();
+    this.changed();
+    // What else may fail, the search itself tells.
+    const error: unknown = await params.then(() => null, (reason: unknown) => reason);
+    if (this.search !== search) return false;
+    if (error instanceof CriterionError) {
+      search.close();
+      Object.assign(this, { search: this.standing, standing: undefined, draftError: error });
+      if (error.field !== 'pattern' && error.field !== 'folders') this.unfolded = true;
       this.changed();
       return false;
     }
+    this.standing?.close();
+    Object.assign(this, { standing: undefined, detailed: null, active: -1 });
     remember(INSIDE, withInside(recall(INSIDE), criteria));
-    Object.assign(this, { detailed: null, active: -1 });
     this.setTitle();
-    void this.search.run().then(() => this.loadHistory());
+    void ended.then(() => this.loadHistory());
     this.changed();
     return true;
+  }
+
+  private closeSearches(): void {
+    this.search?.close();
+    this.standing?.close();
+    this.standing = undefined;
   }
 
   private setTitle(): void {

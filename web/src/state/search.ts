@@ -2,7 +2,7 @@
 // are seen up to date, and tells when anything changed.
 import * as client from '../api/client.ts';
 import { ApiError, walkFailure } from '../api/errors.ts';
-import type { Page, Progress, Walk } from '../api/types.ts';
+import type { Misses, Page, Progress, Walk } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
 import type { Criteria, StartParams } from '../model/criteria.ts';
 import { Pages } from './pages.ts';
@@ -30,6 +30,7 @@ export class Search {
     skipped: { permission: 0, vanished: 0, other: 0 },
     files: { unreadable: 0, not_text: 0 },
   };
+  misses: Misses | null = null; // once it is known why nothing was found
   readonly pages: Pages;
   private taskid = '';
   private closed = false;
@@ -39,7 +40,7 @@ export class Search {
 
   constructor(
     readonly criteria: Criteria,
-    private readonly params: StartParams,
+    private readonly params: Promise<StartParams>,
     public sort: Sort | null,
     private readonly changed: () => void,
     private readonly signedOut: () => void,
@@ -66,7 +67,9 @@ export class Search {
 
   async run(): Promise<void> {
     try {
-      this.taskid = (await client.startSearch(this.params)).taskid;
+      const params = await this.params;
+      if (this.closed) return;
+      this.taskid = (await client.startSearch(params)).taskid;
     } catch (error) {
       this.fail(error);
       return;
@@ -116,9 +119,10 @@ export class Search {
     this.endedAt = performance.now();
     if (progress.progress === -1) {
       this.status = 'failed';
-      this.error = walkFailure(progress.errno ?? 0, this.criteria.pattern);
+      this.error = walkFailure(progress.errno ?? 0);
     } else if (progress.progress === 1) {
       this.status = 'done';
+      if (this.walk.matches === 0) void this.learnWhy();
     } else {
       this.status = 'stopped';
       if (!this.stopAsked) {
@@ -128,6 +132,16 @@ export class Search {
     // The walk's count may run ahead of what is listed; the last pages say how it is.
     if (this.status !== 'failed') this.pages.renew();
     this.changed();
+  }
+
+  // Saying why is a convenience; that nothing was found has been said.
+  private async learnWhy(): Promise<void> {
+    try {
+      this.misses = await client.nearMisses(this.taskid, await this.params);
+      this.changed();
+    } catch {
+      return;
+    }
   }
 
   private fail(error: unknown): void {

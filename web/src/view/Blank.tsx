@@ -1,6 +1,8 @@
 // In place of the table: how to search, before the first search; what to try, when nothing is found.
-import { describe, hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
-import { visible } from '../model/text.ts';
+import { Fragment } from 'preact';
+import type { Misses as NearMisses } from '../api/types.ts';
+import { describe, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
+import { plural, visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';
 import { Name } from './Name.tsx';
@@ -108,6 +110,7 @@ export function Nothing({ app, search }: { app: App; search: Search }) {
         )}
         {hasCriteria(c) ? ' with these criteria.' : '.'}
       </p>
+      {search.misses && <Misses app={app} criteria={c} misses={search.misses} />}
       <div class="actions">
         {offers.map(([text, act]) => (
           <button type="button" class="tool" key={text} onClick={act}>
@@ -117,4 +120,56 @@ export function Nothing({ app, search }: { app: App; search: Search }) {
       </div>
     </div>
   );
+}
+
+// Where it was looked, which part of what was asked for is in the way, and the names that come near.
+function Misses({ app, criteria, misses }: { app: App; criteria: Criteria; misses: NearMisses }) {
+  const several = misses.terms.length > 1;
+  return (
+    <div class="misses">
+      <p class="aside">
+        Looked at {misses.complete ? '' : 'more than '}
+        {plural(misses.entries, 'name')} in {plural(misses.folders, 'folder')}
+        {misses.left_out > 0 &&
+          `; ${plural(misses.left_out, 'folder')} of the system’s own or of its temporary files ${
+            misses.left_out === 1 ? 'is' : 'are'
+          } never searched`}
+        .
+      </p>
+      <ul>
+        {misses.terms.map(({ written, without, names }, i) => (
+          <Fragment key={i}>
+            {several && without > 0 && (
+              <li>
+                Without {written ? <q>{visible(written)}</q> : 'one of the criteria'} there would be{' '}
+                {plural(without, 'match', 'matches')}.
+              </li>
+            )}
+            {names.length > 0 && (
+              <li>
+                Near to <q>{visible(written)}</q>:{' '}
+                {names.map((name) => (
+                  <button
+                    type="button"
+                    class="example"
+                    key={name}
+                    onClick={() => app.submit({ pattern: criteria.pattern.replace(written, () => term(name)) })}
+                  >
+                    <Name text={name} />
+                  </button>
+                ))}
+              </li>
+            )}
+          </Fragment>
+        ))}
+      </ul>
+    </div>
+  );
+}
+
+// A term of the query that looks for this name, with quotes where it needs them; none can be written
+// in quotes.
+function term(name: string): string {
+  if (!/[\s|!"<>*?[\]{},\\:]/.test(name)) return name;
+  return name.split('"').map((part) => part && `"${part}"`).join(' ');
 }

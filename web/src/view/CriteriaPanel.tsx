@@ -10,13 +10,14 @@ import {
   type Field,
   type TextField,
 } from '../model/criteria.ts';
-import { splitCustom, TIME_WORDS } from '../model/times.ts';
+import { isDay, splitCustom, TIME_WORDS } from '../model/times.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import { Icon } from './icons.tsx';
 
 const LAST_DAY = '2038-01-18'; // the last whole day that a search can compare
-const CUSTOM = 'between';
+const BETWEEN = 'between';
+const WRITTEN = 'written';
 
 // The two sizes stand side by side; the rest as they come in the table.
 const AFTER_SIZE = FIELDS.slice(FIELDS.indexOf('sizeTo') + 1);
@@ -36,7 +37,7 @@ export function CriteriaPanel({ app }: { app: App }) {
       ))}
       <footer>
         <p class="hint" role="alert">
-          {error ? <span class="wrong">{error.message}</span> : 'An owner or group that does not exist restricts nothing.'}
+          {error && error.field in CRITERIA ? <span class="wrong">{error.message}</span> : 'Write a size as 1.5 GB, and a time of your own as 2 weeks, 2026-07 or <2025.'}
         </p>
         <button
           type="button"
@@ -131,20 +132,23 @@ function Time({ app, field }: { app: App; field: TextField }) {
   const value = app.draft[field];
   const [from, to] = splitCustom(value);
   const isWord = TIME_WORDS.some(([word]) => word === value);
-  const [choosing, setChoosing] = useState(false);
-  const custom = !isWord && (value !== '' || choosing);
+  const [choice, setChoice] = useState('');
+  const days = from + to !== '' && [from, to].every((end) => end === '' || isDay(end));
+  const told = isWord ? value : days ? BETWEEN : value !== '' ? WRITTEN : choice;
+  const kind = choice === WRITTEN ? choice : told;
   const setDays = (first: string, last: string) =>
     app.edit({ [field]: first || last ? `${first}..${last}` : '' });
   return (
-    <div class={`labelled time ${custom ? 'custom' : ''}`} role="group" aria-label={label}>
+    <div class={`labelled time ${kind === BETWEEN ? 'custom' : ''}`} role="group" aria-label={label}>
       <label>
         <span>{label}</span>
         <select
-          value={custom ? CUSTOM : value}
+          value={kind}
           onChange={(event) => {
             const word = event.currentTarget.value;
-            setChoosing(word === CUSTOM);
-            app.edit({ [field]: word === CUSTOM ? '' : word });
+            const own = word === BETWEEN || word === WRITTEN;
+            setChoice(own ? word : '');
+            app.edit({ [field]: own ? '' : word });
           }}
         >
           <option value="">Any time</option>
@@ -153,10 +157,25 @@ function Time({ app, field }: { app: App; field: TextField }) {
               {name}
             </option>
           ))}
-          <option value={CUSTOM}>Between days …</option>
+          <option value={BETWEEN}>Between days …</option>
+          <option value={WRITTEN}>As written …</option>
         </select>
       </label>
-      {custom && (
+      {kind === WRITTEN && (
+        <input
+          type="text"
+          aria-label={`${label}, as written`}
+          value={value}
+          placeholder="2 weeks, 2026-07, <2025"
+          spellcheck={false}
+          autocapitalize="none"
+          autocomplete="off"
+          aria-invalid={app.draftError?.field === field}
+          onInput={(event) => app.edit({ [field]: event.currentTarget.value })}
+          onKeyDown={searchOnEnter(app)}
+        />
+      )}
+      {kind === BETWEEN && (
         <div class="days">
           <input
             type="date"

@@ -2,6 +2,7 @@
 import { useEffect, useMemo, useState } from 'preact/hooks';
 import { fileAddress } from '../api/client.ts';
 import type { FileRow } from '../api/types.ts';
+import type { CriterionError } from '../model/criteria.ts';
 import { previewKind } from '../model/preview.ts';
 import { visible, whyNotFetched } from '../model/text.ts';
 import type { App } from '../state/app.ts';
@@ -63,12 +64,12 @@ export function Page({ app }: { app: App }) {
         </button>
         <CriteriaTags app={app} />
       </section>
-      {app.unfolded && <CriteriaPanel app={app} />}
-      {!app.unfolded && app.draftError && (
+      {app.draftError && !inPanel(app.draftError) && (
         <p class="wrong band" role="alert">
           {app.draftError.message}
         </p>
       )}
+      {app.unfolded && <CriteriaPanel app={app} />}
       <Result app={app} actions={actions} />
       {app.notice && (
         <p class="notice" role="status">
@@ -79,6 +80,9 @@ export function Page({ app }: { app: App }) {
     </>
   );
 }
+
+// Told beside the field that it is about.
+const inPanel = ({ field }: CriterionError) => field !== 'pattern' && field !== 'folders';
 
 function Result({ app, actions }: { app: App; actions: RowActions }) {
   const { search } = app;

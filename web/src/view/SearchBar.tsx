@@ -76,6 +76,7 @@ export function SearchBar({ app }: { app: App }) {
           placeholder="Name of a file or folder"
           aria-label="Search for"
           role="combobox"
+          aria-invalid={app.draftError?.field === 'pattern'}
           aria-expanded={unfolded}
           aria-controls="suggestions"
           aria-autocomplete="list"
