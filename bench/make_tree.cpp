@@ -6,6 +6,8 @@
 //                               "xylophone".
 //   make_tree huge DIR FILES    one folder of FILES empty files
 //   make_tree chain DIR DEPTH   DEPTH folders, each inside the one before, with a file in each
+//   make_tree photos DIR FILES  FILES of 300 KB that begin as JPEG does, a hundred to a folder
+//   make_tree sparse DIR FILES  FILES of 1 MiB that take no room, a hundred to a folder
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -118,11 +120,44 @@ void MakeChain(int root, std::uint64_t depth) {
   }
 }
 
+constexpr size_t kPhotoBytes = 300'000;
+constexpr off_t kSparseBytes = off_t{1} << 20;
+
+// As a camera writes them: a head, then what looks like chance.
+void WritePhoto(int file, std::mt19937_64& random) {
+  constexpr std::string_view kHead("\xff\xd8\xff\xe0\0\x10JFIF\0\1\1", 13);
+  std::string bytes(kHead);
+  while (bytes.size() < kPhotoBytes) {
+    const std::uint64_t next = random();
+    bytes.append(reinterpret_cast<const char*>(&next), sizeof next);
+  }
+  if (write(file, bytes.data(), kPhotoBytes) != static_cast<ssize_t>(kPhotoBytes)) Fail("photo");
+}
+
+void MakeBinaries(int root, std::uint64_t count, bool sparse) {
+  constexpr std::uint64_t kInFolder = 100;
+  std::mt19937_64 random{20'260'102};
+  int folder = -1;
+  for (std::uint64_t i = 0; i < count; ++i) {
+    if (i % kInFolder == 0) {
+      if (folder >= 0) close(folder);
+      folder = MakeFolder(root, "album " + std::to_string(i / kInFolder));
+    }
+    const std::string name = "IMG_" + std::to_string(i) + (sparse ? ".img" : ".jpg");
+    const int fd = openat(folder, name.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644);
+    if (fd < 0) Fail(name);
+    if (!sparse) WritePhoto(fd, random);
+    if (sparse && ftruncate(fd, kSparseBytes) != 0) Fail(name);
+    close(fd);
+  }
+  if (folder >= 0) close(folder);
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
   if (argc != 4) {
-    std::fprintf(stderr, "usage: make_tree names|huge|chain DIR COUNT\n");
+    std::fprintf(stderr, "usage: make_tree names|huge|chain|photos|sparse DIR COUNT\n");
     return 2;
   }
   const std::string_view kind = argv[1];
@@ -139,6 +174,8 @@ int main(int argc, char** argv) {
     }
   } else if (kind == "chain") {
     MakeChain(root, count);
+  } else if (kind == "photos" || kind == "sparse") {
+    MakeBinaries(root, count, kind == "sparse");
   } else {
     std::fprintf(stderr, "make_tree: unknown kind of tree\n");
     return 2;

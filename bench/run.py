@@ -155,12 +155,20 @@ def comparisons(args, trees):
         "ours": [*ours, "--content", "spin_lock_irqsave", text],
         "ripgrep": ["rg", "-uu", "-il", "spin_lock_irqsave", text],
         "grep": ["grep", "-rilIF", "spin_lock_irqsave", text], "floor": floor("read", text),
-    }, {"ripgrep": "≤ 1.1"}
+    }, {"ripgrep": "≤ 0.95"}
     expression = "[a-z]{3}[0-9]{4}[x-z]{2}[0-9]{2}"
     yield "contents, an expression without a literal", {
         "ours": [*ours, "--content", "regex:" + expression, text],
         "ripgrep": ["rg", "-uu", "-il", expression, text], "floor": floor("read", text),
     }, {"ripgrep": "≤ 1.5"}
+    for kind, name, target in [("photos", "photos", {"ripgrep": "≤ 1.1"}),
+                               ("sparse", "sparse files", {})]:
+        binaries = trees.generated(kind, 3_000)
+        yield f"contents, {name}", {
+            "ours": [*ours, "--content", "spin_lock_irqsave", binaries],
+            "ripgrep": ["rg", "-uu", "-il", "spin_lock_irqsave", binaries],
+            "floor": floor("read", binaries),
+        }, target
     empty = trees.empty()
     yield "an empty folder", {
         "ours": [*ours, "x", empty], "fd": [*fd, "x", empty],

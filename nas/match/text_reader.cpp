@@ -13,6 +13,9 @@ namespace {
 
 // Where a NUL makes a file binary: read alone at first, as most large files are binary.
 constexpr size_t kFirstBlockBytes = 32 * 1024;
+// Of that, what is read before all else: nearly every binary format has a NUL near its beginning,
+// and reading the whole block takes longer than opening the file.
+constexpr size_t kHeadBytes = 4 * 1024;
 // What an encoding is guessed from, most of it behind the first foreign byte.
 constexpr size_t kSampleBytes = 64 * 1024;
 constexpr std::uint64_t kSampleBefore = 4 * 1024;
@@ -57,7 +60,9 @@ bool TextReader::StartGuessed() {
 TextReader::Piece TextReader::Next(size_t keep) {
   const size_t kept = std::max(keep, cut_);
   std::memmove(buffer_.data(), buffer_.data() + filled_ - kept, kept);
-  const auto added = first_ ? ReadFirst() : decoder_ ? ReadDecoded(kept) : ReadPlain(kept);
+  const auto added = first_     ? ReadFirst()
+                     : decoder_ ? ReadDecoded(kept)
+                                : ReadPlain(kept, buffer_.size());
   if (!added) return Piece::kFailed;
   filled_ = kept + *added;
   const std::string_view beginning = text().substr(0, kFirstBlockBytes);
@@ -71,22 +76,28 @@ TextReader::Piece TextReader::Next(size_t keep) {
 // A mark is no part of the text; that of UTF-16 also says how to read it.
 std::optional<size_t> TextReader::ReadFirst() {
   if (decoder_) return ReadDecoded(0);
-  const auto count = ReadPlain(0);
+  const auto count = ReadPlain(0, kHeadBytes);
   if (!count) return std::nullopt;
   const TextMark mark = FindTextMark({buffer_.data(), *count});
   if (mark.encoding != nullptr) {
     auto decoder = TextDecoder::For(mark.encoding);
-    if (!decoder || lseek(fd_, static_cast<off_t>(mark.bytes), SEEK_SET) < 0) return count;
-    Begin(std::move(decoder));
-    return ReadDecoded(0);
+    if (decoder && lseek(fd_, static_cast<off_t>(mark.bytes), SEEK_SET) >= 0) {
+      Begin(std::move(decoder));
+      return ReadDecoded(0);
+    }
   }
-  std::memmove(buffer_.data(), buffer_.data() + mark.bytes, *count - mark.bytes);
-  return *count - mark.bytes;
+  const size_t from = mark.encoding == nullptr ? mark.bytes : 0;
+  const size_t head = *count - from;
+  std::memmove(buffer_.data(), buffer_.data() + from, head);
+  if (at_end_ || std::memchr(buffer_.data(), 0, head) != nullptr) return head;
+  const auto rest = ReadPlain(head, kFirstBlockBytes - head);
+  if (!rest) return std::nullopt;
+  return head + *rest;
 }
 
 // A regular file gives less than asked for only at its end.
-std::optional<size_t> TextReader::ReadPlain(size_t kept) {
-  const size_t room = std::min(buffer_.size() - kept, first_ ? kFirstBlockBytes : buffer_.size());
+std::optional<size_t> TextReader::ReadPlain(size_t kept, size_t most) {
+  const size_t room = std::min(buffer_.size() - kept, most);
   const ssize_t count = Uninterrupted([&] { return read(fd_, buffer_.data() + kept, room); });
   if (count < 0) return std::nullopt;
   at_end_ = static_cast<size_t>(count) < room;

@@ -33,7 +33,7 @@ class TextReader {
  private:
   void Begin(std::optional<TextDecoder> decoder);
   // Both return how many bytes they added; nothing where reading failed.
-  std::optional<size_t> ReadPlain(size_t kept);
+  std::optional<size_t> ReadPlain(size_t kept, size_t most);
   std::optional<size_t> ReadDecoded(size_t kept);
   std::optional<size_t> ReadFirst();
   void LookForForeign(size_t kept);

@@ -68,6 +68,7 @@ TEST_F(Contents, Table) {
       {"regex:a.b", "a\nb", false, "a dot stays in its line"},
       {"regex:\\bint\\s+main", "int  main()", true, ""},
       {"needle", "needle\0"s, false, "binary"},
+      {"needle", "needle" + std::string(30'000, 'x') + "\0"s, false, "a NUL in the first block"},
       {"needle", std::string(40'000, 'x') + "\0needle"s, true, "a NUL behind the first block"},
       {"x", "\xff\xc0x", true, "not UTF-8"},
       {"regex:x", "\xff\xc0x", true, "not UTF-8"},
@@ -114,6 +115,19 @@ TEST_F(Contents, NothingIsLostWherePiecesMeet) {
   EXPECT_TRUE(Finds(huge, std::string(kPiece - 1, '-') + huge)) << "as long as a pattern may be";
 }
 
+// So are the parts that the first piece is read in.
+TEST_F(Contents, NothingIsLostInTheFirstBlock) {
+  for (const size_t edge : {size_t{4} << 10, size_t{32} << 10}) {
+    for (size_t at = edge - 7; at <= edge + 1; ++at) {
+      for (const char* mark : {"", "\xef\xbb\xbf"}) {
+        const std::string content = mark + std::string(at, '-') + "needle";
+        EXPECT_TRUE(Finds("regex:^-*needle$", content)) << at;
+        EXPECT_TRUE(Finds("needle", content + std::string(edge, '-'))) << at;
+      }
+    }
+  }
+}
+
 TEST_F(Contents, LiteralAgainstPlainSearch) {
   std::mt19937 random(7);
   int found = 0;
@@ -124,7 +138,7 @@ TEST_F(Contents, LiteralAgainstPlainSearch) {
       return text;
     };
     const std::string needle = letters(1 + random() % 5);
-    const std::string hay = letters(random() % 70);
+    const std::string hay = std::string(random() % 150, 'z') + letters(random() % 70);
     const bool expected = AsciiLower(hay).find(AsciiLower(needle)) != std::string::npos;
     ASSERT_EQ(LiteralFinder(needle).Finds(hay), expected) << needle << " in " << hay;
     found += expected;
