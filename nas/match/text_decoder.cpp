@@ -108,4 +108,11 @@ size_t TextDecoder::Decode(std::string_view bytes, char* out) {
   return static_cast<size_t>(out - begin);
 }
 
+size_t TextDecoder::Finish(char* out) {
+  char* const begin = out;
+  size_t room = kMostPending;
+  iconv(conversion_, nullptr, nullptr, &out, &room);
+  return static_cast<size_t>(out - begin);
+}
+
 }  // namespace nas

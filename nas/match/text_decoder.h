@@ -43,6 +43,9 @@ class TextDecoder {
   // (kMostPending), and returns how many were written. What is no character becomes U+FFFD; one
   // that the end of a piece cuts is pending until the next.
   size_t Decode(std::string_view bytes, char* out);
+  // Writes what was held back until the next character, with which it might have become one, as
+  // Hebrew letters and their points do; at the text's end, into room for kMostPending.
+  size_t Finish(char* out);
   static constexpr size_t kMostPending = 16;
 
  private:

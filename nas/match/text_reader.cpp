@@ -111,7 +111,9 @@ std::optional<size_t> TextReader::ReadDecoded(size_t kept) {
   const ssize_t count = Uninterrupted([&] { return read(fd_, encoded_.data(), room); });
   if (count < 0) return std::nullopt;
   at_end_ = static_cast<size_t>(count) < room;
-  return decoder_->Decode({encoded_.data(), static_cast<size_t>(count)}, buffer_.data() + kept);
+  char* const out = buffer_.data() + kept;
+  const size_t decoded = decoder_->Decode({encoded_.data(), static_cast<size_t>(count)}, out);
+  return decoded + (at_end_ ? decoder_->Finish(out + decoded) : 0);
 }
 
 void TextReader::LookForForeign(size_t kept) {

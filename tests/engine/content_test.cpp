@@ -29,6 +29,17 @@ class Contents : public testing::Test {
     std::ofstream(folder_ + "/file", std::ios::binary) << content;
     return ContentScanner(*query, stop_).Scan(fd_.get(), "file");
   }
+  // Long enough that its encoding is told.
+  static std::string Hebrew() {
+    std::string text;
+    for (int i = 0; i < 5; ++i) {
+      text +=
+          "\xe4\xf1\xf4\xf8 \xe4\xe6\xe4 \xf0\xeb\xfa\xe1 \xe1\xf2\xe1\xf8\xe9\xfa "
+          "\xe5\xe4\xe5\xe0 \xf2\xe5\xf1\xf7 \xe1\xfa\xe5\xec\xe3\xe5\xfa \xe4\xf2\xe9\xf8 "
+          "\xe9\xf8\xe5\xf9\xec\xe9\xed. ";
+    }
+    return text;
+  }
   bool Finds(const std::string& pattern, const std::string& content) {
     return Scan(pattern, content) == ContentScanner::Outcome::kMatch;
   }
@@ -83,6 +94,8 @@ TEST_F(Contents, Table) {
        true, "Windows-1251"},
       {"日本語", "\x82\xb1\x82\xea\x82\xcd\x93\xfa\x96\x7b\x8c\xea\x82\xc5\x82\xb7", true,
        "Shift JIS"},
+      {"הסוב", Hebrew() + "\xe4\xf1\xe5\xe1", true,
+       "Windows-1255, a letter that waits for its point"},
       {"é", "\xff caf\xc3\xa9", true, "UTF-8 with damages"},
   };
   for (const auto& row : rows) {
