@@ -7,6 +7,7 @@
 #include "arbory/comparators.h"
 #include "arbory/search_text.h"
 #include "arbory/terminal.h"
+#include "nas/match/meant_query.h"
 #include "nas/search/near_misses.h"
 
 namespace arbory {
@@ -34,6 +35,8 @@ void Explain(const Json::Value& params, std::chrono::milliseconds most) {
              " of the system's own or of its temporary files " +
              (near->left_out == 1 ? "is" : "are") + " never searched");
   }
+  const std::string meant = nas::MeantQuery(params["pattern"].asString());
+  if (!meant.empty()) Complain("did you mean '" + meant + "'?");
   for (const auto& term : near->terms) ComplainOfTerm(term, near->terms.size() > 1);
 }
 

@@ -71,13 +71,26 @@ Result<std::int64_t> AccountNumber(Kind kind, const std::string& name) {
                       : "users and groups cannot be looked up just now");
 }
 
+// Types go by several names, of one or of many.
+std::string TypeName(std::string_view word) {
+  static constexpr std::pair<std::string_view, std::string_view> kNames[] = {
+      {"folder", "dir"},  {"directory", "dir"}, {"directorie", "dir"}, {"picture", "image"},
+      {"photo", "image"}, {"movie", "video"},   {"film", "video"},     {"music", "audio"},
+      {"sound", "audio"}, {"doc", "document"}};
+  std::string name = AsciiLower(word);
+  if (name.ends_with('s')) name.pop_back();
+  const auto* const known =
+      std::ranges::find_if(kNames, [&](const auto& one) { return one.first == name; });
+  return known == std::end(kNames) ? name : std::string(known->second);
+}
+
 Status AddWord(const QueryPrefix& prefix, std::string_view word, QueryNode& node) {
   if (prefix.kind == Kind::kExtension) {
     std::ranges::move(ExtensionNode(word).suffixes, std::back_inserter(node.suffixes));
     return {};
   }
   if (prefix.kind == Kind::kType) {
-    const auto type = AsciiLower(word) == "folder" ? FileType{true} : ParseFileType(word);
+    const auto type = ParseFileType(TypeName(word));
     if (!type) return Wrong(prefix);
     node.types.push_back(*type);
     return {};

@@ -361,6 +361,9 @@ test('what finds nothing tells what is in the way, and what is near', async () =
   await tab.page.getByRole('button', { name: 'plan large.txt' }).click();
   await tab.page.locator('.figures strong', { hasText: '1 match' }).waitFor();
   assert.equal(await tab.page.inputValue('#pattern'), '"plan large.txt" ext:txt');
+  await tab.search('plan size > 20kb');
+  await tab.page.getByRole('button', { name: 'plan size:>20kb' }).click();
+  await tab.page.locator('.figures strong', { hasText: '1 match' }).waitFor();
   await tab.close();
 });
 

@@ -9,6 +9,7 @@
 #include <random>
 #include <string>
 
+#include "nas/match/meant_query.h"
 #include "nas/match/near_text.h"
 #include "nas/match/query.h"
 #include "nas/match/query_match.h"
@@ -136,9 +137,9 @@ TEST_F(Queries, Table) {
       {"EXT:*.tar.gz", "e.tar.gz", "in any case"},
       {"!ext:jpg,png,py,txt type:file", "d.pdf e.tar.gz", ""},
       {"ext:png|<ext:jpg size:0>", "a.jpg c.png", ""},
-      {"type:image,document !py", "a.jpg b.JPG c.png d.pdf Caf\u00e9.txt", ""},
+      {"type:photos,document !py", "a.jpg b.JPG c.png d.pdf Caf\u00e9.txt", ""},
       {"type:dir", "src/ src/lib/", ""},
-      {"type:Folder", "src/ src/lib/", ""},
+      {"type:Folders", "src/ src/lib/", ""},
       {"size:>1kb", "c.png d.pdf e.tar.gz", "more than that"},
       {"size:>=1kb size:<1mb", "b.JPG c.png", ""},
       {"size:1kb..1025", "b.JPG c.png", "both ends belong to it"},
@@ -355,6 +356,37 @@ TEST_F(Queries, TypedDays) {
     const auto end = midnight(row.to);
     EXPECT_EQ(time->to, end ? *end - 1 : Bounds::kMost) << row.text;
   }
+}
+
+// By the habits of other programs.
+TEST_F(Queries, AsTheyWereMeant) {
+  const std::pair<const char*, const char*> rows[] = {
+      {"size > 1gb", "size:>1gb"},
+      {"a size >1 gb", "a size:>1 gb"},
+      {"modified = today", "modified:today"},
+      {"date:2019 report", "modified:2019 report"},
+      {"name:report", "report"},
+      {"extension:pdf kind:dir", "ext:pdf type:dir"},
+      {"modifed:today", "modified:today"},
+      {"*.png;*.jpg", "*.png|*.jpg"},
+      {"report OR budget NOT draft", "report|budget !draft"},
+      {"report AND 2026", "report 2026"},
+      {"-draft", "!draft"},
+      {"dir\\file", "dir/file"},
+      {"./a file:///b/c", "/a /b/c"},
+      {"'exact words' x", "\"exact words\" x"},
+      {"[draft]", "\"[draft]\""},
+      // What says nothing else, or what nobody can tell.
+      {"plan  ext:pdf", ""},
+      {"note:x", ""},
+      {"\"a OR b\"", ""},
+      {"OR", ""},
+      {"regex:a OR b", ""},
+      {"date:ever", ""},
+      {"*[ab]\\*", ""},
+      {"", ""},
+  };
+  for (const auto& [query, meant] : rows) EXPECT_EQ(MeantQuery(query), meant) << query;
 }
 
 // Against the table that the distance is defined by.

@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "nas/base/utf8.h"
+#include "nas/match/meant_query.h"
 #include "nas/match/query.h"
 #include "nas/match/query_match.h"
 #include "tests/fuzz/fuzz.h"
@@ -158,6 +159,8 @@ int fuzz::Target(std::string_view rest) {
   const std::string_view text = fuzz::Take(&rest, '\n');
   const std::string name(rest);
   if (name.size() > 255) return fuzz::kUseless;
+  const std::string meant = nas::MeantQuery(text);
+  DEMAND(meant.empty() || bool{Query::Parse(meant)});
   const auto query = Query::Parse(text, kNow);
   if (!query) {
     DEMAND(!query.error().path.empty());

@@ -108,6 +108,7 @@ TEST_F(Why, SearchThatFindsNothing) {
     const char* says;
   } rows[] = {
       {{"zz"}, "nothing found among 8 names in 3 folders\n"},
+      {{"name:plan"}, "did you mean 'plan'?\n"},
       {{"plam"}, "near to 'plam': plan.txt\n"},
       {{"Pl\u00e0n|zz"}, "near to 'Pl\u00e0n|zz': plan.txt\n"},
       {{"plan size:>1kb"}, "without 'size:>1kb' there would be 1 file\n"},

@@ -70,6 +70,7 @@ TEST_F(QueryTest, ASearchThatFoundNothingIsToldWhatItCameCloseTo) {
   EXPECT_EQ(near["entries"], 3);
   EXPECT_EQ(near["folders"], 1);
   EXPECT_EQ(near["complete"], true);
+  EXPECT_EQ(near["meant"], "");
   EXPECT_EQ(near["terms"][0],
             Parsed(R"({"written":"raport","without":2,"names":["report.txt","rapart.jpg"]})"));
   EXPECT_EQ(near["terms"][1]["written"], "ext:pdf|txt");

@@ -14,6 +14,7 @@
 #include "arbory/search_request.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
+#include "nas/match/meant_query.h"
 #include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
@@ -151,7 +152,9 @@ void NearMissesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try
   params["recursive"] = request->GetParam("recursive", true).asBool();
   params["folder_path"] = search.location;
   const auto near = NearMissesOf(params, kMost);
-  response->SetError(kOk, MissesJson(near.value_or(nas::NearMisses())));
+  Json::Value body = MissesJson(near.value_or(nas::NearMisses()));
+  body["meant"] = nas::MeantQuery(params["pattern"].asString());
+  response->SetError(kOk, body);
 } catch (const UsageError& error) {
   response->SetError(kBadRequest, Error(kBadRequest, error.what()));
 } catch (const Json::Exception&) {

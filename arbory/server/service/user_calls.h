@@ -23,8 +23,8 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 nas::Child StartReadQuery(const nas::ApiCall& call);
 
 // What the user's search, started with the call's parameters, came close to in its folders:
-// {"complete","entries","folders","left_out","terms":[{"written","without","names"}]}; 404 when
-// there is no such search.
+// {"complete","entries","folders","left_out","meant","terms":[{"written","without","names"}]}; 404
+// when there is no such search.
 nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id);
 
 // Stops the user's running searches by the module's own method "stop". {"stopped":N}.

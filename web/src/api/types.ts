@@ -49,6 +49,7 @@ export interface Misses {
   entries: number;
   folders: number;
   left_out: number;
+  meant: string; // the pattern as other programs would have understood it; often empty
   terms: { written: string; without: number; names: string[] }[];
 }
 

@@ -137,6 +137,15 @@ function Misses({ app, criteria, misses }: { app: App; criteria: Criteria; misse
         .
       </p>
       <ul>
+        {misses.meant && (
+          <li>
+            Did you mean{' '}
+            <button type="button" class="example" onClick={() => app.submit({ pattern: misses.meant })}>
+              <Name text={misses.meant} />
+            </button>
+            ?
+          </li>
+        )}
         {misses.terms.map(({ written, without, names }, i) => (
           <Fragment key={i}>
             {several && without > 0 && (
