@@ -139,11 +139,10 @@ function Misses({ app, criteria, misses }: { app: App; criteria: Criteria; misse
       <ul>
         {misses.meant && (
           <li>
-            Did you mean{' '}
+            Did you mean:{' '}
             <button type="button" class="example" onClick={() => app.submit({ pattern: misses.meant })}>
               <Name text={misses.meant} />
             </button>
-            ?
           </li>
         )}
         {misses.terms.map(({ written, without, names }, i) => (
