@@ -20,6 +20,3 @@ int GetACLPrivilege(const char* path) {
   }
   return privilege;
 }
-
-// There is no file index on this machine yet, so no share is covered by one.
-int FILEIDXIsShareIndexed(const char* /*share*/) { return 0; }

@@ -44,6 +44,29 @@ struct ServerSettings {
   bool operator==(const ServerSettings&) const = default;
 };
 
+// What `arbory index` goes by.
+struct IndexSettings {
+  std::string socket;  // empty: the usual place (index/daemon_socket.h)
+  // Names of shares and absolute folders; empty: every share and volume.
+  std::vector<std::string> folders;
+  // Whether each write to a file is noted. Without it writers pay less, and attributes that a
+  // search asks for are looked up.
+  bool modify_events = true;
+  int questions_per_user = 8;  // at once
+  int question_memory_mb = 512;
+  int question_seconds = 600;  // of processor time
+  // Changes that are kept in mind, and events while there is no table to note them with; beyond it
+  // the table is compared with the file system.
+  int max_changes = 1'000'000;
+  // Between two writings of the table where little has changed.
+  int rewrite_minutes = 15;
+
+  bool operator==(const IndexSettings&) const = default;
+};
+
+// Where root's state is unless configured otherwise.
+inline constexpr char kSystemStateDir[] = "/var/lib/arbory";
+
 struct Config {
   std::string state_dir;                            // absolute
   std::vector<std::string> volumes = {"/volume*"};  // shell patterns of absolute directories
@@ -64,6 +87,7 @@ struct Config {
   std::uint64_t large_call_memory_bytes() const { return Megabytes(large_call_memory_mb); }
   static std::uint64_t Megabytes(int count) { return static_cast<std::uint64_t>(count) << 20; }
   ServerSettings server;
+  IndexSettings index;
 
   bool operator==(const Config&) const = default;
 };

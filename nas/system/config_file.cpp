@@ -7,6 +7,8 @@
 //   photo = "/srv/photo"
 //   [server]
 //   listen = "127.0.0.1:8750"
+//   [index]
+//   folders = ["photo", "/srv/music"]
 //
 // A key that is not known is an error, so that a misspelt one is noticed.
 
@@ -28,7 +30,6 @@ namespace {
 constexpr size_t kMaxFileBytes = size_t{1} << 20;
 constexpr int kMaxLimit = 1'000'000'000;  // so that no sum or product of limits overflows 64 bits
 constexpr char kSystemFile[] = "/etc/arbory/arbory.toml";
-constexpr char kSystemState[] = "/var/lib/arbory";
 
 std::string Environment(const char* name) {
   const char* value = std::getenv(name);
@@ -48,7 +49,7 @@ std::string BaseDirectory(const char* variable, const char* below_home) {
 }
 
 std::string DefaultStateDir() {
-  if (geteuid() == 0) return kSystemState;
+  if (geteuid() == 0) return kSystemStateDir;
   const std::string base = BaseDirectory("XDG_STATE_HOME", ".local/state");
   // A user without a home has nowhere to keep state; the first use then says so.
   return (base.empty() ? "/nonexistent" : base) + "/arbory";
@@ -89,6 +90,7 @@ class Reader {
         {"large_calls_per_user",
          [&](const toml::node& node) { config->large_calls_per_user = Limit(node); }},
         {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
+        {"index", [&](const toml::node& node) { ReadIndex(node, &config->index); }},
     };
     ReadTable(document, keys);
   }
@@ -122,9 +124,19 @@ class Reader {
     }
   }
 
-  void ReadServer(const toml::node& node, ServerSettings* server) {
+  const toml::table& Table(const toml::node& node) {
     const toml::table* table = node.as_table();
     if (table == nullptr) Fail(node.source(), "a table is expected here");
+    return *table;
+  }
+
+  void AddLimits(std::initializer_list<std::pair<const char*, int*>> limits, Keys* keys) {
+    for (const auto& [name, limit] : limits) {
+      (*keys)[name] = [this, limit = limit](const toml::node& value) { *limit = Limit(value); };
+    }
+  }
+
+  void ReadServer(const toml::node& node, ServerSettings* server) {
     Keys keys = {
         {"listen", [&](const toml::node& value) { server->listen = Text(value); }},
         {"web_dir", [&](const toml::node& value) { server->web_dir = PathOrNone(value); }},
@@ -135,22 +147,36 @@ class Reader {
         {"pam_dir", [&](const toml::node& value) { server->pam_dir = PathOrNone(value); }},
         {"access_log", [&](const toml::node& value) { server->access_log = Truth(value); }},
     };
-    const std::pair<const char*, int*> limits[] = {
-        {"max_connections", &server->max_connections},
-        {"max_calls", &server->max_calls},
-        {"body_bytes", &server->body_bytes},
-        {"header_seconds", &server->header_seconds},
-        {"idle_seconds", &server->idle_seconds},
-        {"stall_seconds", &server->stall_seconds},
-        {"call_seconds", &server->call_seconds},
-        {"logins_per_minute", &server->logins_per_minute},
-        {"session_minutes", &server->session_minutes},
-        {"account_check_seconds", &server->account_check_seconds},
+    AddLimits(
+        {
+            {"max_connections", &server->max_connections},
+            {"max_calls", &server->max_calls},
+            {"body_bytes", &server->body_bytes},
+            {"header_seconds", &server->header_seconds},
+            {"idle_seconds", &server->idle_seconds},
+            {"stall_seconds", &server->stall_seconds},
+            {"call_seconds", &server->call_seconds},
+            {"logins_per_minute", &server->logins_per_minute},
+            {"session_minutes", &server->session_minutes},
+            {"account_check_seconds", &server->account_check_seconds},
+        },
+        &keys);
+    ReadTable(Table(node), keys);
+  }
+
+  void ReadIndex(const toml::node& node, IndexSettings* index) {
+    Keys keys = {
+        {"socket", [&](const toml::node& value) { index->socket = PathOrNone(value); }},
+        {"folders", [&](const toml::node& value) { index->folders = Texts(value); }},
+        {"modify_events", [&](const toml::node& value) { index->modify_events = Truth(value); }},
     };
-    for (const auto& [name, limit] : limits) {
-      keys[name] = [this, limit = limit](const toml::node& value) { *limit = Limit(value); };
-    }
-    ReadTable(*table, keys);
+    AddLimits({{"questions_per_user", &index->questions_per_user},
+               {"question_memory_mb", &index->question_memory_mb},
+               {"question_seconds", &index->question_seconds},
+               {"max_changes", &index->max_changes},
+               {"rewrite_minutes", &index->rewrite_minutes}},
+              &keys);
+    ReadTable(Table(node), keys);
   }
 
   std::string Text(const toml::node& node) {
