@@ -6,4 +6,5 @@ target_link_libraries(
   arbory_nas
   PUBLIC PkgConfig::JSONCPP
   PRIVATE PkgConfig::SQLITE PkgConfig::UCHARDET PkgConfig::UTF8PROC PkgConfig::PCRE2 PkgConfig::ACL PkgConfig::TOML
+          PkgConfig::XXHASH
           Threads::Threads ${CMAKE_DL_LIBS})

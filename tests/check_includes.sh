@@ -17,7 +17,7 @@ nas/system               : nas/base platform <acl> <sys/acl.h> <toml++>
 nas/files                : nas/base
 nas/match                : nas/base <pcre2.h> <utf8proc.h>
 nas/results              : nas/base nas/files nas/match
-nas/index                : nas/base nas/system nas/files nas/match platform
+nas/index                : nas/base nas/system nas/files nas/match platform <xxhash.h>
 nas/search               : nas/base nas/files nas/match nas/results nas/index nas/system platform
 nas/tasks                : nas/base nas/system platform
 nas/records              : nas/base nas/system platform

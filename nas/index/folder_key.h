@@ -3,6 +3,7 @@
 // own handle for it. Inode numbers are used again and repeat between subvolumes; handles do not.
 
 #include <string>
+#include <string_view>
 
 #include "nas/base/error.h"
 
@@ -15,5 +16,9 @@ using FolderKey = std::string;
 // Of the folder open at `fd` (O_PATH will do). Fails with EOPNOTSUPP where the file system has no
 // handles.
 Result<FolderKey> KeyOf(int fd);
+// Of the folder `name` in the folder open at `fd`; not followed where it is a symbolic link.
+Result<FolderKey> KeyOf(int fd, const char* name);
+// From what an event tells of a folder.
+FolderKey MakeFolderKey(int handle_type, std::string_view handle);
 
 }  // namespace nas

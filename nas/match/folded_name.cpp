@@ -92,6 +92,12 @@ bool LowerInto(std::string_view text, std::string& out) {
 
 }  // namespace
 
+std::string FoldVersion() {
+  // Changes with what this file does to a name.
+  constexpr char kRules[] = "1-unicode-";
+  return std::string(kRules) + utf8proc_unicode_version();
+}
+
 bool IsAscii(std::string_view text) {
   constexpr std::uint64_t kHighBits = 0x8080808080808080;
   std::uint64_t seen = 0;

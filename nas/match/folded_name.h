@@ -16,6 +16,9 @@ bool IsAscii(std::string_view text);
 // ligature into its letters, "\u00e9" into "e". May say yes for others. Where the answer is no, the
 // ASCII parts of both forms are those of the text itself.
 bool MayFoldToAscii(std::string_view text);
+// Names which rules and whose tables of characters folding follows: what was folded under another
+// version may have become something else.
+std::string FoldVersion();
 // All ASCII runs of both forms of `text`, in lower case, with \x80 in the place of other letters:
 // what is ASCII and not in it is in neither form. Takes a fraction of the time of making them.
 // False where only they can tell.
