@@ -4,7 +4,8 @@
 // identity, so neither the order of events nor their repetition matters, and an event costs no
 // look-up.
 //
-//   - A name in a folder of the table: whatever the table says of it is not believed. A search looks
+//   - A name in a folder of the table: whatever the table says of it is not believed. A search
+//   looks
 //     it up; where it is a folder that the table does not have in that place, it is walked.
 //   - A whole folder: its entries are read, as a walk reads them.
 //   - An inode: attributes that the table has of it, under whichever name, are not believed.
@@ -30,9 +31,14 @@ class Changes {
     std::set<std::string, std::less<>> names;  // none where it is `whole`
   };
 
-  void AddName(NameTable::FolderId folder, std::string_view name);
+  // Returns how many names are now noted of the folder; 0 where it is `whole`.
+  size_t AddName(NameTable::FolderId folder, std::string_view name);
   void AddFolder(NameTable::FolderId folder);
   void AddInode(std::uint64_t inode);
+
+  // What is noted, in all: names, whole folders and inodes.
+  size_t size() const { return names_ + wholes_ + inodes_.size(); }
+  size_t whole_folders() const { return wholes_; }
 
   // By folder number, so that those of one tree follow each other.
   const std::map<NameTable::FolderId, InFolder>& folders() const { return folders_; }
@@ -41,6 +47,8 @@ class Changes {
  private:
   std::map<NameTable::FolderId, InFolder> folders_;
   std::unordered_set<std::uint64_t> inodes_;
+  size_t names_ = 0;
+  size_t wholes_ = 0;
 };
 
 // What a search is answered from. Borrowed; does not change while it is used.

@@ -4,13 +4,12 @@
 #include <sys/socket.h>
 #include <sys/time.h>
 
-#include <array>
 #include <cerrno>
-#include <cstring>
+#include <span>
 
 #include "nas/base/deadline.h"
-#include "nas/base/system_call.h"
 #include "nas/index/daemon_socket.h"
+#include "nas/index/descriptors.h"
 #include "nas/index/frames.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
@@ -25,32 +24,14 @@ constexpr char kBusy[] = "busy";
 // A report is made at once, but by a process that may have others to serve first.
 constexpr int kReportMilliseconds = 5000;
 
-bool SendHello(int connection, HelloKind kind, char flags, int location_fd) {
-  std::array<char, kHelloBytes> hello = {static_cast<char>(kind), flags};
-  iovec part = {hello.data(), hello.size()};
-  msghdr message = {};
-  message.msg_iov = &part;
-  message.msg_iovlen = 1;
-  alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int))> control = {};
-  if (location_fd >= 0) {
-    message.msg_control = control.data();
-    message.msg_controllen = control.size();
-    cmsghdr* head = CMSG_FIRSTHDR(&message);
-    head->cmsg_level = SOL_SOCKET;
-    head->cmsg_type = SCM_RIGHTS;
-    head->cmsg_len = CMSG_LEN(sizeof(int));
-    std::memcpy(CMSG_DATA(head), &location_fd, sizeof location_fd);
-  }
-  const ssize_t sent = Uninterrupted([&] { return sendmsg(connection, &message, MSG_NOSIGNAL); });
-  return sent == static_cast<ssize_t>(hello.size());
-}
-
 // The daemon at `path`: its first frame, and the connection where one goes on.
 Result<std::string> Ask(const std::string& path, HelloKind kind, char flags, int location_fd,
                         const Deadline& deadline, UniqueFd* connection) {
   auto connected = ConnectToIndex(path, deadline.left_ms());
   if (!connected) return connected.error();
-  if (!SendHello(connected->get(), kind, flags, location_fd)) return ErrnoError(EPIPE, path);
+  const Hello hello = {static_cast<char>(kind), flags};
+  const std::span<const int> descriptors(&location_fd, location_fd >= 0 ? 1 : 0);
+  if (!SendMessage(connected->get(), hello, descriptors)) return ErrnoError(EPIPE, path);
   Frame frame;
   FrameReader reader(connected->get(),
                      kind == HelloKind::kReport ? kMaxAnswerBytes : kMaxStateBytes);

@@ -31,6 +31,7 @@ inline constexpr std::string_view kIndexCurrent = "current";
 enum class HelloKind : char {
   kQuestion = 'Q',  // with a location
   kCovered = 'C',   // with a location: only whether questions of it are answered
+  kCheck = 'K',     // with a location, root or the daemon's own user: compare its whole file system
   kReport = 'R',    // the state of each file system, as the payload of the status frame (JSON)
   kRebuild = 'B',   // root or the daemon's own user: make all tables anew
 };

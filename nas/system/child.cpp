@@ -35,17 +35,6 @@ constexpr std::uint64_t kMaxFrameBytes = std::uint64_t{1} << 62;
 constexpr std::uint64_t kUsualPipeBytes = std::uint64_t{64} << 10;
 constexpr int kLargePipeBytes = 1 << 20;
 
-void ResetSignals() {
-  for (int signal_number = 1; signal_number < NSIG; ++signal_number) {
-    signal(signal_number, SIG_DFL);
-  }
-  signal(SIGPIPE, SIG_IGN);
-  signal(SIGXFSZ, SIG_IGN);
-  sigset_t none;
-  sigemptyset(&none);
-  sigprocmask(SIG_SETMASK, &none, nullptr);
-}
-
 // Leaves only the standard streams and the pipe open. Returns the pipe's number, which is no longer
 // that of a standard stream, or -1.
 int KeepOnly(int pipe_fd) {
@@ -65,12 +54,6 @@ int KeepOnly(int pipe_fd) {
   const auto above = static_cast<unsigned>(pipe + 1);
   if (pipe > kFirstFreeFd && close_range(kFirstFreeFd, below, 0) != 0) return -1;
   return close_range(above, ~0U, 0) == 0 ? pipe : -1;
-}
-
-// To be called before the child becomes a user, who may not write this of a process that was root.
-void OfferToOutOfMemoryKiller() {
-  const UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC));
-  if (score) (void)WriteAll(score.get(), kChildScore);
 }
 
 [[noreturn]] void RunChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes,
@@ -106,6 +89,22 @@ bool ParseNumbers(std::string_view line, ReplyHead* head) {
 }
 
 }  // namespace
+
+void ResetSignals() {
+  for (int signal_number = 1; signal_number < NSIG; ++signal_number) {
+    signal(signal_number, SIG_DFL);
+  }
+  signal(SIGPIPE, SIG_IGN);
+  signal(SIGXFSZ, SIG_IGN);
+  sigset_t none;
+  sigemptyset(&none);
+  sigprocmask(SIG_SETMASK, &none, nullptr);
+}
+
+void OfferToOutOfMemoryKiller() {
+  const UniqueFd score(open("/proc/self/oom_score_adj", O_WRONLY | O_CLOEXEC));
+  if (score) (void)WriteAll(score.get(), kChildScore);
+}
 
 Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes) {
   Child child;

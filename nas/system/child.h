@@ -70,6 +70,12 @@ struct Child {
 // one thread.
 Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes = 0);
 
+// What StartChild does to its children, for those that are made otherwise: default handlers and an
+// empty mask, SIGPIPE and SIGXFSZ ignored; and to be among the first to go where memory runs out,
+// which is to be said before a process of root's becomes a user's.
+void ResetSignals();
+void OfferToOutOfMemoryKiller();
+
 // For the child. False when the parent has gone, which nobody needs to be told.
 bool SendReply(int pipe, const Reply& reply);
 // Sends the frame's beginning; `body_bytes` more must follow.

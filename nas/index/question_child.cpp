@@ -1,0 +1,170 @@
+#include "nas/index/question_child.h"
+
+#include <fcntl.h>
+#include <grp.h>
+#include <linux/capability.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <charconv>
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <string>
+
+#include "nas/base/paths.h"
+#include "nas/index/client.h"
+#include "nas/index/frames.h"
+#include "nas/system/child.h"
+#include "nas/system/config.h"
+#include "nas/system/memory.h"
+
+namespace nas {
+namespace {
+
+constexpr int kConnection = 3;
+constexpr int kLocation = 4;
+// Set in tests, whose sanitizers report there (system/child.cpp).
+constexpr char kKeepStandardError[] = "ARBORY_CHILD_STDERR";
+// A peer sends its question at once, and takes rows or has stopped.
+constexpr time_t kQuestionSeconds = 10;
+constexpr time_t kStallSeconds = 60;
+
+// Two descriptors under numbers of their own, the standard streams, and nothing else.
+bool KeepOnly(const Question& question) {
+  constexpr int kAbove = 64;  // out of the way of both numbers
+  const int connection = fcntl(question.connection, F_DUPFD_CLOEXEC, kAbove);
+  const int location = fcntl(question.location, F_DUPFD_CLOEXEC, kAbove);
+  const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
+  if (connection < 0 || location < 0 || null < 0) return false;
+  const bool keep_error = std::getenv(kKeepStandardError) != nullptr;
+  for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+    if (standard == STDERR_FILENO && keep_error) continue;
+    if (null == standard ? fcntl(null, F_SETFD, 0) != 0 : dup2(null, standard) < 0) return false;
+  }
+  return dup3(connection, kConnection, O_CLOEXEC) >= 0 &&
+         dup3(location, kLocation, O_CLOEXEC) >= 0 && close_range(kLocation + 1, ~0U, 0) == 0;
+}
+
+void Bound() {
+  const IndexSettings& settings = CurrentConfig().index;
+  LimitMemory(Config::Megabytes(settings.question_memory_mb));
+  const auto seconds = static_cast<rlim_t>(settings.question_seconds);
+  const rlimit time = {seconds, seconds};
+  setrlimit(RLIMIT_CPU, &time);
+  const rlimit nothing = {0, 0};
+  setrlimit(RLIMIT_CORE, &nothing);
+  setrlimit(RLIMIT_FSIZE, &nothing);
+  const timeval question = {kQuestionSeconds, 0};
+  const timeval stall = {kStallSeconds, 0};
+  setsockopt(kConnection, SOL_SOCKET, SO_RCVTIMEO, &question, sizeof question);
+  setsockopt(kConnection, SOL_SOCKET, SO_SNDTIMEO, &stall, sizeof stall);
+}
+
+// Of root's rights only those to read.
+bool KeepReadingOnly() {
+  __user_cap_header_struct header = {_LINUX_CAPABILITY_VERSION_3, 0};
+  std::array<__user_cap_data_struct, _LINUX_CAPABILITY_U32S_3> sets = {};
+  if (syscall(SYS_capget, &header, sets.data()) != 0) return false;
+  const std::uint32_t reading = (1U << CAP_DAC_READ_SEARCH) | (1U << CAP_DAC_OVERRIDE);
+  for (size_t at = 0; at < sets.size(); ++at) {
+    sets[at].permitted &= at == 0 ? reading : 0;
+    sets[at].effective = sets[at].permitted;
+    sets[at].inheritable = 0;
+  }
+  return syscall(SYS_capset, &header, sets.data()) == 0;
+}
+
+[[noreturn]] void Answer(const Question& question, const NameTable& table, Changes& changes,
+                         bool attributes_current, const AnswerFunction& answer) {
+  ResetSignals();
+  OfferToOutOfMemoryKiller();
+  if (attributes_current && question.asks_times) attributes_current = AddMappedInodes(changes);
+  const bool ready = KeepOnly(question) && BecomePeer(question.peer).ok();
+  if (ready) {
+    Bound();
+    try {
+      if (SendFrame(kConnection, FrameType::kStatus, kIndexCurrent)) {
+        answer(kConnection, UniqueFd(kLocation), {table, changes, attributes_current});
+      }
+    } catch (...) {
+      // The peer sees a connection that ends before its answer does, and walks.
+    }
+  }
+  _exit(ready ? EXIT_SUCCESS : EXIT_FAILURE);
+}
+
+// A line of /proc/PID/maps: "BEGIN-END rw-s OFFSET MAJOR:MINOR INODE   PATH".
+void AddLine(std::string_view line, Changes& changes) {
+  constexpr size_t kFieldsBeforeInode = 4;
+  size_t at = line.find(' ');
+  if (at == std::string_view::npos || at + 4 >= line.size()) return;
+  if (line[at + 2] != 'w' || line[at + 4] != 's') return;
+  for (size_t field = 1; field < kFieldsBeforeInode && at != std::string_view::npos; ++field) {
+    at = line.find(' ', at + 1);
+  }
+  if (at == std::string_view::npos) return;
+  std::uint64_t inode = 0;
+  std::from_chars(line.data() + at + 1, line.data() + line.size(), inode);
+  if (inode != 0) changes.AddInode(inode);
+}
+
+}  // namespace
+
+Status BecomePeer(const Peer& peer) {
+  prctl(PR_SET_DUMPABLE, 0);
+  if (geteuid() == 0) {
+    if (setgroups(peer.groups.size(), peer.groups.data()) != 0 ||
+        setresgid(peer.gid, peer.gid, peer.gid) != 0 ||
+        setresuid(peer.uid, peer.uid, peer.uid) != 0) {
+      return ErrnoError();
+    }
+    if (peer.uid == 0 && !KeepReadingOnly()) return ErrnoError();
+  } else if (peer.uid != geteuid()) {
+    return ErrnoError(EPERM);
+  }
+  // A change of ids has set it anew.
+  if (prctl(PR_SET_DUMPABLE, 0) != 0 || prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
+    return ErrnoError();
+  }
+  if (peer.uid != 0 && (setuid(0) == 0 || geteuid() != peer.uid)) return ErrnoError(EPERM);
+  return {};
+}
+
+pid_t StartQuestion(const Question& question, const NameTable& table, Changes& changes,
+                    bool attributes_current, const AnswerFunction& answer) {
+  const pid_t pid = fork();
+  if (pid == 0) Answer(question, table, changes, attributes_current, answer);
+  return pid;
+}
+
+bool AddMappedInodes(Changes& changes) {
+  const auto names = NamesIn(AT_FDCWD, "/proc");
+  if (!names) return false;
+  char* line = nullptr;
+  size_t room = 0;
+  bool complete = true;
+  for (const std::string& name : *names) {
+    if (name.find_first_not_of("0123456789") != std::string::npos) continue;
+    const std::unique_ptr<FILE, int (*)(FILE*)> maps(
+        std::fopen(("/proc/" + name + "/maps").c_str(), "re"), std::fclose);
+    if (!maps) {
+      complete = complete && (errno == ENOENT || errno == ESRCH);
+      continue;
+    }
+    for (ssize_t length = 0; (length = getline(&line, &room, maps.get())) > 0;) {
+      AddLine({line, static_cast<size_t>(length)}, changes);
+    }
+  }
+  std::free(line);
+  return complete;
+}
+
+}  // namespace nas
