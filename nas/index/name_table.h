@@ -43,6 +43,7 @@ class NameTable {
     std::uint32_t mode = 0;
     std::uint32_t uid = 0;
     std::uint32_t gid = 0;
+    bool operator==(const Attributes&) const = default;
   };
   // When a folder's own inode last changed, to tell whether it has since; {} where that cannot be
   // told from it, because it was read too soon after a change.

@@ -2,26 +2,16 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <climits>
-#include <thread>
 
 #include "nas/files/beneath.h"
 #include "nas/index/folder_reader.h"
+#include "nas/index/open_path.h"
 
 namespace nas {
-namespace {
-
-// Folders that wait are opened by the descriptor of the folder they lie in. Very deep trees would
-// hold more of these than a process may have; beyond this many the path is gone down again.
-constexpr size_t kMostHeld = 256;
-
-}  // namespace
-
 NameTable::FolderId OldTable::FirstHint(NameTable::FolderId begin, NameTable::FolderId end) const {
   const auto first = hinted.lower_bound(begin);
   return first != hinted.end() && *first < end ? *first : NameTable::kNoFolder;
@@ -33,17 +23,13 @@ class TreeReader::Worker {
   Worker(TreeReader& reader, NodeArena& arena)
       : reader_(reader), arena_(arena), entries_(arena, reader.classes_) {}
 
-  void Run() {
-    Task task;
-    while (reader_.Take(task)) {
-      ReadNode(task);
-      reader_.Done();
-    }
+  void Run(const Queue::Take& take) {
+    for (Queue::Task task; take(task);) ReadNode(task);
   }
 
  private:
-  void ReadNode(const Task& task);
-  UniqueFd Open(const Task& task, bool& readable);
+  void ReadNode(const Queue::Task& task);
+  UniqueFd Open(const Queue::Task& task, bool& readable);
   bool LookAt(FolderNode& node, int fd);
   void Keep(FolderNode& node, UniqueFd fd);
   void ReadEntries(FolderNode& node, UniqueFd fd);
@@ -59,8 +45,9 @@ class TreeReader::Worker {
   FolderReader entries_;
 };
 
-UniqueFd TreeReader::Worker::Open(const Task& task, bool& readable) {
-  FolderNode& node = *task.node;
+UniqueFd TreeReader::Worker::Open(const Queue::Task& task, bool& readable) {
+  FolderNode& node = *task.folder;
+  if (reader_.stopped()) reader_.queue_.Fail(ErrnoError(ECANCELED));
   UniqueFd reopened;
   if (!task.parent && node.parent != nullptr) {
     reopened = reader_.OpenByPath(*node.parent);
@@ -77,13 +64,15 @@ UniqueFd TreeReader::Worker::Open(const Task& task, bool& readable) {
   return fd;
 }
 
-void TreeReader::Worker::ReadNode(const Task& task) {
-  FolderNode& node = *task.node;
+void TreeReader::Worker::ReadNode(const Queue::Task& task) {
+  FolderNode& node = *task.folder;
   bool readable = false;
   UniqueFd fd = Open(task, readable);
   if (!fd) {
-    if (errno == EMFILE || errno == ENFILE || errno == ENOMEM) return reader_.Fail(ErrnoError());
-    if (node.parent == nullptr) return reader_.Fail(ErrnoError(reader_.roots_[node.tree].name));
+    if (errno == EMFILE || errno == ENFILE || errno == ENOMEM)
+      return reader_.queue_.Fail(ErrnoError());
+    if (node.parent == nullptr)
+      return reader_.queue_.Fail(ErrnoError(reader_.roots_[node.tree].name));
     node.state = errno == EXDEV ? FolderNode::State::kElsewhere : FolderNode::State::kGone;
     return Mismatch(node);
   }
@@ -147,7 +136,7 @@ FolderNode* TreeReader::Worker::ChildOf(FolderNode& node, std::string_view name)
 void TreeReader::Worker::Keep(FolderNode& node, UniqueFd fd) {
   node.state = FolderNode::State::kKept;
   node.folder.stamp = old().stamp(node.old);
-  Batch batch;
+  std::vector<FolderNode*> below;
   const NameTable::FolderId end = old().subtree_end(node.old);
   NameTable::FolderId hint = reader_.old_.FirstHint(node.old + 1, end);
   while (hint != NameTable::kNoFolder) {
@@ -155,12 +144,10 @@ void TreeReader::Worker::Keep(FolderNode& node, UniqueFd fd) {
     FolderNode* child = ChildOf(node, old().folder_name(hint));
     child->old = hint;
     node.changed.emplace_back(hint, child);
-    batch.nodes.push_back(child);
+    below.push_back(child);
     hint = reader_.old_.FirstHint(old().subtree_end(hint), end);
   }
-  if (batch.nodes.empty()) return;
-  batch.parent = std::make_shared<UniqueFd>(std::move(fd));
-  reader_.Push(std::move(batch));
+  reader_.queue_.Push(std::move(fd), std::move(below));
 }
 
 void TreeReader::Worker::ReadEntries(FolderNode& node, UniqueFd fd) {
@@ -170,11 +157,11 @@ void TreeReader::Worker::ReadEntries(FolderNode& node, UniqueFd fd) {
     node.folder.unreadable = true;
     return;
   }
-  Batch batch;
+  std::vector<FolderNode*> below;
   for (ReadEntry& entry : found) {
     if (reader_.stopped()) return;
     if (entries_.IsFolder(entry) && MakeChild(node, fd.get(), entry)) {
-      batch.nodes.push_back(entry.child);
+      below.push_back(entry.child);
     }
   }
   node.count = found.size();
@@ -184,9 +171,7 @@ void TreeReader::Worker::ReadEntries(FolderNode& node, UniqueFd fd) {
   reader_.entries_ += found.size();
   reader_.text_bytes_ += entries_.text_bytes();
   if (reader_.options_.progress != nullptr) reader_.options_.progress->entries += found.size();
-  if (batch.nodes.empty()) return;
-  batch.parent = std::make_shared<UniqueFd>(std::move(fd));
-  reader_.Push(std::move(batch));
+  reader_.queue_.Push(std::move(fd), std::move(below));
 }
 
 // True where the child is to be read.
@@ -234,7 +219,7 @@ bool TreeReader::IsRoot(std::uint64_t inode) const {
 
 Status TreeReader::FindRoots() {
   NodeArena& arena = *arenas_.emplace_back(std::make_unique<NodeArena>());
-  Batch batch;
+  std::vector<FolderNode*> below;
   for (size_t i = 0; i < roots_.size(); ++i) {
     FolderStatus status;
     if (!ReadFolderStatus(roots_[i].fd, status)) return ErrnoError(roots_[i].name);
@@ -244,83 +229,29 @@ Status TreeReader::FindRoots() {
     top->tree = static_cast<std::uint16_t>(i);
     if (old_.table != nullptr) top->old = old_.table->top(i);
     tops_.push_back(top);
-    batch.nodes.push_back(top);
+    below.push_back(top);
   }
-  if (!batch.nodes.empty()) Push(std::move(batch));
+  queue_.Push(UniqueFd(), std::move(below));
   return {};
 }
 
 Status TreeReader::Read() {
   if (const Status found = FindRoots(); !found) return found;
-  std::vector<std::thread> threads;
-  for (unsigned i = 0; i < std::max(1U, options_.threads); ++i) {
-    NodeArena& arena = *arenas_.emplace_back(std::make_unique<NodeArena>());
-    threads.emplace_back([this, &arena] { Worker(*this, arena).Run(); });
-  }
-  for (std::thread& thread : threads) thread.join();
-  if (stopped()) return ErrnoError(ECANCELED);
-  return failed_ ? Status(*failed_) : Status();
-}
-
-void TreeReader::Push(Batch batch) {
-  const std::lock_guard lock(mutex_);
-  unfinished_ += batch.nodes.size();
-  if (batch.parent && held_ >= kMostHeld) batch.parent.reset();
-  if (batch.parent) ++held_;
-  // Taken from the end.
-  std::reverse(batch.nodes.begin(), batch.nodes.end());
-  waiting_.push_back(std::move(batch));
-  changed_.notify_all();
-}
-
-bool TreeReader::Take(Task& task) {
-  task = {};
-  std::unique_lock lock(mutex_);
-  changed_.wait(lock, [this] { return !waiting_.empty() || unfinished_ == 0 || failed_; });
-  if (waiting_.empty() || failed_ || stopped()) return false;
-  Batch& batch = waiting_.back();
-  task = {batch.parent, batch.nodes.back()};
-  batch.nodes.pop_back();
-  if (batch.nodes.empty()) {
-    if (batch.parent) --held_;
-    waiting_.pop_back();
-  }
-  return true;
-}
-
-void TreeReader::Done() {
-  const std::lock_guard lock(mutex_);
-  if (--unfinished_ == 0 || stopped()) {
-    if (stopped() && !failed_) failed_ = ErrnoError(ECANCELED);
-    changed_.notify_all();
-  }
-}
-
-void TreeReader::Fail(Error error) {
-  const std::lock_guard lock(mutex_);
-  if (!failed_) failed_ = std::move(error);
-  changed_.notify_all();
+  const unsigned threads = std::max(1U, options_.threads);
+  for (unsigned i = 0; i < threads; ++i) arenas_.push_back(std::make_unique<NodeArena>());
+  const Status read = queue_.Run(threads, [this](unsigned number, const Queue::Take& take) {
+    Worker(*this, *arenas_[number]).Run(take);
+  });
+  return stopped() ? ErrnoError(ECANCELED) : read;
 }
 
 // The folder of a node by the names that lead to it; nothing where it is not the one any more.
 UniqueFd TreeReader::OpenByPath(const FolderNode& node) const {
-  std::vector<const FolderNode*> steps;
+  std::vector<std::string_view> names;
   for (const FolderNode* step = &node; step->parent != nullptr; step = step->parent) {
-    steps.push_back(step);
+    names.push_back(step->name);
   }
-  constexpr int kFlags = O_PATH | O_DIRECTORY | O_NOFOLLOW;
-  UniqueFd fd(OpenOnSameMount(roots_[node.tree].fd, ".", kFlags));
-  while (fd && !steps.empty()) {
-    // As many names at once as one system call takes.
-    std::string path(steps.back()->name);
-    steps.pop_back();
-    while (!steps.empty() && path.size() + 1 + steps.back()->name.size() < PATH_MAX) {
-      path.append("/").append(steps.back()->name);
-      steps.pop_back();
-    }
-    fd = OpenAt2(fd.get(), path.c_str(), kFlags,
-                 RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_XDEV);
-  }
+  UniqueFd fd = OpenByNames(roots_[node.tree].fd, std::move(names));
   if (fd && KeyOf(fd.get()).value_or({}) != node.folder.key) {
     fd.Reset();
     errno = ENOENT;

@@ -3,10 +3,8 @@
 // to have changed.
 
 #include <atomic>
-#include <condition_variable>
 #include <memory>
 #include <mutex>
-#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -14,6 +12,7 @@
 #include "nas/base/unique_fd.h"
 #include "nas/files/directory_reader.h"
 #include "nas/index/folder_node.h"
+#include "nas/index/folder_queue.h"
 #include "nas/index/tree_scan.h"
 
 namespace nas {
@@ -50,22 +49,10 @@ class TreeReader {
     std::uint64_t device = 0;
     std::uint64_t mount = 0;
   };
-  // Sub-folders of one folder that wait to be read.
-  struct Batch {
-    std::shared_ptr<UniqueFd> parent;  // nothing where too many are held: opened by its path
-    std::vector<FolderNode*> nodes;
-  };
-  struct Task {
-    std::shared_ptr<UniqueFd> parent;
-    FolderNode* node = nullptr;
-  };
+  using Queue = FolderQueue<FolderNode*>;
   class Worker;
 
   Status FindRoots();
-  void Push(Batch batch);
-  bool Take(Task& task);
-  void Done();
-  void Fail(Error error);
   bool stopped() const { return options_.stop != nullptr && options_.stop->load(); }
   bool IsRoot(std::uint64_t inode) const;
   UniqueFd OpenByPath(const FolderNode& node) const;
@@ -82,12 +69,9 @@ class TreeReader {
   std::atomic<size_t> entries_ = 0;
   std::atomic<size_t> text_bytes_ = 0;
 
+  Queue queue_;
+
   std::mutex mutex_;  // guards what follows
-  std::condition_variable changed_;
-  std::vector<Batch> waiting_;
-  size_t held_ = 0;  // descriptors of those waiting
-  size_t unfinished_ = 0;
-  std::optional<Error> failed_;
   std::set<NameTable::FolderId> stale_;
 };
 
