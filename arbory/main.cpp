@@ -10,6 +10,7 @@
 
 #include "arbory/call_command.h"
 #include "arbory/command_line.h"
+#include "arbory/index_command.h"
 #include "arbory/options.h"
 #include "arbory/search_command.h"
 #include "arbory/serve_command.h"
@@ -59,6 +60,15 @@ constexpr char kWhyHelp[] =
     "Examples:\n"
     "  arbory why ~/photos/IMG_1.jpg holiday ~/photos -t image\n"
     "  arbory why /var/log/syslog 'error code' /var/log --content\n";
+
+constexpr char kIndexHelp[] =
+    "Keeps the names of all shares and volumes in mind, so that searches need not read the\n"
+    "folders, and answers until SIGTERM or SIGINT. As root for everybody, each with what\n"
+    "they may see; as an ordinary user over what that user may read. The other forms ask\n"
+    "the daemon that runs.\n"
+    "\n"
+    "Exit status: --status 0 all is current, 1 not yet, 2 no daemon; --check 0 no\n"
+    "difference, 1 some, 2 it could not be done.\n";
 
 // Help without the parser's own notes on which options need or exclude each other.
 class Formatter : public CLI::Formatter {
@@ -143,6 +153,21 @@ CLI::App* AddWhy(CLI::App* app, WhyOptions* options) {
   return why;
 }
 
+CLI::App* AddIndex(CLI::App* app, IndexOptions* options) {
+  CLI::App* index =
+      app->add_subcommand("index", "Keep an index of names, so that searches are quick");
+  CLI::Option* status = index->add_flag("--status", options->status, "Tell what the daemon does");
+  index->add_flag("--json", options->json, "The same as JSON")->needs(status);
+  CLI::Option* rebuild =
+      index->add_flag("--rebuild", options->rebuild, "Have everything read anew")->excludes(status);
+  index->add_flag("--check", options->check, "Print how the index differs from the folders")
+      ->excludes(status)
+      ->excludes(rebuild);
+  AddCommonOptions(index, &options->common);
+  index->footer(kIndexHelp);
+  return index;
+}
+
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
   const auto chosen = app.get_subcommands();
   if (chosen.empty()) {
@@ -171,6 +196,8 @@ int Run(int argc, char** argv) {
   ServeOptions serve_options;
   CLI::App* call = AddCall(&app, &call_options);
   CLI::App* serve = AddServe(&app, &serve_options);
+  IndexOptions index_options;
+  CLI::App* index = AddIndex(&app, &index_options);
   WhyOptions why_options;
   AddSearch(&app, &search_options);
   CLI::App* why = AddWhy(&app, &why_options);
@@ -185,6 +212,7 @@ int Run(int argc, char** argv) {
     Unmark(&call_options.params);
     return RunCallCommand(call_options);
   }
+  if (index->parsed()) return RunIndexCommand(index_options);
   if (serve->parsed()) return RunServeCommand(serve_options);
   if (why->parsed()) {
     Unmark(&why_options.file);

@@ -53,6 +53,15 @@ struct ServeOptions {
   std::string listen;  // HOST:PORT; empty: as configured
 };
 
+struct IndexOptions {
+  CommonOptions common;
+  // One of these, or none: be the daemon.
+  bool status = false;
+  bool rebuild = false;
+  bool check = false;
+  bool json = false;  // of the status
+};
+
 // Both bounds are inclusive.
 struct TimeRange {
   std::string from;

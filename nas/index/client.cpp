@@ -52,7 +52,7 @@ void LiftTimeouts(int connection) {
 }
 
 IndexAnswer AskAbout(int location_fd, HelloKind kind, char flags) {
-  const Deadline deadline(kAskMilliseconds);
+  const Deadline deadline(kIndexMilliseconds);
   IndexAnswer answer;
   answer.state = kNoIndex;
   for (const std::string& path : IndexSockets()) {
@@ -73,6 +73,12 @@ IndexAnswer AskAbout(int location_fd, HelloKind kind, char flags) {
 IndexAnswer AskIndex(int location_fd, bool asks_times) {
   IndexAnswer answer =
       AskAbout(location_fd, HelloKind::kQuestion, asks_times ? kHelloAsksTimes : '\0');
+  if (answer.connection) LiftTimeouts(answer.connection.get());
+  return answer;
+}
+
+IndexAnswer AskToCheck(int location_fd) {
+  IndexAnswer answer = AskAbout(location_fd, HelloKind::kCheck, '\0');
   if (answer.connection) LiftTimeouts(answer.connection.get());
   return answer;
 }

@@ -45,11 +45,14 @@ struct IndexAnswer {
 };
 
 // As long as a search waits for the daemon before it walks.
-inline constexpr int kAskMilliseconds = 150;
+inline constexpr int kIndexMilliseconds = 150;
 
 // Asks whether the index answers for the folder open at `location_fd`, and begins a question.
 // Listeners that are neither root's nor one's own are not believed ("no index").
 IndexAnswer AskIndex(int location_fd, bool asks_times);
+
+// The same for a comparing of the whole file system that the folder is on (table_check_child.h).
+IndexAnswer AskToCheck(int location_fd);
 
 // Whether the index covers the folder and is current; no question is begun.
 bool IsIndexed(int location_fd);

@@ -7,7 +7,7 @@
 
 #include "nas/index/client.h"
 #include "nas/index/frames.h"
-#include "nas/index/table_sweep.h"
+#include "nas/index/table_compare.h"
 #include "nas/system/child.h"
 
 namespace nas {
