@@ -76,7 +76,7 @@ class NodeArena {
 
   void* Get(size_t bytes, size_t alignment) {
     used_ = (used_ + alignment - 1) / alignment * alignment;
-    if (used_ + bytes > size_) {
+    if (blocks_.empty() || used_ + bytes > size_) {
       size_ = bytes > kBlock ? bytes : kBlock;
       blocks_.push_back(std::unique_ptr<char[]>(new char[size_]));
       used_ = 0;

@@ -33,13 +33,13 @@ constexpr size_t kMaxOutputBytes = size_t{320} << 20;
   if (idle) {
     syscall(SYS_ioprio_set, kOfProcess, 0, kIdleClass);
   }
-  int result = EINTR;
+  int result = EIO;
   try {
     if (getppid() == parent) result = body(pipe);
   } catch (const std::bad_alloc&) {
     result = ENOMEM;
   } catch (...) {
-    result = EIO;
+    // As it is of a child that dies.
   }
   _exit(result);
 }
@@ -85,7 +85,7 @@ int TableJob::Finish() {
   int status = 0;
   const pid_t ended = Uninterrupted([&] { return waitpid(pid_, &status, 0); });
   pid_ = -1;
-  return ended > 0 && WIFEXITED(status) ? WEXITSTATUS(status) : EINTR;
+  return ended > 0 && WIFEXITED(status) ? WEXITSTATUS(status) : EIO;
 }
 
 }  // namespace nas

@@ -29,7 +29,7 @@ class TableJob {
   pid_t pid() const { return pid_; }
   // Takes what has come. True once the child has ended, or has said more than it may.
   bool Read();
-  // After Read was true: 0, or the errno that the child failed with; EINTR where it was ended.
+  // After Read was true: 0, or the errno that the child failed with; EIO where it died.
   int Finish();
   const std::string& output() const { return output_; }
 
