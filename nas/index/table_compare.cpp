@@ -145,7 +145,8 @@ void Comparison::CompareFolder(const Queue::Task& task) {
   if (!covered && (fd ? !same || !readable : !table_.unreadable(folder.id))) {
     Tell(Kind::kFolder, folder);
   }
-  if (same) CompareEntries(folder, std::move(fd));
+  // Of one that could not be read a search believes nothing.
+  if (same && !table_.unreadable(folder.id)) CompareEntries(folder, std::move(fd));
 }
 
 // Of each name in the folder, sorted.

@@ -199,7 +199,9 @@ NameTable::FolderId TreeReader::Worker::KnownChild(const FolderNode& node, int f
   const NameTable::EntryId id = old().FindEntry(node.old, entry.Name());
   const NameTable::FolderId known =
       id == old().entries() ? NameTable::kNoFolder : old().folder_at(id);
-  if (known == NameTable::kNoFolder || old().folder_inode(known) != entry.inode) {
+  // One that could not be read may be readable by now.
+  if (known == NameTable::kNoFolder || old().folder_inode(known) != entry.inode ||
+      old().unreadable(known)) {
     return NameTable::kNoFolder;
   }
   const Result<FolderKey> key = KeyOf(fd, entry.Name().data());

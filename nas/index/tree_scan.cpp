@@ -4,6 +4,7 @@
 
 #include <algorithm>
 
+#include "nas/index/moved_folders.h"
 #include "nas/index/tree_reader.h"
 
 namespace nas {
@@ -134,6 +135,7 @@ bool HasTheseRoots(const NameTable& old, const std::vector<TableRoot>& roots) {
 
 Status WriteTable(const TreeReader& reader, const NameTable* old, ClassTable& classes,
                   const std::vector<TableRoot>& roots, const TablePlace& place) {
+  DropMovedFolders(reader.tops());
   std::vector<std::uint16_t> rows;
   if (old != nullptr) {
     for (const TableClass& row : old->class_rows()) {
@@ -168,10 +170,12 @@ Status MergeTable(const NameTable& old, const Changes& changes, bool all_attribu
     ClassTable classes;
     TreeReader reader(roots, from, classes, options);
     if (const Status read = reader.Read(); !read) return read;
-    if (reader.stale().empty() || round == kRounds) {
+    std::set<NameTable::FolderId> stale = FoldersLeft(reader.tops(), old);
+    stale.insert(reader.stale().begin(), reader.stale().end());
+    if (stale.empty() || round == kRounds) {
       return WriteTable(reader, &old, classes, roots, place);
     }
-    from.hinted.insert(reader.stale().begin(), reader.stale().end());
+    from.hinted.merge(stale);
   }
 }
 

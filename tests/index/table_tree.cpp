@@ -140,10 +140,24 @@ std::string TableTest::Differences(const nas::NameTable& table, const nas::Chang
 }
 
 std::string RandomTree::Name() {
-  static const std::vector<std::string> kNames = {
-      "a", "B", "report.TXT", "two\nlines", "\xff\xfe broken", "\u00dcbersicht",
-      "U\u0308bersicht", "stra\u00dfe", "\u65e5\u672c\u8a9e", std::string(255, 'x'), "\1", "-", " ",
-      "\u0130", "na\u00efve.JPG", "name.with.dots", "tab\there", std::string(127, 'A') + "\u00e9"};
+  static const std::vector<std::string> kNames = {"a",
+                                                  "B",
+                                                  "report.TXT",
+                                                  "two\nlines",
+                                                  "\xff\xfe broken",
+                                                  "\u00dcbersicht",
+                                                  "U\u0308bersicht",
+                                                  "stra\u00dfe",
+                                                  "\u65e5\u672c\u8a9e",
+                                                  std::string(255, 'x'),
+                                                  "\1",
+                                                  "-",
+                                                  " ",
+                                                  "\u0130",
+                                                  "na\u00efve.JPG",
+                                                  "name.with.dots",
+                                                  "tab\there",
+                                                  std::string(127, 'A') + "\u00e9"};
   std::string name = kNames[Below(kNames.size())];
   constexpr size_t kLongest = 255;
   if (Below(2) == 0) name += std::to_string(Below(10));

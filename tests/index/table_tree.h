@@ -37,7 +37,8 @@ class TableTest : public nas_test::PlatformTest {
   nas::TablePlace Place(const std::string& name) const;
   nas::Result<nas::NameTable> Open(const std::string& name) const;
   // A table of the tree, made now.
-  nas::NameTable Scan(const std::string& name = "names", const nas::ScanOptions& options = {}) const;
+  nas::NameTable Scan(const std::string& name = "names",
+                      const nas::ScanOptions& options = {}) const;
   nas::NameTable Merge(const nas::NameTable& old, const nas::Changes& changes) const;
   // What events would have said: this name, and that its folder has changed.
   static void Note(const nas::NameTable& table, const std::string& path, nas::Changes& changes);
