@@ -1,16 +1,14 @@
 #include "nas/index/inotify_source.h"
 
-#include <fcntl.h>
 #include <sys/inotify.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <array>
-#include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <utility>
 
-#include "nas/base/file_io.h"
 #include "nas/base/system_call.h"
 
 namespace nas {
@@ -20,7 +18,6 @@ constexpr size_t kBufferBytes = size_t{64} << 10;
 // What is kept of folders of a table that is being made: some 100 bytes each.
 constexpr size_t kMostEarly = 200'000;
 constexpr char kLimitFile[] = "/proc/sys/fs/inotify/max_user_watches";
-constexpr size_t kMaxLimitText = 64;
 // As small as the kernel makes the limit on the smallest machines.
 constexpr int kUsualLimit = 8192;
 constexpr std::uint32_t kMask =
@@ -28,9 +25,10 @@ constexpr std::uint32_t kMask =
 
 // Other programs of the user need some as well.
 int Budget() {
-  const auto text = ReadWholeFile(AT_FDCWD, kLimitFile, kMaxLimitText);
-  const int limit = text ? std::atoi(text->c_str()) : 0;
-  return (limit > 0 ? limit : kUsualLimit) / 2;
+  // Not by ReadWholeFile: the kernel gives such a file in one read alone.
+  int limit = 0;
+  if (!(std::ifstream(kLimitFile) >> limit) || limit <= 0) limit = kUsualLimit;
+  return limit / 2;
 }
 
 }  // namespace

@@ -100,7 +100,7 @@ class Watcher {
   Clock::time_point gathered_;
   std::optional<Clock::time_point> retry_;
   Clock::duration patience_ = kFirstRetry;
-  Clock::time_point gap_;
+  std::optional<Clock::time_point> gap_;
   std::map<pid_t, uid_t> questions_;
   bool ending_ = false;
 };
@@ -297,7 +297,9 @@ void Watcher::AfterSweep() {
 // In a storm of events the next gap would come before the comparing is done: nothing is noted then
 // for a while.
 void Watcher::LoseTrack(Clock::time_point now) {
-  if (now - gap_ >= kBetweenGaps) return AfterGap();
+  const bool storm = gap_ && now - *gap_ < kBetweenGaps;
+  gap_ = now;
+  if (!storm) return AfterGap();
   Abandon();
   hints_.ForgetAll();
   hints_.Use(nullptr);
@@ -307,7 +309,6 @@ void Watcher::LoseTrack(Clock::time_point now) {
 
 // Nothing is believed of what happened before now.
 void Watcher::AfterGap() {
-  gap_ = Clock::now();
   Abandon();
   hints_.ForgetAll();
   const bool compare = table_ && trees_->by_folder() == nullptr;

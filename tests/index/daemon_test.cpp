@@ -243,11 +243,11 @@ TEST_F(Life, DoesNotBelieveMappedFiles) {
   if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
   MountTree("tmpfs");
   MakeTree(tree_);
+  StartDaemon();  // which would inherit what is mapped now
   const std::string path = tree_ + "/a/one";
   const nas::UniqueFd file(open(path.c_str(), O_RDWR | O_CLOEXEC));
   void* mapping = mmap(nullptr, 1, PROT_READ | PROT_WRITE, MAP_SHARED, file.get(), 0);
   ASSERT_NE(mapping, MAP_FAILED);
-  StartDaemon();
   ASSERT_TRUE(Current());
   EXPECT_TRUE(Tells(See(tree_, true)["inodes"], path));
   EXPECT_FALSE(Tells(See(tree_, false)["inodes"], path)) << "looked for though nobody asks";
