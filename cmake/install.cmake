@@ -7,7 +7,7 @@ if(TARGET arbory_module)
 endif()
 install(DIRECTORY web/dist/ DESTINATION share/arbory/web OPTIONAL)
 install(DIRECTORY packaging/sample DESTINATION share/arbory)
-install(FILES packaging/arbory.service DESTINATION lib/systemd/system)
-install(FILES docs/http.md docs/deploy.md packaging/arbory.toml packaging/nginx.conf
+install(FILES packaging/arbory.service packaging/arbory-index.service DESTINATION lib/systemd/system)
+install(FILES docs/http.md docs/deploy.md docs/index.md packaging/arbory.toml packaging/nginx.conf
         DESTINATION share/doc/arbory)
 install(FILES packaging/pam/arbory DESTINATION share/doc/arbory/pam)
