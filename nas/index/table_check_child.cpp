@@ -38,7 +38,8 @@ void Compare(int connection, const NameTable& table, const Changes& changes, boo
   const Status done = CompareTable(table, changes, attributes, roots, [&](const auto& difference) {
     ++count;
     const std::string& root = roots[difference.tree].name;
-    const std::string path = difference.path.empty() ? root : root + "/" + difference.path;
+    const std::string path =
+        difference.path.empty() ? root : (root == "/" ? root : root + "/") + difference.path;
     // Whoever has gone is noticed at the end.
     (void)SendFrame(connection, FrameType::kRows, path + ": " + WordsOf(difference.kind));
   });
