@@ -21,8 +21,6 @@ namespace {
 constexpr size_t kMaxStateBytes = 256;
 constexpr char kNoIndex[] = "no index";
 constexpr char kBusy[] = "busy";
-// A report is made at once, but by a process that may have others to serve first.
-constexpr int kReportMilliseconds = 5000;
 
 // The daemon at `path`: its first frame, and the connection where one goes on.
 Result<std::string> Ask(const std::string& path, HelloKind kind, char flags, int location_fd,
@@ -87,8 +85,8 @@ bool IsIndexed(int location_fd) {
   return AskAbout(location_fd, HelloKind::kCovered, '\0').state == kIndexCurrent;
 }
 
-Result<std::string> AskDaemon(HelloKind kind) {
-  const Deadline deadline(kReportMilliseconds);
+Result<std::string> AskDaemon(HelloKind kind, int timeout_ms) {
+  const Deadline deadline(timeout_ms);
   Error failed = ErrnoError(ENOENT);
   for (const std::string& path : IndexSockets()) {
     UniqueFd connection;

@@ -58,7 +58,8 @@ IndexAnswer AskToCheck(int location_fd);
 bool IsIndexed(int location_fd);
 
 // What the daemon says to a hello without a location; fails with ENOENT or ECONNREFUSED where
-// there is no daemon.
-Result<std::string> AskDaemon(HelloKind kind);
+// there is no daemon, EAGAIN where it says nothing in that time.
+inline constexpr int kReportMilliseconds = 5000;
+Result<std::string> AskDaemon(HelloKind kind, int timeout_ms = kReportMilliseconds);
 
 }  // namespace nas

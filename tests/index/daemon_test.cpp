@@ -162,6 +162,13 @@ class Life : public DaemonTest {
     if (round > 0) fs::remove_all(tree_ + "/round" + std::to_string(round - 1));
   }
   void ExpectEqual() {
+    // Names first, while attributes may still be read.
+    std::vector<std::string> first;
+    EXPECT_TRUE(Eventually([&] {
+      first = Differences(tree_);
+      return first.size() != 1 || !first.front().starts_with("state: ");
+    }));
+    EXPECT_EQ(first, std::vector<std::string>());
     ASSERT_TRUE(Current());
     EXPECT_EQ(Differences(tree_), std::vector<std::string>());
     EXPECT_TRUE(See(tree_)["attributes"].asBool());

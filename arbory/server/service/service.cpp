@@ -1,4 +1,5 @@
 #include "arbory/server/service/service.h"
+#include "arbory/server/service/index_metrics.h"
 
 #include <unistd.h>
 
@@ -192,7 +193,8 @@ Answer Service::MetricsReply() {
   const size_t all = ChildrenOfThisProcess().size();
   HttpReply reply = JsonReply(kOk, metrics_.Text({counts.connections, counts.children,
                                                   all > counts.children ? all - counts.children : 0,
-                                                  entrance_.SessionCount()}));
+                                                  entrance_.SessionCount()}) +
+                                       IndexMetrics());
   reply.fields[0].second = "text/plain; version=0.0.4; charset=utf-8";
   return reply;
 }
