@@ -52,12 +52,15 @@ std::string Hex(const void* bytes, size_t length) {
 // The file system's own id, the same wherever and whenever it is mounted. Empty for none.
 std::string IdOf(int folder, const std::string& type) {
   OwnId own;
-  if (ioctl(folder, kGetOwnId, &own) == 0 && own.length <= own.bytes.size()) {
-    return Hex(own.bytes.data(), own.length);
-  }
   struct statfs status;
-  if (!IsAmong(kOwnFsid, type) || fstatfs(folder, &status) != 0) return {};
-  return Hex(&status.f_fsid, sizeof status.f_fsid);
+  std::string id;
+  if (ioctl(folder, kGetOwnId, &own) == 0 && own.length <= own.bytes.size()) {
+    id = Hex(own.bytes.data(), own.length);
+  } else if (IsAmong(kOwnFsid, type) && fstatfs(folder, &status) == 0) {
+    id = Hex(&status.f_fsid, sizeof status.f_fsid);
+  }
+  // Images are made without one.
+  return id.find_first_not_of('0') == std::string::npos ? std::string() : id;
 }
 
 std::vector<std::string> WantedFolders() {
@@ -110,7 +113,17 @@ class Planner {
   }
 
   Plan Take() {
-    for (auto& [device, found] : by_device_) plan_.file_systems.push_back(std::move(found));
+    std::map<std::string, int> with_id;
+    for (const auto& [device, found] : by_device_) ++with_id[found.id];
+    for (auto& [device, found] : by_device_) {
+      // Copies of one file system, as a volume's snapshot is: nobody can tell later which was
+      // which.
+      if (with_id[found.id] > 1) {
+        found.id += "-" + device;
+        found.keeps = false;
+      }
+      plan_.file_systems.push_back(std::move(found));
+    }
     std::ranges::sort(plan_.file_systems, {}, &FileSystem::id);
     return std::move(plan_);
   }

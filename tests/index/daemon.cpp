@@ -135,15 +135,19 @@ bool DaemonTest::CanWatchFileSystems() const {
 }
 
 void DaemonTest::MountTree(const std::string& type) {
-  std::string source = "none";
-  if (type != "tmpfs") {
-    const std::string image = dir_ + "/image";
-    ASSERT_EQ(
-        std::system(("truncate -s 64M " + image + " && mkfs." + type + " -q " + image).c_str()), 0);
-    ASSERT_EQ(std::system(("mount -o loop " + image + " " + tree_).c_str()), 0);
-  } else {
+  if (type == "tmpfs") {
     ASSERT_EQ(mount("none", tree_.c_str(), "tmpfs", 0, "mode=755"), 0) << strerror(errno);
+    mounted_.push_back(tree_);
+    return;
   }
+  const std::string image = dir_ + "/image";
+  const std::string make = "truncate -s 64M " + image + " && mkfs." + type + " -q " + image;
+  ASSERT_EQ(std::system(make.c_str()), 0);
+  MountImage(image);
+}
+
+void DaemonTest::MountImage(const std::string& image) {
+  ASSERT_EQ(std::system(("mount -o loop " + image + " " + tree_).c_str()), 0);
   mounted_.push_back(tree_);
 }
 

@@ -30,6 +30,7 @@ class DaemonTest : public nas_test::PlatformTest {
 
   // Where the trees are: a file system of its own, of that type, where root can mount one.
   void MountTree(const std::string& type);
+  void MountImage(const std::string& image);
   // With fewer rights it would watch single folders, which other tests are about.
   bool CanWatchFileSystems() const;
   void ConfigureIndex(const nas::IndexSettings& settings = {});

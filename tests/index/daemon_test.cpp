@@ -262,6 +262,30 @@ TEST_F(Life, DoesNotBelieveMappedFiles) {
   EXPECT_FALSE(Tells(See(tree_, true)["inodes"], path));
 }
 
+// A copy has its original's id, and both may be there at once.
+TEST_F(Life, TellsCopiesOfAFileSystemApart) {
+  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
+  MountTree("ext4");
+  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
+  const std::string original = tree_;
+  MakeTree(original);
+  sync();
+  fs::copy_file(dir_ + "/image", dir_ + "/copied");
+  tree_ = MakeFolder("copy");
+  MountImage(dir_ + "/copied");
+  nas::IndexSettings settings;
+  settings.folders = {original, tree_};
+  ConfigureIndex(settings);
+  StartDaemon();
+  ASSERT_TRUE(Current());
+  const Json::Value found = Report()["file_systems"];
+  ASSERT_EQ(found.size(), 2U);
+  EXPECT_NE(found[0]["id"], found[1]["id"]) << "they write one table";
+  nas_test::WriteFile(tree_ + "/c/in the copy", "");
+  EXPECT_EQ(Texts(See(tree_)["changes"]), std::vector<std::string>{"c/in the copy"});
+  EXPECT_EQ(Texts(See(original)["changes"]), std::vector<std::string>());
+}
+
 class Identity : public DaemonTest {};
 
 TEST_F(Identity, TheAnswererIsTheAskerForGood) {
