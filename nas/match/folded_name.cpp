@@ -207,11 +207,12 @@ std::string ComposeText(std::string_view text) {
 }
 
 void FoldedName::Fold() {
-  if (LowerInto(name_, folded_)) {
+  if (LowerInto(name_, buffer_)) {
     state_ = State::kAscii;
   } else {
-    state_ = Normalise(name_, kFold, folded_) ? State::kUtf8 : State::kBroken;
+    state_ = Normalise(name_, kFold, buffer_) ? State::kUtf8 : State::kBroken;
   }
+  folded_ = buffer_;
 }
 
 }  // namespace nas

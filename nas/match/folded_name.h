@@ -41,6 +41,13 @@ class FoldedName {
     state_ = State::kUnknown;
     has_plain_ = false;
   }
+  // `name` is ASCII without capital letters, and so its own folded form.
+  void SetFolded(std::string_view name) {
+    name_ = name;
+    state_ = State::kAscii;
+    folded_ = name;
+    has_plain_ = false;
+  }
   std::string_view name() const { return name_; }
   std::string_view folded() {
     if (state_ == State::kUnknown) Fold();
@@ -67,7 +74,8 @@ class FoldedName {
   void Fold();
 
   std::string_view name_;
-  std::string folded_;
+  std::string_view folded_;
+  std::string buffer_;
   std::string plain_;
   bool has_plain_ = false;
   State state_ = State::kUnknown;

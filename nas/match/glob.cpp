@@ -97,6 +97,20 @@ std::string_view Glob::LongestLiteral() const {
       ->literal;
 }
 
+std::string Glob::LongestText() const {
+  std::string longest(LongestLiteral());
+  for (const Segment& segment : segments_) {
+    std::string run;
+    for (const Unit& unit : segment.units) {
+      const bool one = !unit.any && !unit.negated && unit.ranges.size() == 1 &&
+                       unit.ranges[0].first == unit.ranges[0].second && unit.ranges[0].first < 0x80;
+      one ? run.push_back(static_cast<char>(unit.ranges[0].first)) : run.clear();
+      if (run.size() > longest.size()) longest = run;
+    }
+  }
+  return longest;
+}
+
 bool Glob::Unit::Accepts(char32_t c) const {
   if (any) return true;
   const bool in = std::any_of(ranges.begin(), ranges.end(),

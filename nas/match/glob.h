@@ -26,6 +26,8 @@ class Glob {
   bool Matches(std::string_view text) const;
   // The longest plain text between two stars, which every match holds; may be empty.
   std::string_view LongestLiteral() const;
+  // The same, where it may lie between wildcards for one character.
+  std::string LongestText() const;
 
  private:
   // One character: any, or one of (none of) the ranges.

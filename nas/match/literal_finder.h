@@ -1,5 +1,5 @@
 #pragma once
-// Finds a plain ASCII text in a large buffer, ignoring the case of letters.
+// Finds a plain text in a large buffer, ignoring the case of ASCII letters.
 //
 // Two bytes of the text, the rarest in common files, are compared with 16 places of the buffer at
 // once; only where both fit is the whole text compared. Does not change once made: any thread may
@@ -16,7 +16,7 @@ namespace nas {
 
 class LiteralFinder {
  public:
-  // `text` is ASCII and not empty.
+  // `text` is not empty; what is not ASCII in it is found as these very bytes.
   explicit LiteralFinder(std::string_view text);
   bool Finds(std::string_view buffer) const { return Find(buffer).has_value(); }
   // The first place of it.

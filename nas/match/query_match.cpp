@@ -59,6 +59,7 @@ Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
     case Kind::kCreated:
       return Known(file.created != QueryAttributes::kNoTime && HoldsOne(node, file.created));
     case Kind::kOpened:
+      if (!file.opened_known) return Answer::kMaybe;
       return Known(HoldsOne(node, file.opened));
     case Kind::kOwner:
       return Known(HoldsOne(node, file.uid));

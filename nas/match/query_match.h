@@ -21,6 +21,7 @@ struct QueryAttributes {
   std::int64_t modified = 0;
   std::int64_t created = kNoTime;  // kNoTime: not recorded, and so never within bounds
   std::int64_t opened = 0;
+  bool opened_known = true;
   std::uint32_t uid = 0;
   std::uint32_t gid = 0;
 };

@@ -2,6 +2,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
+
+#include "nas/match/regex_literal.h"
 
 namespace nas {
 
@@ -10,6 +13,8 @@ Result<std::shared_ptr<const TextTerm>> TextTerm::Make(std::string_view text, Fo
   std::shared_ptr<TextTerm> term(new TextTerm);
   term->exact_ = exact;
   term->text_ = text;
+  term->given_ = text;
+  term->form_ = form;
   if (form == Form::kRegex) {
     // Names are compared composed, so the expression has to be.
     auto regex = Regex::Compile(ComposeText(text), Regex::Kind::kName, exact);
@@ -44,6 +49,41 @@ Result<std::shared_ptr<const TextTerm>> TextTerm::Make(std::string_view text, Fo
   const std::string_view required = wild ? compared.wildcards->Required() : compared.text;
   if (!required.empty() && IsAscii(required)) term->required_.emplace(required);
   return std::shared_ptr<const TextTerm>(std::move(term));
+}
+
+namespace {
+
+std::string LongestAsciiRun(std::string_view text) {
+  std::string_view longest;
+  for (size_t at = 0; at < text.size();) {
+    size_t end = at;
+    while (end < text.size() && static_cast<unsigned char>(text[end]) < 0x80) ++end;
+    if (end - at > longest.size()) longest = text.substr(at, end - at);
+    at = end + 1;
+  }
+  return AsciiLower(longest);
+}
+
+}  // namespace
+
+std::vector<std::string> TextTerm::RequiredTexts() const {
+  if (of_path_) return {};
+  std::vector<std::string> all;
+  if (regex_) {
+    all.push_back(LiteralOf(text_, exact_));
+  } else {
+    for (const Comparand& form : forms_) {
+      if (form.wildcards) {
+        std::ranges::move(form.wildcards->RequiredTexts(), std::back_inserter(all));
+      }
+      if (literal_) all.push_back(form.text);
+    }
+    // Where letter case counts, names are compared as they are and not folded; what is ASCII stays
+    // that when they are.
+    if (exact_) std::ranges::transform(all, all.begin(), LongestAsciiRun);
+  }
+  if (std::ranges::any_of(all, &std::string::empty)) return {};
+  return all;
 }
 
 // Whether one of the forms in which `text` is compared passes the test with the term's own.

@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "nas/base/error.h"
 #include "nas/match/entry_path.h"
@@ -31,7 +32,14 @@ class TextTerm {
   // For terms that are about paths: those that hold a "/".
   bool FindsInPath(EntryPath& path) const;
 
+  // Texts, one of which is in the folded form (folded_name.h) of every name that has the term, or
+  // in that form without accents. None where that cannot be told, as of terms about paths.
+  std::vector<std::string> RequiredTexts() const;
+
   const std::string& text() const { return text_; }  // without quotes, prefix and escapes
+  // What Make was given.
+  const std::string& given() const { return given_; }
+  Form form() const { return form_; }
   bool of_path() const { return of_path_; }
   bool exact() const { return exact_; }
   bool is_regex() const { return regex_ != nullptr; }
@@ -57,6 +65,8 @@ class TextTerm {
   bool AnyForm(FoldedName& text, const Test& test) const;
 
   std::string text_;
+  std::string given_;
+  Form form_ = Form::kPlain;
   bool of_path_ = false;
   bool exact_ = false;
   bool literal_ = false;

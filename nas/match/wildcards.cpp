@@ -189,4 +189,11 @@ std::string_view Wildcards::Required() const {
   return longest;
 }
 
+std::vector<std::string> Wildcards::RequiredTexts() const {
+  std::vector<std::string> texts;
+  for (const Glob& glob : globs_) texts.push_back(glob.LongestText());
+  if (texts.empty()) texts.emplace_back();
+  return texts;
+}
+
 }  // namespace nas

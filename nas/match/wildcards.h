@@ -37,6 +37,9 @@ class Wildcards {
   bool Matches(std::string_view text) const;
   // A text that everything matched holds; may be empty.
   std::string_view Required() const;
+  // Of wildcards over names: texts, one of which everything matched holds; one that is empty says
+  // that nothing is known.
+  std::vector<std::string> RequiredTexts() const;
 
  private:
   // One alternative for paths: runs of names with any number of folders between them.

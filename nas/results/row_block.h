@@ -3,6 +3,8 @@
 // thread at a time.
 
 #include <cstdint>
+#include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -21,6 +23,21 @@ class RowBlock {
   void SetFolder(std::uint16_t location, std::string_view path);
   // Copies what it is given; the copy's `folder` is set here. Names, as paths, hold no NUL.
   void Add(std::string_view name, const FileAttributes& attributes);
+
+  // Takes rows that another process has found, all of them of one location and at or below `path`
+  // in its share: the three sides of a block, whose own numbers of locations do not count. False,
+  // with the block empty, for what is no block.
+  bool Assign(std::uint16_t location, std::string_view path, std::string_view folders,
+              std::string_view names, std::string_view attributes);
+
+  // Calls `tell` with each folder's path and the NUL-ended names that follow each other in it.
+  void EachFolder(
+      const std::function<void(std::string_view path, std::string_view names)>& tell) const;
+
+  // Of what is taken from another process: whether the path is that of the folder or of one below
+  // it, and how many NUL-ended names of entries there are; nothing where they are not that.
+  static bool IsAtOrBelow(std::string_view path, std::string_view folder);
+  static std::optional<size_t> CountNames(std::string_view names);
 
   size_t size() const { return attributes_.size(); }
   bool full() const { return size() >= kMostRows; }
