@@ -33,7 +33,21 @@ Result<NameTable> NameTable::Open(int dir_fd, const std::string& name,
   table.mapping_ = static_cast<const char*>(mapped);
   table.bytes_ = bytes;
   if (const int refused = TableCheck(table).Check(file_system)) return ErrnoError(refused, name);
+  table.FindStrays();
   return table;
+}
+
+void NameTable::FindStrays() {
+  const std::uint32_t* next = columns_.by_entry;
+  const std::uint32_t* const end = next + (folders_ - trees_);
+  for (EntryId id = 0; id < entries_; ++id) {
+    if (type(id) != DT_DIR) continue;
+    if (next != end && columns_.folder_entries[*next] == id) {
+      ++next;
+    } else {
+      strays_.push_back(id);
+    }
+  }
 }
 
 NameTable::NameTable(NameTable&& other) noexcept { Swap(other); }
@@ -58,6 +72,7 @@ void NameTable::Swap(NameTable& other) {
   std::swap(class_count_, other.class_count_);
   std::swap(key_slot_count_, other.key_slot_count_);
   std::swap(columns_, other.columns_);
+  std::swap(strays_, other.strays_);
 }
 
 NameTable::EntryId NameTable::folder_entry(FolderId id) const {

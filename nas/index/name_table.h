@@ -20,6 +20,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "nas/base/error.h"
 #include "nas/index/folder_key.h"
@@ -118,6 +119,8 @@ class NameTable {
   // The folder that an entry of type DT_DIR is; kNoFolder where it is not in the table, such as a
   // mount point. Logarithmic.
   FolderId folder_at(EntryId id) const;
+  // The entries of type DT_DIR that are no folder of the table, ascending.
+  const std::vector<EntryId>& strays() const { return strays_; }
 
   // The texts of entries [begin, end), and where the text of one begins (also of entries() itself)
   // counted from that of entry 0. entry_of_text: the entry whose text holds the byte at `offset`;
@@ -168,6 +171,7 @@ class NameTable {
 
   NameTable() = default;
   void Swap(NameTable& other);
+  void FindStrays();
   // Texts that lie end to end, each with its NUL.
   static std::string_view Piece(const char* texts, const std::uint32_t* begins, size_t number) {
     return {texts + begins[number], begins[number + 1] - begins[number] - 1};
@@ -188,6 +192,7 @@ class NameTable {
   size_t class_count_ = 0;
   size_t key_slot_count_ = 0;
   Columns columns_;
+  std::vector<EntryId> strays_;
 };
 
 }  // namespace nas
