@@ -15,13 +15,22 @@
 
 namespace nas {
 
-class CandidateList {
+// Where they go.
+class CandidateSink {
+ public:
+  virtual ~CandidateSink() = default;
+  // Adds files of one folder; `names` are NUL-ended. Callable from any thread. Throws where they
+  // cannot be taken, which ends the search.
+  virtual void Add(std::uint16_t location, std::string_view folder_path,
+                   std::string_view names) = 0;
+};
+
+class CandidateList : public CandidateSink {
  public:
   // The temporary file is made in `folder`. Throws std::system_error, here and below.
   explicit CandidateList(const std::string& folder);
 
-  // Adds files of one folder; `names` are NUL-ended. Callable from any thread.
-  void Add(std::uint16_t location, std::string_view folder_path, std::string_view names);
+  void Add(std::uint16_t location, std::string_view folder_path, std::string_view names) override;
 
   struct Record {
     std::uint16_t location = 0;

@@ -13,14 +13,17 @@
 
 namespace nas {
 
-FolderGate::FolderGate(const std::vector<Location>& locations, bool recursive)
-    : recursive_(recursive) {
+FolderGate::Rules FolderGate::RulesFor(const std::vector<Location>& locations, bool recursive) {
+  Rules rules{.recursive = recursive};
   for (const std::string& folder : TemporaryFolders()) {
     struct stat status;
-    if (stat(folder.c_str(), &status) == 0) temporary_.emplace(status.st_dev, status.st_ino);
+    if (stat(folder.c_str(), &status) == 0) rules.temporary.emplace(status.st_dev, status.st_ino);
   }
-  if (locations.size() == 1) return;
-  for (const Location& location : locations) locations_.emplace(location.device, location.inode);
+  if (locations.size() == 1) return rules;
+  for (const Location& location : locations) {
+    rules.locations.emplace(location.device, location.inode);
+  }
+  return rules;
 }
 
 FolderGate::Opened FolderGate::Open(int parent, const char* name) const {
@@ -30,6 +33,7 @@ FolderGate::Opened FolderGate::Open(int parent, const char* name) const {
   bool crossed = false;
   UniqueFd fd = OpenOnSameMount(parent, name, kFlags);
   if (!fd && errno == EXDEV) {
+    if (!rules_.crosses_mounts) return {UniqueFd(), Refusal::kOtherMount, 0};
     crossed = true;
     fd.Reset(openat(parent, name, kFlags));
   }
@@ -41,13 +45,13 @@ FolderGate::Opened FolderGate::Open(int parent, const char* name) const {
 
 Refusal FolderGate::MayEnter(int fd, std::string_view name, bool crossed) const {
   if (crossed && IsPseudoFileSystem(fd)) return Refusal::kPseudoFileSystem;
-  const bool may_be_temporary = name == kTemporaryFolder && !temporary_.empty();
-  if (!may_be_temporary && locations_.empty()) return Refusal::kNone;
+  const bool may_be_temporary = name == kTemporaryFolder && !rules_.temporary.empty();
+  if (!may_be_temporary && rules_.locations.empty()) return Refusal::kNone;
   struct stat status;
   if (fstat(fd, &status) != 0) return Refusal::kNone;
   const std::pair id(status.st_dev, status.st_ino);
-  if (temporary_.contains(id)) return Refusal::kTemporaryFolder;
-  return locations_.contains(id) ? Refusal::kOtherLocation : Refusal::kNone;
+  if (rules_.temporary.contains(id)) return Refusal::kTemporaryFolder;
+  return rules_.locations.contains(id) ? Refusal::kOtherLocation : Refusal::kNone;
 }
 
 }  // namespace nas

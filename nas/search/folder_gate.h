@@ -22,14 +22,27 @@ namespace nas {
 // Does not change once made: any thread may ask.
 class FolderGate {
  public:
+  using FolderIds = std::set<std::pair<dev_t, ino_t>>;
+  struct Rules {
+    bool recursive = true;
+    bool crosses_mounts = true;  // otherwise what is mounted below a location is left to another
+    FolderIds temporary = {};    // the @tmp folders of volumes
+    FolderIds locations = {};    // filled when there is more than one
+  };
   // Looks where the volumes' temporary folders are.
-  FolderGate(const std::vector<Location>& locations, bool recursive);
+  static Rules RulesFor(const std::vector<Location>& locations, bool recursive);
+
+  FolderGate(const std::vector<Location>& locations, bool recursive)
+      : FolderGate(RulesFor(locations, recursive)) {}
+  explicit FolderGate(Rules rules) : rules_(std::move(rules)) {}
+
+  const Rules& rules() const { return rules_; }
 
   // Whether an entry of this type (DT_*) is a folder whose own entries are searched too; kNone, or
   // why not. Says nothing yet of that very folder: Open does.
   Refusal Below(unsigned char type) const {
     if (type != DT_DIR) return type == DT_LNK ? Refusal::kSymbolicLink : Refusal::kNoFolder;
-    return recursive_ ? Refusal::kNone : Refusal::kNotRecursive;
+    return rules_.recursive ? Refusal::kNone : Refusal::kNotRecursive;
   }
 
   // The folder to read, or why it is left out: with kFolderUnreadable errno says more.
@@ -42,13 +55,9 @@ class FolderGate {
   Opened Open(int parent, const char* name) const;
 
  private:
-  using FolderIds = std::set<std::pair<dev_t, ino_t>>;
-
   Refusal MayEnter(int fd, std::string_view name, bool crossed) const;
 
-  const bool recursive_;
-  FolderIds temporary_;  // the @tmp folders of volumes
-  FolderIds locations_;  // filled when there is more than one
+  const Rules rules_;
 };
 
 }  // namespace nas

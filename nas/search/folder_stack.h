@@ -43,6 +43,11 @@ class FolderStack {
   // Waits for a folder to read. False once none waits and every thread that could find more has
   // come back here, or after Abort. A thread asks again only when it is done with its last item.
   bool Take(size_t thread, Item& item);
+  // While anybody holds it, no Take ends for want of folders: some may still be pushed.
+  void Hold() { ++unfinished_; }
+  void Release() {
+    if (--unfinished_ == 0) WakeAll();
+  }
   // Makes every Take return false at once.
   void Abort();
 
@@ -62,7 +67,7 @@ class FolderStack {
   void WakeAll();
 
   std::array<Own, kMostThreads> own_;
-  std::atomic<size_t> unfinished_ = 0;  // folders pushed and not yet done with
+  std::atomic<size_t> unfinished_ = 0;  // folders pushed and not yet done with, and holders
   std::atomic<bool> aborted_ = false;
   std::atomic<int> changes_ = 0;  // what threads without work wait on
 };

@@ -11,21 +11,31 @@ namespace nas {
 static_assert(FolderStack::kMostThreads >= NameSource::kMostThreads);
 
 FolderWalk::FolderWalk(const std::vector<Location>& locations, bool recursive, SharedSearch& search)
-    : locations_(locations), search_(search), gate_(locations, recursive) {
+    : FolderWalk(locations, FolderGate(locations, recursive), search) {
   std::set<std::pair<dev_t, ino_t>> known;
   for (size_t i = 0; i < locations.size(); ++i) {
     const bool added = known.emplace(locations[i].device, locations[i].inode).second;
-    if (added) Push(static_cast<std::uint16_t>(i), locations[i]);
+    if (added) Begin(0, static_cast<std::uint16_t>(i));
   }
 }
 
-void FolderWalk::Push(std::uint16_t number, const Location& location) {
+FolderWalk::FolderWalk(const std::vector<Location>& locations, FolderGate gate,
+                       SharedSearch& search)
+    : locations_(locations), search_(search), gate_(std::move(gate)) {}
+
+void FolderWalk::Begin(size_t thread, std::uint16_t number) {
+  const Location& location = locations_[number];
+  Add(thread, number, UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0)), location.path, ".");
+}
+
+void FolderWalk::Add(size_t thread, std::uint16_t number, UniqueFd parent, std::string parent_path,
+                     std::string_view name) {
   auto batch = std::make_shared<FolderBatch>();
-  batch->parent = UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0));
+  batch->parent = std::move(parent);
   batch->location = number;
-  batch->parent_path = location.path;
-  batch->names.assign(".\0", 2);
-  stack_.Push(0, std::move(batch));
+  batch->parent_path = std::move(parent_path);
+  batch->names.append(name).push_back('\0');
+  stack_.Push(thread, std::move(batch));
 }
 
 void FolderWalk::Feed(size_t thread, Judge& judge) {
@@ -37,7 +47,8 @@ void FolderWalk::Feed(size_t thread, Judge& judge) {
       ReadFolder(item, std::move(folder.fd), reading);
     } else if (folder.refusal == Refusal::kFolderUnreadable) {
       search_.progress.AddSkipped(folder.error_number);
-    } else if (folder.refusal != Refusal::kOtherLocation) {
+    } else if (folder.refusal != Refusal::kOtherLocation &&
+               folder.refusal != Refusal::kOtherMount) {
       search_.progress.AddLeftOut();
     }
     if (search_.stopping()) stack_.Abort();

@@ -1,6 +1,7 @@
 #pragma once
 // The walk over the folders of locations, as a source of names. Which folders it enters stands in
-// folder_gate.h. What cannot be read is counted and left out.
+// folder_gate.h. What cannot be read is counted and left out. Other sources have one for the parts
+// of a tree that they do not know.
 
 #include <cstdint>
 #include <string>
@@ -19,6 +20,18 @@ class FolderWalk : public NameSource {
   // Everything is borrowed. Not `recursive`: only the entries of the locations themselves. A
   // location given twice is walked once.
   FolderWalk(const std::vector<Location>& locations, bool recursive, SharedSearch& search);
+  // One that begins nowhere, and ends once it has walked what it is told below and nobody holds it.
+  FolderWalk(const std::vector<Location>& locations, FolderGate gate, SharedSearch& search);
+
+  // While it is held, more may be told. `thread` is the caller's, as in Feed.
+  void Hold() { stack_.Hold(); }
+  void Release() { stack_.Release(); }
+  // A location, by its number.
+  void Begin(size_t thread, std::uint16_t number);
+  // The folder `name` of the one open at `parent`, whose path below the root of the location's
+  // share is `parent_path`.
+  void Add(size_t thread, std::uint16_t number, UniqueFd parent, std::string parent_path,
+           std::string_view name);
 
   void Feed(size_t thread, Judge& judge) override;
   void Abort() override { stack_.Abort(); }
@@ -32,7 +45,6 @@ class FolderWalk : public NameSource {
     std::string path;  // of the folder being read
   };
 
-  void Push(std::uint16_t number, const Location& location);
   void ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading& reading);
 
   const std::vector<Location>& locations_;

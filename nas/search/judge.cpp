@@ -23,14 +23,53 @@ void SharedSearch::AskContents(bool texts_too) {
 void SharedSearch::SearchContents(const std::string& temporary_folder, bool texts_too) {
   AskContents(texts_too);
   if (content) candidates = std::make_unique<CandidateList>(temporary_folder);
+  candidate_sink = candidates.get();
+}
+
+namespace {
+
+std::string ToldKey(std::uint16_t location, std::string_view folder, std::string_view name) {
+  std::string key(reinterpret_cast<const char*>(&location), sizeof(location));
+  return key.append(folder).append("/").append(name);
+}
+
+}  // namespace
+
+void ToldEntries::Add(std::uint16_t location, std::string_view folder, std::string_view names) {
+  const std::lock_guard lock(mutex_);
+  for (size_t end; !names.empty(); names.remove_prefix(end + 1)) {
+    end = std::min(names.find('\0'), names.size() - 1);
+    told_.insert(ToldKey(location, folder, names.substr(0, end)));
+  }
+  any_ = true;
+}
+
+bool ToldEntries::Has(std::uint16_t location, std::string_view folder,
+                      std::string_view name) const {
+  if (!any_.load(std::memory_order_relaxed)) return false;
+  const std::lock_guard lock(mutex_);
+  return told_.contains(ToldKey(location, folder, name));
+}
+
+Answer SharedSearch::Ask(const QuerySubject& subject) const {
+  if (!content) return nas::Ask(criteria.root, subject);
+  const Answer named = nas::Ask(content->root(), subject);
+  if (named == Answer::kYes || !content->texts_too()) return named;
+  QuerySubject inside = subject;
+  inside.texts_in_contents = true;
+  return std::max(named, nas::Ask(content->root(), inside));
+}
+
+EntryPath::Base PathBaseOf(const Location& location) {
+  const std::string below = location.path.empty() ? "" : "/" + location.path;
+  return {"/" + location.share.name + below, location.share.root + below, location.path};
 }
 
 void Judge::Enter(int fd, std::uint16_t number, const Location& location, std::string_view path) {
   folder_ = {fd, number, path, false};
   if (!search_.criteria.ask_paths) return;
   if (path_base_ != number) {
-    const std::string below = location.path.empty() ? "" : "/" + location.path;
-    path_.SetBase({"/" + location.share.name + below, location.share.root + below, location.path});
+    path_.SetBase(PathBaseOf(location));
     path_base_ = number;
   }
   path_.SetFolder(path);
@@ -45,16 +84,6 @@ void Judge::Meet(std::string_view name, unsigned char type) {
   if (!search_.criteria.ask_paths) return;
   path_.SetEntry(name, subject_.is_folder);
   subject_.path = &path_;
-}
-
-// By its name or, where that is enough, by its contents.
-Answer Judge::Ask() const {
-  if (!search_.content) return nas::Ask(search_.criteria.root, subject_);
-  const Answer named = nas::Ask(search_.content->root(), subject_);
-  if (named == Answer::kYes || !search_.content->texts_too()) return named;
-  QuerySubject inside = subject_;
-  inside.texts_in_contents = true;
-  return std::max(named, nas::Ask(search_.content->root(), inside));
 }
 
 Refusal Judge::Refuse(const char* name) {
@@ -77,12 +106,38 @@ Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
     if (answer != Answer::kYes) answer = Ask();
     if (answer == Answer::kNo) return Refuse(entry.name.data());
   }
+  return Decide(answer, entry, attributes);
+}
+
+Refusal Judge::Decide(Answer answer, const DirectoryReader::Entry& entry,
+                      const FileAttributes& attributes) {
+  if (search_.told.Has(folder_.location, folder_.path, entry.name)) return Refusal::kNone;
   if (answer == Answer::kMaybe) {
     candidates_.emplace_back(entry.inode, entry.name);
     return Refusal::kContentsUnread;
   }
   AddRow(entry.name, attributes);
   return Refusal::kNone;
+}
+
+Refusal Judge::KnownEntry(const DirectoryReader::Entry& entry, bool tell_forbidden) {
+  Meet(entry.name, entry.type);
+  const bool known = entry.type != DT_UNKNOWN;
+  if (known && Ask() == Answer::kNo) return Refusal::kName;
+  const Result<FileAttributes> attributes = ReadAttributes(folder_.fd, entry.name.data());
+  if (!attributes) {
+    const int error_number = attributes.error().error_number;
+    const bool gone = error_number == ENOENT || error_number == ENOTDIR;
+    const bool forbidden = error_number == EACCES && !tell_forbidden;
+    if (!gone && !forbidden && Ask() != Answer::kNo) Skip(error_number);
+    return Refusal::kVanished;
+  }
+  const auto type = static_cast<unsigned char>(IFTODT(attributes->mode));
+  if (type != entry.type) Meet(entry.name, type);
+  Learn(*attributes, entry.name.data());
+  const Answer answer = Ask();
+  if (answer == Answer::kNo) return Refuse(entry.name.data());
+  return Decide(answer, entry, *attributes);
 }
 
 // One that cannot be read is not known to be empty.
@@ -102,11 +157,15 @@ Result<FileAttributes> Judge::Look(const char* name) {
     Skip(attributes.error().error_number);
     return attributes;
   }
-  attributes_ = AttributesOf(*attributes);
+  Learn(*attributes, name);
+  return attributes;
+}
+
+void Judge::Learn(const FileAttributes& attributes, const char* name) {
+  attributes_ = AttributesOf(attributes);
   subject_.attributes = &attributes_;
   is_empty_folder_ = [this, name] { return IsEmptyFolder(name); };
   subject_.is_empty_folder = &is_empty_folder_;
-  return attributes;
 }
 
 void Judge::Skip(int error_number) {
@@ -155,7 +214,7 @@ void Judge::Leave() {
   for (const auto& [inode, name] : candidates_) {
     names.append(name).push_back('\0');
     if (++count % kCandidatesInRecord == 0 || count == candidates_.size()) {
-      search_.candidates->Add(folder_.location, folder_.path, names);
+      search_.candidate_sink->Add(folder_.location, folder_.path, names);
       names.clear();
     }
   }

@@ -9,6 +9,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -33,6 +34,23 @@ class MissSink {
   virtual void See(const QuerySubject& subject) = 0;
 };
 
+// How terms about paths see a location.
+EntryPath::Base PathBaseOf(const Location& location);
+
+// What of a search has been told already, by a source that came to no end: whoever goes over the
+// same folders again leaves it out.
+class ToldEntries {
+ public:
+  // `names` are NUL-ended. Callable from any thread.
+  void Add(std::uint16_t location, std::string_view folder, std::string_view names);
+  bool Has(std::uint16_t location, std::string_view folder, std::string_view name) const;
+
+ private:
+  std::atomic<bool> any_ = false;
+  mutable std::mutex mutex_;  // guards told_
+  std::set<std::string> told_;
+};
+
 // What the threads of one search share. Set up before the first of them starts; after that only
 // what is safe to use from several threads changes. Comparators, sink and flag are borrowed.
 struct SharedSearch {
@@ -45,6 +63,8 @@ struct SharedSearch {
   // The same, with somebody to read them: the files to read wait in a file without a name in
   // `temporary_folder`. Throws std::system_error.
   void SearchContents(const std::string& temporary_folder, bool texts_too);
+  // What the criteria say of an entry, by its name or, where that is enough, by its contents.
+  Answer Ask(const QuerySubject& subject) const;
   bool stopped() const { return __atomic_load_n(&stop_flag, __ATOMIC_RELAXED) != 0; }
   bool stopping() const { return stopped() || failed.load(std::memory_order_relaxed); }
 
@@ -53,8 +73,10 @@ struct SharedSearch {
   const int& stop_flag;
   std::optional<ContentQuery> content;
   std::unique_ptr<CandidateList> candidates;  // of SearchContents
+  CandidateSink* candidate_sink = nullptr;    // borrowed: that list, or somebody else's
   MissSink* misses = nullptr;                 // borrowed; null: nobody asks
   WalkProgress progress;
+  ToldEntries told;
   std::atomic<bool> failed = false;  // a thread has thrown: the others shall end
 };
 
@@ -72,6 +94,10 @@ class Judge {
   // Judges an entry by everything but contents; what passes has become a row, and what contents may
   // still decide (kContentsUnread) a candidate.
   Refusal Entry(const DirectoryReader::Entry& entry);
+  // The same of one that is known by hearsay, which may be old: it is looked up before anything is
+  // told of it. What has gone is left out without a word, and what may not be looked at is counted
+  // only where `tell_forbidden` says so.
+  Refusal KnownEntry(const DirectoryReader::Entry& entry, bool tell_forbidden);
   // Judges a candidate, a regular file, by its contents.
   Refusal Contents(const char* name);
   // Hands over the folder's candidates.
@@ -91,10 +117,13 @@ class Judge {
   };
 
   void Meet(std::string_view name, unsigned char type);
-  Answer Ask() const;
+  Answer Ask() const { return search_.Ask(subject_); }
+  Refusal Decide(Answer answer, const DirectoryReader::Entry& entry,
+                 const FileAttributes& attributes);
   Refusal Refuse(const char* name);
   bool IsEmptyFolder(const char* name);
   Result<FileAttributes> Look(const char* name);
+  void Learn(const FileAttributes& attributes, const char* name);
   void Skip(int error_number);
   void AddRow(std::string_view name, const FileAttributes& attributes);
 

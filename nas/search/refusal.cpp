@@ -64,6 +64,8 @@ const char* Words(Refusal refusal) {
       return "is the temporary folder of a volume, which is never searched";
     case Refusal::kOtherLocation:
       return "is one of the folders to search, and is not searched a second time by this way";
+    case Refusal::kOtherMount:
+      return "is on another file system, which is not searched by this way";
     case Refusal::kNotRecursive:
       return "is a folder in the one to search, and such are not entered";
     case Refusal::kSymbolicLink:

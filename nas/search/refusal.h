@@ -38,6 +38,7 @@ enum class Refusal {
   kPseudoFileSystem,
   kTemporaryFolder,
   kOtherLocation,
+  kOtherMount,
   kNotRecursive,
   kSymbolicLink,
   kNoFolder,

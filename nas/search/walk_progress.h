@@ -21,6 +21,7 @@ class WalkProgress {
     folders_.fetch_add(1, std::memory_order_relaxed);
     entries_.fetch_add(entries, std::memory_order_relaxed);
   }
+  void AddMatches(std::uint64_t count) { matches_.fetch_add(count, std::memory_order_relaxed); }
   void AddMatch() { matches_.fetch_add(1, std::memory_order_relaxed); }
   // A folder could not be read; `error_number` says why.
   void AddSkipped(int error_number) {
@@ -43,23 +44,48 @@ class WalkProgress {
   void AddLeftOut() { left_out_.fetch_add(1, std::memory_order_relaxed); }
   void SetPhase(Phase phase) { phase_ = phase; }
 
+  // What another process has seen and counts for this one, all but matches.
+  struct Counts {
+    std::uint64_t folders = 0;
+    std::uint64_t entries = 0;
+    std::uint64_t permission = 0;
+    std::uint64_t vanished = 0;
+    std::uint64_t other = 0;
+    std::uint64_t unreadable_files = 0;
+    std::uint64_t not_text = 0;
+  };
+  Counts counts() const {
+    return {folders_, entries_, permission_, vanished_, other_, unreadable_files_, not_text_};
+  }
+  // Counts the newer in the place of the older, which were counted before.
+  void Replace(const Counts& older, const Counts& newer) {
+    folders_ += newer.folders - older.folders;
+    entries_ += newer.entries - older.entries;
+    permission_ += newer.permission - older.permission;
+    vanished_ += newer.vanished - older.vanished;
+    other_ += newer.other - older.other;
+    unreadable_files_ += newer.unreadable_files - older.unreadable_files;
+    not_text_ += newer.not_text - older.not_text;
+  }
+
   std::uint64_t folders() const { return folders_; }
   std::uint64_t entries() const { return entries_; }
   std::uint64_t left_out() const { return left_out_; }
 
   Json::Value ToJson() const {
-    using namespace task_record;
-    constexpr const char* kPhases[] = {kNamesPhase, kContentsPhase, kDonePhase};
+    namespace record = task_record;
+    constexpr const char* kPhases[] = {record::kNamesPhase, record::kContentsPhase,
+                                       record::kDonePhase};
     Json::Value json;
-    json[kPhase] = kPhases[static_cast<int>(phase_.load())];
-    json[kFolders] = Json::UInt64{folders_};
-    json[kEntries] = Json::UInt64{entries_};
-    json[kMatches] = Json::UInt64{matches_};
-    json[kSkipped][kPermission] = Json::UInt64{permission_};
-    json[kSkipped][kVanished] = Json::UInt64{vanished_};
-    json[kSkipped][kOther] = Json::UInt64{other_};
-    json[kFiles][kUnreadable] = Json::UInt64{unreadable_files_};
-    json[kFiles][kNotText] = Json::UInt64{not_text_};
+    json[record::kPhase] = kPhases[static_cast<int>(phase_.load())];
+    json[record::kFolders] = Json::UInt64{folders_};
+    json[record::kEntries] = Json::UInt64{entries_};
+    json[record::kMatches] = Json::UInt64{matches_};
+    json[record::kSkipped][record::kPermission] = Json::UInt64{permission_};
+    json[record::kSkipped][record::kVanished] = Json::UInt64{vanished_};
+    json[record::kSkipped][record::kOther] = Json::UInt64{other_};
+    json[record::kFiles][record::kUnreadable] = Json::UInt64{unreadable_files_};
+    json[record::kFiles][record::kNotText] = Json::UInt64{not_text_};
     return json;
   }
 
