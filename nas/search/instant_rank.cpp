@@ -1,0 +1,45 @@
+#include "nas/search/instant_rank.h"
+
+#include <algorithm>
+
+#include "nas/match/folded_name.h"
+
+namespace nas {
+namespace {
+
+using Kind = QueryNode::Kind;
+
+bool IsOfWord(char c) {
+  return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || static_cast<unsigned char>(c) >= 0x80;
+}
+
+bool HoldsWord(std::string_view text, std::string_view word) {
+  for (size_t at = text.find(word); at != std::string_view::npos; at = text.find(word, at + 1)) {
+    const size_t end = at + word.size();
+    const bool begins = at == 0 || !IsOfWord(text[at - 1]);
+    if (begins && (end == text.size() || !IsOfWord(text[end]))) return true;
+  }
+  return false;
+}
+
+}  // namespace
+
+InstantRanking::InstantRanking(const QueryNode& query) { AddWords(query); }
+
+void InstantRanking::AddWords(const QueryNode& node) {
+  if (node.kind == Kind::kNot) return;
+  for (const QueryNode& child : node.children) AddWords(child);
+  const bool word = node.kind == Kind::kText && node.text->is_literal() && !node.text->of_path();
+  if (word) words_.push_back(FoldText(node.text->text()));
+}
+
+InstantRank InstantRanking::Rank(std::string_view folded, int depth, std::int64_t mtime) const {
+  InstantRank rank{.depth = depth, .age = -mtime};
+  rank.begins_otherwise = std::ranges::none_of(
+      words_, [folded](const std::string& word) { return folded.starts_with(word); });
+  rank.within_word = std::ranges::none_of(
+      words_, [folded](const std::string& word) { return HoldsWord(folded, word); });
+  return rank;
+}
+
+}  // namespace nas
