@@ -30,6 +30,7 @@ std::string ActingUser(const std::string& wanted) {
 
 Caller::Caller(const CommonOptions& options) : config_(nas::LoadConfig(options.config)) {
   for (const std::string& share : options.shares) config_.shares.push_back(ParseShare(share));
+  config_.index_use = options.index_use;
   nas::Configure(config_);
   user_ = ActingUser(options.user);
 }

@@ -4,6 +4,7 @@
 
 #include <CLI/CLI.hpp>
 #include <exception>
+#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -127,6 +128,15 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   CLI::Option* json = search->add_flag("--json", options->json, "One JSON object a line");
   search->add_flag("-n,--line-number", options->line_number,
                    "First matching line of files found by their contents; means --content too");
+  search->add_flag("-v,--verbose", options->verbose, "Say how the search was answered");
+  const std::map<std::string, nas::IndexUse> uses = {{"auto", nas::IndexUse::kAuto},
+                                                     {"always", nas::IndexUse::kAlways},
+                                                     {"never", nas::IndexUse::kNever}};
+  search
+      ->add_option("--index", options->common.index_use,
+                   "auto: where it is current; always: or fail; never: walk")
+      ->type_name("WHEN")
+      ->transform(CLI::Transformer(uses, CLI::ignore_case).description(""));
   search->add_flag("-0,--print0", options->null_separated, "End each path with a NUL byte")
       ->excludes(json)
       ->excludes(long_format);

@@ -7,6 +7,8 @@
 #include <string>
 #include <vector>
 
+#include "nas/system/config.h"
+
 namespace arbory {
 
 // The exit codes of all commands.
@@ -38,6 +40,7 @@ struct CommonOptions {
   std::string config;               // path; empty: the usual places
   std::string user;                 // empty: the caller
   std::vector<std::string> shares;  // NAME=DIR
+  nas::IndexUse index_use = nas::IndexUse::kAuto;
 };
 
 struct CallOptions {
@@ -98,6 +101,7 @@ struct SearchOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
+  bool verbose = false;  // say how the search was answered
   bool line_number = false;  // tell the first line of what matches by its contents
 };
 

@@ -17,6 +17,8 @@ namespace record = task_record;
 int IntOf(const Json::Value& value) { return value.isInt() ? value.asInt() : 0; }
 std::uint64_t CountOf(const Json::Value& value) { return value.isUInt64() ? value.asUInt64() : 0; }
 
+std::string TextOf(const Json::Value& value) { return value.isString() ? value.asString() : ""; }
+
 const Json::Value& Member(const Json::Value& value, const char* name) {
   return value.isObject() ? value[name] : Json::Value::nullSingleton();
 }
@@ -40,6 +42,8 @@ void ReadWalk(Json::Value walk, RunningSearch* search) {
   const Json::Value& files = Member(walk, record::kFiles);
   search->unreadable_files = CountOf(Member(files, record::kUnreadable));
   search->not_text = CountOf(Member(files, record::kNotText));
+  search->source = TextOf(Member(walk, record::kSource));
+  search->index = TextOf(Member(walk, record::kIndex));
   search->walk.swap(walk);
 }
 

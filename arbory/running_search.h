@@ -33,6 +33,10 @@ struct RunningSearch {
   std::uint64_t unreadable = 0;  // folders skipped for lack of permission
   std::uint64_t troubled = 0;  // folders skipped for other reasons; those that vanished not counted
   std::uint64_t unreadable_files = 0;
+  // Where names came from ("index", "walk", "both") and why so, as platform/task_record.h has it;
+  // empty until that is known.
+  std::string source;
+  std::string index;
   std::uint64_t not_text = 0;  // files whose contents were not looked into
 };
 

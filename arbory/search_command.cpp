@@ -28,6 +28,7 @@
 #include "nas/results/result_file.h"
 #include "nas/system/identity.h"
 #include "nas/webapi/runner.h"
+#include "platform/task_record.h"
 
 namespace arbory {
 namespace {
@@ -204,13 +205,18 @@ class Search {
     }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
     TellOfSkipped(state);
+    if (options_.verbose) Complain("answered " + SourceText(state));
     found_nothing_ = ending == Ending::kComplete && state.exists && state.matches == 0;
     ran_ = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
 
   bool CameToEnd(Ending ending, const RunningSearch& state) {
-    if (state.progress < 0) {
+    const bool walk_refused = options_.common.index_use == nas::IndexUse::kAlways &&
+                              !state.source.empty() && state.source != task_record::kFromIndex;
+    if (state.progress < 0 && walk_refused) {
+      Complain("not answered, as --index always forbids to walk: " + state.index);
+    } else if (state.progress < 0) {
       Complain(FailureSentence(state.error, options_.query.folders));
     } else if (!state.exists || (state.finished && state.progress == 0)) {
       Complain("the search was stopped before it was complete");

@@ -4,6 +4,7 @@
 
 #include "platform/errors.h"
 #include "platform/task.h"
+#include "platform/task_record.h"
 #include "platform/webfm.h"
 
 namespace arbory {
@@ -42,6 +43,15 @@ std::string ProgressText(const RunningSearch& search, long seconds) {
           Counted(search.entries, "entry", "entries") + ", " + Grouped(search.matches) + " found";
   if (search.reads_contents) text += ", reading contents";
   return text;
+}
+
+std::string SourceText(const RunningSearch& search) {
+  namespace record = task_record;
+  if (search.source == record::kFromIndex) return "from the index, " + search.index;
+  if (search.source == record::kFromBoth) {
+    return "from the index, and by walking (" + search.index + ")";
+  }
+  return "by walking (" + (search.index.empty() ? "index unknown" : search.index) + ")";
 }
 
 std::string FailureSentence(int code, const std::vector<std::string>& folders) {

@@ -15,6 +15,9 @@ std::string Counted(std::uint64_t number, const char* one, const char* many);
 // "Searching 3 s: 1,204 folders, 23,456 entries, 42 found".
 std::string ProgressText(const RunningSearch& search, long seconds);
 
+// How a search was answered, in a few words: "from the index, current".
+std::string SourceText(const RunningSearch& search);
+
 // Why a search of `folders` failed with the web API code `code`.
 std::string FailureSentence(int code, const std::vector<std::string>& folders);
 // Why no search can be started for the caller's user just now; empty when one can.

@@ -16,6 +16,8 @@
 //                   "skipped" {"permission", "vanished", "other"}: folders that could not be read;
 //                   files that vanished are among those
 //                   "files" {"unreadable", "not_text"}: files left out
+//                   "source" where names came from: "index", "walk", or "both" for parts of each
+//                   "index" why so: "current", or a few words about why there was no answer
 //
 // After the first write only the worker writes, and always the whole of "data": it reads the object
 // back, adds to it and writes it. A stopped worker marks the task finished and writes nothing, so
@@ -55,5 +57,10 @@ inline constexpr char kOther[] = "other";
 inline constexpr char kFiles[] = "files";
 inline constexpr char kUnreadable[] = "unreadable";
 inline constexpr char kNotText[] = "not_text";
+inline constexpr char kSource[] = "source";
+inline constexpr char kFromIndex[] = "index";
+inline constexpr char kFromWalk[] = "walk";
+inline constexpr char kFromBoth[] = "both";
+inline constexpr char kIndex[] = "index";
 
 }  // namespace task_record

@@ -21,7 +21,7 @@
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
 #include "nas/search/content_reading.h"
-#include "nas/search/folder_walk.h"
+#include "nas/search/indexed_walk.h"
 #include "nas/search/location.h"
 #include "nas/search/search_job.h"
 #include "nas/system/child.h"
@@ -105,6 +105,7 @@ class WfmSearchWalker::Impl {
  private:
   nas::Status OpenLocations(const std::vector<std::string>& texts);
   void Report(const nas::WalkProgress& progress, bool last);
+  nas::IndexedWalk::Settings NameSettings(const Json::Value& options) const;
   bool RunJob(const Json::Value& options, nas::SharedSearch& search);
   bool IsNamedInTask();
   bool stopped() const { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; }
@@ -123,6 +124,7 @@ class WfmSearchWalker::Impl {
   std::string id_;
   std::optional<nas::ResultClaim> claim_;  // before the writer, which it has to outlive
   std::unique_ptr<nas::ResultWriter> writer_;
+  nas::IndexedWalk* names_ = nullptr;  // of Walk
   bool walked_ = false;
   bool current_only_ = false;
   bool told_ready_ = false;
@@ -198,7 +200,10 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
   walked_ = true;
   nas::SharedSearch search(comps_, *writer_, stop_flag_);
+  std::unique_ptr<nas::IndexedWalk> names;
   try {
+    names = std::make_unique<nas::IndexedWalk>(locations_, NameSettings(options), search);
+    names_ = names.get();
     return RunJob(options, search);
   } catch (...) {
     SetErrorFromException();
@@ -208,14 +213,20 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
   return false;
 }
 
+nas::IndexedWalk::Settings WfmSearchWalker::Impl::NameSettings(const Json::Value& options) const {
+  return {.recursive = !current_only_,
+          .texts_too = options.get("search_content", false).asBool(),
+          .use = nas::CurrentConfig().index_use,
+          .temporary_folder = folder_};
+}
+
 bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch& search) {
   for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
   search.SearchContents(folder_, options.get("search_content", false).asBool());
-  nas::FolderWalk walk(locations_, !current_only_, search);
   nas::ContentReading contents(locations_, search);
   nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },
                               .stuck = [this] { EndWorker(); }});
-  const bool completed = job.Run(walk, contents);
+  const bool completed = job.Run(*names_, contents);
   if (forsaken_) {
     Vanish();
     return false;
@@ -256,7 +267,9 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   if (!last && told_ready_ && now - reported_ < kReportInterval) return;
   reported_ = now;
   task_->beginUpdate();
-  task_->setProperty(task_record::kWalk, progress.ToJson());
+  Json::Value walk = progress.ToJson();
+  if (names_ != nullptr) names_->Tell(&walk);
+  task_->setProperty(task_record::kWalk, walk);
   if (!told_ready_) task_->setProperty(task_record::kResultReady, true);
   // A task that was removed meanwhile has nobody left to tell.
   task_->endUpdate();

@@ -44,6 +44,9 @@ struct ServerSettings {
   bool operator==(const ServerSettings&) const = default;
 };
 
+// Whether searches ask the index: where it is current, only there, or never.
+enum class IndexUse { kAuto, kAlways, kNever };
+
 // What `arbory index` goes by.
 struct IndexSettings {
   std::string socket;  // empty: the usual place (index/daemon_socket.h)
@@ -87,6 +90,7 @@ struct Config {
   std::uint64_t large_call_memory_bytes() const { return Megabytes(large_call_memory_mb); }
   static std::uint64_t Megabytes(int count) { return static_cast<std::uint64_t>(count) << 20; }
   ServerSettings server;
+  IndexUse index_use = IndexUse::kAuto;  // of one run of the program; no file says it
   IndexSettings index;
 
   bool operator==(const Config&) const = default;

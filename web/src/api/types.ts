@@ -28,6 +28,8 @@ export interface Walk {
   matches: number;
   skipped: { permission: number; vanished: number; other: number };
   files: { unreadable: number; not_text: number };
+  source?: 'index' | 'walk' | 'both'; // where names came from, and a few words why
+  index?: string;
 }
 
 export interface Progress {

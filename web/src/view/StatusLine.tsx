@@ -28,6 +28,7 @@ export function StatusLine({ app, search }: { app: App; search: Search }) {
         </span>
         <span class="aside seen">
           {plural(search.walk.entries, 'name')} seen in {plural(search.walk.folders, 'folder')}
+          {from(search)}
           {notText > 0 && `; ${plural(notText, 'file is', 'files are')} not text`}
         </span>
       </p>
@@ -39,6 +40,14 @@ export function StatusLine({ app, search }: { app: App; search: Search }) {
       <Spoken search={search} />
     </div>
   );
+}
+
+// In the words of the terminal; nothing where there is no index at all.
+function from(search: Search): string {
+  const { source, index } = search.walk;
+  if (source === 'index') return `, from the index, ${index}`;
+  if (source === 'both') return `, from the index and by walking (${index})`;
+  return source === 'walk' && index !== 'no index' ? `, by walking (${index})` : '';
 }
 
 function Elapsed({ search }: { search: Search }) {
