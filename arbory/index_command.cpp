@@ -14,9 +14,7 @@
 #include "nas/index/broker.h"
 #include "nas/index/client.h"
 #include "nas/index/frames.h"
-#if __has_include("nas/search/index_answer.h")
 #include "nas/search/index_answer.h"
-#endif
 
 namespace arbory {
 namespace {
@@ -84,16 +82,9 @@ int Check() {
   return code;
 }
 
-void Answer(int connection, nas::UniqueFd location, const nas::IndexSnapshot& snapshot) {
-#if __has_include("nas/search/index_answer.h")
-  nas::AnswerQuestion(connection, std::move(location), snapshot);
-#else
-  (void)connection, (void)location, (void)snapshot;
-#endif
-}
-
 int RunDaemon() {
-  const nas::Status ended = nas::RunIndexDaemon(Answer, [] { Say("The index daemon answers."); });
+  const nas::Status ended =
+      nas::RunIndexDaemon(nas::AnswerQuestion, [] { Say("The index daemon answers."); });
   if (!ended) throw std::runtime_error("the index daemon cannot start: " + ended.error().Text());
   return kExitSuccess;
 }

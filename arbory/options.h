@@ -101,7 +101,7 @@ struct SearchOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
-  bool verbose = false;  // say how the search was answered
+  bool verbose = false;      // say how the search was answered
   bool line_number = false;  // tell the first line of what matches by its contents
 };
 

@@ -133,7 +133,9 @@ Json::Value QueryToJson(const QueryNode& query) {
   }
   for (const std::string& suffix : query.suffixes) json.append(suffix);
   for (const FileType& type : query.types) {
-    json.append(type.folder ? kFolder : type.category ? static_cast<int>(*type.category) : kAnyFile);
+    json.append(type.folder     ? kFolder
+                : type.category ? static_cast<int>(*type.category)
+                                : kAnyFile);
   }
   for (const Bounds& bounds : query.bounds) {
     Json::Value& pair = json.append(Json::arrayValue);

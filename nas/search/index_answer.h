@@ -9,8 +9,8 @@
 namespace nas {
 
 // Reads the question, waiting a bounded time for it, and answers it; returns when the answer is
-// whole, cannot be had, or nobody waits for it any more. `location` is the folder that the asker has
-// handed over. The process must be the asker's; threads are started and have ended.
+// whole, cannot be had, or nobody waits for it any more. `location` is the folder that the asker
+// has handed over. The process must be the asker's; threads are started and have ended.
 void AnswerQuestion(int connection, UniqueFd location, const IndexSnapshot& snapshot);
 
 }  // namespace nas

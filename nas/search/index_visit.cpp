@@ -163,7 +163,10 @@ void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
     if (special->changed != nullptr) {
       for (const std::string& name : special->changed->names) LookAt(folder, name);
     }
-    for (const std::string& name : special->mounts) LookAt(folder, name);
+    for (const std::string& name : special->mounts) {
+      const bool looked_at = special->changed != nullptr && special->changed->names.contains(name);
+      if (!looked_at) LookAt(folder, name);
+    }
   }
   for (; next_look_ < looks_.size() && looks_[next_look_] < table_.entries_end(folder);
        ++next_look_) {

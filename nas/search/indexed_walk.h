@@ -57,8 +57,7 @@ class IndexedWalk : public NameSource {
   void GiveUp(Receiving& receiving);
   bool WalkMounts(size_t thread, std::uint16_t number, const std::vector<std::string>& mounts);
   void WalkInstead(size_t thread, std::uint16_t number, const std::string& why);
-  std::string QuestionAbout(const Location& location,
-                            const std::vector<std::string>& mounts) const;
+  std::string QuestionAbout(const Location& location, const std::vector<std::string>& mounts) const;
 
   const std::vector<Location>& locations_;
   const Settings settings_;

@@ -16,7 +16,7 @@
 namespace nas {
 namespace {
 
-#ifdef __SANITIZE_ADDRESS__
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 constexpr bool kCanLimit = false;
 #else
 constexpr bool kCanLimit = true;
