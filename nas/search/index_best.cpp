@@ -1,6 +1,7 @@
 #include "nas/search/index_best.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cstdint>
 #include <mutex>
 #include <string>
@@ -19,7 +20,7 @@ using EntryId = NameTable::EntryId;
 
 // Of those in order, so many are kept: what is closed to the user among them has successors, and
 // further matches are counted no further.
-constexpr size_t kMostRanked = 20'000;
+constexpr size_t kMostRanked = 4000;
 
 struct Ranked {
   InstantRank rank;
@@ -41,13 +42,17 @@ void KeepBest(std::vector<Ranked>& all) {
 class Ranker {
  public:
   Ranker(IndexNames& names, const NameTable& table, const Location& location,
-         const QueryNode& query, FolderId top)
+         const QueryNode& query, FolderId top, Clock::time_point end)
       : names_(names),
         table_(table),
         location_(location),
         query_(query),
         ranking_(query),
-        top_(top) {}
+        top_(top),
+        end_(end) {}
+
+  // Whether there was no time for all, or no room.
+  bool cut() const { return cut_; }
 
   // `noted`: names that are not, or not surely, in the table.
   std::vector<Ranked> RankAll(const std::vector<IndexNames::NotedName>& noted) {
@@ -56,6 +61,7 @@ class Ranker {
       std::jthread other([this] { RankPieces(); });
       RankPieces();
     }
+    cut_ = cut_ || all_.size() > kMostRanked;
     KeepBest(all_);
     std::ranges::sort(all_);
     return std::move(all_);
@@ -89,28 +95,42 @@ class Ranker {
     EntryFilter filter(names_.filter(), location_);
     std::vector<EntryId> entries;
     std::vector<Ranked> mine;
+    size_t begun = 0;  // of mine, those whose names begin with what was asked for
     while (names_.NextCandidates(filter, &entries)) {
       FolderId folder = NameTable::kNoFolder;
       int depth = 0;
       for (const EntryId entry : entries) {
+        const std::string_view name = FoldedNameOf(entry);
+        const bool begins = ranking_.Begins(name);
+        if (!begins && begun >= kMostRanked) {
+          cut_ = true;
+          continue;
+        }
+        begun += begins ? 1 : 0;
         if (folder == NameTable::kNoFolder || entry >= table_.entries_end(folder)) {
           folder = table_.folder_of(entry);
           depth = DepthOf(folder);
         }
-        mine.push_back({RankOf(entry, depth), entry});
+        const auto attributes = table_.attributes(entry);
+        mine.push_back({ranking_.Rank(name, depth, attributes ? attributes->mtime : 0), entry});
       }
       entries.clear();
-      if (mine.size() > 2 * kMostRanked) KeepBest(mine);
+      if (mine.size() > 2 * kMostRanked) {
+        KeepBest(mine);
+        cut_ = true;
+      }
+      if (Clock::now() >= end_) {
+        cut_ = true;
+        break;
+      }
     }
     const std::lock_guard lock(mutex_);
     all_.insert(all_.end(), mine.begin(), mine.end());
   }
 
-  InstantRank RankOf(EntryId entry, int depth) const {
-    std::string_view text = table_.texts(entry, entry + 1);
-    text = text.substr(0, text.find_first_of({"\1\0", 2}));
-    const auto attributes = table_.attributes(entry);
-    return ranking_.Rank(text, depth, attributes ? attributes->mtime : 0);
+  std::string_view FoldedNameOf(EntryId entry) const {
+    const std::string_view text = table_.texts(entry, entry + 1);
+    return text.substr(0, text.find_first_of({"\1\0", 2}));
   }
 
   int DepthOf(FolderId folder) const {
@@ -125,6 +145,8 @@ class Ranker {
   const QueryNode& query_;
   const InstantRanking ranking_;
   const FolderId top_;
+  const Clock::time_point end_;
+  std::atomic<bool> cut_ = false;
   std::mutex mutex_;  // guards all_
   std::vector<Ranked> all_;
 };
@@ -136,9 +158,11 @@ BestCount FindBest(IndexNames& names, const IndexSnapshot& snapshot, const Locat
   // The best are worth waiting for longer than the count of the others.
   constexpr int kPatience = 5;
   const Clock::time_point begun = Clock::now();
+  // Most questions need a fraction of that for all names.
+  const Clock::time_point ranked_by = begun + 2 * budget;
   const auto noted = names.NotedNames();
   Ranker ranker(names, snapshot.table, location, search.criteria.root,
-                IndexNames::FolderOf(snapshot, location));
+                IndexNames::FolderOf(snapshot, location), ranked_by);
   const std::vector<Ranked> ranked = ranker.RankAll(noted);
   NoRows nowhere;
   NodeComp query(search.criteria.root);
@@ -146,7 +170,7 @@ BestCount FindBest(IndexNames& names, const IndexSnapshot& snapshot, const Locat
   Judge best(search);
   Judge further(counting);
   IndexVisit visit(names, 0, best);
-  BestCount count{.more = ranked.size() == kMostRanked};
+  BestCount count{.more = ranker.cut()};
   size_t found = 0;
   for (const Ranked& one : ranked) {
     const bool enough = found >= most;

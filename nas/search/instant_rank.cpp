@@ -33,10 +33,14 @@ void InstantRanking::AddWords(const QueryNode& node) {
   if (word) words_.push_back(FoldText(node.text->text()));
 }
 
+bool InstantRanking::Begins(std::string_view folded) const {
+  return std::ranges::any_of(
+      words_, [folded](const std::string& word) { return folded.starts_with(word); });
+}
+
 InstantRank InstantRanking::Rank(std::string_view folded, int depth, std::int64_t mtime) const {
   InstantRank rank{.depth = depth, .age = -mtime};
-  rank.begins_otherwise = std::ranges::none_of(
-      words_, [folded](const std::string& word) { return folded.starts_with(word); });
+  rank.begins_otherwise = !Begins(folded);
   rank.within_word = std::ranges::none_of(
       words_, [folded](const std::string& word) { return HoldsWord(folded, word); });
   return rank;

@@ -25,6 +25,7 @@ class InstantRanking {
   explicit InstantRanking(const QueryNode& query);
   // `folded`: the name as it is compared (folded_name.h).
   InstantRank Rank(std::string_view folded, int depth, std::int64_t mtime) const;
+  bool Begins(std::string_view folded) const;
 
  private:
   void AddWords(const QueryNode& node);

@@ -5,7 +5,7 @@ import { after, before, test } from 'node:test';
 import { join } from 'node:path';
 import type { Browser } from 'playwright-core';
 import { openBrowser, Tab } from './browser.ts';
-import { Place, Server } from './server.ts';
+import { Index, Place, Server } from './server.ts';
 import { HOSTILE, itemName, makeFiles, makeMany, MANY } from './tree.ts';
 
 let place: Place;
@@ -442,3 +442,29 @@ interface Axe {
     options: object,
   ): Promise<{ violations: { id: string; nodes: { html: string }[] }[] }>;
 }
+
+test('with an index, the best results are there while one types', async () => {
+  const index = await Index.start(place);
+  try {
+    const tab = await openTab();
+    const { page } = tab;
+    await page.fill('#pattern', 'pla');
+    await page.getByText('from the index').waitFor();
+    assert.equal(await page.textContent('.figures strong'), '4 matches');
+    assert.match((await tab.names())[0]!, /^plan/);
+    assert.equal(new URL(page.url()).hash, '', 'nothing was searched for');
+    // What is wrong for a moment takes nothing away; the newest words count.
+    await page.fill('#pattern', '<pla size:>');
+    await page.fill('#pattern', 'small');
+    await page.waitForFunction(() => document.querySelector('.figures strong')?.textContent === '1 match');
+    await page.keyboard.press('Enter');
+    await tab.over();
+    assert.match(page.url(), /#q=small/);
+    assert.deepEqual(await tab.names(), ['plan small.txt']);
+    await page.fill('#pattern', '');
+    await tab.firstIs('plan small.txt');
+    await tab.close();
+  } finally {
+    await index.stop();
+  }
+});

@@ -1,6 +1,6 @@
 // A real `arbory serve` in a folder of its own, for an ordinary user: when the tests run as root it
 // serves nobody, so that permissions are what they are for people.
-import { spawn, type ChildProcess } from 'node:child_process';
+import { spawn, spawnSync, type ChildProcess } from 'node:child_process';
 import * as fs from 'node:fs';
 import { tmpdir } from 'node:os';
 import { join } from 'node:path';
@@ -67,11 +67,35 @@ export class Server {
     return new Server(child, await printedAddress(child));
   }
 
-  async stop(): Promise<void> {
-    const ended = new Promise((done) => this.child.once('exit', done));
-    this.child.kill('SIGTERM');
-    await ended;
+  stop(): Promise<void> {
+    return stopped(this.child);
   }
+}
+
+// An index of the server's shares, once it is current.
+export class Index {
+  private constructor(private readonly child: ChildProcess) {}
+
+  static async start(place: Place): Promise<Index> {
+    const words = ['index', '--config', join(place.root, 'arbory.toml')];
+    const program = process.env.ARBORY_PROGRAM!;
+    const index = new Index(spawn(program, words, { stdio: 'ignore' }));
+    const end = Date.now() + START_MS;
+    while (spawnSync(program, [...words, '--status']).status !== 0) {
+      if (Date.now() > end) throw new Error('the index is not current');
+    }
+    return index;
+  }
+
+  stop(): Promise<void> {
+    return stopped(this.child);
+  }
+}
+
+async function stopped(child: ChildProcess): Promise<void> {
+  const ended = new Promise((done) => child.once('exit', done));
+  child.kill('SIGTERM');
+  await ended;
 }
 
 function printedAddress(child: ChildProcess): Promise<string> {

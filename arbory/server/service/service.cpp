@@ -109,6 +109,9 @@ std::span<const Route> Service::Routes() {
                          [&](const nas::ApiCall& call) { return StartNearMisses(call, path[1]); });
        },
        "What a search that found nothing came close to", kJson},
+      {kGet, "/instant", Access::kLoggedIn,
+       [](Self self, Request request, Path) { return self.AskInstantly(*request); },
+       "The best that the index knows of ?params=, at once", kJson},
       {kPost, "/query", Access::kLoggedIn,
        [](Self self, Request request, Path) { return self.Ask(*request, "query", StartReadQuery); },
        "What was typed, as the parameters of a search", kJson},
@@ -288,6 +291,15 @@ std::optional<FileRequest> Service::FileOf(const HttpRequest& request, const Req
   file.share = path[1];
   file.path.assign(path.begin() + kBeforePath, path.end());
   return file;
+}
+
+// The parameters are those that a POST of them has as its body.
+Answer Service::AskInstantly(const HttpRequest& request) {
+  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server"};
+  const auto params = QueryValue(request.query(), "params");
+  if (params) call.read_params = ReaderOf(*params);
+  return calls_.Run(Calls::Kind::kCall, request.user, "instant",
+                    [&] { return StartInstant(call); });
 }
 
 Answer Service::GetFirstLine(const HttpRequest& request, const RequestPath& path) {

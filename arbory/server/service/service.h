@@ -57,6 +57,7 @@ class Service : public HttpService {
   HttpReply NoSuchRowReply(const RequestPath& path) const;
   static std::optional<FileRequest> FileOf(const HttpRequest& request, const RequestPath& path);
   Answer GetFile(const HttpRequest& request, const RequestPath& path);
+  Answer AskInstantly(const HttpRequest& request);
   Answer GetFirstLine(const HttpRequest& request, const RequestPath& path);
   // The reply to a request that may not ask this route.
   std::optional<HttpReply> Refusal(const Route& route, HttpRequest* request);

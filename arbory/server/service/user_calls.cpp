@@ -8,6 +8,7 @@
 #include <ctime>
 #include <vector>
 
+#include "arbory/comparators.h"
 #include "arbory/nothing_found.h"
 #include "arbory/options.h"
 #include "arbory/running_search.h"
@@ -15,6 +16,9 @@
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
 #include "nas/match/meant_query.h"
+#include "nas/search/criteria.h"
+#include "nas/search/instant.h"
+#include "nas/search/location.h"
 #include "nas/system/identity.h"
 #include "nas/system/shares.h"
 #include "platform/system.h"
@@ -24,6 +28,10 @@ namespace arbory {
 namespace {
 
 constexpr char kTaskId[] = "taskid";
+// A person reads the first few.
+constexpr size_t kInstantRows = 100;
+// Each is a question of its own.
+constexpr size_t kMostInstantLocations = 64;
 constexpr char kNoSearch[] = "There is no such search; start a new one.";
 
 Json::Value Error(int status, const char* sentence) {
@@ -112,6 +120,53 @@ void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try 
     body["wrong"]["sentence"] = error.what();
   }
   response->SetError(kOk, body);
+} catch (const Json::Exception&) {
+  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
+}
+
+// Of those that can be opened.
+std::vector<nas::Location> InstantLocations(const NUVA::APIRequest& request) {
+  const Json::Value asked = request.GetParam("folder_path", Json::Value());
+  std::vector<std::string> texts;
+  if (asked.isString()) texts.push_back(asked.asString());
+  if (asked.isArray()) {
+    for (const Json::Value& text : asked) texts.push_back(text.asString());
+  } else if (asked.isNull()) {
+    for (const nas::Share& share : nas::ListShares()) {
+      if (CanList(share.root)) texts.push_back("/" + share.name);
+    }
+  }
+  std::vector<nas::Location> locations;
+  for (const std::string& text : texts) {
+    if (locations.size() == kMostInstantLocations) break;
+    auto location = nas::OpenLocation(text);
+    if (location) locations.push_back(std::move(*location));
+  }
+  return locations;
+}
+
+void InstantEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
+  if (!Become(request, response)) return;
+  Json::Value body;
+  try {
+    const Comparators comps(SearchRequest(TypedQuery(*request), {}, std::time(nullptr)));
+    const nas::Criteria criteria(comps.get());
+    const auto locations = InstantLocations(*request);
+    const bool recursive = request->GetParam("recursive", true).asBool();
+    const auto answer = nas::AskInstantly(locations, criteria.root, recursive, kInstantRows);
+    if (answer) {
+      body = nas::InstantJson(*answer, locations);
+    } else {
+      body["wrong"]["criterion"] = "pattern";
+      body["wrong"]["sentence"] = answer.error().path;
+    }
+  } catch (const CriterionError& error) {
+    body["wrong"]["criterion"] = error.criterion();
+    body["wrong"]["sentence"] = error.what();
+  }
+  response->SetError(kOk, body);
+} catch (const UsageError& error) {
+  response->SetError(kBadRequest, Error(kBadRequest, error.what()));
 } catch (const Json::Exception&) {
   response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
 }
@@ -244,6 +299,10 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id) 
 
 nas::Child StartReadQuery(const nas::ApiCall& call) {
   return nas::StartCall({"arbory", 1, "", ReadQueryEntry}, call, EncodeOwnReply);
+}
+
+nas::Child StartInstant(const nas::ApiCall& call) {
+  return nas::StartCall({"arbory", 1, "", InstantEntry}, call, EncodeOwnReply);
 }
 
 nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id) {

@@ -3,6 +3,7 @@ import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
   HistoryKind,
   HistoryRecord,
+  InstantAnswer,
   Misses,
   Page,
   Progress,
@@ -62,6 +63,10 @@ async function call<T>(api: string, method: string, params: object, init?: Reque
 
 export const startSearch = (params: object) => call<Started>(SEARCH, 'start', params);
 export const understand = (typed: object) => post('query', typed) as Promise<Understood>;
+export const instant = (typed: object, signal: AbortSignal) =>
+  request(`instant?${new URLSearchParams({ params: JSON.stringify(typed) })}`, {
+    signal,
+  }) as Promise<InstantAnswer>;
 export const nearMisses = (taskid: string, params: object) =>
   post(`searches/${encodeURIComponent(taskid)}/misses`, params) as Promise<Misses>;
 export const stopSearch = (taskid: string) => call<null>(SEARCH, 'stop', { taskid: [taskid] });

@@ -45,6 +45,17 @@ export type Understood =
   | { params: Record<string, unknown>; wrong?: undefined }
   | { wrong: { criterion: string; sentence: string } };
 
+// What an index knows of a question at once; or what about it cannot be understood.
+export type InstantAnswer =
+  | {
+      index: string; // "current", or a few words why it does not answer
+      rows: { path: string; name: string; is_dir: boolean; size: number; mtime: number }[];
+      found: number; // matches looked up
+      more: boolean; // there may be more
+      wrong?: undefined;
+    }
+  | { wrong: { criterion: string; sentence: string } };
+
 // What a search that found nothing came close to.
 export interface Misses {
   complete: boolean;

@@ -13,6 +13,7 @@ import {
   type Criteria,
 } from '../model/criteria.ts';
 import { fromRecord, lookedInside, withInside } from '../model/history.ts';
+import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
 import { Search } from './search.ts';
 
@@ -35,6 +36,7 @@ export class App {
   draft: Criteria = NO_CRITERIA;
   draftError: CriterionError | null = null;
   search: Search | null = null;
+  readonly instant: Instant;
   history: Remembered[] = [];
   historyKnown = false; // until then it may still come
   unfolded = false;
@@ -48,6 +50,7 @@ export class App {
   private drawing = 0;
 
   constructor(private readonly draw: () => void) {
+    this.instant = new Instant(this.changed, this.signedOut);
     addEventListener('popstate', () => this.followAddress());
     addEventListener('pagehide', () => this.closeSearches());
     addEventListener('pageshow', (event) => {
@@ -123,13 +126,35 @@ export class App {
   edit(change: Partial<Criteria>): void {
     this.draftError = null;
     this.draft = { ...this.draft, ...change };
+    this.askAtOnce();
     this.changed();
+  }
+
+  // What is typed and not yet searched for is shown as far as an index knows it.
+  private askAtOnce(): void {
+    const { draft, search } = this;
+    const folders = draft.folders.length > 0 ? draft.folders : this.everywhere;
+    const empty = draft.pattern.trim() === '' && !hasCriteria(draft);
+    const indexed = this.shares.some((share) => share.indexed);
+    if (!indexed || empty || (search && sameCriteria(draft, search.criteria))) this.instant.drop();
+    else this.instant.ask(draft, folders);
+  }
+
+  // Whether the instant answer stands in the place of a search: until the search of the same words
+  // has something to show.
+  get showsInstant(): boolean {
+    const { criteria } = this.instant;
+    const { search } = this;
+    if (!criteria) return false;
+    if (!search || !sameCriteria(criteria, search.criteria)) return true;
+    return !search.over && search.found === 0;
   }
 
   // Searches for what is typed, and puts it into the address bar. The order is that of the search
   // before, in this tab or the last one.
   submit(change: Partial<Criteria> = {}): void {
     this.edit(change);
+    this.instant.cancel();
     const sort = this.search ? this.search.sort : parseSort(recall('sort'));
     const hash = toHash({ criteria: this.draft, sort });
     void this.start(this.draft, sort).then((started) => {
@@ -151,6 +176,7 @@ export class App {
 
   reset(): void {
     this.closeSearches();
+    this.instant.drop();
     Object.assign(this, { search: null, detailed: null, active: -1, draft: NO_CRITERIA });
     this.draftError = null;
     this.setTitle();
@@ -180,6 +206,7 @@ export class App {
     }
     this.standing?.close();
     Object.assign(this, { standing: undefined, detailed: null, active: -1 });
+    if (this.instant.criteria && !sameCriteria(this.instant.criteria, criteria)) this.instant.drop();
     remember(INSIDE, withInside(recall(INSIDE), criteria));
     this.setTitle();
     void ended.then(() => this.loadHistory());
@@ -199,6 +226,13 @@ export class App {
   }
 
   setSort(sort: Sort | null): void {
+    if (this.showsInstant) {
+      // The best of them cannot be sorted: all are.
+      remember('sort', sortText(sort));
+      if (this.search) this.search.sort = sort;
+      this.submit();
+      return;
+    }
     if (!this.search) return;
     this.active = -1;
     this.search.setSort(sort);

@@ -18,7 +18,7 @@ import { Icon, Wordmark } from './icons.tsx';
 import { Popover } from './Popover.tsx';
 import { ResultTable, type RowActions } from './ResultTable.tsx';
 import { SearchBar } from './SearchBar.tsx';
-import { StatusLine } from './StatusLine.tsx';
+import { InstantLine, StatusLine } from './StatusLine.tsx';
 
 export function Page({ app }: { app: App }) {
   const [help, setHelp] = useState(false);
@@ -86,6 +86,7 @@ const inPanel = ({ field }: CriterionError) => field !== 'pattern' && field !== 
 
 function Result({ app, actions }: { app: App; actions: RowActions }) {
   const { search } = app;
+  if (app.showsInstant) return <AtOnce app={app} actions={actions} />;
   if (!search) {
     return (
       <main>
@@ -113,6 +114,27 @@ function Result({ app, actions }: { app: App; actions: RowActions }) {
           )}
         </div>
       )}
+    </main>
+  );
+}
+
+// What is shown while one types.
+function AtOnce({ app, actions }: { app: App; actions: RowActions }) {
+  const { instant } = app;
+  return (
+    <main>
+      <InstantLine app={app} />
+      <div class={`result ${app.detailed ? 'with-details' : ''}`}>
+        <ResultTable app={app} search={instant} actions={actions} />
+        {app.detailed && (
+          <Details
+            app={app}
+            row={app.detailed}
+            pattern={instant.criteria?.pattern ?? ''}
+            actions={actions}
+          />
+        )}
+      </div>
     </main>
   );
 }

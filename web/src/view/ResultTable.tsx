@@ -5,7 +5,7 @@ import type { FileRow } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
 import { ScrollModel } from '../model/scroll.ts';
 import type { App } from '../state/app.ts';
-import type { Search } from '../state/search.ts';
+import type { Shown } from '../state/shown.ts';
 import { COLUMNS } from './columns.ts';
 import { Icon } from './icons.tsx';
 import { Row } from './Row.tsx';
@@ -20,12 +20,13 @@ export interface RowActions {
   copy: (row: FileRow) => void;
 }
 
-export function ResultTable({ app, search, actions }: { app: App; search: Search; actions: RowActions }) {
+export function ResultTable({ app, search, actions }: { app: App; search: Shown; actions: RowActions }) {
   const root = useRef<HTMLDivElement>(null);
   const scroller = useRef<HTMLDivElement>(null);
   const model = useMemo(() => new ScrollModel(), [search]);
   const [, redraw] = useState(0);
-  const highlighter = useMemo(() => new Highlighter(search.criteria.pattern), [search]);
+  const pattern = search.criteria?.pattern ?? '';
+  const highlighter = useMemo(() => new Highlighter(pattern), [pattern]);
   const rows = search.found;
   const { rowHeight, viewport } = useMeasures(scroller);
   model.resize({ rows, rowHeight, viewport });
@@ -144,7 +145,7 @@ function focusField(): void {
   field?.select();
 }
 
-function Head({ app, search }: { app: App; search: Search }) {
+function Head({ app, search }: { app: App; search: Shown }) {
   const { sort } = search;
   const click = (column: (typeof COLUMNS)[number]) => {
     const first = Boolean(column.mostFirst);

@@ -50,6 +50,26 @@ function from(search: Search): string {
   return source === 'walk' && index !== 'no index' ? `, by walking (${index})` : '';
 }
 
+// Above the answers while one types.
+export function InstantLine({ app }: { app: App }) {
+  const { instant } = app;
+  const count = plural(instant.known, 'match', 'matches');
+  const best = instant.known > instant.found ? `the best ${instant.found} first` : '';
+  return (
+    <div class="status">
+      <p class="figures" role="status">
+        <strong>{instant.complete ? count : `more than ${count}`}</strong>
+        {best && <span class="aside">{best}</span>}
+        <span class="aside">from the index</span>
+      </p>
+      <span class="grow" />
+      <span class="hint keyed">
+        <kbd>Enter</kbd> searches for all of them
+      </span>
+    </div>
+  );
+}
+
 function Elapsed({ search }: { search: Search }) {
   const [, tick] = useState(0);
   useEffect(() => {

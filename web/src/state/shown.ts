@@ -1,0 +1,16 @@
+// Rows as the table shows them, wherever they come from.
+import type { FileRow } from '../api/types.ts';
+import type { Sort } from '../model/address.ts';
+import type { Criteria } from '../model/criteria.ts';
+
+export interface Shown {
+  readonly criteria: Criteria | null;
+  readonly found: number;
+  readonly sort: Sort | null;
+  readonly over: boolean;
+  readonly pages: {
+    row(index: number): FileRow | undefined;
+    // Which rows are seen.
+    show(first: number, last: number): void;
+  };
+}
