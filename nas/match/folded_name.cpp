@@ -101,13 +101,17 @@ std::string FoldVersion() {
 bool IsAscii(std::string_view text) {
   constexpr std::uint64_t kHighBits = 0x8080808080808080;
   std::uint64_t seen = 0;
-  size_t i = 0;
-  for (std::uint64_t word; i + sizeof(word) <= text.size(); i += sizeof(word)) {
+  std::uint64_t word = 0;
+  if (text.size() < sizeof(word)) {
+    for (const char c : text) seen |= static_cast<unsigned char>(c);
+    return (seen & kHighBits) == 0;
+  }
+  for (size_t i = 0; i + sizeof(word) < text.size(); i += sizeof(word)) {
     std::memcpy(&word, text.data() + i, sizeof(word));
     seen |= word;
   }
-  for (; i < text.size(); ++i) seen |= static_cast<unsigned char>(text[i]);
-  return (seen & kHighBits) == 0;
+  std::memcpy(&word, text.data() + text.size() - sizeof(word), sizeof(word));
+  return ((seen | word) & kHighBits) == 0;
 }
 
 bool MayFoldToAscii(std::string_view text) {
@@ -200,9 +204,43 @@ std::string WithoutAccents(std::string_view folded) {
   return plain;
 }
 
+namespace {
+
+// How many bytes the character at the front of `text` has, where it is a common one that is
+// composed and neither composes with another such nor is taken apart; else 0. Those are Latin and
+// Cyrillic letters, kana, ideographs and Hangul syllables.
+size_t PlainCharacter(std::string_view text) {
+  const auto byte = [text](size_t at) {
+    return at < text.size() ? static_cast<unsigned char>(text[at]) : 0U;
+  };
+  const auto follows = [&byte](size_t at) { return (byte(at) & 0xc0) == 0x80; };
+  const unsigned lead = byte(0);
+  const unsigned next = byte(1);
+  if (lead < 0x80) return 1;
+  if ((lead >= 0xc2 && lead <= 0xcb) || lead == 0xd0 || lead == 0xd1) return follows(1) ? 2 : 0;
+  if (!follows(1) || !follows(2)) return 0;
+  const bool kana = lead == 0xe3 && next >= 0x81 && next <= 0x83;
+  const bool mark = next == 0x82 && (byte(2) == 0x99 || byte(2) == 0x9a);
+  const bool ideograph = lead >= 0xe4 && lead <= 0xe9;
+  const bool syllable = (lead == 0xea && next >= 0xb0) || lead == 0xeb || lead == 0xec ||
+                        (lead == 0xed && next <= 0x9d);
+  return (kana && !mark) || ideograph || syllable ? 3 : 0;
+}
+
+}  // namespace
+
+bool IsComposed(std::string_view text) {
+  if (IsAscii(text)) return true;
+  for (size_t bytes; !text.empty(); text.remove_prefix(bytes)) {
+    bytes = PlainCharacter(text);
+    if (bytes == 0) return false;
+  }
+  return true;
+}
+
 std::string ComposeText(std::string_view text) {
   std::string composed;
-  if (IsAscii(text) || !Normalise(text, kCompose, composed)) composed = text;
+  if (IsComposed(text) || !Normalise(text, kCompose, composed)) composed = text;
   return composed;
 }
 

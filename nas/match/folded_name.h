@@ -28,6 +28,9 @@ std::string AsciiLower(std::string_view text);
 std::string FoldText(std::string_view text, bool* valid = nullptr);
 // A folded text without its accents; unchanged where it has none or is not valid UTF-8.
 std::string WithoutAccents(std::string_view folded);
+// Whether the text is surely valid UTF-8 and in NFC, at a glance. No says nothing: it knows the
+// common characters only.
+bool IsComposed(std::string_view text);
 // The text in NFC, case kept; unchanged where it is not valid UTF-8.
 std::string ComposeText(std::string_view text);
 
@@ -47,6 +50,14 @@ class FoldedName {
     state_ = State::kAscii;
     folded_ = name;
     has_plain_ = false;
+  }
+  // `name` is valid UTF-8, not ASCII, and its own folded form; `plain`: without accents.
+  void SetFolded(std::string_view name, std::string_view plain) {
+    name_ = name;
+    state_ = State::kUtf8;
+    folded_ = name;
+    plain_ = plain;
+    has_plain_ = true;
   }
   std::string_view name() const { return name_; }
   std::string_view folded() {

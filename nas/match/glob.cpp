@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "nas/match/folded_name.h"
+
 namespace nas {
 namespace {
 
@@ -87,6 +89,7 @@ Glob::Segment Glob::ParseSegment(std::string_view pattern) {
       const char32_t c = NextCharacter(pattern, i);
       unit.ranges.emplace_back(c, c);
     }
+    for (char32_t c = 0; c < unit.ascii.size(); ++c) unit.ascii[c] = unit.Accepts(c);
     segment.units.push_back(std::move(unit));
   }
   return segment;
@@ -118,8 +121,17 @@ bool Glob::Unit::Accepts(char32_t c) const {
   return in != negated;
 }
 
+bool Glob::Segment::AcceptsAscii(const char* at) const {
+  return std::ranges::all_of(
+      units, [&at](const Unit& unit) { return unit.ascii[static_cast<unsigned char>(*at++)]; });
+}
+
 size_t Glob::Segment::MatchAt(std::string_view text, size_t at) const {
   if (units.empty()) return text.substr(at).starts_with(literal) ? at + literal.size() : kNone;
+  if (IsAscii(text.substr(at, units.size()))) {
+    if (text.size() - at < units.size()) return kNone;
+    return AcceptsAscii(text.data() + at) ? at + units.size() : kNone;
+  }
   for (const Unit& unit : units) {
     if (at == text.size() || !unit.Accepts(NextCharacter(text, at))) return kNone;
   }
@@ -140,6 +152,10 @@ size_t Glob::Segment::FindFrom(std::string_view text, size_t from) const {
 
 bool Glob::Segment::MatchesEnd(std::string_view text, size_t from) const {
   if (units.empty()) return text.substr(from).ends_with(literal);
+  // So many characters in ASCII at the end are as many bytes, and no part of others.
+  if (text.size() - from >= units.size() && IsAscii(text.substr(text.size() - units.size()))) {
+    return AcceptsAscii(text.data() + (text.size() - units.size()));
+  }
   for (size_t at = from; at < text.size(); NextCharacter(text, at)) {
     if (MatchAt(text, at) == text.size()) return true;
   }

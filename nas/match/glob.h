@@ -5,6 +5,7 @@
 // character each. Every text is a pattern. Matching takes at most text length x pattern length
 // steps, whatever the pattern, and any thread may ask.
 
+#include <bitset>
 #include <cstddef>
 #include <string>
 #include <string_view>
@@ -35,6 +36,7 @@ class Glob {
     std::vector<std::pair<char32_t, char32_t>> ranges;
     bool any = false;
     bool negated = false;
+    std::bitset<128> ascii = {};  // what is accepted of it
     bool Accepts(char32_t c) const;
   };
   // What stands between two stars: a plain text or, where it holds "?" or sets, units.
@@ -46,6 +48,7 @@ class Glob {
     // Position behind the first match that begins at `from` or later, or npos.
     size_t FindFrom(std::string_view text, size_t from) const;
     bool MatchesEnd(std::string_view text, size_t from) const;
+    bool AcceptsAscii(const char* at) const;  // as many bytes as there are units
   };
 
   static Segment ParseSegment(std::string_view pattern);

@@ -18,9 +18,12 @@ Answer AskContents(const QueryNode& node, const QuerySubject& subject) {
 
 Answer AskText(const QueryNode& node, const QuerySubject& subject) {
   if (subject.texts_in_contents) return AskContents(node, subject);
-  if (subject.name == nullptr) return Answer::kMaybe;
-  if (!node.text->of_path()) return Known(node.text->FindsInName(*subject.name));
-  return subject.path == nullptr ? Answer::kMaybe : Known(node.text->FindsInPath(*subject.path));
+  if (node.text->of_path()) {
+    if (subject.path != nullptr) return Known(node.text->FindsInPath(*subject.path));
+    const bool none = subject.folder != nullptr && !node.text->MayFindBelow(*subject.folder);
+    return none ? Answer::kNo : Answer::kMaybe;
+  }
+  return subject.name == nullptr ? Answer::kMaybe : Known(node.text->FindsInName(*subject.name));
 }
 
 bool HasExtension(const QueryNode& node, FoldedName& name) {
@@ -39,6 +42,11 @@ bool IsOfType(const QueryNode& node, const QuerySubject& subject) {
 
 bool HoldsOne(const QueryNode& node, std::int64_t value) {
   return std::ranges::any_of(node.bounds, [value](const Bounds& b) { return b.Hold(value); });
+}
+
+Answer AskDepth(const QueryNode& node, const QuerySubject& subject) {
+  const EntryPath* path = subject.path != nullptr ? subject.path : subject.folder;
+  return path == nullptr ? Answer::kMaybe : Known(HoldsOne(node, path->depth()));
 }
 
 Answer AskEmpty(const QuerySubject& subject) {
@@ -107,8 +115,7 @@ Answer Ask(const QueryNode& node, const QuerySubject& subject) {
       if (subject.name == nullptr) return Answer::kMaybe;
       return Known(node.types.empty() || IsOfType(node, subject));
     case Kind::kDepth:
-      return subject.path == nullptr ? Answer::kMaybe
-                                     : Known(HoldsOne(node, subject.path->depth()));
+      return AskDepth(node, subject);
     default:
       return AskAttributes(node, subject);
   }

@@ -30,6 +30,9 @@ struct QueryAttributes {
 struct QuerySubject {
   FoldedName* name = nullptr;
   EntryPath* path = nullptr;
+  // In the place of an entry's path: that of the folder it lies in, as of an entry without a name.
+  // Then it is asked whether there may be a match in it.
+  EntryPath* folder = nullptr;
   bool is_folder = false;
   bool is_file = false;  // a regular one, which alone has contents
   const QueryAttributes* attributes = nullptr;

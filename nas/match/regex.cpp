@@ -1,56 +1,18 @@
 #include "nas/match/regex.h"
 
-#define PCRE2_CODE_UNIT_WIDTH 8
-#include <pcre2.h>
-
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <new>
 #include <string>
 
 #include "nas/match/folded_name.h"
+#include "nas/match/pcre.h"
 
 namespace nas {
 namespace {
 
-// Backtracking steps in one search of one text: a second or so at worst for the most hostile
-// expression, far above what honest ones need.
-constexpr std::uint32_t kMatchLimit = 2'000'000;
-// Machine stack for compiled code, grown on demand; the built-in 32 KiB is too little for
-// expressions with many alternatives.
-constexpr size_t kJitStackStart = 32 * 1024;
-constexpr size_t kJitStackMost = 1024 * 1024;
 // Longer ones are cut.
 constexpr size_t kMostMessageBytes = 256;
-
-// What matching needs besides the expression, one for each thread.
-class Scratch {
- public:
-  Scratch()
-      : match_(pcre2_match_data_create(1, nullptr)),
-        context_(pcre2_match_context_create(nullptr)),
-        stack_(pcre2_jit_stack_create(kJitStackStart, kJitStackMost, nullptr)) {
-    if (match_ == nullptr || context_ == nullptr) throw std::bad_alloc();
-    pcre2_set_match_limit(context_, kMatchLimit);
-    if (stack_ != nullptr) pcre2_jit_stack_assign(context_, nullptr, stack_);
-  }
-  ~Scratch() {
-    pcre2_jit_stack_free(stack_);
-    pcre2_match_context_free(context_);
-    pcre2_match_data_free(match_);
-  }
-  Scratch(const Scratch&) = delete;
-  Scratch& operator=(const Scratch&) = delete;
-
-  pcre2_match_data* match() const { return match_; }
-  pcre2_match_context* context() const { return context_; }
-
- private:
-  pcre2_match_data* match_;
-  pcre2_match_context* context_;
-  pcre2_jit_stack* stack_;
-};
 
 std::uint32_t CompileOptions(Regex::Kind kind) {
   constexpr std::uint32_t kCommon =
@@ -104,7 +66,7 @@ Regex::~Regex() {
 }
 
 std::optional<TextPlace> Regex::Find(std::string_view text, size_t from) const {
-  thread_local Scratch scratch;
+  PcreScratch& scratch = PcreScratch::OfThread();
   const void* code = ascii_code_ != nullptr && IsAscii(text) ? ascii_code_ : code_;
   if (pcre2_match(static_cast<const pcre2_code*>(code), reinterpret_cast<PCRE2_SPTR>(text.data()),
                   text.size(), from, 0, scratch.match(), scratch.context()) < 0) {

@@ -48,6 +48,10 @@ Result<std::shared_ptr<const TextTerm>> TextTerm::Make(std::string_view text, Fo
   const Comparand& compared = term->forms_.front();
   const std::string_view required = wild ? compared.wildcards->Required() : compared.text;
   if (!required.empty() && IsAscii(required)) term->required_.emplace(required);
+  const std::string_view of_folder = term->of_path_ && !term->literal_
+                                         ? compared.wildcards->RequiredOfFolder()
+                                         : std::string_view();
+  if (!of_folder.empty() && IsAscii(of_folder)) term->required_of_folder_.emplace(of_folder);
   return std::shared_ptr<const TextTerm>(std::move(term));
 }
 
@@ -125,7 +129,10 @@ bool TextTerm::FindsIn(FoldedName& text) const {
 }
 
 bool TextTerm::FindsInName(FoldedName& name) const {
-  if (regex_) return regex_->Finds(name.ascii() ? name.name() : ComposeText(name.name()));
+  if (regex_) {
+    const std::string_view text = name.name();
+    return IsComposed(text) ? regex_->Finds(text) : regex_->Finds(ComposeText(text));
+  }
   return FindsIn(name);
 }
 
@@ -144,6 +151,52 @@ bool TextTerm::FindsInPath(EntryPath& path) const {
   if (!text_.starts_with('/')) return FindsIn(path.below());
   return Begins(path.below(), "") || Begins(path.in_share(), path.base().in_share) ||
          Begins(path.on_disk(), path.base().on_disk);
+}
+
+namespace {
+
+// Whether the path of something in `folder`, which ends with "/", may hold the text: the folder's
+// own does, or the text goes on behind its last "/". A name holds none; a folder has one behind it.
+bool GoesOnBelow(std::string_view folder, std::string_view text) {
+  if (folder.find(text) != std::string_view::npos) return true;
+  if (text.ends_with('/')) text.remove_suffix(1);
+  const size_t slash = text.rfind('/');
+  return slash == std::string_view::npos || folder.ends_with(text.substr(0, slash + 1));
+}
+
+}  // namespace
+
+bool TextTerm::MayFitBelow(std::string_view folder) const {
+  const bool from_root = text_.starts_with('/');
+  return std::ranges::any_of(forms_, [&](const Comparand& form) {
+    if (form.wildcards && form.wildcards->MayMatchBelow(folder)) return true;
+    if (form.wildcards && (from_root || !literal_)) return false;
+    if (!from_root) return GoesOnBelow(folder, form.text);
+    return folder.starts_with(form.text) || form.text.starts_with(folder);
+  });
+}
+
+// The path of what lies in a folder has the folder's path before it in each form, for nothing
+// crosses a "/". But the form is that of bytes as soon as one name is not UTF-8.
+bool TextTerm::ReachesInto(FoldedName& folder) const {
+  thread_local std::string skeleton;
+  if (required_of_folder_ && AsciiSkeleton(folder.name(), skeleton) &&
+      !required_of_folder_->Finds(skeleton)) {
+    return false;
+  }
+  if (exact_) return MayFitBelow(folder.name()) || MayFitBelow(ComposeText(folder.name()));
+  if (IsAscii(folder.name())) return MayFitBelow(folder.folded());
+  // Their parts in ASCII are the same in every form but for accents, which the skeleton leaves out.
+  const bool ascii = !forms_.front().wildcards && IsAscii(text_);
+  if (ascii && AsciiSkeleton(folder.name(), skeleton)) return MayFitBelow(skeleton);
+  return MayFitBelow(folder.folded()) || MayFitBelow(folder.plain()) ||
+         MayFitBelow(AsciiLower(folder.name()));
+}
+
+bool TextTerm::MayFindBelow(EntryPath& folder) const {
+  if (!text_.starts_with('/')) return ReachesInto(folder.below());
+  return ReachesInto(folder.below()) || ReachesInto(folder.in_share()) ||
+         ReachesInto(folder.on_disk());
 }
 
 }  // namespace nas

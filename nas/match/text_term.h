@@ -31,6 +31,9 @@ class TextTerm {
   bool FindsInName(FoldedName& name) const;
   // For terms that are about paths: those that hold a "/".
   bool FindsInPath(EntryPath& path) const;
+  // Whether FindsInPath may say yes of something in a folder, whose path is given as that of an
+  // entry in it without a name. Never no where it may.
+  bool MayFindBelow(EntryPath& folder) const;
 
   // Texts, one of which is in the folded form (folded_name.h) of every name that has the term, or
   // in that form without accents. None where that cannot be told, as of terms about paths.
@@ -58,9 +61,12 @@ class TextTerm {
   bool AddForm(std::string text);
   bool Fits(std::string_view text, const Comparand& form) const;
   bool MayHold(std::string_view name) const;
+  bool ReachesInto(FoldedName& folder) const;
   bool FindsIn(FoldedName& text) const;
   // Of a path term that begins at the root.
   bool Begins(FoldedName& path, std::string_view root) const;
+  // Whether what lies in a folder may pass, by its path in one of the forms.
+  bool MayFitBelow(std::string_view folder) const;
   template <class Test>
   bool AnyForm(FoldedName& text, const Test& test) const;
 
@@ -75,6 +81,8 @@ class TextTerm {
   std::shared_ptr<const Regex> regex_;
   // ASCII text without which nothing matches: lets most names be told from their bytes.
   std::optional<LiteralFinder> required_;
+  // The same of the path of the folder that a match lies in.
+  std::optional<LiteralFinder> required_of_folder_;
 };
 
 }  // namespace nas

@@ -146,7 +146,8 @@ bool Wildcards::PathGlob::Matches(const std::vector<std::string_view>& names,
   if (folders_only && !is_folder) return false;
   const auto fits = [&](const std::vector<Glob>& run, size_t at) {
     for (size_t i = 0; i < run.size(); ++i) {
-      if (at + i >= names.size() || !run[i].Matches(names[at + i])) return false;
+      if (at + i >= names.size()) return false;
+      if (!names[at + i].empty() && !run[i].Matches(names[at + i])) return false;
     }
     return true;
   };
@@ -163,18 +164,34 @@ bool Wildcards::PathGlob::Matches(const std::vector<std::string_view>& names,
   return at + last.size() <= names.size() && fits(last, names.size() - last.size());
 }
 
+namespace {
+
+std::vector<std::string_view> NamesOf(std::string_view path) {
+  std::vector<std::string_view> names;
+  while (!path.empty()) {
+    const size_t end = std::min(path.find('/'), path.size());
+    if (end > 0) names.push_back(path.substr(0, end));
+    path.remove_prefix(std::min(end + 1, path.size()));
+  }
+  return names;
+}
+
+}  // namespace
+
 bool Wildcards::Matches(std::string_view text) const {
   if (path_globs_.empty()) {
     return std::ranges::any_of(globs_, [text](const Glob& glob) { return glob.Matches(text); });
   }
-  std::vector<std::string_view> names;
-  for (std::string_view rest = text; !rest.empty();) {
-    const size_t end = std::min(rest.find('/'), rest.size());
-    if (end > 0) names.push_back(rest.substr(0, end));
-    rest.remove_prefix(std::min(end + 1, rest.size()));
-  }
+  const std::vector<std::string_view> names = NamesOf(text);
   return std::ranges::any_of(
       path_globs_, [&](const PathGlob& glob) { return glob.Matches(names, text.ends_with('/')); });
+}
+
+bool Wildcards::MayMatchBelow(std::string_view folder) const {
+  std::vector<std::string_view> names = NamesOf(folder);
+  names.emplace_back();
+  return std::ranges::any_of(path_globs_,
+                             [&](const PathGlob& glob) { return glob.Matches(names, true); });
 }
 
 std::string_view Wildcards::Required() const {
@@ -185,6 +202,20 @@ std::string_view Wildcards::Required() const {
   if (globs_.size() == 1) consider(globs_.front());
   if (path_globs_.size() == 1) {
     for (const auto& run : path_globs_.front().runs) std::ranges::for_each(run, consider);
+  }
+  return longest;
+}
+
+std::string_view Wildcards::RequiredOfFolder() const {
+  std::string_view longest;
+  if (path_globs_.size() != 1) return longest;
+  const auto& runs = path_globs_.front().runs;
+  for (const auto& run : runs) {
+    for (const Glob& glob : run) {
+      const bool last = &run == &runs.back() && &glob == &run.back();
+      const std::string_view text = glob.LongestLiteral();
+      if (!last && text.size() > longest.size()) longest = text;
+    }
   }
   return longest;
 }

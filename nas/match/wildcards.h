@@ -35,8 +35,12 @@ class Wildcards {
 
   // A path begins with "/", and ends with it where it is a folder's.
   bool Matches(std::string_view text) const;
+  // Of wildcards over paths: whether something that lies in the folder of this path may match.
+  bool MayMatchBelow(std::string_view folder) const;
   // A text that everything matched holds; may be empty.
   std::string_view Required() const;
+  // Of wildcards over paths: a text that is in the path of the folder of everything matched.
+  std::string_view RequiredOfFolder() const;
   // Of wildcards over names: texts, one of which everything matched holds; one that is empty says
   // that nothing is known.
   std::vector<std::string> RequiredTexts() const;
@@ -47,6 +51,7 @@ class Wildcards {
     bool anchored = false;
     bool folders_only = false;
     std::vector<std::vector<Glob>> runs;
+    // An empty name stands for any.
     bool Matches(const std::vector<std::string_view>& names, bool is_folder) const;
   };
   static PathGlob MakePathGlob(std::string_view text);

@@ -3,6 +3,8 @@
 #include <dirent.h>
 
 #include <algorithm>
+#include <cstddef>
+#include <cstdint>
 
 #include "nas/match/required_texts.h"
 
@@ -18,6 +20,23 @@ bool IsPlainText(const QueryNode& leaf) {
          !leaf.text->has_wildcards() && !leaf.text->of_path();
 }
 
+// An expression that names must match, and that can be run over all of them.
+std::shared_ptr<const RegexScan> ScanOf(const QueryNode& root) {
+  for (const QueryNode& child : root.children) {
+    if (child.kind != QueryNode::Kind::kText || !child.text->is_regex()) continue;
+    if (child.text->exact()) continue;  // the texts do not have it
+    if (auto scan = RegexScan::Make(child.text->text())) return scan;
+  }
+  return nullptr;
+}
+
+bool IsOfRanges(const QueryNode& leaf) {
+  return IsOfAttributes(leaf.kind) && leaf.kind != QueryNode::Kind::kEmpty;
+}
+
+// Where more than one name of so many has a needle, an expression is as well run over all.
+constexpr EntryId kNamesForNeedle = 8;
+
 }  // namespace
 
 IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& search)
@@ -25,13 +44,24 @@ IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& sear
       search_(search),
       asks_attributes_(snapshot.attributes_current && search.criteria.ask_attributes) {
   const QueryNode& root = search.criteria.root;
-  by_texts_ = !AnyLeaf(root, [](const QueryNode& leaf) {
-    return leaf.text != nullptr && (leaf.text->exact() || leaf.text->is_regex());
+  const auto is_regex = [](const QueryNode& leaf) { return leaf.text && leaf.text->is_regex(); };
+  has_regex_ = AnyLeaf(root, is_regex);
+  by_texts_ = !AnyLeaf(root, [&](const QueryNode& leaf) {
+    return leaf.text &&
+           (leaf.text->exact() || (is_regex(leaf) && !ForManyTexts(leaf.text->text())));
   });
   // Where contents stand in for names, names say nothing.
-  if (search.content && search.content->texts_too()) return;
-  for (const std::string& text : RequiredTexts(root)) needles_.emplace_back(text);
+  const bool by_names = !search.content || !search.content->texts_too();
+  const std::vector<std::string> texts =
+      by_names ? RequiredTexts(root) : std::vector<std::string>();
+  for (const std::string& text : texts) needles_.emplace_back(text);
+  if (by_names && has_regex_) scan_ = ScanOf(root);
   decides_ = !needles_.empty() && root.children.size() == 1 && IsPlainText(root.children[0]);
+  if (finds()) return;
+  for (const QueryNode& child : root.children) {
+    if (IsOfRanges(child)) ranges_.push_back(&child);
+  }
+  only_ranges_ = ranges_.size() == root.children.size();
 }
 
 namespace {
@@ -52,21 +82,63 @@ EntryId EntryFrom(const NameTable& table, EntryId from, std::uint64_t offset) {
 
 }  // namespace
 
-void IndexFilter::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+bool IndexFilter::FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
   const NameTable& table = snapshot_.table;
   const std::string_view texts = table.texts(begin, end);
   const std::uint64_t base = table.text_begin(begin);
+  const size_t most = scan_ ? (end - begin) / kNamesForNeedle : SIZE_MAX;
   for (const TextFinder& needle : needles_) {
     EntryId entry = begin;
     for (size_t at = 0; (at = needle.Find(texts, at)) != std::string_view::npos;) {
+      if (found->size() == most) return false;
       entry = EntryFrom(table, entry, base + at);
       found->push_back(entry);
       at = table.text_begin(entry + 1) - base;
     }
   }
-  if (needles_.size() == 1) return;
-  std::ranges::sort(*found);
+  if (needles_.size() > 1) {
+    std::ranges::sort(*found);
+    found->erase(std::ranges::unique(*found).begin(), found->end());
+  }
+  return true;
+}
+
+// Where the search is given up every further name is to be asked by itself.
+void IndexFilter::Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+  const NameTable& table = snapshot_.table;
+  const std::string_view texts = table.texts(begin, end);
+  const std::uint64_t base = table.text_begin(begin);
+  EntryId entry = begin;
+  for (size_t at = 0; at < texts.size(); at = table.text_begin(entry++ + 1) - base) {
+    const auto place = scan_->Find(texts, at);
+    if (!place) {
+      for (entry = EntryFrom(table, entry, base + at); entry < end; ++entry) {
+        found->push_back(entry);
+      }
+      return;
+    }
+    if (*place >= texts.size()) return;
+    entry = EntryFrom(table, entry, base + *place);
+    found->push_back(entry);
+  }
+}
+
+void IndexFilter::FindOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+  const auto middle = static_cast<std::ptrdiff_t>(found->size());
+  for (EntryId entry = begin; entry < end; ++entry) {
+    if (!IsAscii(snapshot_.table.name(entry))) found->push_back(entry);
+  }
+  std::ranges::inplace_merge(*found, found->begin() + middle);
   found->erase(std::ranges::unique(*found).begin(), found->end());
+}
+
+void IndexFilter::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+  if (begin == end) return;
+  found->clear();
+  if (!needles_.empty() && FindNeedles(begin, end, found)) return;
+  found->clear();
+  Scan(begin, end, found);
+  FindOthers(begin, end, found);
 }
 
 EntryFilter::EntryFilter(const IndexFilter& filter, const Location& location)
@@ -74,44 +146,57 @@ EntryFilter::EntryFilter(const IndexFilter& filter, const Location& location)
   path_.SetBase(PathBaseOf(location));
 }
 
-void EntryFilter::Enter(std::string_view path, bool by_attributes) {
+bool EntryFilter::Enter(std::string_view path, bool by_attributes) {
   by_attributes_ = by_attributes && filter_.asks_attributes_;
-  if (filter_.search_.criteria.ask_paths) path_.SetFolder(path);
+  if (!filter_.search_.criteria.ask_paths) return true;
+  path_.SetFolder(path);
+  path_.SetEntry({}, false);
+  QuerySubject subject;
+  subject.folder = &path_;
+  subject.is_file = true;  // for all that is known
+  return filter_.search_.Ask(subject) != Answer::kNo;
 }
 
 void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
-                       const std::function<std::string(NameTable::FolderId)>& path_of,
+                       const std::function<std::string_view(NameTable::FolderId)>& path_of,
                        std::vector<EntryId>* found) {
-  const EntryId first = table_.entries_begin(begin);
   const EntryId last = table_.entries_begin(end);
   const bool hits = filter_.finds();
   const bool paths = filter_.search_.criteria.ask_paths;
   hits_.clear();
-  if (hits) filter_.Find(first, last, &hits_);
+  if (hits) filter_.Find(table_.entries_begin(begin), last, &hits_);
+  auto hit = hits_.begin();
+  const auto next = [&](EntryId from) {
+    if (!hits) return from;
+    while (hit != hits_.end() && *hit < from) ++hit;
+    return hit == hits_.end() ? last : *hit;
+  };
   Enter({});
-  EntryId behind = first;  // the folder whose path is known
-  std::string path;
-  const size_t count = hits ? hits_.size() : last - first;
-  for (size_t i = 0; i < count; ++i) {
-    const EntryId entry = hits ? hits_[i] : first + static_cast<EntryId>(i);
-    if (paths && entry >= behind) {
+  for (EntryId entry = next(table_.entries_begin(begin)); entry < last;) {
+    EntryId behind = last;  // the folder, where it counts
+    bool may_match = true;
+    if (paths) {
       const NameTable::FolderId folder = table_.folder_of(entry);
       behind = table_.entries_end(folder);
-      path = path_of(folder);
-      Enter(path);
+      may_match = Enter(path_of(folder));
     }
-    if (MayMatch(entry)) found->push_back(entry);
+    for (; may_match && entry < behind; entry = next(entry + 1)) {
+      if (MayMatch(entry)) found->push_back(entry);
+    }
+    if (!may_match) entry = next(behind);
   }
 }
 
 // A folder's own attributes change with what is in it.
-bool EntryFilter::LearnAttributes(EntryId entry, unsigned char type) {
+bool EntryFilter::IsBelieved(EntryId entry, unsigned char type) const {
   const Changes& changes = filter_.snapshot_.changes;
-  if (changes.inodes().contains(table_.inode(entry))) return false;
-  if (type == DT_DIR) {
-    const NameTable::FolderId folder = table_.folder_at(entry);
-    if (folder == NameTable::kNoFolder || changes.folders().contains(folder)) return false;
-  }
+  if (!changes.inodes().empty() && changes.inodes().contains(table_.inode(entry))) return false;
+  if (type != DT_DIR) return true;
+  const NameTable::FolderId folder = table_.folder_at(entry);
+  return folder != NameTable::kNoFolder && !changes.folders().contains(folder);
+}
+
+bool EntryFilter::LearnAttributes(EntryId entry) {
   const auto known = table_.attributes(entry);
   if (!known) return false;
   attributes_ = {.size = static_cast<std::int64_t>(known->size),
@@ -123,31 +208,54 @@ bool EntryFilter::LearnAttributes(EntryId entry, unsigned char type) {
   return true;
 }
 
-// Names that are ASCII are most often asked as the table's texts have them: where letter case does
-// not count that is the same, and they need not be folded.
+// Where letter case does not count, names are most often asked as the table's texts have them:
+// these are the names' folded forms, which fold to themselves. Expressions can tell another name of
+// the same text from it.
 void EntryFilter::SetName(EntryId entry) {
-  if (filter_.by_texts_) {
-    std::string_view text = table_.texts(entry, entry + 1);
-    text.remove_suffix(1);
-    if (IsAscii(text) && text.find('\1') == std::string_view::npos) return name_.SetFolded(text);
+  const std::string_view name = table_.name(entry);
+  std::string_view text = table_.texts(entry, entry + 1);
+  text.remove_suffix(1);
+  const size_t mark = text.find('\1');
+  const std::string_view folded = text.substr(0, mark);
+  const bool usable = filter_.by_texts_ && (!filter_.has_regex_ || IsAscii(name));
+  if (usable && mark == std::string_view::npos && IsAscii(text)) return name_.SetFolded(text);
+  // What a broken name has is in no such form.
+  if (!usable || IsAscii(folded) || !IsComposed(folded) || name.find('\1') != name.npos) {
+    return name_.Set(name);
   }
-  name_.Set(table_.name(entry));
+  name_.SetFolded(folded, mark == std::string_view::npos ? folded : text.substr(mark + 1));
+}
+
+// What leaves an entry out by attributes is seldom in doubt, so that is asked last.
+bool EntryFilter::IsInRanges(EntryId entry, QuerySubject& subject) {
+  if (!LearnAttributes(entry)) return true;
+  subject.attributes = &attributes_;
+  const bool in = std::ranges::all_of(filter_.ranges_, [&subject](const QueryNode* range) {
+    return Ask(*range, subject) != Answer::kNo;
+  });
+  subject.attributes = nullptr;
+  return in || !IsBelieved(entry, table_.type(entry));
 }
 
 bool EntryFilter::MayMatch(EntryId entry) {
   if (filter_.decides_) return true;
-  const unsigned char type = table_.type(entry);
-  SetName(entry);
   QuerySubject subject;
-  subject.name = &name_;
+  const unsigned char type = table_.type(entry);
   subject.is_folder = type == DT_DIR;
   subject.is_file = type == DT_REG;
+  if (by_attributes_ && !filter_.ranges_.empty()) {
+    if (!IsInRanges(entry, subject)) return false;
+    if (filter_.only_ranges_) return true;
+  }
+  SetName(entry);
+  subject.name = &name_;
   if (filter_.search_.criteria.ask_paths) {
     path_.SetEntry(table_.name(entry), subject.is_folder);
     subject.path = &path_;
   }
   if (filter_.search_.Ask(subject) == Answer::kNo) return false;
-  if (!by_attributes_ || !LearnAttributes(entry, type)) return true;
+  const bool ask = by_attributes_ && IsBelieved(entry, type) && LearnAttributes(entry);
+  if (!ask) return true;
   subject.attributes = &attributes_;
   return filter_.search_.Ask(subject) != Answer::kNo;
 }

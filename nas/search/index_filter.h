@@ -4,11 +4,12 @@
 // the rest.
 
 #include <functional>
-#include <string>
+#include <memory>
 #include <string_view>
 #include <vector>
 
 #include "nas/index/changes.h"
+#include "nas/match/regex_scan.h"
 #include "nas/match/text_finder.h"
 #include "nas/search/judge.h"
 
@@ -19,21 +20,34 @@ class IndexFilter {
  public:
   IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& search);
 
-  // Whether there are texts without which nothing matches, so that Find tells where to look.
-  bool finds() const { return !needles_.empty(); }
-  // The entries of [begin, end) that have one, in order.
+  // Whether there are texts, or an expression, without which nothing matches, so that Find tells
+  // where to look.
+  bool finds() const { return !needles_.empty() || scan_ != nullptr; }
+  // The entries of [begin, end) that may have one, in order.
   void Find(NameTable::EntryId begin, NameTable::EntryId end,
             std::vector<NameTable::EntryId>* found) const;
 
  private:
   friend class EntryFilter;
+  using EntryId = NameTable::EntryId;
+
+  // False, with less than all of it, where they tell so little that scan_ is the quicker way.
+  bool FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
+  void Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
+  // Those whose name is not ASCII.
+  void FindOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
 
   const IndexSnapshot& snapshot_;
   const SharedSearch& search_;
   std::vector<TextFinder> needles_;
+  std::shared_ptr<const RegexScan> scan_;
+  // What asks for attributes and holds of every match; where nothing is found by names.
+  std::vector<const QueryNode*> ranges_;
+  bool only_ranges_ = false;      // there is nothing else
   bool asks_attributes_ = false;  // and the table's are believed
   bool by_texts_ = false;         // texts say of names in ASCII what the names say
-  bool decides_ = false;          // what Find finds needs no further question
+  bool has_regex_ = false;
+  bool decides_ = false;  // what Find finds needs no further question
 };
 
 // One thread's.
@@ -42,21 +56,23 @@ class EntryFilter {
   EntryFilter(const IndexFilter& filter, const Location& location);
 
   // The entries of the folders [begin, end) that can match; `path_of` tells the path of a folder,
-  // and is asked where criteria do.
+  // good until it is called again, and is asked where criteria do.
   void Find(NameTable::FolderId begin, NameTable::FolderId end,
-            const std::function<std::string(NameTable::FolderId)>& path_of,
+            const std::function<std::string_view(NameTable::FolderId)>& path_of,
             std::vector<NameTable::EntryId>* found);
 
   // The entries that follow lie in this folder, below the root of the location's share; borrowed.
   // Attributes do not count where the user could not look at the files: whether there is more than
-  // names to ask is then nothing that may show.
-  void Enter(std::string_view path, bool by_attributes = true);
-  // Whether the entry can match, as the table has it.
+  // names to ask is then nothing that may show. False where nothing in it can match.
+  bool Enter(std::string_view path, bool by_attributes = true);
+  // Of one of a folder that was entered: whether the entry can match, as the table has it.
   bool MayMatch(NameTable::EntryId entry);
 
  private:
   void SetName(NameTable::EntryId entry);
-  bool LearnAttributes(NameTable::EntryId entry, unsigned char type);
+  bool IsBelieved(NameTable::EntryId entry, unsigned char type) const;
+  bool LearnAttributes(NameTable::EntryId entry);
+  bool IsInRanges(NameTable::EntryId entry, QuerySubject& subject);
 
   const IndexFilter& filter_;
   const NameTable& table_;

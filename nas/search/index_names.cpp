@@ -100,24 +100,34 @@ bool IndexNames::Claim(FolderId folder) {
   return claimed_.insert(folder).second;
 }
 
-std::string IndexNames::PathOf(FolderId folder) const {
-  std::vector<std::string_view> names;
-  for (; folder != top_; folder = table_.parent(folder)) {
-    names.push_back(table_.folder_name(folder));
+FolderPaths::FolderPaths(const NameTable& table, FolderId top, std::string_view path)
+    : table_(table), levels_{{top, path.size()}}, path_(path) {}
+
+std::string_view FolderPaths::Of(FolderId folder) {
+  while (levels_.size() > 1) {
+    const FolderId above = levels_.back().folder;
+    if (above <= folder && folder < table_.subtree_end(above)) break;
+    levels_.pop_back();
   }
-  std::string path = locations_.front().path;
-  for (auto name = names.rbegin(); name != names.rend(); ++name) {
-    path.append(path.empty() ? "" : "/").append(*name);
+  path_.resize(levels_.back().length);
+  way_.clear();
+  for (FolderId id = folder; id != levels_.back().folder; id = table_.parent(id)) {
+    way_.push_back(id);
   }
-  return path;
+  for (auto id = way_.rbegin(); id != way_.rend(); ++id) {
+    path_.append(path_.empty() ? "" : "/").append(table_.folder_name(*id));
+    levels_.push_back({*id, path_.size()});
+  }
+  return path_;
 }
 
 bool IndexNames::NextCandidates(EntryFilter& filter, std::vector<EntryId>* found) {
   const size_t number = next_++;
   if (number >= pieces_) return false;
   const Piece piece = PieceOf(number);
+  FolderPaths paths(table_, top_, locations_.front().path);
   filter.Find(
-      piece.begin, piece.end, [this](FolderId folder) { return PathOf(folder); }, found);
+      piece.begin, piece.end, [&paths](FolderId folder) { return paths.Of(folder); }, found);
   return true;
 }
 

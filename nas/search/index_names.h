@@ -28,6 +28,26 @@
 
 namespace nas {
 
+// The paths of a table's folders, each made from that of the one before it: quick where they are
+// asked for in order.
+class FolderPaths {
+ public:
+  // `path`: that of the folder `top`, below which the others are.
+  FolderPaths(const NameTable& table, NameTable::FolderId top, std::string_view path);
+  // Good until the next call.
+  std::string_view Of(NameTable::FolderId folder);
+
+ private:
+  struct Level {
+    NameTable::FolderId folder;
+    size_t length;
+  };
+  const NameTable& table_;
+  std::vector<Level> levels_;
+  std::vector<NameTable::FolderId> way_;
+  std::string path_;
+};
+
 class IndexNames : public NameSource {
  public:
   using FolderId = NameTable::FolderId;
@@ -80,7 +100,6 @@ class IndexNames : public NameSource {
   void FindSpecials();
   void AddMount(std::string_view path);
   Piece PieceOf(size_t number) const;
-  std::string PathOf(FolderId folder) const;
   const Special* SpecialOf(FolderId folder) const;
   // Whether the caller is the first to take the folder, to walk or to count it.
   bool Claim(FolderId folder);

@@ -49,7 +49,8 @@ IndexVisit::IndexVisit(IndexNames& names, size_t thread, Judge& judge)
       search_(names.search_),
       thread_(thread),
       judge_(judge),
-      filter_(names.filter_, names.locations_.front()) {}
+      filter_(names.filter_, names.locations_.front()),
+      paths_(names.table_, names.top_, names.locations_.front().path) {}
 
 void IndexVisit::Visit(FolderId begin, FolderId end) {
   hits_.clear();
@@ -135,9 +136,8 @@ void IndexVisit::VisitFolder(FolderId folder) {
 void IndexVisit::CollectEntries(FolderId folder, const Special* special) {
   entries_.clear();
   const EntryId end = table_.entries_end(folder);
-  std::string path;
-  if (search_.criteria.ask_paths) path = names_.PathOf(folder);
-  filter_.Enter(path, may_enter_);
+  const std::string_view path = search_.criteria.ask_paths ? paths_.Of(folder) : std::string_view();
+  if (!filter_.Enter(path, may_enter_)) return;
   const auto consider = [&](EntryId entry) {
     if (special != nullptr && special->Holds(table_.name(entry))) return;
     if (filter_.MayMatch(entry)) entries_.push_back(entry);

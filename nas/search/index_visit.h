@@ -87,6 +87,7 @@ class IndexVisit {
   Judge& judge_;
   const OwnRights rights_;
   EntryFilter filter_;
+  FolderPaths paths_;
   std::vector<EntryId> hits_;  // of the piece, where the filter finds
   size_t next_hit_ = 0;
   std::vector<EntryId> looks_;  // folders among the entries of the piece, not of the table
