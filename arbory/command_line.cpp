@@ -82,4 +82,14 @@ void AddQueryOptions(CLI::App* command, SearchQuery* query) {
   });
 }
 
+void AddFormat(CLI::App* command, OutputOptions* output) {
+  CLI::Option* long_format = command->add_flag("-l,--long", output->long_format,
+                                               "Mode, owner, group, size and time of each file");
+  CLI::Option* json = command->add_flag("--json", output->json, "One JSON object a line");
+  command->add_flag("-0,--print0", output->null_separated, "End each path with a NUL byte")
+      ->excludes(json)
+      ->excludes(long_format);
+  json->excludes(long_format);
+}
+
 }  // namespace arbory

@@ -26,6 +26,9 @@ void AddCommonOptions(CLI::App* command, CommonOptions* common);
 // not be read. `query` must live as long as `command`.
 void AddQueryOptions(CLI::App* command, SearchQuery* query);
 
+// -l, --json and -0, in the current group.
+void AddFormat(CLI::App* command, OutputOptions* output);
+
 // What PATTERN, SIZE and TIME may be; lines that fit a terminal of 80 columns.
 extern const char kQueryHelp[];
 

@@ -123,9 +123,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   search->add_option("--offset", options->offset, "Leave out the first N files")
       ->type_name("N")
       ->check(count);
-  CLI::Option* long_format = search->add_flag("-l,--long", options->long_format,
-                                              "Mode, owner, group, size and time of each file");
-  CLI::Option* json = search->add_flag("--json", options->json, "One JSON object a line");
+  AddFormat(search, &options->output);
   search->add_flag("-n,--line-number", options->line_number,
                    "First matching line of files found by their contents; means --content too");
   search->add_flag("-v,--verbose", options->verbose, "Say how the search was answered");
@@ -137,10 +135,6 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
                    "auto: where it is current; always: or fail; never: walk")
       ->type_name("WHEN")
       ->transform(CLI::Transformer(uses, CLI::ignore_case).description(""));
-  search->add_flag("-0,--print0", options->null_separated, "End each path with a NUL byte")
-      ->excludes(json)
-      ->excludes(long_format);
-  json->excludes(long_format);
 }
 
 void AddSearch(CLI::App* app, SearchOptions* options) {

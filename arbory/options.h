@@ -90,6 +90,13 @@ struct SearchQuery {
   bool content = false;
 };
 
+// How what is found is printed.
+struct OutputOptions {
+  bool long_format = false;
+  bool json = false;
+  bool null_separated = false;
+};
+
 struct SearchOptions {
   CommonOptions common;
   SearchQuery query;
@@ -98,9 +105,7 @@ struct SearchOptions {
   bool descending = false;
   std::uint64_t limit = 0;  // 0: all
   std::uint64_t offset = 0;
-  bool long_format = false;
-  bool json = false;
-  bool null_separated = false;
+  OutputOptions output;
   bool verbose = false;      // say how the search was answered
   bool line_number = false;  // tell the first line of what matches by its contents
 };

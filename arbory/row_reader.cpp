@@ -18,11 +18,7 @@ std::uint64_t EndOf(const SearchOptions& options) {
 }  // namespace
 
 RowReader::RowReader(const std::string& path, const SearchOptions& options, const RowFormat& format)
-    : options_(options),
-      reader_(path),
-      writer_(format, reader_),
-      at_(options.offset),
-      end_(EndOf(options)) {
+    : options_(options), reader_(path), writer_(format), at_(options.offset), end_(EndOf(options)) {
   if (!options.sort_by.empty()) Sort();
 }
 

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <array>
 #include <charconv>
@@ -136,8 +137,16 @@ std::string UpperCase(std::string_view text) {
 
 }  // namespace
 
-RowWriter::RowWriter(const RowFormat& format, nas::ResultReader& reader)
-    : format_(format), reader_(reader) {
+RowFormat FormatOf(const OutputOptions& options) {
+  RowFormat format;
+  if (options.json) format.kind = RowFormat::Kind::kJson;
+  if (options.long_format) format.kind = RowFormat::Kind::kLong;
+  if (options.null_separated) format.end = '\0';
+  format.escape = isatty(STDOUT_FILENO) != 0 && !options.null_separated;
+  return format;
+}
+
+RowWriter::RowWriter(const RowFormat& format) : format_(format) {
   static const int never = 0;
   if (format.lines) scanner_.emplace(*format.lines, never);
 }
@@ -156,8 +165,8 @@ void RowWriter::AppendLong(const nas::FileAttributes& file, std::string* out) {
   constexpr size_t kSizeWidth = 12;
   AppendMode(file.mode, out);
   *out += ' ';
-  AppendPadded(Escaped(reader_.UserName(file.uid)), kNameWidth, out);
-  AppendPadded(Escaped(reader_.GroupName(file.gid)), kNameWidth, out);
+  AppendPadded(Escaped(owners_.User(file.uid)), kNameWidth, out);
+  AppendPadded(Escaped(owners_.Group(file.gid)), kNameWidth, out);
   const std::string size = std::to_string(file.size);
   if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
   *out += size + " " + LocalTime(file.mtime) + " ";
@@ -200,9 +209,9 @@ void RowWriter::AppendJson(const nas::ResultRow& row, const Line& line, std::str
   members.Text("name", row.name);
   JsonMembers owner(members.Name("owner"));
   owner.Number("gid", file.gid);
-  owner.Text("group", reader_.GroupName(file.gid));
+  owner.Text("group", owners_.Group(file.gid));
   owner.Number("uid", file.uid);
-  owner.Text("user", reader_.UserName(file.uid));
+  owner.Text("user", owners_.User(file.uid));
   owner.End();
   members.Text("path", "/" + std::string(row.share_name) + path_.substr(row.share_root.size()));
   char mode[sizeof("\"07777\"")];

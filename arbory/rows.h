@@ -5,9 +5,11 @@
 #include <optional>
 #include <string>
 
+#include "arbory/options.h"
+#include "nas/base/accounts.h"
 #include "nas/match/content_query.h"
 #include "nas/match/content_scanner.h"
-#include "nas/results/result_reader.h"
+#include "nas/results/block_reader.h"
 
 namespace arbory {
 
@@ -20,11 +22,13 @@ struct RowFormat {
   std::shared_ptr<const nas::ContentQuery> lines;
 };
 
-// For one thread. Borrows both.
+// For standard output.
+RowFormat FormatOf(const OutputOptions& options);
+
+// For one thread. Borrows the format.
 class RowWriter {
  public:
-  // `reader` knows the owners' names.
-  RowWriter(const RowFormat& format, nas::ResultReader& reader);
+  explicit RowWriter(const RowFormat& format);
 
   // Appends the row with its end.
   void Append(const nas::ResultRow& row, std::string* out);
@@ -38,7 +42,7 @@ class RowWriter {
   void AppendLine(const nas::MatchingLine& line, std::string* out) const;
 
   const RowFormat& format_;
-  nas::ResultReader& reader_;
+  nas::AccountTexts owners_;
   std::optional<nas::ContentScanner> scanner_;
   std::string path_;  // of the row, on disk
   std::string json_;

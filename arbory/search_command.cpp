@@ -64,12 +64,11 @@ enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 class Search {
  public:
   Search(Caller* caller, const SearchOptions& options)
-      : caller_(*caller), options_(options), started_(Clock::now()) {
-    if (options.json) format_.kind = RowFormat::Kind::kJson;
-    if (options.long_format) format_.kind = RowFormat::Kind::kLong;
-    if (options.null_separated) format_.end = '\0';
+      : caller_(*caller),
+        options_(options),
+        started_(Clock::now()),
+        format_(FormatOf(options.output)) {
     if (options.line_number) format_.lines = LinesOf(options.query.pattern);
-    format_.escape = isatty(STDOUT_FILENO) != 0 && !options.null_separated;
   }
 
   int Run(const Json::Value& params) {

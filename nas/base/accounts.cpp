@@ -101,6 +101,18 @@ std::string GroupText(gid_t gid) {
   return found ? found->name : std::to_string(gid);
 }
 
+const std::string& AccountTexts::User(uid_t uid) {
+  const auto [text, added] = users_.try_emplace(uid);
+  if (added) text->second = UserText(uid);
+  return text->second;
+}
+
+const std::string& AccountTexts::Group(gid_t gid) {
+  const auto [text, added] = groups_.try_emplace(gid);
+  if (added) text->second = GroupText(gid);
+  return text->second;
+}
+
 void LoadNameService() {
   constexpr char kRoot[] = "root";
   if (geteuid() != 0) return;  // only root's calls look up groups, to become their user

@@ -8,8 +8,6 @@
 #include <algorithm>
 #include <stdexcept>
 
-#include "nas/base/accounts.h"
-
 namespace nas {
 namespace {
 
@@ -153,18 +151,6 @@ void ResultReader::Purge(const std::vector<std::uint32_t>& numbers) {
   Statement insert(db_, "INSERT OR IGNORE INTO purged VALUES(?)");
   for (const std::uint32_t number : numbers) insert.Bind(1, number).Run();
   transaction.Commit();
-}
-
-const std::string& ResultReader::UserName(std::uint32_t uid) {
-  const auto [name, added] = user_names_.try_emplace(uid);
-  if (added) name->second = UserText(uid);
-  return name->second;
-}
-
-const std::string& ResultReader::GroupName(std::uint32_t gid) {
-  const auto [name, added] = group_names_.try_emplace(gid);
-  if (added) name->second = GroupText(gid);
-  return name->second;
 }
 
 }  // namespace nas

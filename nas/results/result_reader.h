@@ -7,7 +7,6 @@
 // called again after that.
 
 #include <cstdint>
-#include <map>
 #include <optional>
 #include <string>
 #include <unordered_set>
@@ -63,10 +62,6 @@ class ResultReader {
   // this reader leaves them out from now on all the same.
   void Purge(const std::vector<std::uint32_t>& numbers);
 
-  // The owners' names, or the number in decimal where there is none.
-  const std::string& UserName(std::uint32_t uid);
-  const std::string& GroupName(std::uint32_t gid);
-
  private:
   void ReadPurged();
   std::vector<bool> Passing(const Selection& selection);
@@ -79,8 +74,6 @@ class ResultReader {
   RowSorter sorter_{db_, blocks_};
   std::unordered_set<std::uint32_t> purged_;
   std::unordered_set<std::uint32_t> purged_here_;  // by this reader, stored or not
-  std::map<std::uint32_t, std::string> user_names_;
-  std::map<std::uint32_t, std::string> group_names_;
 };
 
 }  // namespace nas

@@ -11,6 +11,7 @@
 #include <optional>
 #include <utility>
 
+#include "nas/base/accounts.h"
 #include "nas/base/error.h"
 #include "nas/match/file_kinds.h"
 #include "nas/match/query_match.h"
@@ -55,8 +56,7 @@ bool AsksMoreThanRows(const nas::QueryNode& leaf) {
 // Lends rows to a callback in the platform's form, row after row from the same memory.
 class Lender {
  public:
-  Lender(nas::ResultReader& reader, SelectCallback callback, void* context)
-      : reader_(reader), callback_(callback), context_(context) {}
+  Lender(SelectCallback callback, void* context) : callback_(callback), context_(context) {}
 
   BOOL Lend(const nas::ResultRow& row) {
     const nas::FileAttributes& file = *row.attributes;
@@ -70,8 +70,8 @@ class Lender {
     data.relative_path = relative_path_.data();
     data.extension = Keep(extension_, nas::ExtensionOf(row.name));
     data.mode = file.mode;
-    data.owner_name = Keep(owner_, reader_.UserName(file.uid));
-    data.group_name = Keep(group_, reader_.GroupName(file.gid));
+    data.owner_name = Keep(owner_, owners_.User(file.uid));
+    data.group_name = Keep(group_, owners_.Group(file.gid));
     data.uid = file.uid;
     data.gid = file.gid;
     data.is_dir = S_ISDIR(file.mode);
@@ -89,7 +89,7 @@ class Lender {
     return kept.data();
   }
 
-  nas::ResultReader& reader_;
+  nas::AccountTexts owners_;
   const SelectCallback callback_;
   void* const context_;
   std::string share_root_;
@@ -144,7 +144,7 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
   }
   const nas::ResultReader::Page page = reader.Select(selection, offset, limit);
   *total = page.total;
-  Lender lender(reader, callback, context);
+  Lender lender(callback, context);
   purges_.clear();
   const struct Selecting {
     std::optional<std::uint32_t>& current;
