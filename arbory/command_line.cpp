@@ -82,6 +82,19 @@ void AddQueryOptions(CLI::App* command, SearchQuery* query) {
   });
 }
 
+void AddFindQuery(CLI::App* command, FindOptions* find) {
+  command->add_option("WORDS", find->words, "What to look for");
+  AddCriteria(command, &find->query);
+  command->get_option("--content")->group("");  // refused with a sentence
+  command->final_callback([find] {
+    for (std::string& word : find->words) {
+      Unmark(&word);
+      find->query.pattern += (&word == &find->words.front() ? "" : " ") + word;
+    }
+    for (std::string& folder : find->query.folders) Unmark(&folder);
+  });
+}
+
 void AddFormat(CLI::App* command, OutputOptions* output) {
   CLI::Option* long_format = command->add_flag("-l,--long", output->long_format,
                                                "Mode, owner, group, size and time of each file");

@@ -26,6 +26,10 @@ void AddCommonOptions(CLI::App* command, CommonOptions* common);
 // not be read. `query` must live as long as `command`.
 void AddQueryOptions(CLI::App* command, SearchQuery* query);
 
+// WORDS, --in and the criteria, in the same way: the query's pattern is the words then, and it has
+// no folder where none was given.
+void AddFindQuery(CLI::App* command, FindOptions* find);
+
 // -l, --json and -0, in the current group.
 void AddFormat(CLI::App* command, OutputOptions* output);
 

@@ -44,6 +44,14 @@ std::vector<std::string> RealFolders(const std::vector<std::string>& folders, bo
   return outermost;
 }
 
+// The directory to share for a folder. Only the share "homes" may lie in or be a folder "homes", so
+// below one the share begins above it.
+std::string ShareRoot(const std::string& path) {
+  return path.substr(0, (path + "/").find("/homes/"));
+}
+
+}  // namespace
+
 const nas::Share* InnermostShare(const std::string& path, const std::vector<nas::Share>& shares) {
   const nas::Share* best = nullptr;
   for (const nas::Share& share : shares) {
@@ -52,14 +60,6 @@ const nas::Share* InnermostShare(const std::string& path, const std::vector<nas:
   }
   return best;
 }
-
-// The directory to share for a folder. Only the share "homes" may lie in or be a folder "homes", so
-// below one the share begins above it.
-std::string ShareRoot(const std::string& path) {
-  return path.substr(0, (path + "/").find("/homes/"));
-}
-
-}  // namespace
 
 std::string FreeShareName(const std::string& real_path, const std::vector<std::string>& taken) {
   constexpr size_t kMaxBytes = 200;  // leaves room for a number

@@ -20,6 +20,11 @@ struct Locations {
 Locations LocateFolders(const std::vector<std::string>& folders,
                         const std::vector<nas::Share>& shares, bool recursive);
 
+// The share that holds the folder at `real_path` (empty: the root directory), the innermost where
+// there are several; null where there is none.
+const nas::Share* InnermostShare(const std::string& real_path,
+                                 const std::vector<nas::Share>& shares);
+
 // A name for a share of its own that holds the folder at `real_path`: like the folder's where that
 // is allowed and not among `taken`.
 std::string FreeShareName(const std::string& real_path, const std::vector<std::string>& taken);

@@ -3,6 +3,8 @@
 #include <unistd.h>
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
+#include <charconv>
 #include <exception>
 #include <map>
 #include <memory>
@@ -11,12 +13,14 @@
 
 #include "arbory/call_command.h"
 #include "arbory/command_line.h"
+#include "arbory/find_command.h"
 #include "arbory/index_command.h"
 #include "arbory/options.h"
 #include "arbory/search_command.h"
 #include "arbory/serve_command.h"
 #include "arbory/terminal.h"
 #include "arbory/why_command.h"
+#include "nas/search/index_question.h"
 
 namespace arbory {
 namespace {
@@ -61,6 +65,20 @@ constexpr char kWhyHelp[] =
     "Examples:\n"
     "  arbory why ~/photos/IMG_1.jpg holiday ~/photos -t image\n"
     "  arbory why /var/log/syslog 'error code' /var/log --content\n";
+
+constexpr char kFindHelp[] =
+    "The best first: names that begin with the words, whole words, little depth, the\n"
+    "newest. Only the index is asked (arbory index): nothing is walked or stored. WORDS\n"
+    "are a pattern of arbory search, whose help tells of SIZE and TIME as well. Without\n"
+    "WORDS, on a terminal, the program fzf shows what is found while you type, and the\n"
+    "path that you choose is printed.\n"
+    "\n"
+    "Exit status: 0 found, 1 nothing found, 2 error or no index, 130 interrupted.\n"
+    "\n"
+    "Examples:\n"
+    "  arbory find holiday ext:jpg\n"
+    "  arbory find plan --in ~/documents --mtime-from last-7-days -l\n"
+    "  vi \"$(arbory find)\"\n";
 
 constexpr char kIndexHelp[] =
     "Keeps the names of all shares and volumes in mind, so that searches need not read the\n"
@@ -146,6 +164,34 @@ void AddSearch(CLI::App* app, SearchOptions* options) {
   search->footer(std::string(kQueryHelp) + kSearchHelp);
 }
 
+CLI::App* AddFind(CLI::App* app, FindOptions* options) {
+  CLI::App* find = app->add_subcommand("find", "Print the best matches that the index knows");
+  AddFindQuery(find, options);
+  find->option_defaults()->group("Output");
+  const CLI::Validator count(
+      [](const std::string& text) {
+        size_t number = 0;
+        const auto [end, failed] = std::from_chars(text.data(), text.data() + text.size(), number);
+        const bool whole = failed == std::errc() && end == text.data() + text.size();
+        if (whole && number > 0 && number <= nas::kMostBest) return std::string();
+        return "'" + text + "' is no number from 1 to " + std::to_string(nas::kMostBest) +
+               "; arbory search lists all";
+      },
+      "");
+  find->add_option("--limit", options->limit, "Print at most N files; 100 by default")
+      ->type_name("N")
+      ->check(count);
+  AddFormat(find, &options->output);
+  find->add_flag("--choices", options->choices)->group("");
+  find->option_defaults()->group("Where and as whom");
+  find->add_option("--in", options->query.folders, "Look there, not in all shares and volumes")
+      ->type_name("FOLDER")
+      ->allow_extra_args(false);
+  AddCommonOptions(find, &options->common);
+  find->footer(kFindHelp);
+  return find;
+}
+
 CLI::App* AddWhy(CLI::App* app, WhyOptions* options) {
   CLI::App* why = app->add_subcommand("why", "Tell why a search does not find a file");
   why->add_option("FILE", options->file, "The file, or folder, that it should find")->required();
@@ -202,8 +248,11 @@ int Run(int argc, char** argv) {
   CLI::App* serve = AddServe(&app, &serve_options);
   IndexOptions index_options;
   CLI::App* index = AddIndex(&app, &index_options);
+  FindOptions find_options;
+  find_options.arguments.assign(argv + std::min(argc, 1), argv + argc);
   WhyOptions why_options;
   AddSearch(&app, &search_options);
+  CLI::App* find = AddFind(&app, &find_options);
   CLI::App* why = AddWhy(&app, &why_options);
   try {
     app.parse(MarkedArguments(argc, argv));
@@ -217,6 +266,7 @@ int Run(int argc, char** argv) {
     return RunCallCommand(call_options);
   }
   if (index->parsed()) return RunIndexCommand(index_options);
+  if (find->parsed()) return RunFindCommand(find_options);
   if (serve->parsed()) return RunServeCommand(serve_options);
   if (why->parsed()) {
     Unmark(&why_options.file);

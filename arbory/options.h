@@ -110,6 +110,18 @@ struct SearchOptions {
   bool line_number = false;  // tell the first line of what matches by its contents
 };
 
+struct FindOptions {
+  static constexpr size_t kUsualLimit = 100;  // what an eye runs over
+
+  CommonOptions common;
+  std::vector<std::string> words;
+  SearchQuery query;  // its pattern is the words; all shares and volumes where it has no folder
+  OutputOptions output;
+  size_t limit = kUsualLimit;
+  bool choices = false;                // for the picker, which runs the program with it
+  std::vector<std::string> arguments;  // all of the command line
+};
+
 struct WhyOptions {
   std::string file;
   SearchOptions search;  // whose results FILE is not among

@@ -10,6 +10,7 @@
 #include <ctime>
 
 #include "arbory/terminal.h"
+#include "nas/base/hex.h"
 #include "nas/base/json_text.h"
 #include "nas/base/utf8.h"
 #include "nas/match/file_kinds.h"
@@ -146,6 +147,20 @@ RowFormat FormatOf(const OutputOptions& options) {
   return format;
 }
 
+std::string PathOfChoice(std::string_view line) {
+  constexpr int kDigitBits = 4;
+  const std::string_view digits = line.substr(0, line.find('\t'));
+  if (digits.size() == line.size() || digits.size() % 2 != 0) return "";
+  std::string path;
+  for (size_t at = 0; at < digits.size(); at += 2) {
+    const int high = nas::HexValue(digits[at]);
+    const int low = nas::HexValue(digits[at + 1]);
+    if (high < 0 || low < 0) return "";
+    path += static_cast<char>(high << kDigitBits | low);
+  }
+  return path;
+}
+
 RowWriter::RowWriter(const RowFormat& format) : format_(format) {
   static const int never = 0;
   if (format.lines) scanner_.emplace(*format.lines, never);
@@ -248,6 +263,13 @@ void RowWriter::Append(const nas::ResultRow& row, std::string* out) {
       break;
     case RowFormat::Kind::kJson:
       AppendJson(row, line, out);
+      break;
+    case RowFormat::Kind::kChoice:
+      for (const char byte : path_) {
+        nas::AppendHex(static_cast<unsigned char>(byte), nas::kLowerHex, out);
+      }
+      *out += '\t';
+      AppendEscaped(path_, out);
       break;
   }
   if (line && format_.kind != RowFormat::Kind::kJson) AppendLine(*line, out);

@@ -4,6 +4,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "arbory/options.h"
 #include "nas/base/accounts.h"
@@ -14,7 +15,9 @@
 namespace arbory {
 
 struct RowFormat {
-  enum class Kind { kPath, kLong, kJson };
+  // kChoice is for a picker that shows text and cannot be trusted with a path's bytes: the path in
+  // hexadecimal digits, a tab, and the path as a terminal may show it.
+  enum class Kind { kPath, kLong, kJson, kChoice };
   Kind kind = Kind::kPath;
   char end = '\n';
   bool escape = false;  // for a terminal
@@ -24,6 +27,9 @@ struct RowFormat {
 
 // For standard output.
 RowFormat FormatOf(const OutputOptions& options);
+
+// The path of a line of kChoice, without its end; empty for any other line.
+std::string PathOfChoice(std::string_view line);
 
 // For one thread. Borrows the format.
 class RowWriter {
