@@ -22,9 +22,9 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 // times as texts: "size_from", "size_to", and bounds as "mtime", "crtime" and "atime".
 nas::Child StartReadQuery(const nas::ApiCall& call);
 
-// What the index knows at once: {"index","found","more","rows"} (nas/search/instant.h), or {"wrong"}
-// as StartReadQuery has it. The call's parameters are those of StartReadQuery and "folder_path", a
-// location or several; without it all shares that the user can list.
+// What the index knows at once: {"index","found","more","rows"} (nas/search/instant.h), or
+// {"wrong"} as StartReadQuery has it. The call's parameters are those of StartReadQuery and
+// "folder_path", a location or several; without it all shares that the user can list.
 nas::Child StartInstant(const nas::ApiCall& call);
 
 // What the user's search, started with the call's parameters, came close to in its folders:
