@@ -81,8 +81,9 @@ class Search {
       throw;
     }
     CleanUp();
-    if (found_nothing_)
+    if (found_nothing_ && IsWorthExplaining()) {
       ExplainNothing(params, std::clamp(ran_ / kHintShare, kLeastHint, kMostHint));
+    }
     return exit_code;
   }
 
@@ -206,9 +207,13 @@ class Search {
     TellOfSkipped(state);
     if (options_.verbose) Complain("answered " + SourceText(state));
     found_nothing_ = ending == Ending::kComplete && state.exists && state.matches == 0;
+    from_index_ = state.source == task_record::kFromIndex;
     ran_ = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
     return printed_ > 0 ? kExitSuccess : kExitNothing;
   }
+
+  // What answers at once shall not walk for a script, which reads no advice.
+  bool IsWorthExplaining() const { return !from_index_ || isatty(STDERR_FILENO) != 0; }
 
   bool CameToEnd(Ending ending, const RunningSearch& state) {
     const bool walk_refused = options_.common.index_use == nas::IndexUse::kAlways &&
@@ -262,6 +267,7 @@ class Search {
   std::string failure_text_;  // of kFailed
   bool running_ = true;
   bool found_nothing_ = false;
+  bool from_index_ = false;
   std::chrono::milliseconds ran_{0};
 };
 
