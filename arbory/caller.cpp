@@ -41,6 +41,11 @@ void Caller::AddShares(const std::vector<nas::ShareSetting>& shares) {
   nas::Configure(config_);
 }
 
+void Caller::LeaveUnsorted() {
+  config_.keep_orderings = false;
+  nas::Configure(config_);
+}
+
 const nas::Module& Caller::module() {
   if (!module_) module_ = std::make_unique<nas::Module>(std::string());
   return *module_;

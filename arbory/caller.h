@@ -42,6 +42,9 @@ class Caller {
   // Searches begun from here on end when this program is gone (nas::ApiCall::leased).
   void LeaseSearches() { leased_ = true; }
 
+  // Nobody will ask for the results of searches begun from here on in the order of a column.
+  void LeaveUnsorted();
+
   // Makes one call as this user; see nas::RunCall.
   nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
                   const nas::ReplyEncoder& encode) const;

@@ -278,6 +278,7 @@ int RunSearchCommand(const SearchOptions& options) {
   Caller caller(options.common);
   nas::PrepareForCalls();
   const Json::Value params = PrepareSearch(options.query, &caller);
+  if (options.sort_by.empty()) caller.LeaveUnsorted();
   // From here on the program follows what the user's own processes write.
   caller.module();
   caller.BecomeUser();

@@ -233,7 +233,7 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
   }
   writer_->Complete();
   Report(search.progress, true);
-  if (writer_->rows() >= kWorthSorting) {
+  if (writer_->rows() >= kWorthSorting && nas::CurrentConfig().keep_orderings) {
     writer_.reset();
     WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
   }

@@ -90,7 +90,9 @@ struct Config {
   std::uint64_t large_call_memory_bytes() const { return Megabytes(large_call_memory_mb); }
   static std::uint64_t Megabytes(int count) { return static_cast<std::uint64_t>(count) << 20; }
   ServerSettings server;
-  IndexUse index_use = IndexUse::kAuto;  // of one run of the program; no file says it
+  // Of one run of the program; no file says them.
+  IndexUse index_use = IndexUse::kAuto;
+  bool keep_orderings = true;  // results may be listed later, sorted by any column
   IndexSettings index;
 
   bool operator==(const Config&) const = default;

@@ -4,6 +4,7 @@
 #include <memory>
 #include <set>
 
+#include "nas/base/sqlite.h"
 #include "nas/results/result_file.h"
 #include "nas/system/user_state.h"
 #include "nas/system/volumes.h"
@@ -116,6 +117,33 @@ TEST_F(Walker, AFailedWalkTellsHowFarItCame) {
   ASSERT_TRUE(walk.isObject());
   EXPECT_EQ(walk[task_record::kMatches], 3);
   EXPECT_NE(walk[task_record::kPhase], task_record::kDonePhase);
+}
+
+// Orderings take longer than finding what they order.
+TEST_F(Walker, ManyResultsAreSortedUnlessNobodyWillAsk) {
+  constexpr int kFiles = 100'000;  // as many as are worth sorting
+  for (int i = 0; i < kFiles; ++i) {
+    ASSERT_EQ(mknod((share_ + "/" + std::to_string(i)).c_str(), S_IFREG | 0600, 0), 0);
+  }
+  nas::Config config = nas::CurrentConfig();
+  for (const bool kept : {true, false}) {
+    SCOPED_TRACE(kept);
+    config.keep_orderings = kept;
+    nas::Configure(config);
+    // Elsewhere, as whoever sorts may outlive the walk.
+    EXPECT_TRUE(InChild([&] {
+      auto walker = NewWalker();
+      ASSERT_TRUE(walker->init({"/share"}, {}));
+      NameInTask(*walker);
+      ASSERT_TRUE(Walk(*walker));
+      while (waitpid(-1, nullptr, 0) > 0) {
+      }
+      const std::string path =
+          nas::ResultPath(nas::ResultFolderPath(walker->getDBVol(), me_), walker->getDBTaskId());
+      const nas::Database results(path, SQLITE_OPEN_READWRITE, 0);
+      EXPECT_EQ(nas::Statement(results, "SELECT 1 FROM ordering").Step(), kept);
+    }));
+  }
 }
 
 TEST_F(Walker, AStopEndsTheOpeningOfLocations) {
