@@ -67,11 +67,11 @@ constexpr char kWhyHelp[] =
     "  arbory why /var/log/syslog 'error code' /var/log --content\n";
 
 constexpr char kFindHelp[] =
-    "The best first: names that begin with the words, whole words, little depth, the\n"
-    "newest. Only the index is asked (arbory index): nothing is walked or stored. WORDS\n"
-    "are a pattern of arbory search, whose help tells of SIZE and TIME as well. Without\n"
-    "WORDS, on a terminal, the program fzf shows what is found while you type, and the\n"
-    "path that you choose is printed.\n"
+    "The best first: names that begin with the words, whole words, little depth,\n"
+    "the newest. Only the index is asked (arbory index): nothing is walked or stored.\n"
+    "WORDS are a pattern of arbory search, whose help tells of SIZE and TIME as well.\n"
+    "Without WORDS, on a terminal, the program fzf shows what is found while you\n"
+    "type, and the path that you choose is printed.\n"
     "\n"
     "Exit status: 0 found, 1 nothing found, 2 error or no index, 130 interrupted.\n"
     "\n"
