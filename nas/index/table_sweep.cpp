@@ -32,6 +32,9 @@ class Sweeper {
   // Whether the folder is still the one of the table.
   bool Compare(int parent, const char* name, FolderId id, std::vector<FolderId>& differ);
   void CompareBelow(UniqueFd fd, FolderId id, std::vector<FolderId>& differ);
+  // The folder is not where the table has it. It may be anywhere else, changed or not, and be asked
+  // about there.
+  void Gone(FolderId id, std::vector<FolderId>& differ) const;
   void Open(const Queue::Task& task, std::vector<FolderId>& differ);
   size_t TreeOf(FolderId id) const;
   bool HasFolders(FolderId id) const { return table_.subtree_end(id) > id + 1; }
@@ -72,18 +75,21 @@ bool Sweeper::Compare(int parent, const char* name, FolderId id, std::vector<Fol
   return true;
 }
 
+void Sweeper::Gone(FolderId id, std::vector<FolderId>& differ) const {
+  if (table_.parent(id) != NameTable::kNoFolder) differ.push_back(table_.parent(id));
+  for (FolderId each = id; each < table_.subtree_end(id); ++each) differ.push_back(each);
+}
+
 void Sweeper::CompareBelow(UniqueFd fd, FolderId id, std::vector<FolderId>& differ) {
   std::vector<FolderId> below;
-  bool gone = false;
   const FolderId end = table_.subtree_end(id);
   for (FolderId child = id + 1; child < end && !stopped(); child = table_.subtree_end(child)) {
     if (!Compare(fd.get(), table_.folder_name(child).data(), child, differ)) {
-      gone = true;
+      Gone(child, differ);
     } else if (HasFolders(child)) {
       below.push_back(child);
     }
   }
-  if (gone) differ.push_back(id);
   queue_.Push(std::move(fd), std::move(below));
 }
 
@@ -104,7 +110,7 @@ void Sweeper::Open(const Queue::Task& task, std::vector<FolderId>& differ) {
   if (fd) return CompareBelow(std::move(fd), id, differ);
   if (errno == EMFILE || errno == ENFILE || errno == ENOMEM) return queue_.Fail(ErrnoError());
   // Gone since it was compared, or a mount point by now.
-  differ.push_back(table_.parent(id) == NameTable::kNoFolder ? id : table_.parent(id));
+  Gone(id, differ);
 }
 
 Result<std::vector<FolderId>> Sweeper::Sweep() {

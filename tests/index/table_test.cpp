@@ -5,6 +5,8 @@
 #include <fcntl.h>
 #include <sys/mount.h>
 
+#include <algorithm>
+
 #include "nas/index/table_compare.h"
 #include "nas/index/table_sweep.h"
 #include "nas/index/table_writer.h"
@@ -406,6 +408,22 @@ TEST_F(Table, HasNoStampOfAFolderThatHasJustChanged) {
     EXPECT_EQ(*swept, std::vector<FolderId>{table.Find(key)});
     return true;
   }));
+}
+
+// Whoever asks about a folder finds it by its key, wherever it has gone.
+TEST_F(Table, DoesNotBelieveWhatHasMovedAway) {
+  fs::create_directories(Path("moved/below"));
+  fs::create_directory(Path("stays"));
+  LetStampsSettle();
+  const nas::NameTable table = Scan();
+  fs::rename(Path("moved"), Path("stays/elsewhere"));
+  WriteFile(Path("stays/elsewhere/below/new"), "");
+  const auto swept = nas::SweepFolders(table, Roots());
+  ASSERT_TRUE(swept);
+  for (const char* folder : {"stays/elsewhere", "stays/elsewhere/below", "stays"}) {
+    const FolderId id = table.Find(KeyAt(Path(folder)));
+    EXPECT_NE(std::ranges::find(*swept, id), swept->end()) << folder;
+  }
 }
 
 }  // namespace
