@@ -77,7 +77,10 @@ std::optional<std::string> QueryValue(std::string_view query, std::string_view n
     query.remove_prefix(std::min(query.size(), pair.size() + 1));
     const size_t equals = pair.find('=');
     if (pair.substr(0, equals) != name) continue;
-    return Decoded(equals == std::string_view::npos ? "" : pair.substr(equals + 1));
+    // Forms write a space as "+", and a "+" as %2B.
+    std::string value(equals == std::string_view::npos ? "" : pair.substr(equals + 1));
+    std::ranges::replace(value, '+', ' ');
+    return Decoded(value);
   }
   return std::nullopt;
 }
