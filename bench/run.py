@@ -15,6 +15,8 @@ import sys
 import tempfile
 import time
 
+import index as name_index
+
 ROUNDS = 7
 COLD_ROUNDS = 3
 THREADS = str(os.cpu_count())
@@ -232,7 +234,17 @@ def main():
         for name, commands, target in cold_comparisons(args, trees):
             if args.only in name:
                 rows += compare(name, commands, target, COLD_ROUNDS, drop_caches)
+    measured = []
+    if os.geteuid() == 0 and (args.only in "index" or args.only.startswith("index")):
+        names = trees.generated("names", 1_000_000)
+        index = name_index.Index(args.bin, names)
+        for name, commands, target in name_index.comparisons(index, ["fdfind", "-uu"]):
+            if args.only in name:
+                rows += compare(name, commands, target)
+        measured = list(name_index.measures(index, names))
     text = table(head, rows)
+    if measured:
+        text += "\n" + table(["the name index", "measured", "must"], measured)
     if args.only in "service":
         text += "\n" + table(["as a client of the module", "measured", "must"],
                              list(service_rows(args, trees)))
