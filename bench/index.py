@@ -124,9 +124,9 @@ def instant(index):
     took = []
     with server(index) as (connection, cookie):
         for number in range(QUESTIONS):
-            query = urllib.parse.quote(INSTANT[number % len(INSTANT)])
+            query = urllib.parse.quote(json.dumps({"pattern": INSTANT[number % len(INSTANT)]}))
             begun = time.perf_counter()
-            connection.request("GET", "/instant?q=" + query, headers={"Cookie": cookie})
+            connection.request("GET", "/instant?params=" + query, headers={"Cookie": cookie})
             reply = connection.getresponse()
             text = reply.read()
             took.append((time.perf_counter() - begun) * 1000)
