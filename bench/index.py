@@ -43,8 +43,8 @@ class Index:
             time.sleep(0.02)
         self.built = time.perf_counter() - begun
 
-    def spawn(self, command, before=(), **more):
-        return subprocess.Popen([*before, self.program, command, "--config", self.config],
+    def spawn(self, *words, before=(), **more):
+        return subprocess.Popen([*before, self.program, *words, "--config", self.config],
                                 stderr=subprocess.DEVNULL, **more)
 
     def status(self):
@@ -104,7 +104,7 @@ def comparisons(index, fd):
 
 @contextlib.contextmanager
 def server(index):
-    process = index.spawn("serve", stdout=subprocess.PIPE, text=True, before=())
+    process = index.spawn("serve", "--user", "root", stdout=subprocess.PIPE, text=True)
     try:
         match = None
         while not match:

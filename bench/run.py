@@ -241,6 +241,8 @@ def main():
         for name, commands, target in name_index.comparisons(index, ["fdfind", "-uu"]):
             if args.only in name:
                 rows += compare(name, commands, target)
+                print(*(" | ".join(row) for row in rows[-len(commands) + 1:]), sep="\n",
+                      file=sys.stderr)
         measured = list(name_index.measures(index, names))
     text = table(head, rows)
     if measured:
