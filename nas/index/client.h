@@ -36,7 +36,7 @@ enum class HelloKind : char {
   kRebuild = 'B',   // root or the daemon's own user: make all tables anew
 };
 inline constexpr size_t kHelloBytes = 2;
-inline constexpr char kHelloAsksTimes = 1;  // flag: sizes or times decide or order what is shown
+inline constexpr char kHelloAsksTimes = 1;  // flag: times of change decide what is found
 
 struct IndexAnswer {
   UniqueFd connection;  // ready for the question; none where `state` is not kIndexCurrent

@@ -65,12 +65,9 @@ bool ReadAll(const Json::Value& json, IndexQuestion& question) {
 
 }  // namespace
 
-bool AsksTimesOrSizes(const QueryNode& query) {
-  using Kind = QueryNode::Kind;
-  return AnyLeaf(query, [](const QueryNode& leaf) {
-    return leaf.kind == Kind::kSize || leaf.kind == Kind::kModified ||
-           leaf.kind == Kind::kCreated || leaf.kind == Kind::kEmpty;
-  });
+bool AsksTimes(const QueryNode& query) {
+  return AnyLeaf(query,
+                 [](const QueryNode& leaf) { return leaf.kind == QueryNode::Kind::kModified; });
 }
 
 std::string QuestionText(const IndexQuestion& question) {

@@ -42,8 +42,10 @@ struct IndexQuestion {
 // As many rows as an instant question may ask for.
 inline constexpr size_t kMostBest = 1000;
 
-// What the daemon is told before the question: such a one needs attributes that are up to date.
-bool AsksTimesOrSizes(const QueryNode& query);
+// What the daemon is told before the question: files that are written to by memory alone have to be
+// looked for, since that changes their time of change without an event. Nothing else of them
+// changes so: neither size nor time of creation.
+bool AsksTimes(const QueryNode& query);
 
 std::string QuestionText(const IndexQuestion& question);
 // Fails with kErrorIllegal.

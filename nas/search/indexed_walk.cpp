@@ -55,7 +55,7 @@ IndexedWalk::IndexedWalk(const std::vector<Location>& locations, Settings settin
       search_(search),
       gate_(locations, settings_.recursive),
       gate_to_mounts_(OnOneMount(gate_.rules())),
-      asks_times_(AsksTimesOrSizes(search.criteria.root)),
+      asks_times_(AsksTimes(search.criteria.root)),
       walk_(locations, gate_, search) {
   std::set<std::pair<dev_t, ino_t>> known;
   for (size_t i = 0; i < locations.size(); ++i) {

@@ -116,7 +116,7 @@ Result<InstantReply> AskInstantly(
                       .mounts = mounts ? *mounts : std::vector<std::string>(),
                       .rules = FolderGate::RulesFor(locations, recursive),
                       .best = std::min(most, kMostBest)});
-    const IndexAnswer answer = ask(location.fd.get(), AsksTimesOrSizes(query));
+    const IndexAnswer answer = ask(location.fd.get(), AsksTimes(query));
     std::string state = answer.state;
     if (answer.connection) {
       const bool sent = SendFrame(answer.connection.get(), FrameType::kQuestion, question).ok();
