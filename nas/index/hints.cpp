@@ -12,38 +12,35 @@ constexpr size_t kNamesPerEntries = 16;
 
 }  // namespace
 
+NameTable::FolderId Hints::IdOf(std::string_view folder) const {
+  return table_ == nullptr ? NameTable::kNoFolder : table_->Find(folder);
+}
+
+void Hints::KeepName(std::string_view folder, Names Kept::*names, std::string_view name) {
+  if (!making_) return;
+  Names& kept = folders_[std::string(folder)].*names;
+  if (kept.contains(name)) return;
+  kept.emplace(name);
+  ++kept_;
+}
+
 void Hints::NameChanged(std::string_view folder, std::string_view name) {
   ++events_;
-  const auto id = table_ == nullptr ? NameTable::kNoFolder : table_->Find(folder);
-  if (id != NameTable::kNoFolder) Note(id, name);
-  if (making_) {
-    Kept& kept = folders_[std::string(folder)];
-    if (!kept.names.contains(name)) {
-      kept.names.emplace(name);
-      ++kept_;
-    }
-  }
+  if (const auto id = IdOf(folder); id != NameTable::kNoFolder) Note(id, name);
+  KeepName(folder, &Kept::names, name);
   CheckBounds();
 }
 
 void Hints::TreeCame(std::string_view folder, std::string_view name) {
   ++events_;
-  const auto id = table_ == nullptr ? NameTable::kNoFolder : table_->Find(folder);
-  if (id != NameTable::kNoFolder) NoteTree(id, name);
-  if (making_) {
-    Kept& kept = folders_[std::string(folder)];
-    if (!kept.trees.contains(name)) {
-      kept.trees.emplace(name);
-      ++kept_;
-    }
-  }
+  if (const auto id = IdOf(folder); id != NameTable::kNoFolder) NoteTree(id, name);
+  KeepName(folder, &Kept::trees, name);
   CheckBounds();
 }
 
 void Hints::FolderChanged(std::string_view folder) {
   ++events_;
-  const auto id = table_ == nullptr ? NameTable::kNoFolder : table_->Find(folder);
-  if (id != NameTable::kNoFolder) NoteFolder(id);
+  if (const auto id = IdOf(folder); id != NameTable::kNoFolder) NoteFolder(id);
   if (making_) {
     Kept& kept = folders_[std::string(folder)];
     kept_ += kept.folder ? 0 : 1;

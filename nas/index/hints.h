@@ -50,11 +50,16 @@ class Hints : public EventSink {
   std::uint64_t events() const { return events_; }
 
  private:
+  using Names = std::set<std::string, std::less<>>;
   struct Kept {
     bool folder = false;
-    std::set<std::string, std::less<>> names;
-    std::set<std::string, std::less<>> trees;
+    Names names;
+    Names trees;
   };
+
+  // In the table in use; kNoFolder where that does not know it.
+  NameTable::FolderId IdOf(std::string_view folder) const;
+  void KeepName(std::string_view folder, Names Kept::*names, std::string_view name);
   void Note(NameTable::FolderId folder, std::string_view name);
   void NoteTree(NameTable::FolderId folder, std::string_view name);
   void NoteFolder(NameTable::FolderId folder);
