@@ -107,22 +107,31 @@ function searchOnEnter(app: App): (event: KeyboardEvent) => void {
   };
 }
 
+// `label`: where no element around it has one.
+function Typed(props: { app: App; field: TextField; label?: string; placeholder?: string }) {
+  const { app, field, label, placeholder } = props;
+  return (
+    <input
+      type="text"
+      aria-label={label}
+      value={app.draft[field]}
+      placeholder={placeholder}
+      spellcheck={false}
+      autocapitalize="none"
+      autocomplete="off"
+      aria-invalid={app.draftError?.field === field}
+      onInput={(event) => app.edit({ [field]: event.currentTarget.value })}
+      onKeyDown={searchOnEnter(app)}
+    />
+  );
+}
+
 function Text({ app, field }: { app: App; field: TextField }) {
   const { label, placeholder } = CRITERIA[field];
   return (
     <label class={`labelled ${field}`}>
       <span>{label}</span>
-      <input
-        type="text"
-        value={app.draft[field]}
-        placeholder={placeholder}
-        spellcheck={false}
-        autocapitalize="none"
-        autocomplete="off"
-        aria-invalid={app.draftError?.field === field}
-        onInput={(event) => app.edit({ [field]: event.currentTarget.value })}
-        onKeyDown={searchOnEnter(app)}
-      />
+      <Typed app={app} field={field} placeholder={placeholder} />
     </label>
   );
 }
@@ -162,17 +171,11 @@ function Time({ app, field }: { app: App; field: TextField }) {
         </select>
       </label>
       {kind === WRITTEN && (
-        <input
-          type="text"
-          aria-label={`${label}, as written`}
-          value={value}
+        <Typed
+          app={app}
+          field={field}
+          label={`${label}, as written`}
           placeholder="2 weeks, 2026-07, <2025"
-          spellcheck={false}
-          autocapitalize="none"
-          autocomplete="off"
-          aria-invalid={app.draftError?.field === field}
-          onInput={(event) => app.edit({ [field]: event.currentTarget.value })}
-          onKeyDown={searchOnEnter(app)}
         />
       )}
       {kind === BETWEEN && (
