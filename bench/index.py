@@ -19,7 +19,6 @@ QUESTIONS = 300
 CHANGED = 20_000
 FRESH_ROUNDS = 40
 PATIENCE = 600
-SMALL_BOX = 256 << 20
 INSTANT = ["invoice", "xylophone", "zzz-nothing", "e", "*.jpg", "regex:[0-9]{3}x", "size:>1k",
            "modified:today", "ext:pdf report", "!invoice photo|music"]
 
@@ -27,7 +26,7 @@ INSTANT = ["invoice", "xylophone", "zzz-nothing", "e", "*.jpg", "regex:[0-9]{3}x
 class Index:
     """`arbory index` over one folder, and what asks it."""
 
-    def __init__(self, bin_dir, folder, before=()):
+    def __init__(self, bin_dir, folder):
         self.program = str(bin_dir / "arbory")
         self.folder = folder
         self.dir = tempfile.mkdtemp(prefix="arbory-bench-index-")
@@ -36,15 +35,15 @@ class Index:
             f'state_dir = "{self.dir}/state"\nvolumes = []\n[shares]\ntree = "{folder}"\n'
             '[server]\nlisten = "127.0.0.1:0"\naccess_log = false\n')
         begun = time.perf_counter()
-        self.daemon = self.spawn("index", before=before)
+        self.daemon = self.spawn("index")
         while not self.status()["current"]:
             if time.perf_counter() - begun > PATIENCE:
                 raise RuntimeError(f"the index is not current: {self.status()}")
             time.sleep(0.02)
         self.built = time.perf_counter() - begun
 
-    def spawn(self, *words, before=(), **more):
-        return subprocess.Popen([*before, self.program, *words, "--config", self.config],
+    def spawn(self, *words, **more):
+        return subprocess.Popen([self.program, *words, "--config", self.config],
                                 stderr=subprocess.DEVNULL, **more)
 
     def status(self):

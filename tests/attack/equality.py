@@ -391,13 +391,13 @@ class Equality:
         if os.stat(folder).st_dev != os.stat(top).st_dev:
             folder = top  # another file system, which is walked
         self.outcome.count("questions")
-        if self.search(user, "never", question, folder)[0] == 2:
+        status, walked, _ = self.search(user, "never", question, folder)
+        if status == 2:
             self.outcome.count("questions that a walk refuses")
             return
         got = self.from_index(user, question, folder)
         if got is None:
             return
-        status, walked, said = self.search(user, "never", question, folder)
         self.outcome.count("rows compared", len(walked))
         if got != walked:
             more, less = [list((Counter(one) - Counter(other)).elements())

@@ -44,21 +44,13 @@ std::vector<std::string> Arguments(const Json::Value& params, const std::string&
 class Differential : public ProgramTest {
  protected:
   Found ByEngine(const Json::Value& params, const std::string& folder) const {
-    std::vector<nas::Location> locations;
-    locations.push_back(std::move(*nas::OpenLocation("/share" + folder.substr(share_.size()))));
-    const arbory::Comparators comparators(params);
-    KeptRows rows(share_);
-    const int never = 0;
-    nas::SharedSearch search(comparators.get(), rows, never);
-    search.SearchContents(dir_, params["search_content"].asBool());
-    nas::FolderWalk walk(locations, params["recursive"].asBool(), search);
-    nas::ContentReading contents(locations, search);
-    nas::SearchJob job(search, {.report = [](const nas::WalkProgress&) {}, .stuck = {}});
-    EXPECT_TRUE(job.Run(walk, contents));
-    const Json::Value seen = search.progress.ToJson();
-    EXPECT_EQ(seen["matches"].asUInt64(), rows.paths().size());
+    EngineSearch engine(params, share_, folder, dir_);
+    nas::FolderWalk walk(engine.locations, params["recursive"].asBool(), engine.search);
+    engine.Run(walk);
+    const Json::Value seen = engine.search.progress.ToJson();
+    EXPECT_EQ(seen["matches"].asUInt64(), engine.rows.paths().size());
     EXPECT_EQ(seen["skipped"]["other"].asUInt64(), 0) << "something was opened that never is";
-    return {rows.paths(), static_cast<size_t>(seen["skipped"]["permission"].asUInt64())};
+    return {engine.rows.paths(), static_cast<size_t>(seen["skipped"]["permission"].asUInt64())};
   }
 
   // Asks of every file there is whether it would be found.

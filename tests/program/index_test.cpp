@@ -202,13 +202,9 @@ class Index : public ProgramTest {
 
   // The search by one source of names or another.
   Seen Search(const Json::Value& params, const std::string& folder, const WatchedTree* index) {
-    std::vector<nas::Location> locations;
-    locations.push_back(std::move(*nas::OpenLocation("/share" + folder.substr(share_.size()))));
-    const arbory::Comparators comparators(params);
-    KeptRows rows(share_);
-    const int never = 0;
-    nas::SharedSearch search(comparators.get(), rows, never);
-    search.SearchContents(results_, params["search_content"].asBool());
+    EngineSearch engine(params, share_, folder, results_);
+    const std::vector<nas::Location>& locations = engine.locations;
+    nas::SharedSearch& search = engine.search;
     const bool recursive = params["recursive"].asBool();
     std::unique_ptr<nas::NameSource> names;
     std::optional<nas::IndexSnapshot> snapshot;
@@ -230,10 +226,9 @@ class Index : public ProgramTest {
     } else {
       names = std::make_unique<nas::FolderWalk>(locations, recursive, search);
     }
-    nas::ContentReading contents(locations, search);
-    nas::SearchJob job(search, {.report = [](const nas::WalkProgress&) {}, .stuck = {}});
-    EXPECT_TRUE(job.Run(*names, contents));
-    Seen seen{{rows.paths().begin(), rows.paths().end()}, search.progress.ToJson()};
+    engine.Run(*names);
+    const std::vector<std::string>& paths = engine.rows.paths();
+    Seen seen{{paths.begin(), paths.end()}, search.progress.ToJson()};
     if (ask_) static_cast<nas::IndexedWalk&>(*names).Tell(&seen.source);
     return seen;
   }

@@ -1,5 +1,5 @@
 #pragma once
-// The rows of a search as paths.
+// Searches by the engine itself, whose rows are kept as paths.
 
 #include <cstring>
 #include <mutex>
@@ -7,7 +7,10 @@
 #include <string_view>
 #include <vector>
 
+#include "arbory/comparators.h"
 #include "nas/results/row_sink.h"
+#include "nas/search/content_reading.h"
+#include "nas/search/search_job.h"
 #include "tests/program/program_test.h"
 
 namespace program_test {
@@ -40,6 +43,29 @@ class KeptRows : public nas::RowSink {
   const std::string root_;
   std::mutex mutex_;  // guards paths_
   std::vector<std::string> paths_;
+};
+
+// A search by the engine itself, set up as a worker does; `folder` lies in the share whose root is
+// `share`.
+struct EngineSearch {
+  EngineSearch(const Json::Value& params, const std::string& share, const std::string& folder,
+               const std::string& temporary_folder)
+      : comparators(params), rows(share), search(comparators.get(), rows, never) {
+    locations.push_back(std::move(*nas::OpenLocation("/share" + folder.substr(share.size()))));
+    search.SearchContents(temporary_folder, params["search_content"].asBool());
+  }
+  // To its end.
+  void Run(nas::NameSource& names) {
+    nas::ContentReading contents(locations, search);
+    nas::SearchJob job(search, {.report = [](const nas::WalkProgress&) {}, .stuck = {}});
+    EXPECT_TRUE(job.Run(names, contents));
+  }
+
+  std::vector<nas::Location> locations;
+  const arbory::Comparators comparators;
+  KeptRows rows;
+  const int never = 0;
+  nas::SharedSearch search;
 };
 
 }  // namespace program_test
