@@ -78,7 +78,8 @@ void AddQueryOptions(CLI::App* command, SearchQuery* query) {
   command->final_callback([query] {
     Unmark(&query->pattern);
     for (std::string& folder : query->folders) Unmark(&folder);
-    if (query->folders.empty()) query->folders = {"."};
+    query->here = query->folders.empty();
+    if (query->here) query->folders = {"."};
   });
 }
 

@@ -161,7 +161,7 @@ int Find(const FindOptions& options) {
   if (!answer) return kExitInterrupted;
   const bool picks = WantsPicker(options);
   RowFormat format = FormatOf(options.output);
-  if (picks || options.choices) format = {RowFormat::Kind::kChoice, '\0', false, nullptr};
+  if (picks || options.choices) format = {.kind = RowFormat::Kind::kChoice, .end = '\0'};
   std::string text = RowsText(*answer, shares, format);
   if (picks) return Pick(options, std::move(text));
   const int code = Print(text);

@@ -142,6 +142,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
       ->type_name("N")
       ->check(count);
   AddFormat(search, &options->output);
+  search->add_flag("-a,--absolute", options->output.absolute, "Whole paths, as they are on disk");
   search->add_flag("-n,--line-number", options->line_number,
                    "First matching line of files found by their contents; means --content too");
   search->add_flag("-v,--verbose", options->verbose, "Say how the search was answered");

@@ -76,6 +76,7 @@ struct TimeRange {
 struct SearchQuery {
   std::string pattern;
   std::vector<std::string> folders;
+  bool here = false;  // no folder was named, so it is the current one
 
   std::vector<std::string> extensions;
   std::string type;
@@ -95,6 +96,7 @@ struct OutputOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
+  bool absolute = false;
 };
 
 struct SearchOptions {

@@ -166,16 +166,30 @@ RowWriter::RowWriter(const RowFormat& format) : format_(format) {
   if (format.lines) scanner_.emplace(*format.lines, never);
 }
 
-void RowWriter::AppendName(std::string* out) const {
+void RowWriter::EnterFolder(const nas::ResultRow& row) {
+  const bool same = !real_folder_.empty() && row.folder == folder_ && row.share_root == share_root_;
+  if (same) return;
+  share_root_ = row.share_root;
+  folder_ = row.folder;
+  const std::string real = share_root_ + (folder_.empty() ? "" : "/" + folder_);
+  real_folder_ = real + "/";
+  shown_folder_.clear();
+  format_.paths.AppendFolder(real, &shown_folder_);
+  if (format_.escape) shown_folder_ = Escaped(shown_folder_);
+}
+
+void RowWriter::AppendShown(const nas::ResultRow& row, std::string* out) const {
+  *out += shown_folder_;
   if (format_.escape) {
-    AppendEscaped(path_, out);
+    AppendEscaped(row.name, out);
   } else {
-    *out += path_;
+    *out += row.name;
   }
 }
 
 // Columns have fixed least widths, as rows are printed before the next ones are known.
-void RowWriter::AppendLong(const nas::FileAttributes& file, std::string* out) {
+void RowWriter::AppendLong(const nas::ResultRow& row, std::string* out) {
+  const nas::FileAttributes& file = *row.attributes;
   constexpr size_t kNameWidth = 8;
   constexpr size_t kSizeWidth = 12;
   AppendMode(file.mode, out);
@@ -185,7 +199,7 @@ void RowWriter::AppendLong(const nas::FileAttributes& file, std::string* out) {
   const std::string size = std::to_string(file.size);
   if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
   *out += size + " " + LocalTime(file.mtime) + " ";
-  AppendName(out);
+  AppendShown(row, out);
 }
 
 // ":NUMBER:TEXT", on a terminal with what was found in bold red.
@@ -248,18 +262,19 @@ void RowWriter::AppendJson(const nas::ResultRow& row, const Line& line, std::str
 
 void RowWriter::Append(const nas::ResultRow& row, std::string* out) {
   constexpr size_t kMostLineBytes = 4096;
-  path_.assign(row.share_root).append("/").append(row.folder);
-  path_.append(row.folder.empty() ? "" : "/").append(row.name);
+  EnterFolder(row);
+  path_.assign(real_folder_).append(row.name);
   Line line;
   if (scanner_ && S_ISREG(row.attributes->mode)) {
     line = scanner_->FirstLine(AT_FDCWD, path_.c_str(), kMostLineBytes);
   }
   switch (format_.kind) {
     case RowFormat::Kind::kPath:
-      AppendName(out);
+      AppendShown(row, out);
+      if (S_ISDIR(row.attributes->mode)) *out += '/';
       break;
     case RowFormat::Kind::kLong:
-      AppendLong(*row.attributes, out);
+      AppendLong(row, out);
       break;
     case RowFormat::Kind::kJson:
       AppendJson(row, line, out);

@@ -23,6 +23,7 @@
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
 #include "arbory/search_text.h"
+#include "arbory/shown_paths.h"
 #include "arbory/terminal.h"
 #include "nas/base/unique_fd.h"
 #include "nas/results/result_file.h"
@@ -59,6 +60,13 @@ std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
   return query ? std::make_shared<const nas::ContentQuery>(std::move(*query)) : nullptr;
 }
 
+// A path that a program is to be given begins with no "-".
+ShownPaths PathsFor(const SearchOptions& options) {
+  if (options.output.absolute) return {};
+  if (!options.query.here) return ShownPaths(options.query.folders);
+  return ShownPaths({options.output.null_separated ? "." : ""});
+}
+
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
 class Search {
@@ -68,6 +76,7 @@ class Search {
         options_(options),
         started_(Clock::now()),
         format_(FormatOf(options.output)) {
+    format_.paths = PathsFor(options);
     if (options.line_number) format_.lines = LinesOf(options.query.pattern);
   }
 

@@ -82,7 +82,7 @@ TEST_F(Find, PrintsTheBestOrSaysWhyNot) {
        both + other + "/[plan\n",
        ""},
       {"what begins with a bracket", {"[plan"}, 0, other + "/[plan\n", ""},
-      {"criteria alone", {"-t", "dir", "--in", "."}, 0, share_ + "/below\n", ""},
+      {"criteria alone", {"-t", "dir", "--in", "."}, 0, share_ + "/below/\n", ""},
       {"the folder alone",
        {"--no-recursive", "plan", "--in", "."},
        0,
