@@ -182,6 +182,46 @@ test('reload and a shared link repeat the search; the way back leads to the one 
   await tab.close();
 });
 
+test('a found folder opens; the way back leads to its row, and closes details first', async () => {
+  const tab = await openTab('#q=*&in=/many&sort=-name');
+  const { page, tasks } = tab;
+  const details = page.locator('.details');
+  await page.focus('.table');
+  await page.keyboard.press('End');
+  await page.locator('.row.active', { hasText: 'f0' }).waitFor();
+  const [top] = await tab.names();
+  await page.keyboard.press('Space');
+  await details.waitFor();
+  await page.keyboard.press('Enter');
+  await tab.firstIs(itemName(0));
+  await tab.over();
+  assert.equal(await tab.count(), '1,000 matches', 'nothing but what the folder holds');
+  assert.equal(await page.textContent('.crumbs'), 'manyf0');
+  await page.goBack();
+  await page.locator('.row.active', { hasText: 'f0' }).waitFor();
+  await details.waitFor();
+  assert.equal((await tab.names())[0], top);
+  await page.goBack();
+  await details.waitFor({ state: 'detached' });
+  await page.goForward();
+  await details.getByRole('button', { name: 'Close' }).click();
+  await details.waitFor({ state: 'detached' });
+  assert.equal((await tab.names())[0], top, 'the table has not moved');
+  assert.equal(tasks.length, 2, 'nothing was searched anew');
+  await page.waitForFunction(() => history.state.active > 0 && !history.state.details);
+  // A reload repeats the search; what is typed is looked for below.
+  await page.reload();
+  await page.locator('.row.active', { hasText: 'f0' }).waitFor();
+  assert.equal((await tab.names())[0], top);
+  await page.goForward();
+  await page.goForward();
+  await page.getByRole('button', { name: 'many', exact: true }).click();
+  await tab.firstIs('f0');
+  await tab.search(itemName(7));
+  assert.equal(await tab.count(), '1 match');
+  await tab.close();
+});
+
 test('past searches are offered, repeated and cleared', async () => {
   const tab = await openTab();
   const { page } = tab;
@@ -376,11 +416,12 @@ test('leaving the page cleans its searches; coming back repeats them', async () 
     assert.equal(await known(task), 404);
   };
   assert.equal(await known(tasks[0]!), 200);
-  await tab.search('notes');
+  // A few are kept for the way back.
+  for (const pattern of ['notes', 'data', 'view', 'Straße', 'été']) await tab.search(pattern);
   await gone(tasks[0]!);
   assert.equal(await known(tasks[1]!), 200);
   await page.goto('about:blank');
-  await gone(tasks[1]!);
+  await Promise.all(tasks.map(gone));
   await page.goBack();
   await tab.over();
   assert.equal(await tab.count(), '1 match');

@@ -173,6 +173,15 @@ export function hasCriteria(c: Criteria): boolean {
   return FIELDS.some((field) => c[field] !== NO_CRITERIA[field]);
 }
 
+// Whether this asks for nothing but what one folder holds, as opening it does.
+export function browses(c: Criteria): boolean {
+  return c.folders.length === 1 && sameCriteria(c, contentsOf(c.folders[0]!));
+}
+
+export function contentsOf(folder: string): Criteria {
+  return { ...NO_CRITERIA, folders: [folder], subfolders: false };
+}
+
 export function sameCriteria(a: Criteria, b: Criteria): boolean {
   return JSON.stringify(a) === JSON.stringify(b);
 }

@@ -17,10 +17,24 @@ export class ScrollModel {
   // Pixels of the whole table above what is seen, and the bar's position that was last seen.
   private top = 0;
   private bar = 0;
+  // Where it was before, which there may not be rows enough for yet; null when somebody has moved it.
+  private wanted: number | null = null;
 
-  resize(size: Size): void {
+  // Whether the table has moved towards where it was before: the bar is to be settled then.
+  resize(size: Size): boolean {
     this.size = size;
-    this.top = Math.min(this.top, this.mostTop);
+    const before = this.top;
+    this.top = Math.min(this.wanted ?? this.top, this.mostTop);
+    if (this.top === this.wanted) this.wanted = null;
+    return this.top > before;
+  }
+
+  // Pixels of the whole table above what is seen.
+  get above(): number {
+    return this.wanted ?? this.top;
+  }
+  restore(above: number): void {
+    this.wanted = above;
   }
 
   get height(): number {
@@ -42,7 +56,9 @@ export class ScrollModel {
   // The bar is now at `bar`.
   scrolled(bar: number): void {
     const moved = bar - this.bar;
+    if (moved === 0) return;
     this.bar = bar;
+    this.wanted = null;
     const jump = !this.scaled || Math.abs(moved) > 2 * this.size.viewport;
     this.top = jump ? this.topFor(bar) : Math.min(Math.max(this.top + moved, 0), this.mostTop);
   }
@@ -79,11 +95,13 @@ export class ScrollModel {
     else if (end > top + this.size.viewport) top = end - this.size.viewport;
     if (top === this.top) return false;
     this.top = Math.max(0, top);
+    this.wanted = null;
     return true;
   }
 
   toTop(): void {
     this.top = 0;
+    this.wanted = null;
   }
 
   // Rows that can be seen, even in part.

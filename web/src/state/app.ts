@@ -3,8 +3,10 @@
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow, HistoryKind, HistoryRecord, Session, Share } from '../api/types.ts';
-import { fromHash, parseSort, sortText, toHash, type Sort } from '../model/address.ts';
+import { fromHash, parseSort, sortText, toHash, type Address, type Sort } from '../model/address.ts';
 import {
+  browses,
+  contentsOf,
   CriterionError,
   hasCriteria,
   NO_CRITERIA,
@@ -16,6 +18,7 @@ import { fromRecord, lookedInside, withInside } from '../model/history.ts';
 import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
 import { Search } from './search.ts';
+import { Trail, type Step } from './trail.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
 
@@ -25,6 +28,9 @@ export interface Remembered {
 }
 
 const NOTICE_MS = 4000;
+const PLACED_MS = 250;
+// As folders are looked through.
+const FOLDER_SORT: Sort = { column: 'name', descending: false };
 // Under which the browser keeps the patterns that were looked for inside files.
 const INSIDE = 'inside';
 
@@ -46,7 +52,9 @@ export class App {
   problem = ''; // why the page cannot work, when it cannot
   // The search before, while the server reads what the present one asks for.
   private standing: Search | null | undefined;
+  private readonly trail = new Trail();
   private noticeTimer = 0;
+  private placing = 0;
   private drawing = 0;
 
   constructor(private readonly draw: () => void) {
@@ -87,7 +95,6 @@ export class App {
 
   private closeGate(error: unknown): void {
     this.closeSearches();
-    this.search = null;
     if (error instanceof ApiError && error.signedOut) {
       this.gate = error.mode === 'single' ? 'open-address' : 'sign-in';
     } else {
@@ -125,7 +132,9 @@ export class App {
 
   edit(change: Partial<Criteria>): void {
     this.draftError = null;
-    this.draft = { ...this.draft, ...change };
+    // Who types a name while a folder lies open looks for it below that.
+    const below = change.pattern && browses(this.draft) ? { subfolders: true } : {};
+    this.draft = { ...this.draft, ...below, ...change };
     this.askAtOnce();
     this.changed();
   }
@@ -150,34 +159,132 @@ export class App {
     return !search.over && search.found === 0;
   }
 
-  // Searches for what is typed, and puts it into the address bar. The order is that of the search
-  // before, in this tab or the last one.
+  // Searches for what is typed, and puts it into the address bar.
   submit(change: Partial<Criteria> = {}): void {
     this.edit(change);
     this.instant.cancel();
-    const sort = this.search ? this.search.sort : parseSort(recall('sort'));
+    const sort = this.nextSort();
     const hash = toHash({ criteria: this.draft, sort });
     void this.start(this.draft, sort).then((started) => {
       if (!started) return;
-      if (hash === location.hash) history.replaceState(null, '', hash);
-      else history.pushState(null, '', hash);
+      if (hash === location.hash) history.replaceState(this.trail.begin(), '', hash);
+      else history.pushState(this.trail.begin(), '', hash);
     });
   }
 
+  // That of the search before, in this tab or the last one; folders are looked through by name.
+  private nextSort(): Sort | null {
+    const shown = this.search;
+    const folder = shown !== null && browses(shown.criteria);
+    if (browses(this.draft)) return folder ? shown.sort : FOLDER_SORT;
+    return shown && !folder ? shown.sort : parseSort(recall('sort'));
+  }
+
+  // Shows what the folder holds.
+  browse(folder: string): void {
+    this.submit(contentsOf(folder));
+  }
+
+  // Details are a step of their own: the way back closes them.
+  showDetails(row: FileRow): void {
+    const { step } = this.trail;
+    if (!this.detailed && !step?.details) {
+      history.pushState({ entry: this.trail.entry, details: true } satisfies Step, '', location.hash);
+    }
+    this.set({ detailed: row });
+  }
+
+  hideDetails(): void {
+    if (!this.detailed) return;
+    this.set({ detailed: null });
+    if (this.trail.step?.details) history.back();
+  }
+
   private followAddress(): void {
+    const { step } = this.trail;
+    if (step && step.entry === this.trail.entry) return this.followDetails(step);
+    this.leaveSearch();
     const address = fromHash(location.hash);
     if (!address) {
       this.reset();
+      history.replaceState({ entry: 0 } satisfies Step, '');
       return;
     }
-    this.draft = address.criteria;
-    void this.start(address.criteria, address.sort);
+    const seen = step && this.trail.back(step.entry);
+    if (seen) {
+      this.instant.drop();
+      Object.assign(this, seen, { draft: seen.search.criteria, draftError: null });
+      this.setTitle();
+      this.followDetails(step);
+    } else {
+      this.repeat(address, step);
+    }
   }
 
-  reset(): void {
-    this.closeSearches();
+  private repeat({ criteria, sort }: Address, step: Step | null): void {
+    if (step) this.trail.entry = step.entry;
+    else this.trail.begin();
+    history.replaceState({ entry: this.trail.entry } satisfies Step, '');
+    this.draft = criteria;
+    void this.start(criteria, sort).then((started) => {
+      if (!started || !this.search) return;
+      this.search.scroll.restore(step?.above ?? 0);
+      this.set({ active: step?.active ?? -1 });
+    });
+  }
+
+  // The search stays; its details come or go, and its order is the one it has by now.
+  private followDetails(step: Step): void {
+    const { search } = this;
+    const row = step.details ? (search?.pages.row(this.active) ?? this.detailed) : null;
+    if (search) history.replaceState(step, '', toHash(search));
+    this.set({ detailed: row });
+    this.placed();
+  }
+
+  // Keeps what is left for the way back: a search that has ended, or that goes on while one of the
+  // folders that it has found is looked into.
+  private leaveSearch(whileRunning = false): void {
+    this.abandon();
+    const { search, active, detailed } = this;
+    this.search = null;
+    if (search?.status === 'done' || search?.status === 'stopped' || (search && whileRunning)) {
+      this.trail.leave({ search, active, detailed });
+    } else {
+      search?.close();
+    }
+  }
+
+  // Of a search that the server has not understood yet nothing is left; the one before is shown.
+  private abandon(): void {
+    if (this.standing === undefined) return;
+    this.search?.close();
+    this.search = this.standing;
+    this.standing = undefined;
+  }
+
+  // Told of the table's place once it rests, for a page that is loaded anew.
+  placed = (): void => {
+    clearTimeout(this.placing);
+    this.placing = window.setTimeout(() => {
+      const { search, active } = this;
+      const { entry, step } = this.trail;
+      if (!search || step?.entry !== entry) return;
+      history.replaceState({ ...step, active, above: search.scroll.above } satisfies Step, '');
+    }, PLACED_MS);
+  };
+
+  // The start page, a step of its own.
+  home(): void {
+    this.reset();
+    history.pushState({ entry: 0 } satisfies Step, '', location.pathname);
+  }
+
+  private reset(): void {
+    this.leaveSearch();
+    this.trail.entry = 0;
     this.instant.drop();
-    Object.assign(this, { search: null, detailed: null, active: -1, draft: NO_CRITERIA });
+    Object.assign(this, { detailed: null, active: -1, draft: NO_CRITERIA });
     this.draftError = null;
     this.setTitle();
     this.changed();
@@ -198,14 +305,16 @@ export class App {
     const error: unknown = await params.then(() => null, (reason: unknown) => reason);
     if (this.search !== search) return false;
     if (error instanceof CriterionError) {
-      search.close();
-      Object.assign(this, { search: this.standing, standing: undefined, draftError: error });
+      this.abandon();
+      this.draftError = error;
       if (error.field !== 'pattern' && error.field !== 'folders') this.unfolded = true;
       this.changed();
       return false;
     }
-    this.standing?.close();
-    Object.assign(this, { standing: undefined, detailed: null, active: -1 });
+    const { standing } = this;
+    Object.assign(this, { search: standing, standing: undefined });
+    this.leaveSearch(browses(criteria));
+    Object.assign(this, { search, detailed: null, active: -1 });
     if (this.instant.criteria && !sameCriteria(this.instant.criteria, criteria)) this.instant.drop();
     remember(INSIDE, withInside(recall(INSIDE), criteria));
     this.setTitle();
@@ -218,11 +327,14 @@ export class App {
     this.search?.close();
     this.standing?.close();
     this.standing = undefined;
+    this.search = null;
+    this.trail.close();
   }
 
   private setTitle(): void {
-    const pattern = this.search?.criteria.pattern.trim();
-    document.title = pattern ? `${pattern} · Arbory Search` : 'Arbory Search';
+    const criteria = this.search?.criteria;
+    const shown = criteria && browses(criteria) ? criteria.folders[0] : criteria?.pattern.trim();
+    document.title = shown ? `${shown} · Arbory Search` : 'Arbory Search';
   }
 
   setSort(sort: Sort | null): void {
@@ -237,7 +349,7 @@ export class App {
     this.active = -1;
     this.search.setSort(sort);
     remember('sort', sortText(sort));
-    history.replaceState(null, '', toHash({ criteria: this.search.criteria, sort }));
+    history.replaceState(this.trail.step, '', toHash({ criteria: this.search.criteria, sort }));
     this.changed();
   }
 

@@ -5,6 +5,7 @@ import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow, InstantAnswer } from '../api/types.ts';
 import { typed, type Criteria } from '../model/criteria.ts';
+import { ScrollModel } from '../model/scroll.ts';
 
 const PAUSE_MS = 60;
 // An index that does not answer is not asked again with every letter.
@@ -23,6 +24,7 @@ export class Instant {
   complete = true; // whether these are all
   readonly sort = null;
   readonly over = true;
+  readonly scroll = new ScrollModel();
   readonly pages = { row: (index: number) => this.rows[index], show: () => {} };
   private timer = 0;
   private abort = new AbortController();

@@ -5,6 +5,7 @@ import { ApiError, walkFailure } from '../api/errors.ts';
 import type { Misses, Page, Progress, Walk } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
 import type { Criteria, StartParams } from '../model/criteria.ts';
+import { ScrollModel } from '../model/scroll.ts';
 import { Pages } from './pages.ts';
 
 export type Status = 'starting' | 'running' | 'done' | 'stopped' | 'failed';
@@ -32,6 +33,7 @@ export class Search {
   };
   misses: Misses | null = null; // once it is known why nothing was found
   readonly pages: Pages;
+  readonly scroll = new ScrollModel();
   private taskid = '';
   private closed = false;
   private stopAsked = false;
@@ -178,6 +180,7 @@ export class Search {
 
   setSort(sort: Sort | null): void {
     this.sort = sort;
+    this.scroll.toTop();
     if (this.taskid) this.pages.renew();
     this.changed();
   }

@@ -2,12 +2,14 @@
 import type { FileRow } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
 import type { Criteria } from '../model/criteria.ts';
+import type { ScrollModel } from '../model/scroll.ts';
 
 export interface Shown {
   readonly criteria: Criteria | null;
   readonly found: number;
   readonly sort: Sort | null;
   readonly over: boolean;
+  readonly scroll: ScrollModel; // where its table stands
   readonly pages: {
     row(index: number): FileRow | undefined;
     // Which rows are seen.

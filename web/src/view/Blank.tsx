@@ -1,7 +1,7 @@
 // In place of the table: how to search, before the first search; what to try, when nothing is found.
 import { Fragment } from 'preact';
 import type { Misses as NearMisses } from '../api/types.ts';
-import { describe, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
+import { browses, describe, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
 import { plural, visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';
@@ -88,6 +88,13 @@ export function Failed({ app, search }: { app: App; search: Search }) {
 
 export function Nothing({ app, search }: { app: App; search: Search }) {
   const c = search.criteria;
+  if (browses(c) && search.status === 'done') {
+    return (
+      <div class="blank">
+        <h2>This folder is empty</h2>
+      </div>
+    );
+  }
   const offers: [string, () => void][] = [];
   if (hasCriteria(c)) {
     const bare = { ...NO_CRITERIA, pattern: c.pattern, folders: c.folders };

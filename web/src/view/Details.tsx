@@ -22,11 +22,10 @@ interface Props {
 
 export function Details({ app, row, pattern, actions }: Props) {
   const close = () => {
-    app.set({ detailed: null });
+    app.hideDetails();
     document.querySelector<HTMLElement>('.table')?.focus();
   };
   const barred = row.is_dir ? '' : whyNotFetched(row.path);
-  const searchIn = (folder: string) => app.submit({ folders: [folder] });
   return (
     <aside class="details" aria-label={`About ${visible(row.name)}`} onKeyDown={(event) => event.key === 'Escape' && close()}>
       <header>
@@ -39,6 +38,11 @@ export function Details({ app, row, pattern, actions }: Props) {
       </header>
       {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} barred={barred !== ''} />}
       <div class="actions">
+        {row.is_dir && (
+          <button type="button" class="tool" onClick={() => app.browse(row.path)}>
+            <Icon name="folder" size={14} /> Open
+          </button>
+        )}
         {!row.is_dir && !barred && (
           <button type="button" class="tool" onClick={() => actions.download(row)}>
             <Icon name="download" size={14} /> Download
@@ -52,9 +56,15 @@ export function Details({ app, row, pattern, actions }: Props) {
         <button type="button" class="tool" onClick={() => actions.copy(row)}>
           <Icon name="copy" size={14} /> Copy path
         </button>
-        <button type="button" class="tool" onClick={() => searchIn(row.is_dir ? row.path : folderOf(row.path))}>
-          <Icon name="search" size={14} /> Search {row.is_dir ? 'in it' : 'its folder'}
-        </button>
+        {row.is_dir ? (
+          <button type="button" class="tool" onClick={() => app.submit({ folders: [row.path], subfolders: true })}>
+            <Icon name="search" size={14} /> Search in it
+          </button>
+        ) : (
+          <button type="button" class="tool" onClick={() => app.browse(folderOf(row.path))}>
+            <Icon name="folder" size={14} /> Open its folder
+          </button>
+        )}
       </div>
       {barred && <p class="hint">{barred}</p>}
       <Facts row={row} />

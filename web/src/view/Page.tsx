@@ -2,7 +2,7 @@
 import { useEffect, useMemo, useState } from 'preact/hooks';
 import { fileAddress } from '../api/client.ts';
 import type { FileRow } from '../api/types.ts';
-import type { CriterionError } from '../model/criteria.ts';
+import { browses, type CriterionError } from '../model/criteria.ts';
 import { previewKind } from '../model/preview.ts';
 import { visible, whyNotFetched } from '../model/text.ts';
 import type { App } from '../state/app.ts';
@@ -10,6 +10,7 @@ import { copyText, follow } from '../state/save.ts';
 import { nextTheme, themeName } from '../state/theme.ts';
 import { Failed, Nothing, Welcome } from './Blank.tsx';
 import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
+import { Crumbs } from './Crumbs.tsx';
 import { Details } from './Details.tsx';
 import { FolderPicker } from './FolderPicker.tsx';
 import { Gate } from './Gate.tsx';
@@ -39,8 +40,7 @@ export function Page({ app }: { app: App }) {
             aria-label="Arbory Search, start"
             onClick={(event) => {
               event.preventDefault();
-              history.pushState(null, '', location.pathname);
-              app.reset();
+              app.home();
             }}
           >
             <Wordmark />
@@ -98,6 +98,7 @@ function Result({ app, actions }: { app: App; actions: RowActions }) {
   const nothing = search.over && !failed && search.found === 0;
   return (
     <main>
+      {browses(search.criteria) && <Crumbs app={app} folder={search.criteria.folders[0]!} />}
       {!failed && <StatusLine app={app} search={search} />}
       {search.error && !failed && (
         <p class="wrong band" role="alert">
@@ -201,7 +202,7 @@ function rowActions(app: App): RowActions {
   return {
     download,
     open: (row) => {
-      if (row.is_dir) app.submit({ folders: [row.path] });
+      if (row.is_dir) app.browse(row.path);
       else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
       else if (previewKind(row.name) === 'none') download(row);
       else window.open(fileAddress(row.path, true), '_blank', 'noopener');

@@ -3,7 +3,7 @@
 import { useCallback, useEffect, useLayoutEffect, useMemo, useRef, useState } from 'preact/hooks';
 import type { FileRow } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
-import { ScrollModel } from '../model/scroll.ts';
+import type { ScrollModel } from '../model/scroll.ts';
 import type { App } from '../state/app.ts';
 import type { Shown } from '../state/shown.ts';
 import { COLUMNS } from './columns.ts';
@@ -23,23 +23,25 @@ export interface RowActions {
 export function ResultTable({ app, search, actions }: { app: App; search: Shown; actions: RowActions }) {
   const root = useRef<HTMLDivElement>(null);
   const scroller = useRef<HTMLDivElement>(null);
-  const model = useMemo(() => new ScrollModel(), [search]);
+  const model = search.scroll;
   const [, redraw] = useState(0);
   const pattern = search.criteria?.pattern ?? '';
   const highlighter = useMemo(() => new Highlighter(pattern), [pattern]);
   const rows = search.found;
   const { rowHeight, viewport } = useMeasures(scroller);
-  model.resize({ rows, rowHeight, viewport });
+  const returns = useRef(0);
+  if (model.resize({ rows, rowHeight, viewport })) ++returns.current;
+  const returned = returns.current;
   const total = useRef(rows);
   total.current = rows;
 
   useSettling(scroller, model, redraw);
-  useEffect(() => {
-    model.toTop();
+  useLayoutEffect(() => {
     if (scroller.current) scroller.current.scrollTop = model.settle();
     redraw((n) => n + 1);
-  }, [search, search.sort]);
+  }, [search, search.sort, returned]);
   useEffect(() => search.pages.show(model.first, model.last));
+  useEffect(app.placed, [model.above, app.active]);
 
   const goTo = useCallback(
     (index: number) => {
@@ -73,13 +75,14 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
     } else if (row && event.key === 'Enter') {
       actions.open(row);
     } else if (row && event.key === ' ') {
-      app.set({ detailed: app.detailed ? null : row });
+      if (app.detailed) app.hideDetails();
+      else app.showDetails(row);
     } else if (row && event.key === 'd') {
       actions.download(row);
     } else if (row && event.key === 'c') {
       actions.copy(row);
     } else if (event.key === 'Escape') {
-      if (app.detailed) app.set({ detailed: null });
+      if (app.detailed) app.hideDetails();
       else focusField();
     } else {
       return;
@@ -128,7 +131,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
               choose={(row) => {
                 root.current?.focus({ preventScroll: true });
                 goTo(index);
-                app.set({ detailed: row });
+                app.showDetails(row);
               }}
               open={actions.open}
             />
