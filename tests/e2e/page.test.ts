@@ -226,34 +226,49 @@ test('past searches are offered, repeated and cleared', async () => {
   const tab = await openTab();
   const { page } = tab;
   await tab.search('notes');
-  // Inside files, and nothing but text files: the server does not remember the first of these.
-  await page.goto(`${server.origin}/#q=needle&ext=txt&in=/files/docs&contents=1`);
+  // All that was asked for comes back, days as they were chosen.
+  await page.goto(`${server.origin}/#q=needle&ext=txt&in=/files/docs&contents=1&modified=last-7-days`);
   await tab.over();
   assert.deepEqual(await tab.names(), ['notes.txt']);
   // The key is pressed before the history has come, which waits for it here.
   let come = () => {};
   const pressed = new Promise<void>((go) => (come = go));
-  await page.route('**/get', (route) => void pressed.then(() => route.continue()));
+  await page.route('**/past', (route) => void pressed.then(() => route.continue()));
   await page.goto(server.origin + '/');
   await page.reload();
   await page.press('#pattern', 'ArrowDown');
   come();
   await page.getByRole('option', { name: 'notes', exact: true }).waitFor();
-  await page.getByRole('option', { name: /^needle .*also inside files/ }).click();
+  const needle = page.getByRole('option', { name: /^needle \.txt · modified last 7 days · also inside files/ });
+  await needle.click();
   await tab.over();
   assert.deepEqual(await tab.names(), ['notes.txt']);
-  await page.fill('#pattern', '');
-  const advanced = page.getByRole('option', { name: /^plan files/ });
-  await advanced.click();
+  assert.match(page.url(), /modified=last-7-days/);
+  // One goes alone; a pinned one has a name, and stays first.
+  await page.fill('#pattern', 'not');
+  await page.press('#pattern', 'ArrowDown');
+  await page.press('#pattern', 'Delete');
+  await page.getByRole('option', { name: 'notes', exact: true }).waitFor({ state: 'detached' });
+  await page.click('.home');
+  await page.getByRole('button', { name: 'Pin plan' }).first().click();
+  await page.getByRole('button', { name: 'Name plan' }).click();
+  await page.getByLabel('Name of the pinned search').fill('My plans');
+  await page.keyboard.press('Enter');
+  await page.getByRole('button', { name: 'My plans', exact: true }).waitFor();
+  await page.reload();
+  await page.getByRole('button', { name: 'My plans', exact: true }).click();
   await tab.over();
-  assert.equal(await tab.count(), '3 matches');
-  await page.click('#pattern');
+  assert.equal(await page.inputValue('#pattern'), 'plan');
+  await page.fill('#pattern', '');
   await page.click('text=Clear history');
   await page.getByText('The history is cleared.').waitFor();
-  await page.fill('#pattern', '');
+  await needle.waitFor({ state: 'detached' });
+  await page.click('.home');
+  await page.getByRole('button', { name: 'Remove My plans' }).click();
+  await page.getByRole('button', { name: 'My plans', exact: true }).waitFor({ state: 'detached' });
   await page.press('#pattern', 'ArrowDown');
   assert.equal(await page.getByRole('option').count(), 0);
-  // A damaged file costs its own entries; what stays as it is must not be told as if it would pass.
+  // A damaged file of other clients' history: what stays as it is must not be told as if it would pass.
   await tab.search('notes');
   await page.goto(`${server.origin}/#q=plan&ext=txt&in=/files/docs`);
   await tab.over();

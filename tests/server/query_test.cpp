@@ -1,5 +1,7 @@
 // What the server tells a form: what was typed means, and what a search came close to.
 
+#include <algorithm>
+
 #include "tests/server/server_test.h"
 
 namespace server_test {
@@ -77,6 +79,64 @@ TEST_F(QueryTest, ASearchThatFoundNothingIsToldWhatItCameCloseTo) {
   EXPECT_EQ(server.Post(route, R"({"pattern":"regex:("})").status, 400);
   EXPECT_EQ(server.Post(route, R"({"size_from":"much"})").status, 400);
   EXPECT_EQ(server.Post("/searches/none/misses", "{}").status, 404);
+}
+
+TEST_F(QueryTest, PastSearchesAreOneListByTime) {
+  Server server = Start();
+  server.Open();
+  const std::string long_text(5000, 'x');
+  const struct {
+    std::string change;
+    int status;
+    const char* searches;  // afterwards; a name behind ":"
+  } rows[] = {
+      {R"({"add":"q=a"})", 200, "q=a"},
+      {R"({"add":"q=b"})", 200, "q=b q=a"},
+      {R"({"add":"q=a"})", 200, "q=a q=b"},
+      {R"({"pin":"q=b","name":"Bees"})", 200, "q=a q=b:Bees"},
+      {R"({"add":"q=b"})", 200, "q=b:Bees q=a"},
+      {R"({"pin":"q=c","name":"new"})", 200, "q=c:new q=b:Bees q=a"},
+      {R"({"remove":"q=c"})", 200, "q=b:Bees q=a"},
+      {R"({"remove":"q=nothing"})", 200, "q=b:Bees q=a"},
+      {"{\"add\":\"" + long_text + "\"}", 400, ""},
+      {"{\"pin\":\"q=a\",\"name\":\"" + long_text + "\"}", 400, ""},
+      {R"({"add":{}})", 400, ""},
+      {R"({"clear":true})", 200, "q=b:Bees"},
+      {R"({"pin":"q=b"})", 200, "q=b"},
+      {R"({"clear":true})", 200, ""},
+  };
+  const auto told = [](const Reply& reply) {
+    std::string text;
+    const Json::Value body = reply.json();
+    for (const Json::Value& one : body["searches"]) {
+      text += (text.empty() ? "" : " ") + one["search"].asString();
+      if (one.isMember("name")) text += ":" + one["name"].asString();
+    }
+    return text;
+  };
+  const auto change = [&](const std::string& word, const std::string& search) {
+    return server.Post("/past", "{\"" + word + "\":\"" + search + "\",\"name\":\"n\"}");
+  };
+  for (const auto& row : rows) {
+    const Reply reply = server.Post("/past", row.change);
+    EXPECT_EQ(reply.status, row.status) << row.change;
+    EXPECT_EQ(told(reply), row.searches) << row.change;
+  }
+  // More than is kept: the oldest go, and no pin.
+  change("pin", "pinned");
+  for (int i = 0; i < 105; ++i) change("add", std::to_string(i));
+  const std::string kept = told(server.Get("/past"));
+  EXPECT_EQ(std::count(kept.begin(), kept.end(), ' '), 100);
+  EXPECT_TRUE(kept.starts_with("104 103 ") && kept.ends_with(" 5 pinned:n")) << kept;
+  for (int i = 1; i < 50; ++i) EXPECT_EQ(change("pin", "p" + std::to_string(i)).status, 200) << i;
+  EXPECT_EQ(change("pin", "one more").status, 400);
+  // A damaged list counts as empty, and can be written again.
+  const std::string path = state_ + "/users/" + User() + "/preference/page_searches.json";
+  for (const char* damage : {"{", "[]", R"({"searches":[3,{"search":4}]})"}) {
+    WriteFile(path, damage);
+    EXPECT_EQ(told(server.Get("/past")), "") << damage;
+    EXPECT_EQ(told(change("add", "a")), "a") << damage;
+  }
 }
 
 }  // namespace

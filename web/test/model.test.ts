@@ -4,13 +4,12 @@ import * as fs from 'node:fs';
 import { join } from 'node:path';
 import { test } from 'node:test';
 import { fromHash, toHash, type Address } from '../src/model/address.ts';
-import { criterion, CriterionError, FIELDS, NO_CRITERIA, OTHER_PARAMS, startParams, type Criteria, type StartParams } from '../src/model/criteria.ts';
+import { contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, startParams, type Criteria, type StartParams } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
-import { fromRecord, lookedInside, withInside } from '../src/model/history.ts';
+import { addressOf, offered, titleOf } from '../src/model/history.ts';
 import { formatSize } from '../src/model/size.ts';
 import { pieces, visible } from '../src/model/text.ts';
-import { customValue } from '../src/model/times.ts';
 import type { FileRow } from '../src/api/types.ts';
 
 // The engine's cases; `marks` is the name with what is marked in «», or null where it does not match.
@@ -113,44 +112,6 @@ test('sizes', () => {
   for (const [bytes, text] of shown) assert.equal(formatSize(bytes), text, String(bytes));
 });
 
-// The tests run in the time zone of Berlin: clocks changed on 2026-03-29 and 2026-10-25.
-test('remembered times are told as what holds the same seconds', () => {
-  const midnight = (day: string) => new Date(`${day}T00:00`).getTime() / 1000;
-  const first = midnight('2026-03-29');
-  const rows: [number | undefined, number | undefined, string | null][] = [
-    [undefined, undefined, ''],
-    [first, first + 23 * 3600 - 1, '2026-03-29..2026-03-29'],
-    [first, midnight('2026-10-26') - 1, '2026-03-29..2026-10-25'],
-    [undefined, midnight('2026-10-26') - 1, '..2026-10-25'],
-    [first, first + 24 * 3600 - 1, `${first}..${first + 24 * 3600 - 1}`], // days of another zone
-    [first + 60, undefined, `${first + 60}..`],
-    [-(2 ** 31), 2 ** 31 - 1, ''],
-    [1500, undefined, null], // would be read as a year
-    [-10_000_001, undefined, null],
-  ];
-  for (const [from, to, text] of rows) assert.equal(customValue(from, to), text, `${from}..${to}`);
-});
-
-// As the server reads what is typed; only of sizes and times it knows more.
-async function understand(asked: StartParams) {
-  const { mtime, crtime, atime, ...params } = asked;
-  const seconds = (day: string, days: number) => {
-    const date = new Date(`${day}T00:00`);
-    date.setDate(date.getDate() + days);
-    return date.getTime() / 1000;
-  };
-  for (const [name, value] of Object.entries({ mtime, crtime, atime })) {
-    const [from, to] = String(value ?? '..').split('..') as [string, string];
-    if (from) params[`${name}_from`] = seconds(from, 0);
-    if (to) params[`${name}_to`] = seconds(to, 1) - 1;
-  }
-  for (const name of ['size_from', 'size_to']) {
-    const [number, unit] = String(params[name]).split(' ');
-    if (params[name] !== undefined) params[name] = Number(number) * (unit === 'GB' ? 2 ** 30 : 1);
-  }
-  return { params };
-}
-
 test('what a search is started with', async () => {
   const full: Criteria = { ...NO_CRITERIA, pattern: ' x ', folders: ['/c'], kind: 'image', sizeTo: ' 1 KB ', modified: '2 weeks', contents: true };
   const asked = { pattern: ' x ', filetype: 'image', size_to: '1 KB', mtime: '2 weeks', search_content: true, recursive: true };
@@ -173,56 +134,30 @@ test('what a search is started with', async () => {
   await assert.rejects(startParams({ ...full, pattern: ' ' }, ['/a'], same), CriterionError);
 });
 
-// What the server remembers of a search that was started with these parameters, as docs/api.md says.
-function remembered(params: Record<string, unknown>): Record<string, unknown> {
-  const { search_content: _c, search_type: _t, ...record } = params;
-  for (const name of ['owner', 'group']) if (record[name]) record[name] = '1026';
-  return record;
-}
-
-test('the history gives back what was searched, or nothing', async () => {
-  const asked: Partial<Criteria>[] = [
-    {},
-    { contents: true },
-    { kind: 'image', contents: true },
-    { kind: 'image' },
-    { extension: 'jpg' },
-    { sizeFrom: '1500', sizeTo: '2 GB' },
-    { modified: '2026-01-01..2026-01-31' },
-    { created: '..2026-01-31' },
-    { accessed: '2026-01-01..' },
-    { subfolders: false },
-    { owner: 'ann' },
-    { group: 'staff' },
+test('past searches are offered as they were asked for, the pinned first', () => {
+  const asked: Criteria = { ...NO_CRITERIA, pattern: 'x', folders: ['/a/b'], contents: true, modified: 'last-7-days', owner: 'ann', subfolders: false };
+  const of = (change: Partial<Criteria>) => addressOf({ ...NO_CRITERIA, ...change });
+  const past = [
+    { at: 5, search: of({ pattern: 'news' }) },
+    { at: 4, search: addressOf(asked) },
+    { at: 3, search: of({ pattern: 'terminal', folders: ['/tmp'] }) },
+    { at: 2, search: 'no address' },
+    { at: 1, search: of({ kind: 'image' }), name: 'Pictures' },
   ];
-  const fields = new Set<string>(asked.flatMap((change) => Object.keys(change)));
-  assert.deepEqual(FIELDS.filter((field) => !fields.has(field)), [], 'every criterion has a row here');
-  for (const change of asked) {
-    const criteria = { ...NO_CRITERIA, pattern: 'x', ...change };
-    const params = await startParams(criteria, ['/a', '/b'], understand);
-    const kind = params.search_type as 'simple' | 'advance';
-    const patterns = withInside('y', criteria);
-    const repeated = fromRecord(remembered(params), kind, ['/b', '/a'], (one) => lookedInside(patterns, one));
-    const isId = 'owner' in change || 'group' in change;
-    assert.deepEqual(repeated, isId ? null : criteria, JSON.stringify(change));
-  }
-  assert.equal(withInside('x\ny', { ...NO_CRITERIA, pattern: 'x', kind: 'file' }), 'y', 'no longer');
-  assert.equal(withInside('x\ny', { ...NO_CRITERIA, pattern: 'x' }), 'x\ny', 'the other history');
-  const never = () => false;
-  const folders = (folder_path: unknown) => fromRecord({ pattern: 'x', folder_path }, 'simple', ['/a'], never)?.folders;
-  assert.deepEqual(folders(['/a', '/b']), ['/a', '/b']);
-  assert.deepEqual(folders('/a,/c'), ['/a', '/c']);
-  for (const broken of [{}, { pattern: '' }, { pattern: 3 }, { pattern: 'x', color: 'red' }, { pattern: 'x', filetype: 'exe' }]) {
-    assert.equal(fromRecord(broken, 'simple', [], never), null, JSON.stringify(broken));
+  const list = offered(past, ['/a', '/home']);
+  assert.deepEqual(list.map(titleOf), ['Pictures', 'news', 'x']);
+  assert.deepEqual(list[2]!.criteria, asked, 'relative days and contents are kept');
+  for (const blank of [{}, { pattern: ' ' }, contentsOf('/a'), { folders: ['/a'] }]) {
+    assert.equal(of(blank), '', JSON.stringify(blank));
   }
 });
 
-test('the page sends, and knows from the history, every parameter that the documents name', () => {
+test('the page sends every parameter that the documents name', () => {
   const api = fs.readFileSync(join(process.cwd(), '../docs/api.md'), 'utf8');
   const start = /^### start\n([^]*?)^### /m.exec(api)![1]!;
   const table = /\| parameter \|.*\n\|[-|]+\n((?:\|.*\n)+)/.exec(start)![1]!;
   const documented = table.trim().split('\n').flatMap((row) => [...row.split('|')[1]!.matchAll(/`(\w+)`/g)].map((m) => m[1]!));
-  const known = [...OTHER_PARAMS, ...FIELDS.flatMap((field) => criterion(field).params)];
+  const known = ['folder_path', 'pattern', 'search_type', ...FIELDS.flatMap((field) => criterion(field).params)];
   assert.deepEqual([...known].sort(), [...documented].sort());
 });
 

@@ -7,6 +7,7 @@
 
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
+#include "arbory/server/service/past_searches.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/children.h"
 #include "arbory/server/transport/http_text.h"
@@ -115,6 +116,16 @@ std::span<const Route> Service::Routes() {
       {kPost, "/query", Access::kLoggedIn,
        [](Self self, Request request, Path) { return self.Ask(*request, "query", StartReadQuery); },
        "What was typed, as the parameters of a search", kJson},
+      {kGet, "/past", Access::kLoggedIn,
+       [](Self self, Request request, Path) {
+         return self.Ask(*request, "past", StartPastSearches);
+       },
+       "The searches made on the page, the newest first", kJson},
+      {kPost, "/past", Access::kLoggedIn,
+       [](Self self, Request request, Path) {
+         return self.Ask(*request, "past", StartPastSearches);
+       },
+       "Add, pin or remove one of them, or clear them", kJson},
       {kGet, "/files/{share}/{path...}", Access::kLoggedIn,
        [](Self self, Request request, Path path) { return self.GetFile(*request, path); },
        "One file, as a download or with preview=1 to look at", "application/octet-stream"},

@@ -34,29 +34,12 @@ constexpr size_t kInstantRows = 100;
 constexpr size_t kMostInstantLocations = 64;
 constexpr char kNoSearch[] = "There is no such search; start a new one.";
 
-Json::Value Error(int status, const char* sentence) {
-  Json::Value body;
-  body["code"] = status;
-  body["error"] = sentence;
-  return body;
-}
-
-// Steps down to the user for good, as these calls make no folders; answers itself when that fails.
-bool Become(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) >= 0) {
-    nas::GiveUpRoot();
-    return true;
-  }
-  response->SetError(kUnavailable, Error(kUnavailable, "The server cannot act as this user."));
-  return false;
-}
-
 bool CanList(const std::string& folder) {
   return faccessat(AT_FDCWD, folder.empty() ? "/" : folder.c_str(), R_OK | X_OK, AT_EACCESS) == 0;
 }
 
 void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   Json::Value body;
   body["shares"] = Json::Value(Json::arrayValue);
   for (const nas::Share& share : nas::ListShares()) {
@@ -73,11 +56,11 @@ void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
 }
 
 void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   const std::string id = request->GetParam(kTaskId, "").asString();
   const RunningSearch search = ReadSearch(request->GetLoginUserName(), id);
   if (!search.exists) {
-    response->SetError(kNotFound, Error(kNotFound, kNoSearch));
+    response->SetError(kNotFound, OwnError(kNotFound, kNoSearch));
     return;
   }
   Json::Value body;
@@ -89,8 +72,6 @@ void ReadSearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   body["walk"] = search.walk;
   response->SetError(kOk, body);
 }
-
-constexpr char kWrongType[] = "A field has a wrong type; docs/http.md names them.";
 
 SearchQuery TypedQuery(const NUVA::APIRequest& request) {
   const auto text = [&](const char* name) { return request.GetParam(name, "").asString(); };
@@ -111,7 +92,7 @@ SearchQuery TypedQuery(const NUVA::APIRequest& request) {
 }
 
 void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   Json::Value body;
   try {
     body["params"] = SearchRequest(TypedQuery(*request), {}, std::time(nullptr));
@@ -121,7 +102,7 @@ void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try 
   }
   response->SetError(kOk, body);
 } catch (const Json::Exception&) {
-  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
+  response->SetError(kBadRequest, OwnError(kBadRequest, kWrongType));
 }
 
 // Of those that can be opened.
@@ -146,7 +127,7 @@ std::vector<nas::Location> InstantLocations(const NUVA::APIRequest& request) {
 }
 
 void InstantEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   Json::Value body;
   try {
     const Comparators comps(SearchRequest(TypedQuery(*request), {}, std::time(nullptr)));
@@ -166,9 +147,9 @@ void InstantEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
   }
   response->SetError(kOk, body);
 } catch (const UsageError& error) {
-  response->SetError(kBadRequest, Error(kBadRequest, error.what()));
+  response->SetError(kBadRequest, OwnError(kBadRequest, error.what()));
 } catch (const Json::Exception&) {
-  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
+  response->SetError(kBadRequest, OwnError(kBadRequest, kWrongType));
 }
 
 Json::Value MissesJson(const nas::NearMisses& near) {
@@ -191,11 +172,11 @@ Json::Value MissesJson(const nas::NearMisses& near) {
 void NearMissesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
   // A person reads meanwhile that nothing was found.
   constexpr std::chrono::milliseconds kMost{1000};
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   const RunningSearch search =
       ReadSearch(request->GetLoginUserName(), request->GetParam(kTaskId, "").asString());
   if (!search.exists) {
-    response->SetError(kNotFound, Error(kNotFound, kNoSearch));
+    response->SetError(kNotFound, OwnError(kNotFound, kNoSearch));
     return;
   }
   Json::Value params;
@@ -211,9 +192,9 @@ void NearMissesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try
   body["meant"] = nas::MeantQuery(params["pattern"].asString());
   response->SetError(kOk, body);
 } catch (const UsageError& error) {
-  response->SetError(kBadRequest, Error(kBadRequest, error.what()));
+  response->SetError(kBadRequest, OwnError(kBadRequest, error.what()));
 } catch (const Json::Exception&) {
-  response->SetError(kBadRequest, Error(kBadRequest, kWrongType));
+  response->SetError(kBadRequest, OwnError(kBadRequest, kWrongType));
 }
 
 // The same request as one for the method "stop" of these searches.
@@ -247,7 +228,7 @@ class NoResponse : public NUVA::APIResponse {
 const NUVA::APIMethod* g_stop = nullptr;
 
 void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (!Become(request, response)) return;
+  if (!BecomeCaller(request, response)) return;
   Json::Value ids(Json::arrayValue);
   for (const std::string& id : UnfinishedSearches(request->GetLoginUserName())) ids.append(id);
   Json::Value body;
@@ -272,11 +253,31 @@ nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
 }
 
 nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
-  const NUVA::APIMethod row = {"arbory", 1, "", entry};
-  return nas::StartCall(row, {"", params, user, "server"}, EncodeOwnReply);
+  return StartOwn(entry, {"", params, user, "server"});
 }
 
 }  // namespace
+
+nas::Child StartOwn(NUVA::APIEntry entry, const nas::ApiCall& call) {
+  return nas::StartCall({"arbory", 1, "", entry}, call, EncodeOwnReply);
+}
+
+Json::Value OwnError(int status, const char* sentence) {
+  Json::Value body;
+  body["code"] = status;
+  body["error"] = sentence;
+  return body;
+}
+
+// For good, as these calls make no folders.
+bool BecomeCaller(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (WfmLibUGIDSet(nullptr, request->GetLoginUserName().c_str()) >= 0) {
+    nas::GiveUpRoot();
+    return true;
+  }
+  response->SetError(kUnavailable, OwnError(kUnavailable, "The server cannot act as this user."));
+  return false;
+}
 
 nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply) {
   const NUVA::APIMethod row = {"arbory", 1, "",
@@ -297,13 +298,9 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id) 
   return Start(ReadSearchEntry, user, params);
 }
 
-nas::Child StartReadQuery(const nas::ApiCall& call) {
-  return nas::StartCall({"arbory", 1, "", ReadQueryEntry}, call, EncodeOwnReply);
-}
+nas::Child StartReadQuery(const nas::ApiCall& call) { return StartOwn(ReadQueryEntry, call); }
 
-nas::Child StartInstant(const nas::ApiCall& call) {
-  return nas::StartCall({"arbory", 1, "", InstantEntry}, call, EncodeOwnReply);
-}
+nas::Child StartInstant(const nas::ApiCall& call) { return StartOwn(InstantEntry, call); }
 
 nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id) {
   nas::ApiCall named = call;
@@ -314,7 +311,7 @@ nas::Child StartNearMisses(const nas::ApiCall& call, const std::string& task_id)
     if (!wrong) (*params)[kTaskId] = task_id;
     return wrong;
   };
-  return nas::StartCall({"arbory", 1, "", NearMissesEntry}, named, EncodeOwnReply);
+  return StartOwn(NearMissesEntry, named);
 }
 
 nas::Child StartStopSearches(const std::string& user, const NUVA::APIMethod& stop) {

@@ -10,6 +10,14 @@
 
 namespace arbory {
 
+// For rows like these elsewhere: forks the child, whose entry function sets the HTTP status as its
+// code; has it step down to the user for good, which answers itself when that fails; the body of an
+// error; and the sentence for parameters of another type than docs/http.md names.
+nas::Child StartOwn(NUVA::APIEntry entry, const nas::ApiCall& call);
+bool BecomeCaller(NUVA::APIRequest* request, NUVA::APIResponse* response);
+Json::Value OwnError(int status, const char* sentence);
+inline constexpr char kWrongType[] = "A field has a wrong type; docs/http.md names them.";
+
 // {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list.
 nas::Child StartListShares(const std::string& user);
 

@@ -2,10 +2,10 @@
 import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
   HistoryKind,
-  HistoryRecord,
   InstantAnswer,
   Misses,
   Page,
+  PastSearch,
   Progress,
   Session,
   Shares,
@@ -90,8 +90,11 @@ export async function listResults(params: ListParams, signal?: AbortSignal): Pro
   return { files: [], total: 0, offset: params.offset, finished: true, ...page };
 }
 
-export const getHistory = (search_type: HistoryKind) =>
-  call<{ history: HistoryRecord[] }>(HISTORY, 'get', { search_type });
+type Past = Promise<{ searches: PastSearch[] }>;
+export const getPast = () => request('past') as Past;
+export const changePast = (change: { add: string } | { pin: string; name: string } | { remove: string } | { clear: true }) =>
+  post('past', change) as Past;
+// The histories that other clients read, into which the searches of the page go too.
 export const clearHistory = (search_type: HistoryKind) =>
   call<null>(HISTORY, 'delete', { search_type });
 

@@ -83,4 +83,10 @@ export interface Shares {
 }
 
 export type HistoryKind = 'simple' | 'advance';
-export type HistoryRecord = Record<string, unknown>;
+
+// A search made on the page before, by what stands in its address; with a name it is pinned.
+export interface PastSearch {
+  at: number;
+  search: string;
+  name?: string;
+}

@@ -1,12 +1,11 @@
 // What a person asks for, as the form and the address bar hold it, and what becomes of it: what the
-// server is asked for, what it remembers of that, and words. Values stay as they were typed until
+// server is asked for, and words. Values stay as they were typed until
 // the search starts, so that "last 7 days" in a shared link means the seven days before it is
 // opened; what they mean the server alone knows.
 import { asSentence } from '../api/errors.ts';
 import type { Understood } from '../api/types.ts';
-import { exactSize } from './size.ts';
 import { plural } from './text.ts';
-import { customValue, describeTime } from './times.ts';
+import { describeTime } from './times.ts';
 
 export const KINDS = [
   ['', 'Anything'],
@@ -50,8 +49,8 @@ export class CriterionError extends Error {
   }
 }
 
-// How one criterion is offered, sent, remembered and told. Adding one is adding a row to CRITERIA:
-// the form, the address, the request, the history, the tags and the repeated search are made of it.
+// How one criterion is offered, sent and told. Adding one is adding a row to CRITERIA: the form, the
+// address, the request, the tags and the repeated search are made of it.
 interface Criterion<F extends Field> {
   none: Criteria[F]; // restricts nothing
   key: string; // in the address
@@ -59,11 +58,7 @@ interface Criterion<F extends Field> {
   label: string;
   placeholder?: string;
   sent: string; // under this name, as it was typed
-  // The parameters of start that it becomes; also the members of a remembered search, see `recall`.
-  params: readonly string[];
-  // From the remembered values of `params`. Null: they do not tell what was asked for, so that the
-  // search cannot be repeated.
-  recall(values: readonly unknown[]): Criteria[F] | null;
+  params: readonly string[]; // of start, that it becomes
   describe(value: Criteria[F], all: Criteria): string; // empty: nothing to say
   fits?(value: Criteria[F]): boolean; // what an address may hold; anyone can write one
 }
@@ -77,25 +72,17 @@ function text(key: string, param: string, label: string, placeholder: string, ab
     placeholder,
     sent: param,
     params: [param],
-    recall: ([value]: readonly unknown[]) => (typeof value === 'string' ? value : ''),
     describe: (value: string) => value && about(value),
   } as const;
 }
 
-// Remembered by the server as an id, which a search does not take: repeating it would silently find
-// more than it did.
 function account(param: string, placeholder: string, label: string) {
-  return {
-    ...text(param, param, label, placeholder, (value) => `${param} ${value}`),
-    recall: ([id]: readonly unknown[]) => (id === undefined ? '' : null),
-  };
+  return text(param, param, label, placeholder, (value) => `${param} ${value}`);
 }
 
 function size(key: string, param: string, label: string, placeholder: string, about: Criterion<'sizeTo'>['describe']) {
   return {
     ...text(key, param, label, placeholder, () => ''),
-    recall: ([bytes]: readonly unknown[]) =>
-      typeof bytes === 'number' && bytes >= 0 ? exactSize(bytes) : '',
     describe: (value: string, all: Criteria) => value && about(tidy(value), all),
   };
 }
@@ -108,7 +95,6 @@ function time(key: string, param: string, label: string, verb: string) {
     label,
     sent: param,
     params: [`${param}_from`, `${param}_to`],
-    recall: ([from, to]: readonly unknown[]) => customValue(number(from), number(to)),
     describe: (value: string) => value && `${verb} ${describeTime(value)}`,
   } as const;
 }
@@ -120,7 +106,6 @@ export const CRITERIA: { readonly [F in Field]: Criterion<F> } = {
   kind: {
     ...text('type', 'filetype', 'Type', '', () => ''),
     input: 'kind',
-    recall: ([kind]) => (kind === undefined ? '' : isKind(kind) ? String(kind) : null),
     describe: (value) => (value ? KINDS.find(([kind]) => kind === value)?.[1].toLowerCase() ?? '' : ''),
     fits: isKind,
   },
@@ -141,7 +126,6 @@ export const CRITERIA: { readonly [F in Field]: Criterion<F> } = {
     label: 'Also look inside files',
     sent: 'search_content',
     params: ['search_content'],
-    recall: ([value]) => value === true, // seldom remembered: see fromRecord
     describe: (value) => (value ? 'also inside files' : ''),
   },
   subfolders: {
@@ -151,13 +135,10 @@ export const CRITERIA: { readonly [F in Field]: Criterion<F> } = {
     label: 'Subfolders',
     sent: 'recursive',
     params: ['recursive'],
-    recall: ([value]) => value !== false,
     describe: (value) => (value ? '' : 'not in subfolders'),
   },
 };
 export const FIELDS = Object.keys(CRITERIA) as Field[];
-// What a search is made of beside the criteria.
-export const OTHER_PARAMS = ['folder_path', 'pattern', 'search_type'];
 
 export const NO_CRITERIA: Criteria = {
   pattern: '',
@@ -231,8 +212,4 @@ export async function startParams(
 
 function tidy(size: string): string {
   return size.trim().replace(/^\d+$/, (digits) => plural(Number(digits), 'byte'));
-}
-
-function number(value: unknown): number | undefined {
-  return typeof value === 'number' ? value : undefined;
 }

@@ -1,54 +1,32 @@
-// Remembered searches: what the server keeps about them, turned back into criteria.
-import type { HistoryKind, HistoryRecord } from '../api/types.ts';
-import { criterion, FIELDS, hasCriteria, NO_CRITERIA, OTHER_PARAMS, type Criteria } from './criteria.ts';
+// The searches made before, as the server keeps them for the page: each by its address, which says
+// all that was asked for.
+import type { PastSearch } from '../api/types.ts';
+import { fromHash, toHash } from './address.ts';
+import { browses, describe, hasCriteria, type Criteria } from './criteria.ts';
 
-const KNOWN = new Set([...OTHER_PARAMS, ...FIELDS.flatMap((field) => criterion(field).params)]);
-
-// Null for a record that cannot be repeated as it was: one that does not tell all that was asked
-// for, or holds what this page does not know, would silently find something else.
-//
-// The server does not remember that contents were asked for. A search of the advanced history that
-// shows no criterion had that one; of others `inside` tells, from what this browser has searched.
-export function fromRecord(
-  record: HistoryRecord,
-  kind: HistoryKind,
-  everywhere: string[],
-  inside: (pattern: string) => boolean,
-): Criteria | null {
-  if (typeof record.pattern !== 'string' || record.pattern === '') return null;
-  if (Object.keys(record).some((name) => !KNOWN.has(name))) return null;
-  const folders = foldersOf(record.folder_path);
-  const all = folders.length > 0 && everywhere.length > 0 && sameSet(folders, everywhere);
-  const criteria: Criteria = { ...NO_CRITERIA, pattern: record.pattern, folders: all ? [] : folders };
-  for (const field of FIELDS) {
-    const { params, recall } = criterion(field);
-    const value = recall(params.map((name) => record[name]));
-    if (value === null) return null;
-    Object.assign(criteria, { [field]: value });
-  }
-  if (kind === 'advance' && (!hasCriteria(criteria) || inside(record.pattern))) criteria.contents = true;
-  return criteria;
+export interface Remembered {
+  search: string; // the address
+  criteria: Criteria;
+  name: string; // of a pinned one; otherwise empty
 }
 
-// The patterns whose last search with criteria looked inside files, one a line, the newest first: as
-// many as the server remembers such searches.
-const MOST_INSIDE = 10;
-
-export function lookedInside(patterns: string, pattern: string): boolean {
-  return patterns.split('\n').includes(pattern);
+// Under which a search is remembered; empty for what says nothing, such as a folder that was opened.
+export function addressOf(criteria: Criteria): string {
+  const blank = criteria.pattern.trim() === '' && (browses(criteria) || !hasCriteria(criteria));
+  return blank ? '' : toHash({ criteria, sort: null }).slice(1);
 }
 
-export function withInside(patterns: string, c: Criteria): string {
-  if (!hasCriteria(c) || c.pattern.includes('\n')) return patterns;
-  const others = patterns.split('\n').filter((one) => one && one !== c.pattern);
-  return (c.contents ? [c.pattern, ...others] : others).slice(0, MOST_INSIDE).join('\n');
+// The pinned first, then by time. `everywhere`: searches of folders outside these find nothing.
+export function offered(past: PastSearch[], everywhere: string[]): Remembered[] {
+  const inside = (folder: string) => everywhere.some((top) => folder === top || folder.startsWith(top + '/'));
+  const known = past.flatMap(({ search, name = '' }) => {
+    const criteria = fromHash('#' + search)?.criteria;
+    return criteria?.folders.every(inside) ? [{ search, criteria, name }] : [];
+  });
+  return [...known.filter(({ name }) => name), ...known.filter(({ name }) => !name)];
 }
 
-function foldersOf(value: unknown): string[] {
-  const list = Array.isArray(value) ? value : typeof value === 'string' ? value.split(',') : [];
-  return list.filter((folder): folder is string => typeof folder === 'string' && folder !== '');
-}
-
-function sameSet(a: string[], b: string[]): boolean {
-  return a.length === b.length && a.every((one) => b.includes(one));
+// What a search is called: by its name, its words, or its criteria.
+export function titleOf({ name, criteria }: Remembered): string {
+  return name || criteria.pattern.trim() || describe(criteria).join(', ');
 }

@@ -14,11 +14,3 @@ export function formatSize(bytes: number): string {
   const digits = unit > 0 && value < 9.95 ? 1 : 0;
   return `${value.toFixed(digits)} ${UNITS[unit]}`;
 }
-
-// The shortest text that reads back as exactly these bytes.
-export function exactSize(bytes: number): string {
-  const units = ['', ' KB', ' MB', ' GB', ' TB'];
-  let power = 0;
-  while (power + 1 < units.length && bytes > 0 && bytes % 1024 ** (power + 1) === 0) ++power;
-  return bytes / 1024 ** power + units[power]!;
-}

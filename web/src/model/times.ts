@@ -16,24 +16,6 @@ export function dayOf(second: number): string {
   return `${String(day.getFullYear()).padStart(4, '0')}-${two(day.getMonth() + 1)}-${two(day.getDate())}`;
 }
 
-// What a search can compare is held in 32 bits; beyond them there is no bound.
-const LATEST_SECOND = 2 ** 31 - 1;
-const EARLIEST_SECOND = -(2 ** 31);
-const FEWEST_DIGITS = 5; // of a second; fewer are a year
-
-// What holds exactly these seconds: a pair of days where they are whole days here, otherwise the
-// seconds themselves, which mean the same wherever the server is. Null where no text does.
-export function customValue(from: number | undefined, to: number | undefined): string | null {
-  if (from !== undefined && from <= EARLIEST_SECOND) from = undefined;
-  if (to !== undefined && to >= LATEST_SECOND) to = undefined;
-  if (from === undefined && to === undefined) return '';
-  const midnight = (second: number) => new Date(second * 1000).toTimeString().startsWith('00:00:00');
-  const whole = (from === undefined || midnight(from)) && (to === undefined || midnight(to + 1));
-  const ends = [from, to].map((second) => (second === undefined ? '' : whole ? dayOf(second) : String(second)));
-  const told = ends.every((end) => end === '' || (end.length >= FEWEST_DIGITS && !end.startsWith('-')));
-  return told ? ends.join('..') : null;
-}
-
 // A day as a calendar's field takes it.
 export function isDay(text: string): boolean {
   return /^\d{4}-\d\d-\d\d$/.test(text);

@@ -2,7 +2,7 @@
 // is shown. Views read it and call it; it tells them when to draw again.
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
-import type { FileRow, HistoryKind, HistoryRecord, Session, Share } from '../api/types.ts';
+import type { FileRow, Session, Share } from '../api/types.ts';
 import { fromHash, parseSort, sortText, toHash, type Address, type Sort } from '../model/address.ts';
 import {
   browses,
@@ -14,25 +14,18 @@ import {
   startParams,
   type Criteria,
 } from '../model/criteria.ts';
-import { fromRecord, lookedInside, withInside } from '../model/history.ts';
 import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
+import { Past } from './past.ts';
 import { Search } from './search.ts';
 import { Trail, type Step } from './trail.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
 
-export interface Remembered {
-  criteria: Criteria;
-  advanced: boolean;
-}
-
 const NOTICE_MS = 4000;
 const PLACED_MS = 250;
 // As folders are looked through.
 const FOLDER_SORT: Sort = { column: 'name', descending: false };
-// Under which the browser keeps the patterns that were looked for inside files.
-const INSIDE = 'inside';
 
 export class App {
   gate: Gate = 'loading';
@@ -43,8 +36,7 @@ export class App {
   draftError: CriterionError | null = null;
   search: Search | null = null;
   readonly instant: Instant;
-  history: Remembered[] = [];
-  historyKnown = false; // until then it may still come
+  readonly past: Past;
   unfolded = false;
   active = -1; // the row the keyboard is at
   detailed: FileRow | null = null; // the row shown beside the table
@@ -59,6 +51,7 @@ export class App {
 
   constructor(private readonly draw: () => void) {
     this.instant = new Instant(this.changed, this.signedOut);
+    this.past = new Past(() => this.everywhere, this.changed, this.failed);
     addEventListener('popstate', () => this.followAddress());
     addEventListener('pagehide', () => this.closeSearches());
     addEventListener('pageshow', (event) => {
@@ -86,7 +79,7 @@ export class App {
       const { shares, homes } = await client.getShares();
       Object.assign(this, { shares, homes, gate: 'ready', problem: '' });
       this.followAddress();
-      void this.loadHistory();
+      void this.past.load();
     } catch (error) {
       this.closeGate(error);
     }
@@ -120,7 +113,6 @@ export class App {
     } catch {
       // The session may have ended by itself.
     }
-    remember(INSIDE, '');
     location.hash = '';
     location.reload();
   }
@@ -316,9 +308,10 @@ export class App {
     this.leaveSearch(browses(criteria));
     Object.assign(this, { search, detailed: null, active: -1 });
     if (this.instant.criteria && !sameCriteria(this.instant.criteria, criteria)) this.instant.drop();
-    remember(INSIDE, withInside(recall(INSIDE), criteria));
     this.setTitle();
-    void ended.then(() => this.loadHistory());
+    void ended.then(() => {
+      if (search.status !== 'failed') void this.past.add(criteria);
+    });
     this.changed();
     return true;
   }
@@ -353,44 +346,15 @@ export class App {
     this.changed();
   }
 
-  async loadHistory(): Promise<void> {
-    try {
-      const [simple, advanced] = await Promise.all([
-        client.getHistory('simple'),
-        client.getHistory('advance'),
-      ]);
-      const inside = (pattern: string) => lookedInside(recall(INSIDE), pattern);
-      const repeated = (records: HistoryRecord[], kind: HistoryKind) =>
-        records.map((record) => fromRecord(record, kind, this.everywhere, inside));
-      const past = [...repeated(simple.history, 'simple'), ...repeated(advanced.history, 'advance')]
-        .filter((criteria) => criteria !== null);
-      const differs = (one: Criteria, at: number) =>
-        past.findIndex((other) => sameCriteria(one, other)) === at;
-      const history = past.filter(differs);
-      this.set({
-        history: history.map((criteria) => ({ criteria, advanced: hasCriteria(criteria) })),
-      });
-    } catch {
-      // Suggestions are a convenience; their absence is no reason to speak.
-    }
-    this.set({ historyKnown: true });
+  async forgetHistory(): Promise<void> {
+    if (await this.past.clear()) this.tell('The history is cleared.');
   }
 
-  async forgetHistory(): Promise<void> {
-    const asked = [client.clearHistory('simple'), client.clearHistory('advance')];
-    // One that cannot be cleared keeps the other no more.
-    const failures = (await Promise.allSettled(asked)).flatMap((each) =>
-      each.status === 'rejected' ? [each.reason as unknown] : [],
-    );
-    if (failures.some((error) => error instanceof ApiError && error.signedOut)) {
-      return this.signedOut();
-    }
-    remember(INSIDE, '');
-    await this.loadHistory();
-    const [error] = failures;
-    if (!error) this.tell('The history is cleared.');
+  // Of something that a person asked for beside a search.
+  private failed = (error: unknown): void => {
+    if (error instanceof ApiError && error.signedOut) this.signedOut();
     else this.tell(error instanceof Error ? error.message : String(error));
-  }
+  };
 
   // A short word at the edge of the page.
   tell(notice: string): void {

@@ -1,11 +1,12 @@
 // In place of the table: how to search, before the first search; what to try, when nothing is found.
 import { Fragment } from 'preact';
 import type { Misses as NearMisses } from '../api/types.ts';
-import { browses, describe, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
+import { browses, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
 import { plural, visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';
 import { Name } from './Name.tsx';
+import { PastSearches } from './PastSearches.tsx';
 
 const WAYS = [
   ['report 2024', 'both words, anywhere in the name'],
@@ -19,10 +20,7 @@ const WAYS = [
   ['regex:^img_\\d{4}', 'a regular expression'],
 ] as const;
 
-const RECENT = 6;
-
 export function Welcome({ app }: { app: App }) {
-  const recent = app.history.slice(0, RECENT);
   return (
     <div class="blank welcome">
       <section aria-labelledby="ways">
@@ -50,21 +48,7 @@ export function Welcome({ app }: { app: App }) {
           </span>
         </p>
       </section>
-      {recent.length > 0 && (
-        <section aria-labelledby="recent">
-          <h2 id="recent">Searched before</h2>
-          <ul>
-            {recent.map((one) => (
-              <li key={one}>
-                <button type="button" class="example" onClick={() => app.submit(one.criteria)}>
-                  <Name text={one.criteria.pattern} />
-                </button>{' '}
-                <span class="aside">{describe(one.criteria).join(' · ')}</span>
-              </li>
-            ))}
-          </ul>
-        </section>
-      )}
+      <PastSearches app={app} />
     </div>
   );
 }

@@ -1,11 +1,11 @@
 // The one field, with past searches as suggestions: they unfold on a click, on typing or with the
 // arrow key, never by themselves.
 import { useEffect, useMemo, useRef, useState } from 'preact/hooks';
-import { describe } from '../model/criteria.ts';
-import { visible } from '../model/text.ts';
-import type { App, Remembered } from '../state/app.ts';
+import { titleOf, type Remembered } from '../model/history.ts';
+import type { App } from '../state/app.ts';
 import { Icon } from './icons.tsx';
 import { Name } from './Name.tsx';
+import { aboutPast, PastIcon } from './PastSearches.tsx';
 
 const MOST_SHOWN = 12;
 
@@ -15,8 +15,8 @@ export function SearchBar({ app }: { app: App }) {
   const [at, setAt] = useState(-1);
   const running = app.search !== null && !app.search.over;
   const shown = useMemo(
-    () => suggestions(app.history, app.draft.pattern),
-    [app.history, app.draft.pattern],
+    () => suggestions(app.past.list, app.draft.pattern),
+    [app.past.list, app.draft.pattern],
   );
   const unfolded = open && shown.length > 0;
 
@@ -42,18 +42,22 @@ export function SearchBar({ app }: { app: App }) {
     } else if (event.key === 'ArrowDown' || event.key === 'ArrowUp') {
       event.preventDefault();
       const step = event.key === 'ArrowDown' ? 1 : -1;
-      const nothing = app.historyKnown && shown.length === 0;
+      const nothing = app.past.known && shown.length === 0;
       if (!unfolded && step === 1 && (nothing || app.search?.pages.total)) {
         document.querySelector<HTMLElement>('[role=grid]')?.focus();
         return;
       }
       setOpen(true);
-      if (!app.historyKnown) {
+      if (!app.past.known) {
         setAt(0); // they unfold as soon as they have come
         return;
       }
       const count = shown.length + 1; // one place is the field itself
       setAt(((at + 1 + step + count) % count) - 1);
+    } else if (event.key === 'Delete' && unfolded && shown[at]) {
+      event.preventDefault();
+      void app.past.remove(shown[at]);
+      setAt(Math.min(at, shown.length - 2));
     } else if (event.key === 'Escape') {
       if (unfolded) setOpen(false);
       else if (running) void app.search?.stop();
@@ -108,18 +112,19 @@ export function SearchBar({ app }: { app: App }) {
             <ul id="suggestions" role="listbox" aria-label="Past searches">
               {shown.map((one, index) => (
                 <li
-                  key={one}
+                  key={one.search}
                   id={`suggestion-${index}`}
                   role="option"
                   aria-selected={index === at}
                   onPointerDown={(event) => event.preventDefault()}
                   onClick={() => choose(one)}
                 >
-                  <Icon name={one.advanced ? 'sliders' : 'clock'} size={14} />
+                  <PastIcon past={one} />
                   <span class="past">
-                    <Name text={one.criteria.pattern} />
+                    <Name text={titleOf(one)} />
                   </span>
-                  <span class="about">{about(one)}</span>
+                  <span class="about">{aboutPast(one)}</span>
+                  <Tools app={app} past={one} />
                 </li>
               ))}
             </ul>
@@ -154,17 +159,35 @@ function leaves(event: FocusEvent): boolean {
   return !(event.currentTarget as Node).contains(event.relatedTarget as Node | null);
 }
 
-// Those that hold what is typed; all of them when it is one of them, as after a search.
-function suggestions(history: Remembered[], typed: string): Remembered[] {
-  const wanted = typed.trim().toLowerCase();
-  const exact = history.some((one) => one.criteria.pattern === typed);
-  const fitting = history.filter(
-    (one) => exact || one.criteria.pattern.toLowerCase().includes(wanted),
+// For the mouse, as an option can hold nothing to press: the key Delete removes it too, and the start
+// page has both as buttons.
+function Tools({ app, past }: { app: App; past: Remembered }) {
+  const pinned = past.name !== '';
+  const click = (act: () => Promise<void>) => (event: MouseEvent) => {
+    event.stopPropagation();
+    void act();
+  };
+  return (
+    <span class="tools" aria-hidden="true">
+      <span
+        class="quiet"
+        title={pinned ? 'Unpin' : 'Pin'}
+        onClick={click(() => app.past.pin(past, pinned ? '' : titleOf(past)))}
+      >
+        <Icon name="pin" size={14} />
+      </span>
+      <span class="quiet" title="Remove (Delete)" onClick={click(() => app.past.remove(past))}>
+        <Icon name="close" size={12} />
+      </span>
+    </span>
   );
-  return fitting.slice(0, MOST_SHOWN);
 }
 
-function about({ criteria }: Remembered): string {
-  const where = criteria.folders.length > 0 ? ['in ' + criteria.folders.map(visible).join(', ')] : [];
-  return [...describe(criteria), ...where].join(' · ');
+// Those that hold what is typed; all of them when it is one of them, as after a search.
+function suggestions(past: Remembered[], typed: string): Remembered[] {
+  const wanted = typed.trim().toLowerCase();
+  const exact = past.some((one) => one.criteria.pattern === typed);
+  const holds = (text: string) => text.toLowerCase().includes(wanted);
+  const fitting = past.filter((one) => exact || holds(one.criteria.pattern) || holds(one.name));
+  return fitting.slice(0, MOST_SHOWN);
 }
