@@ -28,8 +28,8 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
   AddTimes(command, "mtime", "Modified", &query->mtime);
   AddTimes(command, "crtime", "Created", &query->crtime);
   AddTimes(command, "atime", "Last read", &query->atime);
-  command->add_option("--owner", query->owner, "Owned by this user")->type_name("NAME");
-  command->add_option("--group", query->group, "Of this group")->type_name("NAME");
+  command->add_option("--owner", query->owner, "Owned by this user")->type_name("USER");
+  command->add_option("--group", query->group, "Of this group")->type_name("GROUP");
   command->add_flag_function(
       "--no-recursive", [query](std::int64_t) { query->recursive = false; },
       "Do not enter the folders in FOLDER");
@@ -64,7 +64,7 @@ void Unmark(std::string* text) {
 }
 
 void AddCommonOptions(CLI::App* command, CommonOptions* common) {
-  command->add_option("--user", common->user, "Act for this user (root only)")->type_name("NAME");
+  command->add_option("--user", common->user, "Act for this user (root only)")->type_name("USER");
   command->add_option("--share", common->shares, "Offer the directory as a share, for this run")
       ->type_name("NAME=DIR")
       ->allow_extra_args(false);

@@ -13,7 +13,9 @@
 
 #include "arbory/call_command.h"
 #include "arbory/command_line.h"
+#include "arbory/command_tree.h"
 #include "arbory/find_command.h"
+#include "arbory/generate_command.h"
 #include "arbory/index_command.h"
 #include "arbory/options.h"
 #include "arbory/search_command.h"
@@ -26,6 +28,14 @@ namespace arbory {
 namespace {
 
 // Lines of these texts fit a terminal of 80 columns.
+constexpr char kProgramHelp[] =
+    "Searches read the folders themselves, or ask the index where its daemon runs, with\n"
+    "the same results. The server shows a page to search on.\n"
+    "\n"
+    "Configuration: the file given with --config, else $ARBORY_CONFIG, else\n"
+    "/etc/arbory/arbory.toml, else $XDG_CONFIG_HOME/arbory/arbory.toml. None is\n"
+    "needed.\n";
+
 constexpr char kSearchHelp[] =
     "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or\n"
     "crtime.\n"
@@ -93,7 +103,7 @@ constexpr char kIndexHelp[] =
 class Formatter : public CLI::Formatter {
  public:
   std::string make_option_opts(const CLI::Option* option) const override {
-    const std::string type = option->get_type_name();
+    const std::string type = ValueName(option);
     const bool list = option->get_positional() && option->get_items_expected_max() > 1;
     return (type.empty() || option->get_positional() ? "" : " " + type) + (list ? " ..." : "");
   }
@@ -126,8 +136,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
       search->add_option("--sort", options->sort_by, "Print sorted, when the search has finished")
           ->type_name("COLUMN")
           ->check(CLI::IsMember({"name", "path", "size", "type", "user", "group", "mode", "mtime",
-                                 "atime", "ctime", "crtime"})
-                      .description(""));
+                                 "atime", "ctime", "crtime"}));
   search->add_flag("--desc", options->descending, "Largest, latest or last first")->needs(sort);
   const CLI::Validator count(
       [](const std::string& text) {
@@ -153,7 +162,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
       ->add_option("--index", options->common.index_use,
                    "auto: where it is current; always: or fail; never: walk")
       ->type_name("WHEN")
-      ->transform(CLI::Transformer(uses, CLI::ignore_case).description(""));
+      ->transform(CLI::Transformer(uses, CLI::ignore_case));
 }
 
 void AddSearch(CLI::App* app, SearchOptions* options) {
@@ -219,6 +228,16 @@ CLI::App* AddIndex(CLI::App* app, IndexOptions* options) {
   return index;
 }
 
+// For whoever builds the program, so no part of the help.
+CLI::App* AddGenerate(CLI::App* app, GenerateOptions* options) {
+  CLI::App* generate = app->add_subcommand("generate", "Write the manual and the completions");
+  generate->group("");
+  generate->add_option("FOLDER", options->folder, "Where to")->required();
+  generate->add_option("DATE", options->date, "Of the manual: 2026-01-31")->required();
+  generate->add_option("SAMPLE", options->sample, "The configuration file's")->required();
+  return generate;
+}
+
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
   const auto chosen = app.get_subcommands();
   if (chosen.empty()) {
@@ -242,6 +261,7 @@ int Run(int argc, char** argv) {
   app.formatter(formatter);
   app.set_version_flag("--version", std::string("arbory ") + ARBORY_VERSION, "Print the version");
   app.require_subcommand(1);
+  app.footer(kProgramHelp);
   CallOptions call_options;
   SearchOptions search_options;
   ServeOptions serve_options;
@@ -255,6 +275,8 @@ int Run(int argc, char** argv) {
   AddSearch(&app, &search_options);
   CLI::App* find = AddFind(&app, &find_options);
   CLI::App* why = AddWhy(&app, &why_options);
+  GenerateOptions generate_options;
+  CLI::App* generate = AddGenerate(&app, &generate_options);
   try {
     app.parse(MarkedArguments(argc, argv));
   } catch (const CLI::Success& asked) {
@@ -268,6 +290,7 @@ int Run(int argc, char** argv) {
   }
   if (index->parsed()) return RunIndexCommand(index_options);
   if (find->parsed()) return RunFindCommand(find_options);
+  if (generate->parsed()) return RunGenerateCommand(generate_options, Describe(&app));
   if (serve->parsed()) return RunServeCommand(serve_options);
   if (why->parsed()) {
     Unmark(&why_options.file);

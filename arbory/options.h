@@ -129,4 +129,10 @@ struct WhyOptions {
   SearchOptions search;  // whose results FILE is not among
 };
 
+struct GenerateOptions {
+  std::string folder;
+  std::string date;    // year-month-day
+  std::string sample;  // the configuration file's sample
+};
+
 }  // namespace arbory

@@ -8,6 +8,8 @@ endif()
 install(DIRECTORY web/dist/ DESTINATION share/arbory/web OPTIONAL)
 install(DIRECTORY packaging/sample DESTINATION share/arbory)
 install(FILES packaging/arbory.service packaging/arbory-index.service DESTINATION lib/systemd/system)
-install(FILES docs/http.md docs/deploy.md docs/index.md packaging/arbory.toml packaging/nginx.conf
+install(DIRECTORY ${CMAKE_BINARY_DIR}/manual/ DESTINATION share PATTERN made EXCLUDE)
+install(FILES docs/api.md docs/deploy.md docs/http.md docs/index.md docs/query.md packaging/arbory.toml
+              packaging/nginx.conf
         DESTINATION share/doc/arbory)
 install(FILES packaging/pam/arbory DESTINATION share/doc/arbory/pam)

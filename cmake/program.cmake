@@ -14,3 +14,15 @@ set_source_files_properties(arbory/server/transport/connection.cpp arbory/server
 add_executable(arbory arbory/main.cpp)
 target_compile_definitions(arbory PRIVATE ARBORY_VERSION="${PROJECT_VERSION}")
 target_link_libraries(arbory PRIVATE program_objects Threads::Threads)
+
+# The manual pages and the completions, which the program writes about itself. When it is built for
+# another machine than this, CMAKE_CROSSCOMPILING_EMULATOR says what it runs with.
+set(MANUAL_FOLDER ${CMAKE_BINARY_DIR}/manual)
+set(CONFIGURATION_SAMPLE ${CMAKE_SOURCE_DIR}/packaging/arbory.toml)
+string(TIMESTAMP TODAY "%Y-%m-%d" UTC)
+add_custom_command(OUTPUT ${MANUAL_FOLDER}/made
+                   COMMAND arbory generate ${MANUAL_FOLDER} ${TODAY} ${CONFIGURATION_SAMPLE}
+                   COMMAND ${CMAKE_COMMAND} -E touch ${MANUAL_FOLDER}/made
+                   DEPENDS arbory ${CONFIGURATION_SAMPLE}
+                   VERBATIM)
+add_custom_target(manual ALL DEPENDS ${MANUAL_FOLDER}/made)

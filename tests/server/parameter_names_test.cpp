@@ -257,8 +257,9 @@ TEST_F(ParameterNamesTest, TheDescriptionNamesWhatIsDocumented) {
 }
 
 TEST_F(ParameterNamesTest, TheTerminalOffersWhatIsDocumented) {
-  const std::map<std::string, std::string> samples = {
-      {"EXT", "jpg"}, {"TYPE", "file"}, {"SIZE", "1"}, {"TIME", "1"}, {"NAME", "root"}};
+  const std::map<std::string, std::string> samples = {{"EXT", "jpg"},   {"TYPE", "file"},
+                                                      {"SIZE", "1"},    {"TIME", "1"},
+                                                      {"USER", "root"}, {"GROUP", "root"}};
   const auto request = [](std::vector<std::string> reversed_words) {
     CLI::App app;
     arbory::SearchQuery query;
