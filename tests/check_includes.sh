@@ -24,9 +24,9 @@ nas/records              : nas/base nas/system platform
 nas/webapi               : nas/base nas/system platform
 arbory                   : nas platform arbory/server <CLI>
 arbory/server/transport  : nas platform <boost>
-arbory/server/service    : nas platform arbory arbory/server/transport <security>
+arbory/server/service    : nas platform arbory arbory/server/transport <security> <zlib.h>
 bench                    : nas platform <benchmark>
-tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h> <boost>
+tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h> <boost> <zlib.h>
 '
 cd "$1"
 find . -path './build*' -prune -o -name node_modules -prune -o \( -name '*.h' -o -name '*.cpp' \) -print |

@@ -1,9 +1,10 @@
 // Bundles the page into dist/: index.html, and beside it in assets/ the script, the style sheet and
 // the icon under names that tell their content, so that a browser may keep them for good. Nothing in
-// them is fetched from elsewhere.
+// them is fetched from elsewhere. Each file stands there compressed too, under its name and ".gz".
 import { build } from 'esbuild';
 import { readFile, rm, writeFile } from 'node:fs/promises';
 import { basename } from 'node:path';
+import { constants, gzipSync } from 'node:zlib';
 
 process.chdir(new URL('.', import.meta.url).pathname);
 await rm('dist', { recursive: true, force: true });
@@ -29,3 +30,7 @@ for (const path of Object.keys(metafile.outputs)) {
   html = html.replaceAll(`"${name}${ending}"`, `"assets/${basename(path)}"`);
 }
 await writeFile('dist/index.html', html);
+for (const path of ['dist/index.html', ...Object.keys(metafile.outputs)]) {
+  const packed = gzipSync(await readFile(path), { level: constants.Z_BEST_COMPRESSION });
+  await writeFile(path + '.gz', packed);
+}

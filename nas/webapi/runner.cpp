@@ -116,8 +116,9 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   return StartChild(
       [&](int pipe) {
         const pid_t self = getpid();
-        const Reply reply = ServeCall(row, call, encode);
+        Reply reply = ServeCall(row, call, encode);
         if (getpid() != self) return;
+        if (call.finish) reply = call.finish(std::move(reply));
         // What a long page was made of is free by now, and a client may take its time.
         if (reply.beginning) malloc_trim(0);
         SendReply(pipe, reply);

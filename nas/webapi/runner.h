@@ -25,6 +25,8 @@ struct ApiCall {
   // Where given, makes `params` in the request child, as the user: reading what a client sent costs
   // time and memory that nobody else shall wait for. Gives the reply instead when it cannot.
   std::function<std::optional<Reply>(Json::Value* params)> read_params = {};
+  // Where given, what becomes of the reply before it is sent; in the request child too.
+  std::function<Reply(Reply)> finish = {};
 };
 
 // Turns the entry function's reply into what is sent. Runs in the request child, so that a caller

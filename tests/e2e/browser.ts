@@ -53,9 +53,9 @@ export class Tab {
       void dialog.dismiss();
     });
     page.on('response', async (response) => {
-      if (!response.url().endsWith('/start')) return;
+      if (!response.url().endsWith('/searches')) return;
       const reply = await response.json().catch(() => null);
-      if (reply?.data?.taskid) this.tasks.push(reply.data.taskid);
+      if (reply?.taskid) this.tasks.push(reply.taskid);
     });
   }
 

@@ -4,7 +4,7 @@ import * as fs from 'node:fs';
 import { join } from 'node:path';
 import { test } from 'node:test';
 import { fromHash, toHash, type Address } from '../src/model/address.ts';
-import { contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, startParams, type Criteria, type StartParams } from '../src/model/criteria.ts';
+import { begun, contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, type Criteria, type StartParams } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
 import { addressOf, offered, titleOf } from '../src/model/history.ts';
@@ -116,6 +116,7 @@ test('what a search is started with', async () => {
   const full: Criteria = { ...NO_CRITERIA, pattern: ' x ', folders: ['/c'], kind: 'image', sizeTo: ' 1 KB ', modified: '2 weeks', contents: true };
   const asked = { pattern: ' x ', filetype: 'image', size_to: '1 KB', mtime: '2 weeks', search_content: true, recursive: true };
   const same = async (query: StartParams) => ({ params: query });
+  const startParams = async (c: Criteria, folders: string[], begin: Parameters<typeof begun>[2]) => ((await begun(c, folders, begin)) as { params?: object }).params;
   assert.deepEqual(await startParams(full, ['/a'], same), { ...asked, folder_path: ['/c'], search_type: 'advance' }, 'as typed');
   const plain = { ...NO_CRITERIA, pattern: 'x' };
   assert.deepEqual(await startParams(plain, ['/a', '/b'], same), {
@@ -126,7 +127,7 @@ test('what a search is started with', async () => {
     search_type: 'simple',
   });
   for (const [criterion, field] of [['pattern', 'pattern'], ['size_to', 'sizeTo'], ['atime', 'accessed'], ['owner', 'owner'], ['news', 'pattern']] as const) {
-    const wrong = async () => ({ wrong: { criterion, sentence: "'x' is wrong" } });
+    const wrong = async () => ({ wrong: { criterion, sentence: "'x' is wrong" } }) as const;
     const told = (error: unknown) => error instanceof CriterionError && error.field === field && error.message === "'x' is wrong.";
     await assert.rejects(startParams(plain, ['/a'], wrong), told, criterion);
   }

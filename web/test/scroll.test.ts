@@ -103,6 +103,7 @@ test('only pages that are seen are fetched, two at a time', async () => {
     () => {},
     (error) => assert.fail(String(error)),
   );
+  pages.open();
   pages.show(0, 20);
   assert.deepEqual(asked, [0]);
   answers.shift()!();
@@ -128,6 +129,7 @@ test('growth fetches again what may have changed; a new order shows the old unti
     () => {},
     (error) => assert.fail(String(error)),
   );
+  pages.open();
   pages.show(0, 249);
   await turn();
   total = 300;

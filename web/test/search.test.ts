@@ -2,7 +2,9 @@
 import assert from 'node:assert/strict';
 import { afterEach, beforeEach, test } from 'node:test';
 import { NO_CRITERIA } from '../src/model/criteria.ts';
-import { Search } from '../src/state/search.ts';
+import { beginSearch } from '../src/api/client.ts';
+import type { Begun, Page } from '../src/api/types.ts';
+import { firstPage, Search } from '../src/state/search.ts';
 
 type Reply = { status?: number; body: object };
 type Script = Record<string, (times: number) => Reply | Promise<Reply> | 'broken'>; // by the end of the address
@@ -18,7 +20,7 @@ const progress = (finished: boolean, how: number, matches: number, errno?: numbe
   body: { taskid: 't', finished, progress: how, errno, walk: { phase: 'names', matches } },
 });
 const HAPPY: Script = {
-  start: () => data({ taskid: 't', has_not_index_share: false }),
+  searches: () => ({ body: { taskid: 't', params: {} } }),
   list: () => listing(3, true),
   'searches/t': () => progress(true, 1, 3),
   stop: () => data({}),
@@ -37,7 +39,8 @@ function begin(change: Script): void {
     const headers = { 'Content-Type': 'application/json', 'Retry-After': '0.01' };
     return new Response(JSON.stringify(reply.body), { status: reply.status ?? 200, headers });
   }) as typeof fetch;
-  search = new Search(NO_CRITERIA, Promise.resolve({}), null, () => {}, () => ++signedOut);
+  const begun = beginSearch({}, firstPage(null)) as Promise<Begun & { page?: Page }>;
+  search = new Search(NO_CRITERIA, begun, null, () => {}, () => ++signedOut);
 }
 const count = (key: string) => asked.filter((one) => one === key).length;
 const settle = () => new Promise((done) => setTimeout(done, 20));
@@ -52,13 +55,14 @@ test('how a search ends, and what is said', async () => {
     ['done', {}, 'done', /^$/],
     ['failed', { 'searches/t': () => progress(true, -1, 0, 407) }, 'failed', /may not read/],
     ['its worker died', { 'searches/t': () => progress(true, 0, 1) }, 'stopped', /ended early/],
-    ['refused', { start: () => ({ body: { code: 401, data: null } }) }, 'failed', /could not be started/],
-    ['no network', { start: () => 'broken' }, 'failed', /does not answer/],
+    ['failed before it was listed', { 'searches/t': () => progress(true, -1, 0, 407), list: () => ({ body: { code: 600, data: null } }) }, 'failed', /may not read/],
+    ['refused', { searches: () => ({ body: { code: 401 } }) }, 'failed', /could not be started/],
+    ['no network', { searches: () => 'broken' }, 'failed', /does not answer/],
     ['forgotten by the server', { 'searches/t': () => ({ status: 404, body: { code: 404, error: 'x' } }) }, 'failed', /no longer has/],
     ['a lost answer', { 'searches/t': (n) => (n < 4 ? 'broken' : progress(true, 1, 3)) }, 'done', /^$/],
     ['no answer any more', { 'searches/t': () => 'broken' }, 'failed', /does not answer/],
-    ['a busy server', { start: (n) => (n < 3 ? { status: 503, body: { code: 503, error: 'busy' } } : HAPPY.start!(n)) }, 'done', /^$/],
-    ['too busy for too long', { start: () => ({ status: 503, body: { code: 503, error: 'all is busy' } }) }, 'failed', /^All is busy\.$/],
+    ['a busy server', { searches: (n) => (n < 3 ? { status: 503, body: { code: 503, error: 'busy' } } : HAPPY.searches!(n)) }, 'done', /^$/],
+    ['too busy for too long', { searches: () => ({ status: 503, body: { code: 503, error: 'all is busy' } }) }, 'failed', /^All is busy\.$/],
     ['no session', { 'searches/t': () => ({ status: 401, body: { code: 401, error: 'x' } }) }, 'failed', /./],
   ];
   for (const [why, script, status, error] of ends) {
@@ -80,6 +84,22 @@ test('what was found last is shown, though it came after the first page', async 
   await settle();
   assert.equal(search.found, 3);
   assert.equal(search.pages.row(2)?.name, '2');
+});
+
+test('the rows that come with the begin are shown, and asked for again only where more may come', async () => {
+  for (const [finished, lists] of [[true, 0], [false, 1]] as const) {
+    const page = { files: rows(3), total: 3, offset: 0, finished };
+    begin({
+      searches: () => ({ body: { taskid: 't', params: {}, page } }),
+      'searches/t': (n) => (n < 3 ? progress(false, 0, 3) : progress(true, 1, 3)),
+    });
+    const over = search.run();
+    await settle();
+    assert.equal(search.pages.row(2)?.name, '2');
+    await over;
+    await settle();
+    assert.equal(count('list'), lists, `finished: ${finished}`);
+  }
 });
 
 test('growth shows before the end', async () => {

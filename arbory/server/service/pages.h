@@ -14,7 +14,9 @@ namespace arbory {
 std::string FindWebFolder(const std::string& configured);
 
 // The file at this path below the folder, "index.html" for none; 404 when there is none, and a text
-// that says how to build the page when it is the page itself that is missing.
-HttpReply PageReply(const std::string& folder, const std::vector<std::string>& path);
+// that says how to build the page when it is the page itself that is missing. With `takes_gzip` as
+// the build compressed it, where it did.
+HttpReply PageReply(const std::string& folder, const std::vector<std::string>& path,
+                    bool takes_gzip);
 
 }  // namespace arbory

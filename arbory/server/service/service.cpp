@@ -5,6 +5,9 @@
 
 #include <charconv>
 
+#include "arbory/caller.h"
+#include "arbory/server/service/begin_search.h"
+#include "arbory/server/service/gzip.h"
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/past_searches.h"
@@ -45,6 +48,8 @@ auto ReaderOf(const std::string& body) {
     return std::nullopt;
   };
 }
+
+bool IsLeased(const HttpRequest& request) { return request.Field("arbory-lease") != nullptr; }
 
 // So many of the largest bodies: a person's page sends small ones, one after the other.
 constexpr std::uint64_t kLargestOfOneUser = 2;
@@ -98,6 +103,9 @@ std::span<const Route> Service::Routes() {
                                 [&] { return StartListShares(request->user); });
        },
        "The shares the user can enter", kJson},
+      {kPost, "/searches", Access::kLoggedIn,
+       [](Self self, Request request, Path) { return self.BeginSearch(*request); },
+       "Begin a search of what was typed, and list what it finds at once", kJson},
       {kGet, "/searches/{taskid}", Access::kLoggedIn,
        [](Self self, Request request, Path path) {
          return self.calls_.Run(Calls::Kind::kCall, request->user, "searches",
@@ -145,7 +153,9 @@ std::span<const Route> Service::Routes() {
        [](Self self, Request, Path) { return self.MetricsReply(); },
        "Counts, in the Prometheus text format", "text/plain"},
       {kGet, "/{page...}", Access::kEverybody,
-       [](Self self, Request, Path path) -> Answer { return PageReply(self.setup_.web_dir, path); },
+       [](Self self, Request request, Path path) -> Answer {
+         return PageReply(self.setup_.web_dir, path, TakesGzip(*request));
+       },
        nullptr, nullptr},
   };
   return kRoutes;
@@ -219,11 +229,28 @@ Answer Service::CallApi(const HttpRequest& request, const RequestPath& path) {
 
 Answer Service::Ask(const HttpRequest& request, const std::string& name,
                     const std::function<nas::Child(const nas::ApiCall&)>& start) {
-  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server"};
-  if (!request.body.empty()) call.read_params = ReaderOf(request.body);
+  const nas::ApiCall call = OwnCall(request, &request.body);
   return WithRoom(request, [&] {
     return calls_.Run(Calls::Kind::kCall, request.user, name, [&] { return start(call); });
   });
+}
+
+nas::ApiCall Service::OwnCall(const HttpRequest& request, const std::string* body) {
+  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server",
+                       IsLeased(request)};
+  if (body != nullptr && !body->empty()) call.read_params = ReaderOf(*body);
+  if (TakesGzip(request)) call.finish = Gzipped;
+  return call;
+}
+
+Answer Service::BeginSearch(const HttpRequest& request) {
+  const NUVA::APIMethod* start = module_.Find(kSearchApi, kSearchVersion, "start");
+  const NUVA::APIMethod* list = module_.Find(kSearchApi, kSearchVersion, "list");
+  if (start == nullptr || list == nullptr) {
+    return ErrorReply(kNotFound, "This server has no searches; GET /api lists what there is.");
+  }
+  return Ask(request, "begin",
+             [&](const nas::ApiCall& call) { return StartBegin(call, *start, *list); });
 }
 
 Answer Service::WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of) {
@@ -246,9 +273,8 @@ Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
   const auto parsed = std::from_chars(text.data(), text.data() + text.size(), version);
   const bool is_number = parsed.ec == std::errc() && parsed.ptr == text.data() + text.size();
   const NUVA::APIMethod* row = is_number ? module_.Find(path[1], version, path[3]) : nullptr;
-  nas::ApiCall call = {path[3], Json::Value(Json::objectValue), request.user, "",
-                       request.Field("arbory-lease") != nullptr};
-  if (!request.body.empty()) call.read_params = ReaderOf(request.body);
+  nas::ApiCall call = OwnCall(request, &request.body);
+  call.method = path[3];
   if (row == nullptr) return NoSuchRow(path, call);
   const std::string session = entrance_.SessionId(request);
   Answer answer =
@@ -306,9 +332,8 @@ std::optional<FileRequest> Service::FileOf(const HttpRequest& request, const Req
 
 // The parameters are those that a POST of them has as its body.
 Answer Service::AskInstantly(const HttpRequest& request) {
-  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server"};
   const auto params = QueryValue(request.query(), "params");
-  if (params) call.read_params = ReaderOf(*params);
+  const nas::ApiCall call = OwnCall(request, params ? &*params : nullptr);
   return calls_.Run(Calls::Kind::kCall, request.user, "instant",
                     [&] { return StartInstant(call); });
 }

@@ -51,6 +51,8 @@ class Service : public HttpService {
   // The answer of a child that reads the request's body, which `start` makes of the call.
   Answer Ask(const HttpRequest& request, const std::string& name,
              const std::function<nas::Child(const nas::ApiCall&)>& start);
+  // A call of the server's own, whose parameters are read from `body` where there is one.
+  static nas::ApiCall OwnCall(const HttpRequest& request, const std::string* body);
   static Answer WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of);
   Answer StartCall(const HttpRequest& request, const RequestPath& path);
   Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
@@ -58,6 +60,7 @@ class Service : public HttpService {
   static std::optional<FileRequest> FileOf(const HttpRequest& request, const RequestPath& path);
   Answer GetFile(const HttpRequest& request, const RequestPath& path);
   Answer AskInstantly(const HttpRequest& request);
+  Answer BeginSearch(const HttpRequest& request);
   Answer GetFirstLine(const HttpRequest& request, const RequestPath& path);
   // The reply to a request that may not ask this route.
   std::optional<HttpReply> Refusal(const Route& route, HttpRequest* request);

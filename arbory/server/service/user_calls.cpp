@@ -95,7 +95,12 @@ void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try 
   if (!BecomeCaller(request, response)) return;
   Json::Value body;
   try {
-    body["params"] = SearchRequest(TypedQuery(*request), {}, std::time(nullptr));
+    Json::Value& params = body["params"] =
+        SearchRequest(TypedQuery(*request), {}, std::time(nullptr));
+    for (const char* as_given : {"folder_path", "search_type", "list"}) {
+      if (request->HasParam(as_given))
+        params[as_given] = request->GetParam(as_given, Json::Value());
+    }
   } catch (const CriterionError& error) {
     body["wrong"]["criterion"] = error.criterion();
     body["wrong"]["sentence"] = error.what();
@@ -299,6 +304,10 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id) 
 }
 
 nas::Child StartReadQuery(const nas::ApiCall& call) { return StartOwn(ReadQueryEntry, call); }
+
+nas::Reply ReadQuery(const nas::ApiCall& call) {
+  return nas::RunCall({"arbory", 1, "", ReadQueryEntry}, call, EncodeOwnReply);
+}
 
 nas::Child StartInstant(const nas::ApiCall& call) { return StartOwn(InstantEntry, call); }
 

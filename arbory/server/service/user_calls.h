@@ -29,6 +29,8 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 // "sentence"}} where it cannot be understood. The call's parameters are those of a start, sizes and
 // times as texts: "size_from", "size_to", and bounds as "mtime", "crtime" and "atime".
 nas::Child StartReadQuery(const nas::ApiCall& call);
+// The same reply, waited for in the process that calls it.
+nas::Reply ReadQuery(const nas::ApiCall& call);
 
 // What the index knows at once: {"index","found","more","rows"} (nas/search/instant.h), or
 // {"wrong"} as StartReadQuery has it. The call's parameters are those of StartReadQuery and

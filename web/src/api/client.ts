@@ -1,6 +1,7 @@
 // The server's routes as functions. Everything goes to the page's own origin.
 import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
+  Begun,
   HistoryKind,
   InstantAnswer,
   Misses,
@@ -10,7 +11,7 @@ import type {
   Session,
   Shares,
   Started,
-  Understood,
+  Wrong,
 } from './types.ts';
 
 const SEARCH = 'NUVA.Arbory.Search/2';
@@ -62,7 +63,6 @@ async function call<T>(api: string, method: string, params: object, init?: Reque
 }
 
 export const startSearch = (params: object) => call<Started>(SEARCH, 'start', params);
-export const understand = (typed: object) => post('query', typed) as Promise<Understood>;
 export const instant = (typed: object, signal: AbortSignal) =>
   request(`instant?${new URLSearchParams({ params: JSON.stringify(typed) })}`, {
     signal,
@@ -84,10 +84,28 @@ export interface ListParams {
   sort_direction?: 'ASC' | 'DESC';
 }
 
+const ADDITIONAL = ['size', 'owner', 'time', 'type'];
+
 export async function listResults(params: ListParams, signal?: AbortSignal): Promise<Page> {
-  const additional = ['size', 'owner', 'time', 'type'];
-  const page = await call<Partial<Page>>(SEARCH, 'list', { additional, ...params }, { signal });
-  return { files: [], total: 0, offset: params.offset, finished: true, ...page };
+  const asked = { additional: ADDITIONAL, ...params };
+  return whole(await call<Partial<Page>>(SEARCH, 'list', asked, { signal }), params.offset);
+}
+
+function whole(page: Partial<Page>, offset: number): Page {
+  return { files: [], total: 0, offset, finished: true, ...page };
+}
+
+// Begins a search of what was typed, and lists its first rows by the way.
+export async function beginSearch(
+  typed: object,
+  list: Omit<ListParams, 'taskid' | 'offset'>,
+): Promise<(Begun & { page?: Page }) | Wrong> {
+  const body = { ...typed, list: { additional: ADDITIONAL, ...list } };
+  const reply = (await post('searches', body)) as Begun | Wrong | { code: number };
+  if ('code' in reply) throw new ApiError(callFailure('start', reply.code), 200, reply.code);
+  if ('wrong' in reply) return reply;
+  const { page, ...begun } = reply;
+  return { ...begun, ...(page && { page: whole(page, 0) }) };
 }
 
 type Past = Promise<{ searches: PastSearch[] }>;

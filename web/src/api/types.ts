@@ -40,10 +40,18 @@ export interface Progress {
   walk?: Partial<Walk>;
 }
 
-// What was typed, as the parameters of a start; or what about it cannot be understood.
-export type Understood =
-  | { params: Record<string, unknown>; wrong?: undefined }
-  | { wrong: { criterion: string; sentence: string } };
+// What about something that was typed cannot be understood.
+export interface Wrong {
+  wrong: { criterion: string; sentence: string };
+}
+
+// A search that was begun: what was typed as the parameters of its start, and what it had found by
+// then, where that could be listed.
+export interface Begun {
+  taskid: string;
+  params: Record<string, unknown>;
+  page?: Partial<Page>;
+}
 
 // What an index knows of a question at once; or what about it cannot be understood.
 export type InstantAnswer =
@@ -54,7 +62,7 @@ export type InstantAnswer =
       more: boolean; // there may be more
       wrong?: undefined;
     }
-  | { wrong: { criterion: string; sentence: string } };
+  | Wrong;
 
 // What a search that found nothing came close to.
 export interface Misses {

@@ -3,7 +3,7 @@
 // the search starts, so that "last 7 days" in a shared link means the seven days before it is
 // opened; what they mean the server alone knows.
 import { asSentence } from '../api/errors.ts';
-import type { Understood } from '../api/types.ts';
+import type { Wrong } from '../api/types.ts';
 import { plural } from './text.ts';
 import { describeTime } from './times.ts';
 
@@ -183,13 +183,13 @@ export function typed(c: Criteria): StartParams {
   return asked;
 }
 
-// What a search is started with; `understand` asks the server. Throws CriterionError. `everywhere`
-// is what stands for no chosen folder.
-export async function startParams(
+// Has a search begun by `begin`, which the server understands or not. Throws CriterionError.
+// `everywhere` is what stands for no chosen folder.
+export async function begun<Begun extends object>(
   c: Criteria,
   everywhere: string[],
-  understand: (asked: StartParams) => Promise<Understood>,
-): Promise<StartParams> {
+  begin: (asked: StartParams) => Promise<Begun | Wrong>,
+): Promise<Begun> {
   const folders = c.folders.length > 0 ? c.folders : everywhere;
   if (folders.length === 0) {
     throw new CriterionError('folders', 'There is no folder that you may search. Ask for access.');
@@ -197,17 +197,14 @@ export async function startParams(
   if (c.contents && c.pattern.trim() === '') {
     throw new CriterionError('contents', 'Type the words to look for inside the files.');
   }
-  const understood = await understand(typed(c));
-  if (understood.wrong) {
-    const { criterion: name, sentence } = understood.wrong;
+  const search_type = hasCriteria(c) ? 'advance' : 'simple';
+  const reply = await begin({ ...typed(c), folder_path: folders, search_type });
+  if ('wrong' in reply) {
+    const { criterion: name, sentence } = reply.wrong;
     const ofName = (field: Field) => criterion(field).sent === name;
     throw new CriterionError(FIELDS.find(ofName) ?? 'pattern', asSentence(sentence));
   }
-  return {
-    ...understood.params,
-    folder_path: folders,
-    search_type: hasCriteria(c) ? 'advance' : 'simple',
-  };
+  return reply;
 }
 
 function tidy(size: string): string {

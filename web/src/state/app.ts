@@ -11,13 +11,13 @@ import {
   hasCriteria,
   NO_CRITERIA,
   sameCriteria,
-  startParams,
+  begun as begin,
   type Criteria,
 } from '../model/criteria.ts';
 import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
 import { Past } from './past.ts';
-import { Search } from './search.ts';
+import { firstPage, Search } from './search.ts';
 import { Trail, type Step } from './trail.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
@@ -75,9 +75,8 @@ export class App {
 
   async open(): Promise<void> {
     try {
-      this.session = await client.getSession();
-      const { shares, homes } = await client.getShares();
-      Object.assign(this, { shares, homes, gate: 'ready', problem: '' });
+      const [session, { shares, homes }] = await Promise.all([client.getSession(), client.getShares()]);
+      Object.assign(this, { session, shares, homes, gate: 'ready', problem: '' });
       this.followAddress();
       void this.past.load();
     } catch (error) {
@@ -288,13 +287,14 @@ export class App {
     this.draftError = null;
     if (this.standing === undefined) this.standing = this.search;
     else this.search?.close();
-    const params = startParams(criteria, this.everywhere, client.understand);
-    const search = new Search(criteria, params, sort, this.changed, this.signedOut);
+    const list = firstPage(sort);
+    const begun = begin(criteria, this.everywhere, (asked) => client.beginSearch(asked, list));
+    const search = new Search(criteria, begun, sort, this.changed, this.signedOut);
     this.search = search;
     const ended = search.run();
     this.changed();
     // What else may fail, the search itself tells.
-    const error: unknown = await params.then(() => null, (reason: unknown) => reason);
+    const error: unknown = await begun.then(() => null, (reason: unknown) => reason);
     if (this.search !== search) return false;
     if (error instanceof CriterionError) {
       this.abandon();

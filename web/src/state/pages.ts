@@ -13,6 +13,7 @@ type Fetch = (offset: number, limit: number, signal: AbortSignal) => Promise<Pag
 interface Kept {
   rows: FileRow[];
   stale: boolean;
+  final: boolean; // listed when nothing more could come
 }
 
 export class Pages {
@@ -24,6 +25,7 @@ export class Pages {
   private first = 0;
   private last = 0;
   private abort = new AbortController();
+  private opened = false;
   private closed = false;
 
   constructor(
@@ -48,7 +50,7 @@ export class Pages {
   grown(total: number, foundOrder: boolean): void {
     this.total = Math.max(total, this.total);
     this.foundOrder = foundOrder;
-    for (const page of this.kept.values()) page.stale ||= this.canGrow(page.rows);
+    for (const page of this.kept.values()) page.stale ||= !page.final && this.canGrow(page.rows);
     // Their replies may have been written before.
     for (const request of this.flying.values()) request.outgrown = true;
     this.pump();
@@ -56,6 +58,19 @@ export class Pages {
 
   private canGrow(rows: FileRow[]): boolean {
     return !this.foundOrder || rows.length < PAGE_ROWS;
+  }
+
+  // From now on there is something to fetch from; `page` is the first, where that has come by itself.
+  open(page?: Page): void {
+    this.opened = true;
+    if (page) this.keep(0, page, false);
+    this.pump();
+  }
+
+  // Nothing more is found; pages that were listed before that are fetched once more.
+  end(): void {
+    const final = this.kept.size > 0 && [...this.kept.values()].every((page) => page.final);
+    if (!final || this.flying.size > 0) this.renew();
   }
 
   // Everything is fetched anew, in a new order or for the last time; the old is shown meanwhile.
@@ -74,7 +89,7 @@ export class Pages {
   }
 
   private pump(): void {
-    while (!this.closed && this.flying.size < REQUESTS) {
+    while (this.opened && !this.closed && this.flying.size < REQUESTS) {
       const page = this.wanted().find((number) => this.needs(number));
       if (page === undefined) return;
       void this.fetch(page);
@@ -114,7 +129,8 @@ export class Pages {
 
   private keep(number: number, page: Page, outgrown: boolean): void {
     this.kept.delete(number);
-    this.kept.set(number, { rows: page.files, stale: outgrown && this.canGrow(page.files) });
+    const stale = outgrown && !page.finished && this.canGrow(page.files);
+    this.kept.set(number, { rows: page.files, stale, final: page.finished });
     this.before.clear();
     // While a search runs a page may have been counted before the newest matches were.
     this.total = page.finished ? page.total : Math.max(this.total, page.total);

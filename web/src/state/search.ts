@@ -2,11 +2,11 @@
 // are seen up to date, and tells when anything changed.
 import * as client from '../api/client.ts';
 import { ApiError, walkFailure } from '../api/errors.ts';
-import type { Misses, Page, Progress, Walk } from '../api/types.ts';
+import type { Begun, Misses, Page, Progress, Walk } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
-import type { Criteria, StartParams } from '../model/criteria.ts';
+import type { Criteria } from '../model/criteria.ts';
 import { ScrollModel } from '../model/scroll.ts';
-import { Pages } from './pages.ts';
+import { PAGE_ROWS, Pages } from './pages.ts';
 
 export type Status = 'starting' | 'running' | 'done' | 'stopped' | 'failed';
 
@@ -17,6 +17,13 @@ const STEADY_MS = 400;
 const HIDDEN_MS = 2000;
 // So many unanswered questions in a row, and the search is given up.
 const MISSES = 5;
+
+// What the listing is asked for beside its place.
+function ordered(sort: Sort | null) {
+  if (!sort) return {};
+  return { sort_by: sort.column, sort_direction: sort.descending ? ('DESC' as const) : ('ASC' as const) };
+}
+export const firstPage = (sort: Sort | null) => ({ limit: PAGE_ROWS, ...ordered(sort) });
 
 const wait = (ms: number) => new Promise((done) => setTimeout(done, ms));
 
@@ -42,7 +49,7 @@ export class Search {
 
   constructor(
     readonly criteria: Criteria,
-    private readonly params: Promise<StartParams>,
+    private readonly begun: Promise<Begun & { page?: Page }>,
     public sort: Sort | null,
     private readonly changed: () => void,
     private readonly signedOut: () => void,
@@ -68,10 +75,10 @@ export class Search {
   }
 
   async run(): Promise<void> {
+    const { sort } = this;
+    let page: Page | undefined;
     try {
-      const params = await this.params;
-      if (this.closed) return;
-      this.taskid = (await client.startSearch(params)).taskid;
+      ({ taskid: this.taskid, page } = await this.begun);
     } catch (error) {
       this.fail(error);
       return;
@@ -81,8 +88,8 @@ export class Search {
       return;
     }
     this.status = 'running';
+    this.pages.open(this.sort === sort ? page : undefined);
     this.changed();
-    this.pages.show(0, 0);
     await this.follow();
   }
 
@@ -132,14 +139,14 @@ export class Search {
       }
     }
     // The walk's count may run ahead of what is listed; the last pages say how it is.
-    if (this.status !== 'failed') this.pages.renew();
+    if (this.status !== 'failed') this.pages.end();
     this.changed();
   }
 
   // Saying why is a convenience; that nothing was found has been said.
   private async learnWhy(): Promise<void> {
     try {
-      this.misses = await client.nearMisses(this.taskid, await this.params);
+      this.misses = await client.nearMisses(this.taskid, (await this.begun).params);
       this.changed();
     } catch {
       return;
@@ -163,19 +170,14 @@ export class Search {
   private pageFailed(error: unknown): void {
     if (this.closed) return;
     if (error instanceof ApiError && error.signedOut) this.signedOut();
-    // A running search asks again with its next progress; only the end is final.
-    if (this.over) this.error = error instanceof Error ? error.message : String(error);
+    // A running search asks again with its next progress; only the end is final, and of one that
+    // failed it is said why.
+    if (this.over && this.status !== 'failed') this.error = error instanceof Error ? error.message : String(error);
     this.changed();
   }
 
   list(offset: number, limit: number, signal?: AbortSignal): Promise<Page> {
-    const order = this.sort
-      ? {
-          sort_by: this.sort.column,
-          sort_direction: this.sort.descending ? ('DESC' as const) : ('ASC' as const),
-        }
-      : {};
-    return client.listResults({ taskid: this.taskid, offset, limit, ...order }, signal);
+    return client.listResults({ taskid: this.taskid, offset, limit, ...ordered(this.sort) }, signal);
   }
 
   setSort(sort: Sort | null): void {

@@ -1,0 +1,96 @@
+#include "arbory/server/service/begin_search.h"
+
+#include <chrono>
+#include <thread>
+
+#include "arbory/server/service/user_calls.h"
+#include "arbory/server/transport/http.h"
+#include "arbory/server/transport/http_text.h"
+#include "nas/base/json_text.h"
+#include "nas/system/config.h"
+
+namespace arbory {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::steady_clock;
+
+// Most searches have found something by then, and a person feels no more.
+constexpr milliseconds kMostWait{250};
+constexpr milliseconds kLookAgain{10};
+// Of a first page: more than a screen shows, and a reply that need not be spooled.
+constexpr int kMostRows = 1000;
+constexpr char kList[] = "list";
+constexpr char kLimit[] = "limit";
+
+nas::ApiCall CallOf(const nas::ApiCall& outer, const NUVA::APIMethod& row, Json::Value params) {
+  nas::ApiCall call = outer;
+  call.method = row.method;
+  call.params = std::move(params);
+  call.read_params = {};
+  call.finish = {};
+  return call;
+}
+
+// The data of a reply of the module; null where it failed, with its code in `code`.
+Json::Value DataOf(const nas::Reply& reply, int* code) {
+  *code = reply.head.code;
+  Json::Value body;
+  if (*code != 0 || !nas::ParseJson(reply.body, &body)) return {};
+  return body["data"];
+}
+
+// What the search has found once that is something, or it has ended.
+Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Json::Value params) {
+  const Json::Value& limit = params[kLimit];
+  if (!limit.isInt() || limit.asInt() <= 0 || limit.asInt() > kMostRows) params[kLimit] = kMostRows;
+  const auto end = steady_clock::now() + kMostWait;
+  for (;;) {
+    int code = 0;
+    Json::Value page =
+        DataOf(nas::RunCall(list, CallOf(outer, list, params), nas::EncodeJsonReply), &code);
+    const bool waits = page.isObject() && page["files"].empty() && !page["finished"].asBool();
+    if (!waits || steady_clock::now() > end) return page;
+    std::this_thread::sleep_for(kLookAgain);
+  }
+}
+
+nas::Reply Begin(const nas::ApiCall& call, const NUVA::APIMethod& start,
+                 const NUVA::APIMethod& list) {
+  nas::ApiCall plain = call;
+  plain.finish = {};
+  nas::Reply read = ReadQuery(plain);
+  Json::Value body;
+  if (read.head.status != kOk || !nas::ParseJson(read.body, &body) || body.isMember("wrong")) {
+    return read;
+  }
+  Json::Value listing = body["params"]["list"];
+  body["params"].removeMember("list");
+  int code = 0;
+  const Json::Value begun =
+      DataOf(nas::RunCall(start, CallOf(call, start, body["params"]), nas::EncodeJsonReply), &code);
+  if (code != 0) {
+    body = Json::Value();
+    body["code"] = code;
+  } else {
+    if (!listing.isObject()) listing = Json::Value(Json::objectValue);
+    listing["taskid"] = body["taskid"] = begun["taskid"];
+    Json::Value page = FirstPage(call, list, std::move(listing));
+    if (!page.isNull()) body["page"] = std::move(page);
+  }
+  return AsChildsReply(JsonReply(kOk, nas::JsonText(body, nas::JsonBytes::kClean)));
+}
+
+}  // namespace
+
+nas::Child StartBegin(const nas::ApiCall& call, const NUVA::APIMethod& start,
+                      const NUVA::APIMethod& list) {
+  return nas::StartChild(
+      [&](int pipe) {
+        nas::Reply reply = Begin(call, start, list);
+        nas::SendReply(pipe, call.finish ? call.finish(std::move(reply)) : reply);
+      },
+      nas::CurrentConfig().call_memory_bytes());
+}
+
+}  // namespace arbory
