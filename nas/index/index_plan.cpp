@@ -155,7 +155,7 @@ std::vector<std::string> TextsOf(const Json::Value& list) {
 Plan MakePlan() {
   std::vector<std::string> folders = WantedFolders();
   std::ranges::sort(folders);
-  folders.erase(std::ranges::unique(folders).begin(), folders.end());
+  folders.erase(std::unique(folders.begin(), folders.end()), folders.end());
   Planner planner;
   for (const std::string& folder : folders) planner.Add(folder);
   return planner.Take();

@@ -59,7 +59,7 @@ std::vector<std::string> RequiredTexts(const QueryNode& query) {
       return {};
   }
   std::ranges::sort(texts);
-  texts.erase(std::ranges::unique(texts).begin(), texts.end());
+  texts.erase(std::unique(texts.begin(), texts.end()), texts.end());
   if (texts.size() > kMostRequiredTexts) texts.clear();
   return texts;
 }

@@ -98,7 +98,7 @@ bool IndexFilter::FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* 
   }
   if (needles_.size() > 1) {
     std::ranges::sort(*found);
-    found->erase(std::ranges::unique(*found).begin(), found->end());
+    found->erase(std::unique(found->begin(), found->end()), found->end());
   }
   return true;
 }
@@ -129,7 +129,7 @@ void IndexFilter::FindOthers(EntryId begin, EntryId end, std::vector<EntryId>* f
     if (!IsAscii(snapshot_.table.name(entry))) found->push_back(entry);
   }
   std::ranges::inplace_merge(*found, found->begin() + middle);
-  found->erase(std::ranges::unique(*found).begin(), found->end());
+  found->erase(std::unique(found->begin(), found->end()), found->end());
 }
 
 void IndexFilter::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const {

@@ -56,7 +56,8 @@ void IndexNames::FindSpecials() {
     const bool is_changed = next != changed.end() && next->first == id;
     const bool unknown = table_.unreadable(id);
     if (!is_changed && !unknown) continue;
-    Special& special = specials_.emplace_back(id, unknown);
+    specials_.push_back({id, unknown});
+    Special& special = specials_.back();
     if (!is_changed) continue;
     special.changed = &next->second;
     special.whole |= next->second.whole;

@@ -29,7 +29,8 @@ void AddRows(const RowBlock& block, size_t location, InstantReply& reply) {
   std::string_view attributes = block.attributes();
   block.EachFolder([&](std::string_view folder, std::string_view names) {
     while (!names.empty()) {
-      InstantReply::Row& row = reply.rows.emplace_back(location, std::string(folder));
+      reply.rows.push_back({location, std::string(folder), {}, {}});
+      InstantReply::Row& row = reply.rows.back();
       row.name = names.substr(0, names.find('\0'));
       names.remove_prefix(row.name.size() + 1);
       std::memcpy(&row.attributes, attributes.data(), sizeof(row.attributes));

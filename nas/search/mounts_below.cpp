@@ -48,7 +48,7 @@ std::vector<std::string> MountsBelow(const std::string& mountinfo, const std::st
     }
   }
   std::ranges::sort(below);
-  below.erase(std::ranges::unique(below).begin(), below.end());
+  below.erase(std::unique(below.begin(), below.end()), below.end());
   return below;
 }
 
