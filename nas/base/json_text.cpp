@@ -6,6 +6,8 @@
 #include <charconv>
 #include <cmath>
 #include <memory>
+#include <new>
+#include <string_view>
 
 #include "nas/base/hex.h"
 #include "nas/base/utf8.h"
@@ -217,8 +219,13 @@ bool ParseJson(std::string_view text, Json::Value* out, int max_depth) {
     if (!reader->parse(text.data(), text.data() + text.size(), &value, &trouble)) return false;
     *out = std::move(value);
     return true;
-  } catch (const Json::Exception&) {
-    return false;
+  } catch (const Json::Exception& error) {
+    // It has one kind for a document that is too deep and for a string that there is no memory for.
+    // Who took the second for the first would take a good record for a damaged one.
+    if (std::string_view(error.what()).find("Failed to allocate") == std::string_view::npos) {
+      return false;
+    }
+    throw std::bad_alloc();
   }
 }
 

@@ -41,7 +41,8 @@ inline constexpr size_t kJsonMaxValues = 200'000;
 // Reads one JSON document of any type: no comments, nothing after it, at most `max_depth` levels
 // deep and at most kJsonMaxValues values, which are counted before any is made. False, with `out`
 // untouched, for anything else: there is no more to tell, as the texts come from programs. Strings
-// may hold bytes that are not UTF-8. Of members of one name the last counts.
+// may hold bytes that are not UTF-8. Of members of one name the last counts. Throws std::bad_alloc
+// where there is no memory for it, which says nothing of the text.
 bool ParseJson(std::string_view text, Json::Value* out, int max_depth = kJsonMaxDepth);
 
 }  // namespace nas

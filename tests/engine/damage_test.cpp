@@ -14,15 +14,10 @@
 
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
+#include "tests/nas/fixture.h"
 
 namespace nas {
 namespace {
-
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool kSanitized = true;  // their tables take all of the address space
-#else
-constexpr bool kSanitized = false;
-#endif
 
 // While it lives, the process has room for a reader and its cache, and for nothing that a small
 // file merely claims.
@@ -35,7 +30,7 @@ class LittleMemory {
     constexpr size_t kRoom = size_t{64} << 20;
     rlimit limit = before_;
     limit.rlim_cur = pages * static_cast<size_t>(sysconf(_SC_PAGESIZE)) + kRoom;
-    if (!kSanitized) setrlimit(RLIMIT_AS, &limit);
+    if (nas_test::kMemoryIsBounded) setrlimit(RLIMIT_AS, &limit);
   }
   ~LittleMemory() { setrlimit(RLIMIT_AS, &before_); }
   LittleMemory(const LittleMemory&) = delete;

@@ -26,6 +26,13 @@ namespace nas_test {
 // An account that every system has, that is not root, and that owns nothing.
 inline constexpr char kOtherUser[] = "nobody";
 
+// Whether nas::LimitMemory does, which sanitizers would not survive.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+inline constexpr bool kMemoryIsBounded = false;
+#else
+inline constexpr bool kMemoryIsBounded = true;
+#endif
+
 // The name of the user the tests run as.
 std::string Me();
 bool AmRoot();

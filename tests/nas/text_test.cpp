@@ -5,8 +5,10 @@
 
 #include <cstdio>
 #include <limits>
+#include <new>
 
 #include "nas/base/json_text.h"
+#include "nas/system/memory.h"
 #include "nas/system/request_bounds.h"
 #include "platform/json_file.h"
 #include "platform/system.h"
@@ -91,6 +93,25 @@ TEST(Json, RefusesWhatIsNotOneDocument) {
     Json::Value value("untouched");
     EXPECT_FALSE(nas::ParseJson(text, &value)) << text.substr(0, 20);
     EXPECT_EQ(value, "untouched");
+  }
+}
+
+// A record that is taken for damaged is removed, so a shortage must not look like damage.
+TEST(Json, TellsNoMemoryFromNoDocument) {
+  if (!kMemoryIsBounded) GTEST_SKIP() << "sanitizers need their memory";
+  constexpr size_t kBytes = size_t{16} << 20;
+  const std::string text = '"' + std::string(kBytes, 'a') + '"';
+  // Whichever of the copies it is that finds no room.
+  for (size_t more = kBytes / 2; more < 4 * kBytes; more += kBytes / 2) {
+    EXPECT_TRUE(InChild([&] {
+      nas::LimitMemory(kBytes + more);
+      Json::Value value;
+      try {
+        EXPECT_TRUE(nas::ParseJson(text, &value)) << more;
+      } catch (const std::bad_alloc&) {
+        nas::LiftMemoryLimit();
+      }
+    }));
   }
 }
 
