@@ -8,6 +8,7 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
+#include <string_view>
 
 #include "platform/webfm.h"
 
@@ -64,12 +65,19 @@ bool TakeIds(const Account& account) {
          setresuid(account.uid, account.uid, kRoot) == 0;
 }
 
+[[noreturn]] void EndInstead() {
+  constexpr std::string_view kWords =
+      "arbory: ended, as this process cannot take its user's identity\n";
+  (void)write(STDERR_FILENO, kWords.data(), kWords.size());
+  std::abort();
+}
+
 // Returns to an identity the process had. Going on with another one would be worse than ending.
 void Restore(const uid_t (&users)[3], const gid_t (&groups)[3], const std::vector<gid_t>& list) {
   if (seteuid(kRoot) != 0 || setgroups(list.size(), list.data()) != 0 ||
       setresgid(groups[0], groups[1], groups[2]) != 0 ||
       setresuid(users[0], users[1], users[2]) != 0) {
-    std::abort();
+    EndInstead();
   }
 }
 
@@ -110,19 +118,19 @@ const std::optional<Account>& ActingAccount() { return g_self; }
 void GiveUpRoot() {
   const gid_t group = getegid();
   const uid_t user = geteuid();
-  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) std::abort();
+  if (setresgid(group, group, group) != 0 || setresuid(user, user, user) != 0) EndInstead();
 }
 
 ScopedRoot::ScopedRoot() : user_(geteuid()), group_(getegid()) {
   if (user_ == kRoot || !CanBeRoot() || seteuid(kRoot) != 0) return;
   raised_ = true;
-  if (setegid(0) != 0) std::abort();
+  if (setegid(0) != 0) EndInstead();
 }
 
 ScopedRoot::~ScopedRoot() {
   if (!raised_) return;
   const int saved = errno;
-  if (setegid(group_) != 0 || seteuid(user_) != 0) std::abort();
+  if (setegid(group_) != 0 || seteuid(user_) != 0) EndInstead();
   errno = saved;
 }
 

@@ -31,8 +31,8 @@ Status CheckActsAs(const std::string& user);
 const std::optional<Account>& ActingAccount();
 
 // Gives up for good the root that the process could go back to. For whoever is about to read what
-// the user can write, once no folder is left to be made. A process that cannot aborts; one whose
-// user is root stays root.
+// the user can write, once no folder is left to be made. A process that cannot says so and
+// aborts; one whose user is root stays root.
 void GiveUpRoot();
 
 // Root for the time of a few system calls, then the identity before it. Does nothing where root

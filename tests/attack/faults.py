@@ -140,7 +140,8 @@ def attack_operation(name, options, bin_dir):
     become_subreaper()
     random.seed(f"{options.seed} {name}")
     outcome = Outcome()
-    outcome.counts = {"faults injected": 0, "of them in SQLite": 0, "left something to the sweep": 0}
+    outcome.counts = {"faults injected": 0, "of them in SQLite": 0, "left something to the sweep": 0,
+                      "ended by the C library itself": 0}
     attack = Attack(bin_dir)
     campaign = Campaign(attack, outcome, options)
     _, _, rest = options.only.partition(":")
@@ -152,6 +153,7 @@ def attack_operation(name, options, bin_dir):
         else:
             campaign.over(name, operations()[name])
         outcome.count("left something to the sweep", attack.left)
+        outcome.count("ended by the C library itself", attack.ended)
     finally:
         attack.close()
     return outcome
