@@ -13,6 +13,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <ctime>
 #include <list>
 #include <memory>
 #include <optional>
@@ -25,6 +26,7 @@
 #include "nas/index/index_plan.h"
 #include "nas/index/index_report.h"
 #include "nas/index/mounts.h"
+#include "nas/index/table_folders.h"
 #include "nas/index/watcher.h"
 #include "nas/index/watcher_process.h"
 #include "nas/system/child.h"
@@ -36,7 +38,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr char kIndexFolder[] = "/index";
 constexpr char kLock[] = "lock";
 constexpr size_t kMostWaiting = 64;
 // Whoever connects sends its two bytes at once.
@@ -46,6 +47,7 @@ constexpr int kMostAccepted = 16;
 // Mounts come several at a time.
 constexpr std::chrono::milliseconds kAfterMount{500};
 constexpr std::chrono::minutes kBetweenPlans{5};
+constexpr std::chrono::seconds kAfterFailedPlan{5};
 // A file server that does not answer may take minutes; what is known of the others goes on.
 constexpr std::chrono::seconds kPlanPatience{60};
 // For watchers to write their tables, a little longer than they take for it.
@@ -84,6 +86,7 @@ class Broker {
 
   void StartPlan();
   void ReadPlan();
+  void FailPlan();
   void EndPlan();
   void Follow(Plan plan);
   void StartWatchers();
@@ -105,13 +108,14 @@ class Broker {
   ReplyReader plan_head_;
   std::string plan_text_;
   bool plan_has_head_ = false;
+  bool planned_ = false;  // once
   Clock::time_point plan_begun_;
   Clock::time_point next_plan_;
   bool ending_ = false;
 };
 
 Status Broker::TakeLock() {
-  const std::string folder = CurrentConfig().state_dir + kIndexFolder;
+  const std::string folder = TablesFolder();
   const Status made =
       MakeFolders(CurrentConfig().state_dir, S_IRWXU | S_IRGRP | S_IXGRP | S_IROTH | S_IXOTH);
   if (!made) return made;
@@ -197,7 +201,7 @@ void Broker::Handle(std::uint64_t mark) {
 void Broker::Act() {
   const Clock::time_point now = Clock::now();
   while (!waiting_.empty() && waiting_.front().until <= now) waiting_.pop_front();
-  if (planner_.pid >= 0 && now >= plan_begun_ + kPlanPatience) EndPlan();
+  if (planner_.pid >= 0 && now >= plan_begun_ + kPlanPatience) FailPlan();
   if (planner_.pid < 0 && now >= next_plan_) StartPlan();
   StartWatchers();
 }
@@ -278,7 +282,8 @@ void Broker::HandOver(Message& message) {
   if (location < 0) return;
   const WatcherProcess* watcher = WatcherOf(location);
   if (watcher == nullptr) {
-    (void)SendFrame(connection, FrameType::kStatus, planner_.pid >= 0 ? "starting" : "not indexed");
+    const bool known = planned_ && planner_.pid < 0;
+    (void)SendFrame(connection, FrameType::kStatus, known ? "not indexed" : "starting");
     return;
   }
   // Nobody waits behind one who is told to walk.
@@ -301,9 +306,8 @@ bool IsMaster(const UniqueFd& connection) {
 void Broker::Report(const UniqueFd& connection) {
   std::vector<const WatcherProcess*> watchers;
   for (const auto& watcher : watchers_) watchers.push_back(watcher.get());
-  const bool planned = planner_.pid < 0 || !watchers.empty();
   (void)SendFrame(connection.get(), FrameType::kStatus,
-                  IndexReport(watchers, left_out_, planned, IsMaster(connection)));
+                  IndexReport(watchers, left_out_, planned_, IsMaster(connection)));
 }
 
 void Broker::Rebuild(const UniqueFd& connection) {
@@ -323,21 +327,26 @@ void Broker::StartPlan() {
   plan_text_.clear();
   plan_begun_ = Clock::now();
   next_plan_ = plan_begun_ + kBetweenPlans;
-  planner_ = StartChild([](int pipe) { SendReply(pipe, {{}, PlanText(MakePlan())}); });
-  if (planner_.pid >= 0) Watch(planner_.fd.get(), kPlan, EPOLLIN);
+  planner_ = StartChild([](int pipe) {
+    const Plan plan = MakePlan();
+    SweepTableFolders(plan, std::time(nullptr));  // before, as the reply is this process's end
+    SendReply(pipe, {{}, PlanText(plan)});
+  });
+  if (planner_.pid < 0) return FailPlan();
+  Watch(planner_.fd.get(), kPlan, EPOLLIN);
 }
 
 void Broker::ReadPlan() {
   if (planner_.pid < 0) return;
   std::array<char, kPlanPiece> piece;
   const ssize_t got = read(planner_.fd.get(), piece.data(), piece.size());
-  if (got <= 0) return EndPlan();
+  if (got <= 0) return FailPlan();
   const std::string_view bytes(piece.data(), static_cast<size_t>(got));
   if (plan_has_head_) {
     plan_text_.append(bytes);
   } else {
     const ReplyReader::State state = plan_head_.Feed(bytes);
-    if (state == ReplyReader::State::kBroken) return EndPlan();
+    if (state == ReplyReader::State::kBroken) return FailPlan();
     if (state == ReplyReader::State::kMore) return;
     plan_has_head_ = true;
     plan_text_ = plan_head_.body_begin();
@@ -345,8 +354,16 @@ void Broker::ReadPlan() {
   if (plan_text_.size() < plan_head_.body_bytes()) return;
   Plan plan;
   const bool sound = ParsePlan(plan_text_, &plan);
+  if (!sound) return FailPlan();
   EndPlan();
-  if (sound) Follow(std::move(plan));
+  planned_ = true;
+  Follow(std::move(plan));
+}
+
+// What was not found out is tried again soon: file systems that nobody knows of yet are walked.
+void Broker::FailPlan() {
+  if (planner_.pid >= 0) EndPlan();
+  next_plan_ = std::min(next_plan_, Clock::now() + kAfterFailedPlan);
 }
 
 void Broker::EndPlan() {
@@ -381,7 +398,7 @@ void Broker::StartWatchers() {
 void Broker::BecomeWatcher(const WatcherProcess& watcher, UniqueFd channel, Figures* figures) {
   WatcherSetup setup;
   setup.file_system = watcher.file_system();
-  setup.folder = CurrentConfig().state_dir + kIndexFolder + "/" + setup.file_system.id;
+  setup.folder = TableFolder(setup.file_system);
   // Above every number that the broker has, so that the rest can go at once.
   setup.broker = std::move(channel);
   setup.figures = figures;

@@ -36,6 +36,8 @@ struct Figures {
   std::atomic<std::int64_t> made_at = 0;     // when the table in use was made; seconds since 1970
   std::atomic<std::int64_t> swept_at = 0;    // when it was last compared with the file system
   std::atomic<std::uint64_t> work_ms = 0;    // what the last making or comparing took
+  // On the steady clock, when this watcher first answered; 0 before.
+  std::atomic<std::int64_t> answers_since_ns = 0;
 };
 
 inline bool Answers(IndexState state) {

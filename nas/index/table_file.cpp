@@ -16,6 +16,7 @@
 
 #include "nas/base/file_io.h"
 #include "nas/base/unique_fd.h"
+#include "nas/index/table_folders.h"
 #include "nas/index/table_writer.h"
 #include "nas/match/folded_name.h"
 
@@ -100,7 +101,7 @@ Status TableWriter::Write(int dir_fd, const std::string& name, std::string_view 
     return ErrnoError(ENAMETOOLONG, name);
   }
 
-  const std::string unfinished = name + ".new";
+  const std::string unfinished = name + kUnfinished;
   UniqueFd fd(openat(dir_fd, unfinished.c_str(),
                      O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, kMode));
   if (!fd) return ErrnoError(unfinished);

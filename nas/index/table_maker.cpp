@@ -12,6 +12,7 @@
 #include <utility>
 
 #include "nas/base/file_io.h"
+#include "nas/index/table_folders.h"
 #include "nas/index/table_sweep.h"
 #include "nas/index/tree_scan.h"
 #include "nas/system/folders.h"
@@ -19,7 +20,6 @@
 namespace nas {
 namespace {
 
-constexpr char kTableName[] = "names";
 // What a child tells is sent in pieces of about this size.
 constexpr size_t kPieceBytes = size_t{64} << 10;
 

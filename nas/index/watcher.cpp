@@ -339,6 +339,9 @@ void Watcher::Fail(int error) {
 
 void Watcher::Publish() {
   figures_.state = state_;
+  if (Answers(state_) && figures_.answers_since_ns == 0) {
+    figures_.answers_since_ns = Clock::now().time_since_epoch() / std::chrono::nanoseconds(1);
+  }
   figures_.events = hints_.events();
   figures_.changes = hints_.changes().size();
   figures_.entries = table_ ? table_->entries() : 0;

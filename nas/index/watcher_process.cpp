@@ -18,8 +18,9 @@ namespace {
 
 constexpr std::chrono::seconds kFirstPause{1};
 constexpr std::chrono::seconds kLongestPause{60};
-// One that ran so long has not died of what it began with.
-constexpr std::chrono::seconds kLongLife{300};
+// One that answered for so long was of use, and has not died of what it began with: starting it at
+// once costs less than the folders that everybody walks meanwhile.
+constexpr std::chrono::seconds kUsefulLife{10};
 
 Figures* ShareFigures() {
   void* memory =
@@ -29,6 +30,12 @@ Figures* ShareFigures() {
 }
 
 }  // namespace
+
+std::chrono::steady_clock::duration RestartPause(std::chrono::steady_clock::duration before,
+                                                 std::chrono::steady_clock::duration answered) {
+  if (answered >= kUsefulLife) return kFirstPause;
+  return std::min<std::chrono::steady_clock::duration>(before * 2, kLongestPause);
+}
 
 void WatcherProcess::Unmap::operator()(Figures* figures) const { munmap(figures, sizeof *figures); }
 
@@ -50,7 +57,7 @@ void WatcherProcess::Start(const std::function<void(UniqueFd broker, Figures* fi
   channel_.Reset(ends[0]);
   UniqueFd theirs(ends[1]);
   figures_->state = IndexState::kStarting;
-  started_ = Clock::now();
+  figures_->answers_since_ns = 0;
   pid_ = fork();
   if (pid_ == 0) {
     prctl(PR_SET_NAME, "arbory-watcher");
@@ -70,10 +77,11 @@ bool WatcherProcess::Ended(pid_t pid) {
   pid_ = -1;
   channel_.Reset();
   figures_->state = IndexState::kStarting;
-  pause_ = Clock::now() - started_ > kLongLife
-               ? kFirstPause
-               : std::min<Clock::duration>(pause_ * 2, kLongestPause);
-  next_start_ = Clock::now() + pause_;
+  const Clock::time_point now = Clock::now();
+  const std::chrono::nanoseconds since(figures_->answers_since_ns);
+  pause_ = RestartPause(
+      pause_, since.count() == 0 ? Clock::duration::zero() : now.time_since_epoch() - since);
+  next_start_ = now + pause_;
   return true;
 }
 

@@ -15,6 +15,11 @@
 
 namespace nas {
 
+// How long to wait before a watcher that has ended is started again, where the time before was
+// `before` and it had answered for so long, nothing where it never came to answer.
+std::chrono::steady_clock::duration RestartPause(std::chrono::steady_clock::duration before,
+                                                 std::chrono::steady_clock::duration answered);
+
 class WatcherProcess {
  public:
   using Clock = std::chrono::steady_clock;
@@ -51,7 +56,6 @@ class WatcherProcess {
   std::unique_ptr<Figures, Unmap> figures_;
   pid_t pid_ = -1;
   UniqueFd channel_;
-  Clock::time_point started_;
   Clock::time_point next_start_;
   Clock::duration pause_;
 };

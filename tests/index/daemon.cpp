@@ -151,14 +151,16 @@ void DaemonTest::MountImage(const std::string& image) {
   mounted_.push_back(tree_);
 }
 
-void DaemonTest::StartDaemon() {
+void DaemonTest::StartDaemon(const std::function<void()>& begun) {
   std::array<int, 2> ends;
   ASSERT_EQ(pipe2(ends.data(), O_CLOEXEC), 0);
   daemon_ = fork();
   if (daemon_ == 0) {
     prctl(PR_SET_PDEATHSIG, SIGKILL);
-    const nas::Status ended =
-        nas::RunIndexDaemon(Answer, [&] { EXPECT_EQ(write(ends[1], "r", 1), 1); });
+    const nas::Status ended = nas::RunIndexDaemon(Answer, [&] {
+      begun();
+      EXPECT_EQ(write(ends[1], "r", 1), 1);
+    });
     _exit(ended ? EXIT_SUCCESS : EXIT_FAILURE);
   }
   close(ends[1]);

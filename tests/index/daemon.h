@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -34,7 +35,8 @@ class DaemonTest : public nas_test::PlatformTest {
   // With fewer rights it would watch single folders, which other tests are about.
   bool CanWatchFileSystems() const;
   void ConfigureIndex(const nas::IndexSettings& settings = {});
-  void StartDaemon();
+  // `begun` is called in its process.
+  void StartDaemon(const std::function<void()>& begun = [] {});
   // Returns whether it ended by itself and well.
   bool StopDaemon(int signal_number = SIGTERM);
   // Waits until everything is current.

@@ -9,9 +9,13 @@
 #include <grp.h>
 #include <pwd.h>
 #include <algorithm>
+#include <ctime>
+#include <fstream>
 
 #include "nas/index/broker.h"
 #include "nas/index/daemon_socket.h"
+#include "nas/index/table_folders.h"
+#include "nas/index/watcher_process.h"
 #include "platform/system.h"
 #include "tests/index/daemon.h"
 
@@ -285,6 +289,72 @@ TEST_F(Life, TellsCopiesOfAFileSystemApart) {
   nas_test::WriteFile(tree_ + "/c/in the copy", "");
   EXPECT_EQ(Texts(See(tree_)["changes"]), std::vector<std::string>{"c/in the copy"});
   EXPECT_EQ(Texts(See(original)["changes"]), std::vector<std::string>());
+}
+
+TEST_F(Life, ForgetsFileSystemsThatStayAway) {
+  const std::string index = MakeFolder("state", 0755) + "/index";
+  const std::time_t now = std::time(nullptr);
+  constexpr std::time_t kDay = std::time_t{24} * 60 * 60;
+  const struct {
+    const char* id;
+    std::time_t days_away;
+    std::vector<const char*> files;
+    bool stays;
+  } kFolders[] = {
+      {"taken-out", 29, {"names"}, true}, {"thrown-away", 31, {"names", "names.new"}, false},
+      {"device-8:1", 0, {}, false},       {"foreign", 31, {"names", "something else"}, true},
+      {"there", 31, {"names"}, true},
+  };
+  for (const auto& [id, days_away, files, stays] : kFolders) {
+    const std::string folder = index + "/" + id;
+    fs::create_directories(folder);
+    for (const char* file : files) nas_test::WriteFile(folder + "/" + file, "");
+    const timespec then = {now - days_away * kDay, 0};
+    const timespec times[] = {then, then};
+    utimensat(AT_FDCWD, folder.c_str(), times, 0);
+  }
+  nas::Plan plan;
+  plan.file_systems.emplace_back().id = "there";
+  nas::SweepTableFolders(plan, now);
+  for (const auto& [id, days_away, files, stays] : kFolders) {
+    EXPECT_EQ(fs::exists(index + "/" + id), stays) << id;
+  }
+  EXPECT_TRUE(fs::exists(index + "/there/names"));
+  // Noted once a day alone.
+  nas::SweepTableFolders(plan, now + kDay / 2);
+  struct stat status = {};
+  stat((index + "/there").c_str(), &status);
+  EXPECT_EQ(status.st_mtime, now);
+}
+
+// One that dies before it is of use is started ever more seldom, whoever kills others.
+TEST_F(Life, PausesForWhatDiesAtOnce) {
+  using std::chrono::seconds;
+  const struct {
+    seconds before, answered, pause;
+  } kEnds[] = {
+      {seconds(1), seconds(0), seconds(2)},   {seconds(40), seconds(0), seconds(60)},
+      {seconds(60), seconds(9), seconds(60)}, {seconds(60), seconds(10), seconds(1)},
+      {seconds(1), seconds(10), seconds(1)},
+  };
+  for (const auto& [before, answered, pause] : kEnds) {
+    EXPECT_EQ(nas::RestartPause(before, answered), pause) << before.count();
+  }
+}
+
+// Nobody knows of a file system before a plan has come.
+TEST_F(Life, PlansAgainWhenAPlanFails) {
+  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
+  MountTree("tmpfs");
+  StartDaemon([] {
+    // Its only child.
+    const std::string own = std::to_string(getpid());
+    std::ifstream children("/proc/" + own + "/task/" + own + "/children");
+    pid_t planner = -1;
+    if (children >> planner) kill(planner, SIGKILL);
+  });
+  EXPECT_TRUE(Current());
+  EXPECT_EQ(Report()["file_systems"].size(), 1U);
 }
 
 class Identity : public DaemonTest {};
