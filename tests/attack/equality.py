@@ -3,7 +3,8 @@ question twice, of the index and of a walk, for root and for two users of whom e
 The rows must be the same, with their sizes and times, and hold no name that the user cannot reach.
 
 It does so on each kind of file system that can be had, while the index's processes are killed, its
-files damaged, and folders exchanged for others during the question.
+files damaged, and folders exchanged for others during the question; while more changes than it keeps
+in mind, or while it is away. And once as a user who has an index for oneself, without root.
 """
 
 import ctypes
@@ -24,14 +25,19 @@ from attack import Outcome
 from house import House, become_subreaper, children, eventually
 
 PROMISE = "An answer of the index is that of a walk, for every user, and tells of no file out of reach"
-ATTACK = "random changes, kills and damage on each kind of file system, the same questions to both"
+ATTACK = ("random changes, kills, damage, storms and gaps on each kind of file system, and without root, "
+          "the same questions to both")
 
 ROWS, SHORT_ROWS = 100_000, 2_000  # to compare, on all file systems together
 USERS = ("daemon", "bin")
 FOLDERS, FILES_OF_A_FOLDER = 40, 6
 MOST_CHANGES = 12  # before a question
 PATIENCE = 20.0  # seconds for the index to be current
-KILL_EVERY, DAMAGE_EVERY, SWAP_EVERY = 25, 90, 30  # questions
+MOST_BUSY = 0.1  # of the questions, on a machine that does too much else
+KILL_EVERY, DAMAGE_EVERY, SWAP_EVERY, STORM_EVERY, GAP_EVERY = 25, 90, 30, 45, 35  # questions
+MOST_IN_MIND = 250  # changes; a storm has more
+STORM_FOLDERS = 150
+STUB = 2  # an inode's number
 WORDS = ["report", "holiday", "a", "Übung", "cafe\u0301", "naïve", "x y", "IMG_12", "straße", "日本"]
 ENDINGS = ["txt", "jpg", "JPG", "tar.gz", "md", ""]
 ODD = [b"line\nbreak", b"bad\xff\xfename", b"tab\there", b"-rf", b"a" * 255, b"*", b"\\x"]
@@ -46,6 +52,7 @@ MAKERS = {
     "btrfs": (256, ["mkfs.btrfs", "-q"], ["-o", "loop"]),
     "btrfs subvolume": (256, ["mkfs.btrfs", "-q"], ["-o", "loop,subvol=sub"]),
     "tmpfs": (0, None, ["-t", "tmpfs"]),
+    "ext4 without root": (96, ["mkfs.ext4", "-q"], ["-o", "loop"]),
 }
 
 
@@ -278,6 +285,18 @@ class Tree:
             self.snapshots += 1
             ran("btrfs", "subvolume", "snapshot", self.top, self.any_folder() + b"/snap")
 
+    def storm(self):
+        """Many folders, each with a change of its own, and then without."""
+        top = self.make_folder(self.share)
+        below = [self.make_folder(top) for _ in range(STORM_FOLDERS)]
+        for folder in below:
+            for _ in range(3):
+                self.make_file(folder)
+        for folder in self.folders():
+            self.make_file(folder)
+        if self.chance.random() < 0.8:
+            shutil.rmtree(top)
+
     CHANGES = [create, create, create, create_folder, write, write, truncate, rename, rename, replace,
                exchange, move_tree, move_tree, move_out, move_in, touch_outside, link, symlink, remove,
                remove_tree, chmod, chown, acl, utime, hold_open, map, mount, unmount, snapshot]
@@ -292,6 +311,15 @@ def exchange(one, other):
         raise OSError("not exchanged")
 
 
+def is_stub(row):
+    """What a snapshot of btrfs has in the place of another subvolume: an empty folder, whose times are
+    those of the moment in which the system had to look at it anew."""
+    try:
+        return row["is_dir"] and row["name"] == "snap" and os.lstat(row["real_path"]).st_ino == STUB
+    except OSError:
+        return False
+
+
 class Equality:
     def __init__(self, kind, bin_dir, outcome, options):
         self.kind, self.outcome, self.options = kind, outcome, options
@@ -301,8 +329,16 @@ class Equality:
         self.daemon = None
         self.asked = 0
         try:
-            self.house = House(bin_dir, place=self.place)
+            lines = f"[index]\nmax_changes = {MOST_IN_MIND}\n"
+            self.house = House(bin_dir, lines, place=self.place)
             os.chmod(self.house.dir + "/volume1", 0o755)
+            self.users, self.before = ["root", *USERS], []
+            if kind.endswith("without root"):
+                self.users = [USERS[0]]
+                self.before = ["/usr/bin/setpriv", "--reuid", USERS[0], "--regid", USERS[0],
+                               "--clear-groups"]
+                os.mkdir(self.house.state, 0o700)
+                shutil.chown(self.house.state, USERS[0], USERS[0])
             self.tree = Tree(self.place, self.house.dir + "/volume1", self.chance)
         except BaseException:
             self.remove()
@@ -310,7 +346,7 @@ class Equality:
 
     def start(self):
         words = [self.house.program, "index", "--config", self.house.config]
-        self.daemon = self.house.spawn(words, name="index")
+        self.daemon = self.house.spawn(self.before + words, name="index")
         self.house.known.add(self.daemon)
 
     def stop(self, how=signal.SIGTERM):
@@ -326,6 +362,23 @@ class Equality:
                 yield from below(child)
         return [self.daemon, *below(self.daemon)]
 
+    def is_current(self):
+        words = [self.house.program, "index", "--status", "--config", self.house.config]
+        return subprocess.run(words, capture_output=True).returncode == 0
+
+    def how_it_is(self):
+        """For whoever looks into it: what the daemon tells, and what its processes do."""
+        words = [self.house.program, "index", "--status", "--config", self.house.config]
+        told = subprocess.run(words, capture_output=True, text=True)
+        lines = [told.stdout + told.stderr]
+        for process in self.processes():
+            try:
+                with open(f"/proc/{process}/stat") as stat, open(f"/proc/{process}/wchan") as waits:
+                    lines.append(f"{' '.join(stat.read().split()[:4])} waits in {waits.read()}")
+            except OSError:
+                lines.append(f"{process} is gone")
+        return "\n".join(lines)
+
     def kill_one(self):
         victim = self.chance.choice(self.processes())
         try:
@@ -337,6 +390,17 @@ class Equality:
         except ProcessLookupError:
             return
         self.outcome.count("processes killed")
+
+    def leave_a_gap(self):
+        self.stop()
+        for _ in range(MOST_CHANGES):
+            self.tree.change()
+        self.start()
+        self.outcome.count("gaps")
+
+    def storm(self):
+        self.tree.storm()
+        self.outcome.count("storms of changes")
 
     def damage(self):
         self.stop(self.chance.choice([signal.SIGTERM, signal.SIGKILL]))
@@ -358,34 +422,41 @@ class Equality:
 
     def search(self, user, source, question, folder):
         """Status and rows, as the terminal has them."""
-        words = [self.house.program, "search", "--config", self.house.config, "--user", user,
-                 "--index", source, "--json", *question[1:], "--", question[0], folder]
+        words = [*self.before, self.house.program, "search", "--config", self.house.config,
+                 *([] if self.before else ["--user", user]), "--index", source, "--json", *question[1:], "--", question[0], folder]
         done = subprocess.run(words, capture_output=True)
         rows = []
         for line in done.stdout.splitlines():
             row = json.loads(line)
             row.get("time", {}).pop("atime", None)
             row.pop("atime", None)
+            if is_stub(row):
+                row.pop("time", None)
             rows.append(json.dumps(row, sort_keys=True))
         return done.returncode, sorted(rows), done.stderr.decode(errors="replace")
 
     def from_index(self, user, question, folder):
         """None where the index is not current for so long."""
+        # What lies below a folder that one may pass through but not read, only a path leads to.
+        always = "auto" if self.before and folder != os.fsdecode(self.tree.share) else "always"
         end = time.monotonic() + PATIENCE
-        while True:
-            status, rows, said = self.search(user, "always", question, folder)
-            if status != 2:
-                return rows
-            if time.monotonic() > end:
-                self.outcome.breaks(f"{self.kind}: not current after {PATIENCE} s: {said}",
-                                    self.repeat())
-                return None
+        status, rows, said = self.search(user, always, question, folder)
+        while status == 2 and time.monotonic() < end:
             self.outcome.count("questions put again")
             time.sleep(0.02)
+            status, rows, said = self.search(user, always, question, folder)
+        if status != 2:
+            return rows
+        if said.rstrip().endswith("busy") and self.is_current():
+            self.outcome.count("questions with no answer in time")
+        else:
+            self.outcome.breaks(f"{self.kind}, question {self.asked}, {user} {question}: not current "
+                                f"after {PATIENCE} s: {said}{self.how_it_is()}", self.repeat())
+        return None
 
     def ask(self):
         question = list(self.chance.choice(QUESTIONS))
-        user = self.chance.choice(["root", *USERS])
+        user = self.chance.choice(self.users)
         top = os.fsdecode(self.tree.share)
         folder = top if self.chance.random() < 0.7 else os.fsdecode(self.tree.any_folder())
         if os.stat(folder).st_dev != os.stat(top).st_dev:
@@ -447,13 +518,20 @@ class Equality:
                 self.kill_one()
             if self.asked % DAMAGE_EVERY == 0:
                 self.damage()
-            if self.asked % SWAP_EVERY == 0:
+            if self.asked % SWAP_EVERY == 0 and not self.before:
                 self.ask_during_swaps()
+            if self.asked % STORM_EVERY == 0:
+                self.storm()
+            if self.asked % GAP_EVERY == 0:
+                self.leave_a_gap()
             for _ in range(self.chance.randrange(MOST_CHANGES)):
                 if what := self.tree.change():
                     self.outcome.count("changes")
             self.ask()
         self.stop()
+        late = self.outcome.counts.get("questions with no answer in time", 0)
+        if late > MOST_BUSY * self.outcome.counts["questions"]:
+            self.outcome.breaks(f"{self.kind}: {late} questions have no answer in time", self.repeat())
 
     def repeat(self):
         return (f"scripts/attack equality --seed {self.options.seed} --only '{self.kind}' "
