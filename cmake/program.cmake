@@ -3,7 +3,8 @@ file(GLOB PROGRAM_SOURCES CONFIGURE_DEPENDS arbory/*.cpp arbory/server/*/*.cpp)
 list(FILTER PROGRAM_SOURCES EXCLUDE REGEX "/main\\.cpp$")
 add_library(program_objects OBJECT ${PROGRAM_SOURCES})
 target_link_libraries(program_objects PUBLIC arbory_nas PkgConfig::JSONCPP PkgConfig::PAM
-                                             PkgConfig::ZLIB Threads::Threads)
+                                             PkgConfig::ARCHIVE PkgConfig::ZLIB
+                                             Threads::Threads)
 target_compile_definitions(program_objects PRIVATE ARBORY_VERSION="${PROJECT_VERSION}"
                            ARBORY_SOURCE_DIR="${CMAKE_SOURCE_DIR}")
 # Half of the time these take to compile is the optimiser's, which gains nothing there: they wait

@@ -24,7 +24,7 @@ nas/records              : nas/base nas/system platform
 nas/webapi               : nas/base nas/system platform
 arbory                   : nas platform arbory/server <CLI>
 arbory/server/transport  : nas platform <boost>
-arbory/server/service    : nas platform arbory arbory/server/transport <security> <zlib.h>
+arbory/server/service    : nas platform arbory arbory/server/transport <security> <zlib.h> <archive.h> <archive_entry.h>
 bench                    : nas platform <benchmark>
 tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h> <boost> <zlib.h>
 '

@@ -76,7 +76,7 @@ std::string FrameBegin(const ReplyHead& head, std::uint64_t body_bytes) {
   std::string text = std::to_string(head.status) + " " + std::to_string(head.code) + "\n";
   for (const auto& [name, value] : head.fields) text += name + ": " + value + "\n";
   text += '\n';
-  const std::uint64_t length = text.size() + body_bytes;
+  const std::uint64_t length = body_bytes == kUntilEnd ? kUntilEnd : text.size() + body_bytes;
   return std::string(reinterpret_cast<const char*>(&length), sizeof length) + text;
 }
 
@@ -145,7 +145,7 @@ ReplyReader::State ReplyReader::Parse() {
   if (bytes_.size() < kLengthBytes) return State::kMore;
   std::uint64_t length = 0;
   std::memcpy(&length, bytes_.data(), sizeof length);
-  if (length > kMaxFrameBytes) return State::kBroken;
+  if (length > kMaxFrameBytes && length != kUntilEnd) return State::kBroken;
   const std::string_view text = std::string_view(bytes_).substr(kLengthBytes);
   const size_t end = text.substr(0, kMaxHeadBytes).find("\n\n");
   if (end == std::string_view::npos) {
@@ -166,7 +166,8 @@ ReplyReader::State ReplyReader::Parse() {
     head_.fields.emplace_back(line.substr(0, colon), line.substr(colon + 2));
   }
   body_at_ = kLengthBytes + head_bytes;
-  body_bytes_ = length - head_bytes;
+  body_bytes_ = length == kUntilEnd ? kUntilEnd : length - head_bytes;
+  if (body_bytes_ == kUntilEnd) return State::kReady;
   // A worker may have written behind the frame; that is nobody's.
   if (bytes_.size() - body_at_ > body_bytes_) bytes_.resize(body_at_ + body_bytes_);
   return State::kReady;

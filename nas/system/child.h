@@ -19,7 +19,8 @@
 //
 // Protocol, on a pipe from the child to its parent: one frame,
 //
-//   a 64-bit number        bytes that follow, in host order
+//   a 64-bit number        bytes that follow, in host order; all ones: as many as come until the
+//                          child ends, for a body that tells its own end
 //   STATUS CODE\n          HTTP status, and the API's code
 //   Name: value\n          fields, any number; neither part holds a line's end, the name no ": "
 //   \n
@@ -76,9 +77,12 @@ Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory
 void ResetSignals();
 void OfferToOutOfMemoryKiller();
 
+// The length of a body that goes on until the child ends.
+inline constexpr std::uint64_t kUntilEnd = UINT64_MAX;
+
 // For the child. False when the parent has gone, which nobody needs to be told.
 bool SendReply(int pipe, const Reply& reply);
-// Sends the frame's beginning; `body_bytes` more must follow.
+// Sends the frame's beginning; `body_bytes` more must follow, or any number for kUntilEnd.
 bool SendHead(int pipe, const ReplyHead& head, std::uint64_t body_bytes);
 
 // Collects a child's frame up to where the body begins.

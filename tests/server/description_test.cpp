@@ -21,6 +21,8 @@ class DescriptionTest : public ServerTest {
     task_ = server_.Call("start", R"({"folder_path":"/photo","pattern":"a"})")
                 .json()["data"]["taskid"]
                 .asString();
+    const std::string progress = "/searches/" + task_;
+    EXPECT_TRUE(Eventually([&] { return server_.Get(progress).json()["finished"].asBool(); }));
     document_ = server_.Get("/api/openapi.json").json();
   }
 

@@ -77,6 +77,71 @@ TEST_F(FilesTest, FirstLineOfWhatContentsHold) {
   }
 }
 
+// Everything that comes until the connection ends.
+std::string Raw(const Server& server, const std::string& target, const char* version = "1.1") {
+  Client client(server.port);
+  client.Send("GET " + target + " HTTP/" + version + "\r\nHost: " + server.Host() +
+              "\r\nCookie: " + server.cookie + "\r\nConnection: close\r\n\r\n");
+  std::string bytes;
+  char buffer[4096];
+  for (ssize_t count; (count = read(client.fd(), buffer, sizeof buffer)) > 0;) {
+    bytes.append(buffer, static_cast<size_t>(count));
+  }
+  return bytes;
+}
+
+TEST_F(FilesTest, RowsOfASearchComeAsOneArchiveThatTellsItsEnd) {
+  std::filesystem::create_directories(share_ + "/found/below");
+  for (const char* name : {"found/kept.jpg", "found/below/inside.jpg", "found/swapped.jpg"}) {
+    WriteFile(share_ + "/" + name, "open to all");
+  }
+  WriteFile(dir_ + "/outside.jpg", "secret");
+  Server server = Start();
+  server.Open();
+  const Json::Value begun =
+      server.Call("start", R"({"folder_path":"/photo","pattern":"found|kept|swapped"})").json();
+  const std::string zip = "/searches/" + begun["data"]["taskid"].asString() + "/zip?";
+  const std::string list = R"({"taskid":")" + begun["data"]["taskid"].asString() + "\"}";
+  ASSERT_TRUE(Eventually([&] {
+    const Json::Value page = server.Call("list", list).json();
+    return page["data"]["finished"].asBool() && page["data"]["total"] == 3;
+  }));
+  // What has become a link since it was found leads nowhere.
+  std::filesystem::remove(share_ + "/found/swapped.jpg");
+  ASSERT_EQ(symlink((dir_ + "/outside.jpg").c_str(), (share_ + "/found/swapped.jpg").c_str()), 0);
+  const std::string whole = Raw(server, zip);
+  EXPECT_TRUE(whole.ends_with("\r\n0\r\n\r\n"));
+  EXPECT_EQ(whole.find("secret"), std::string::npos);
+  for (const char* text : {"open to all", "found/kept.jpg", "found/below/inside.jpg"}) {
+    EXPECT_NE(whole.find(text), std::string::npos) << text;
+  }
+  const struct {
+    std::string target;
+    const char* version;
+    const char* status;
+  } rows[] = {
+      {zip + "rows=0", "1.1", "200"},
+      {zip + "rows=0-1,2&sort_by=name&sort_direction=desc", "1.1", "200"},
+      {zip + "rows=0&pattern=kept", "1.1", "200"},
+      {zip + "rows=1&pattern=kept", "1.1", "400"},
+      {zip + "rows=0&pattern=regex:(", "1.1", "400"},
+      {zip + "rows=3", "1.1", "400"},
+      {zip + "rows=", "1.1", "400"},
+      {zip + "rows=1-0", "1.1", "400"},
+      {zip + "rows=1,0", "1.1", "400"},
+      {zip + "rows=0-1,1", "1.1", "400"},
+      {zip + "rows=0,", "1.1", "400"},
+      {zip + "rows=-1", "1.1", "400"},
+      {zip + "rows=0-99999999999", "1.1", "400"},
+      {zip + "rows=0", "1.0", "505"},
+      {"/searches/0123456789abcdef0123456789abcdef/zip?rows=0", "1.1", "404"},
+      {"/searches/..%00/zip?rows=0", "1.1", "400"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(Raw(server, row.target, row.version).substr(9, 3), row.status) << row.target;
+  }
+}
+
 TEST_F(FilesTest, OnlySafeTypesAreShown) {
   const char* const text = "text/plain; charset=utf-8";
   // Null for an attachment.

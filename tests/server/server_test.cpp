@@ -107,6 +107,13 @@ Reply Client::Read(bool without_body) {
     at = line_end + 2;
   }
   in_.erase(0, end + 4);
+  if (!without_body && reply.fields.contains("transfer-encoding")) {  // as it comes
+    while (!in_.ends_with("\r\n0\r\n\r\n")) {
+      if (!Fill()) return {};
+    }
+    reply.body.swap(in_);
+    return reply;
+  }
   const size_t length = without_body ? 0 : std::stoul(reply.fields["content-length"]);
   while (in_.size() < length) {
     if (!Fill()) return {};

@@ -6,6 +6,7 @@
 #include <charconv>
 
 #include "arbory/caller.h"
+#include "arbory/server/service/archives.h"
 #include "arbory/server/service/begin_search.h"
 #include "arbory/server/service/gzip.h"
 #include "arbory/server/service/openapi.h"
@@ -118,6 +119,9 @@ std::span<const Route> Service::Routes() {
                          [&](const nas::ApiCall& call) { return StartNearMisses(call, path[1]); });
        },
        "What a search that found nothing came close to", kJson},
+      {kGet, "/searches/{taskid}/zip", Access::kLoggedIn,
+       [](Self self, Request request, Path path) { return self.GetArchive(*request, path[1]); },
+       "Rows of what a search has found, ?rows=0-9,12 or all, as one archive", "application/zip"},
       {kGet, "/instant", Access::kLoggedIn,
        [](Self self, Request request, Path) { return self.AskInstantly(*request); },
        "The best that the index knows of ?params=, at once", kJson},
@@ -344,6 +348,26 @@ Answer Service::GetFirstLine(const HttpRequest& request, const RequestPath& path
   const std::string pattern = QueryValue(request.query(), "pattern").value_or("");
   return calls_.Run(Calls::Kind::kCall, request.user, "lines",
                     [&] { return StartFirstLine(*file, pattern); });
+}
+
+Answer Service::GetArchive(const HttpRequest& request, const std::string& task_id) {
+  const auto value = [&](const char* name) {
+    return QueryValue(request.query(), name).value_or("");
+  };
+  const auto rows = ParseRowRanges(QueryValue(request.query(), "rows").value_or("all"));
+  if (!rows) {
+    return ErrorReply(kBadRequest, "Say which rows: rows=0-9,12 in ascending order.");
+  }
+  ArchiveRequest archive;
+  archive.user = request.user;
+  archive.task_id = task_id;
+  archive.rows = *rows;
+  archive.sort_by = value("sort_by");
+  archive.descending = LowerCase(value("sort_direction")) == "desc";
+  archive.pattern = value("pattern");
+  archive.head_only = request.method == "HEAD";
+  return calls_.Run(Calls::Kind::kDownload, request.user, "zip",
+                    [&] { return StartArchive(archive); });
 }
 
 Answer Service::GetFile(const HttpRequest& request, const RequestPath& path) {

@@ -58,6 +58,7 @@ class Service : public HttpService {
   Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
   HttpReply NoSuchRowReply(const RequestPath& path) const;
   static std::optional<FileRequest> FileOf(const HttpRequest& request, const RequestPath& path);
+  Answer GetArchive(const HttpRequest& request, const std::string& task_id);
   Answer GetFile(const HttpRequest& request, const RequestPath& path);
   Answer AskInstantly(const HttpRequest& request);
   Answer BeginSearch(const HttpRequest& request);

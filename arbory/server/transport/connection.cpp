@@ -274,14 +274,20 @@ void Connection::Send(HttpReply reply) {
 }
 
 void Connection::SendNow(HttpReply reply) {
-  status_ = reply.status;
   const bool relays = reply.child_follows && head_reader_;
   const std::uint64_t length = relays ? head_reader_->body_bytes() : reply.body.size();
+  if (length == nas::kUntilEnd) {
+    if (parser_->get().version() < kHttp11) return RefuseOldClient();
+    keep_alive_ = false;  // the body's own end is not looked for here
+  }
+  status_ = reply.status;
   out_ = HeadText(reply, length);
   if (request_.method != "HEAD") {
     out_ += relays ? head_reader_->body_begin() : std::string_view(reply.body);
   }
-  body_left_ = child_ ? length - head_reader_->body_begin().size() : 0;
+  body_left_ = 0;
+  if (child_)
+    body_left_ = length == nas::kUntilEnd ? length : length - head_reader_->body_begin().size();
   head_reader_.reset();
   Write(&Connection::OnSent);
 }
@@ -294,12 +300,25 @@ void Connection::OnSent() {
   FinishRequest();
 }
 
+// Chunks are the child's own, which old clients do not know.
+void Connection::RefuseOldClient() {
+  if (child_) child_->Close();
+  child_.reset();
+  head_reader_.reset();
+  Refuse(kOldVersion, "Ask for this with HTTP/1.1.");
+}
+
 void Connection::Relay() {
   child_->Read([self = shared_from_this()](std::string_view bytes) {
+    const bool until_end = self->body_left_ == nas::kUntilEnd;
+    if (bytes.empty() && until_end) {
+      self->body_left_ = 0;
+      return self->OnSent();
+    }
     // Without the rest that was announced, only an early end tells the client.
     if (bytes.empty()) return self->Drop();
     const size_t count = std::min<std::uint64_t>(bytes.size(), self->body_left_);
-    self->body_left_ -= count;
+    if (!until_end) self->body_left_ -= count;
     self->out_.assign(bytes.substr(0, count));
     self->Write(&Connection::OnSent);
   });
@@ -311,7 +330,11 @@ std::string Connection::HeadText(const HttpReply& reply, std::uint64_t length) c
   for (const auto& [name, value] : reply.fields) text += name + ": " + value + "\r\n";
   text += "Date: " + DateNow() + "\r\n";
   text += kEveryReply;
-  text += "Content-Length: " + std::to_string(length) + "\r\n";
+  if (length == nas::kUntilEnd) {
+    text += "Transfer-Encoding: chunked\r\n";
+  } else {
+    text += "Content-Length: " + std::to_string(length) + "\r\n";
+  }
   if (!keep_alive_) {
     text += "Connection: close\r\n";
   } else if (parser_ && parser_->get().version() < kHttp11) {

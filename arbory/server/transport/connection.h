@@ -79,6 +79,7 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void AwaitChild(ChildAnswer answer);
   void OnChildBytes(std::string_view bytes);
   void OnChildHead(const nas::ReplyHead* head);
+  void RefuseOldClient();
   void Relay();
   std::string HeadText(const HttpReply& reply, std::uint64_t length) const;
 
@@ -106,7 +107,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
   std::shared_ptr<ChildPipe> child_;
   std::function<HttpReply(const nas::ReplyHead*)> make_reply_;
   std::optional<nas::ReplyReader> head_reader_;
-  std::uint64_t body_left_ = 0;  // of what the child still has to send
+  // Of what the child still has to send, or kUntilEnd.
+  std::uint64_t body_left_ = 0;
 
   int status_ = 0;
   std::string out_;

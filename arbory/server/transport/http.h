@@ -38,6 +38,7 @@ enum HttpStatus : int {
   kTooMany = 429,
   kHeaderTooLarge = 431,
   kUnavailable = 503,
+  kOldVersion = 505,
 };
 
 using Clock = std::chrono::steady_clock;
@@ -79,7 +80,9 @@ struct HttpReply {
   int status = kOk;
   Fields fields;
   std::string body;
-  bool child_follows = false;  // the body is what the child sends after its head
+  // The body is what the child sends after its head: as long as that says, or in chunks of the
+  // child's own (kUntilEnd), after which the connection ends.
+  bool child_follows = false;
   std::optional<Clock::time_point> not_before = {};  // hides how long the answer took to find
 };
 
