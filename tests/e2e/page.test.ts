@@ -195,7 +195,7 @@ test('a found folder opens; the way back leads to its row, and closes details fi
   await page.keyboard.press('Enter');
   await tab.firstIs(itemName(0));
   await tab.over();
-  assert.equal(await tab.count(), '1,000 matches', 'nothing but what the folder holds');
+  assert.equal(await tab.count(), '1,000 items', 'nothing but what the folder holds');
   assert.equal(await page.textContent('.crumbs'), 'manyf0');
   await page.goBack();
   await page.locator('.row.active', { hasText: 'f0' }).waitFor();

@@ -76,12 +76,15 @@ export const cleanSearch = (taskid: string) =>
 export const searchProgress = (taskid: string) =>
   request(`searches/${encodeURIComponent(taskid)}`) as Promise<Progress>;
 
-export interface ListParams {
+export interface ListOrder {
+  sort_by?: string;
+  sort_direction?: 'ASC' | 'DESC';
+  pattern?: string;
+}
+export interface ListParams extends ListOrder {
   taskid: string;
   offset: number;
   limit: number;
-  sort_by?: string;
-  sort_direction?: 'ASC' | 'DESC';
 }
 
 const ADDITIONAL = ['size', 'owner', 'time', 'type'];
@@ -125,4 +128,22 @@ export const logOut = () => post('logout', { stop_searches: true });
 export function fileAddress(path: string, preview = false): string {
   const segments = path.replace(/^\/+/, '').split('/').map(encodeURIComponent).join('/');
   return `files/${segments}${preview ? '?preview=1' : ''}`;
+}
+
+export function zipAddress(taskid: string, rows: string, order: ListOrder): string {
+  return `searches/${encodeURIComponent(taskid)}/zip?${new URLSearchParams({ rows, ...order })}`;
+}
+
+// Why an address cannot be downloaded, as a sentence; empty when it can. A download itself tells
+// nobody.
+export async function refusal(address: string): Promise<string> {
+  try {
+    const reply = await fetch(address, { method: 'HEAD', credentials: 'same-origin', cache: 'no-store' });
+    if (reply.ok) return '';
+    if (reply.status === 401) throw new ApiError('', 401);
+    return reply.status === 503 ? 'The server is busy. Try again in a moment.' : 'The server no longer has this. Search again.';
+  } catch (error) {
+    if (error instanceof ApiError) throw error;
+    return UNREACHABLE;
+  }
 }

@@ -2,7 +2,7 @@
 // that what people look for does not end up in the logs of a proxy.
 import { CRITERIA, criterion, FIELDS, NO_CRITERIA, type Criteria } from './criteria.ts';
 
-export const SORT_COLUMNS = ['name', 'path', 'type', 'size', 'mtime'] as const;
+export const SORT_COLUMNS = ['name', 'path', 'type', 'size', 'mtime', 'crtime', 'user'] as const;
 export type SortColumn = (typeof SORT_COLUMNS)[number];
 
 // No sort: as found, which is the order that never moves a row while the search runs.

@@ -3,7 +3,7 @@
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow, Session, Share } from '../api/types.ts';
-import { fromHash, parseSort, sortText, toHash, type Address, type Sort } from '../model/address.ts';
+import { fromHash, parseSort, sortText, toHash, type Address, type Sort, type SortColumn } from '../model/address.ts';
 import {
   browses,
   contentsOf,
@@ -14,10 +14,12 @@ import {
   begun as begin,
   type Criteria,
 } from '../model/criteria.ts';
+import { parseColumns } from '../view/columns.ts';
 import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
 import { Past } from './past.ts';
 import { firstPage, Search } from './search.ts';
+import type { Shown } from './shown.ts';
 import { Trail, type Step } from './trail.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
@@ -38,6 +40,8 @@ export class App {
   readonly instant: Instant;
   readonly past: Past;
   unfolded = false;
+  columns = parseColumns(recall('columns'));
+  choosing = false; // a tap chooses a row and does not open it
   active = -1; // the row the keyboard is at
   detailed: FileRow | null = null; // the row shown beside the table
   notice = '';
@@ -114,6 +118,23 @@ export class App {
     }
     location.hash = '';
     location.reload();
+  }
+
+  showColumn(column: SortColumn, shown: boolean): void {
+    const words = shown ? [...this.columns, column] : this.columns.filter((one) => one !== column);
+    remember('columns', words.join());
+    this.set({ columns: parseColumns(words.join()) });
+  }
+
+  // The table that is shown.
+  get shown(): Shown | null {
+    return this.showsInstant ? this.instant : this.search;
+  }
+
+  // Has a tap choose rows from now on; null: nothing is chosen any more.
+  choose(taps: true | null): void {
+    if (!taps) this.shown?.choice.clear();
+    this.set({ choosing: taps === true });
   }
 
   get everywhere(): string[] {

@@ -4,6 +4,7 @@
 import * as client from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow, InstantAnswer } from '../api/types.ts';
+import { Choice } from '../model/choice.ts';
 import { typed, type Criteria } from '../model/criteria.ts';
 import { ScrollModel } from '../model/scroll.ts';
 
@@ -25,6 +26,8 @@ export class Instant {
   readonly sort = null;
   readonly over = true;
   readonly scroll = new ScrollModel();
+  readonly choice = new Choice(() => this.answers);
+  private answers = 0;
   readonly pages = { row: (index: number) => this.rows[index], show: () => {} };
   private timer = 0;
   private abort = new AbortController();
@@ -63,6 +66,7 @@ export class Instant {
     const current = answer.index === 'current';
     if (!current) this.restingUntil = performance.now() + REST_MS;
     this.criteria = current ? criteria : null;
+    ++this.answers;
     this.rows = answer.rows.map(({ mtime, ...row }) => ({
       ...row,
       type: typeOf(row),

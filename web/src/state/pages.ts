@@ -18,9 +18,11 @@ interface Kept {
 
 export class Pages {
   total = 0;
+  order = 0; // another number whenever the rows may stand at other places
   private kept = new Map<number, Kept>(); // least recently wanted first
   private before = new Map<number, Kept>(); // of the order before; shown until the first new page
   private flying = new Map<number, { outgrown: boolean }>();
+  private counted = false; // since the rows were renewed
   private foundOrder = true;
   private first = 0;
   private last = 0;
@@ -48,6 +50,7 @@ export class Pages {
 
   // More has been found. In found order full pages never change; in any other, all may.
   grown(total: number, foundOrder: boolean): void {
+    if (!foundOrder && total > this.total) ++this.order;
     this.total = Math.max(total, this.total);
     this.foundOrder = foundOrder;
     for (const page of this.kept.values()) page.stale ||= !page.final && this.canGrow(page.rows);
@@ -80,6 +83,7 @@ export class Pages {
     this.flying.clear();
     if (this.kept.size > 0) this.before = this.kept;
     this.kept = new Map();
+    this.counted = false;
     this.pump();
   }
 
@@ -133,7 +137,10 @@ export class Pages {
     this.kept.set(number, { rows: page.files, stale, final: page.finished });
     this.before.clear();
     // While a search runs a page may have been counted before the newest matches were.
-    this.total = page.finished ? page.total : Math.max(this.total, page.total);
+    const total = page.finished || !this.counted ? page.total : Math.max(this.total, page.total);
+    this.counted = true;
+    if (total < this.total) ++this.order; // files have vanished, and rows moved up
+    this.total = total;
     for (const old of this.kept.keys()) {
       if (this.kept.size <= KEPT_PAGES) break;
       this.kept.delete(old);

@@ -4,6 +4,7 @@ import * as client from '../api/client.ts';
 import { ApiError, walkFailure } from '../api/errors.ts';
 import type { Begun, Misses, Page, Progress, Walk } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
+import { Choice, spansText, type Spans } from '../model/choice.ts';
 import type { Criteria } from '../model/criteria.ts';
 import { ScrollModel } from '../model/scroll.ts';
 import { PAGE_ROWS, Pages } from './pages.ts';
@@ -17,6 +18,7 @@ const STEADY_MS = 400;
 const HIDDEN_MS = 2000;
 // So many unanswered questions in a row, and the search is given up.
 const MISSES = 5;
+const NOT_LISTED = 600;
 
 // What the listing is asked for beside its place.
 function ordered(sort: Sort | null) {
@@ -41,6 +43,9 @@ export class Search {
   misses: Misses | null = null; // once it is known why nothing was found
   readonly pages: Pages;
   readonly scroll = new ScrollModel();
+  readonly choice = new Choice(() => this.pages.order);
+  filter = ''; // what the rows that are shown fit beside what was asked for
+  filterWrong = false;
   private taskid = '';
   private closed = false;
   private stopAsked = false;
@@ -69,9 +74,13 @@ export class Search {
     return (this.over ? this.endedAt : performance.now()) - this.startedAt;
   }
 
-  // What is known to have been found.
+  // What is known to have been found, of which `found` rows are shown.
+  get matches(): number {
+    return this.filter !== '' || !this.over ? Math.max(this.walk.matches, this.found) : this.pages.total;
+  }
   get found(): number {
-    return this.over ? this.pages.total : Math.max(this.pages.total, this.walk.matches);
+    const all = this.over || this.filter !== '';
+    return all ? this.pages.total : Math.max(this.pages.total, this.walk.matches);
   }
 
   async run(): Promise<void> {
@@ -120,7 +129,7 @@ export class Search {
       skipped: { ...this.walk.skipped, ...walk.skipped },
       files: { ...this.walk.files, ...walk.files },
     };
-    if (grew) this.pages.grown(this.walk.matches, this.sort === null);
+    if (grew) this.pages.grown(this.filter === '' ? this.walk.matches : 0, this.sort === null);
     this.changed();
   }
 
@@ -170,6 +179,11 @@ export class Search {
   private pageFailed(error: unknown): void {
     if (this.closed) return;
     if (error instanceof ApiError && error.signedOut) this.signedOut();
+    // Half typed it can be wrong for a moment; the rows before stay.
+    if (this.filter !== '' && error instanceof ApiError && error.code === NOT_LISTED) {
+      this.filterWrong = true;
+      return this.changed();
+    }
     // A running search asks again with its next progress; only the end is final, and of one that
     // failed it is said why.
     if (this.over && this.status !== 'failed') this.error = error instanceof Error ? error.message : String(error);
@@ -177,12 +191,33 @@ export class Search {
   }
 
   list(offset: number, limit: number, signal?: AbortSignal): Promise<Page> {
-    return client.listResults({ taskid: this.taskid, offset, limit, ...ordered(this.sort) }, signal);
+    return client.listResults({ taskid: this.taskid, offset, limit, ...this.order }, signal);
+  }
+
+  private get order(): client.ListOrder {
+    return { ...(this.filter && { pattern: this.filter }), ...ordered(this.sort) };
+  }
+
+  // The rows as one archive.
+  zipAddress(spans: Spans): string {
+    return client.zipAddress(this.taskid, spansText(spans), this.order);
   }
 
   setSort(sort: Sort | null): void {
     this.sort = sort;
+    ++this.pages.order;
     this.scroll.toTop();
+    if (this.taskid) this.pages.renew();
+    this.changed();
+  }
+
+  narrow(text: string): void {
+    if (text.trim() === this.filter) return;
+    this.filter = text.trim();
+    this.filterWrong = false;
+    ++this.pages.order;
+    this.scroll.toTop();
+    this.pages.show(0, 0);
     if (this.taskid) this.pages.renew();
     this.changed();
   }

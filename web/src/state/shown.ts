@@ -1,6 +1,7 @@
 // Rows as the table shows them, wherever they come from.
 import type { FileRow } from '../api/types.ts';
 import type { Sort } from '../model/address.ts';
+import type { Choice } from '../model/choice.ts';
 import type { Criteria } from '../model/criteria.ts';
 import type { ScrollModel } from '../model/scroll.ts';
 
@@ -9,6 +10,7 @@ export interface Shown {
   readonly found: number;
   readonly sort: Sort | null;
   readonly over: boolean;
+  readonly choice: Choice;
   readonly scroll: ScrollModel; // where its table stands
   readonly pages: {
     row(index: number): FileRow | undefined;

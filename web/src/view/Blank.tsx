@@ -23,6 +23,7 @@ const WAYS = [
 export function Welcome({ app }: { app: App }) {
   return (
     <div class="blank welcome">
+      <PastSearches app={app} />
       <section aria-labelledby="ways">
         <h2 id="ways">Ways to ask</h2>
         <table>
@@ -48,7 +49,6 @@ export function Welcome({ app }: { app: App }) {
           </span>
         </p>
       </section>
-      <PastSearches app={app} />
     </div>
   );
 }

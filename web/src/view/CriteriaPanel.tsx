@@ -1,6 +1,7 @@
 // The criteria beside the name. Folded away they are shown as tags that can be taken off.
 import { useState } from 'preact/hooks';
 import {
+  browses,
   CRITERIA,
   describe,
   FIELDS,
@@ -203,7 +204,9 @@ function Time({ app, field }: { app: App; field: TextField }) {
 
 // One tag for each criterion; taking it off searches again when there is a search to repeat.
 export function CriteriaTags({ app }: { app: App }) {
-  const tags = FIELDS.flatMap((field) => {
+  // Of a folder that lies open the way down to it says so.
+  const told = browses(app.draft) ? FIELDS.filter((field) => field !== 'subfolders') : FIELDS;
+  const tags = told.flatMap((field) => {
     const alone = { ...NO_CRITERIA, [field]: app.draft[field] };
     return describe(alone).map((text) => ({ field, text }));
   });

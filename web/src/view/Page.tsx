@@ -4,9 +4,12 @@ import { fileAddress } from '../api/client.ts';
 import type { FileRow } from '../api/types.ts';
 import { browses, type CriterionError } from '../model/criteria.ts';
 import { previewKind } from '../model/preview.ts';
-import { visible, whyNotFetched } from '../model/text.ts';
+import { plural, visible, whyNotFetched } from '../model/text.ts';
 import type { App } from '../state/app.ts';
+import { chosenRows, downloadRows } from '../state/chosen.ts';
 import { copyText, follow } from '../state/save.ts';
+import { Search } from '../state/search.ts';
+import type { Shown } from '../state/shown.ts';
 import { nextTheme, themeName } from '../state/theme.ts';
 import { Failed, Nothing, Welcome } from './Blank.tsx';
 import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
@@ -95,11 +98,11 @@ function Result({ app, actions }: { app: App; actions: RowActions }) {
     );
   }
   const failed = search.status === 'failed' && search.found === 0;
-  const nothing = search.over && !failed && search.found === 0;
+  const nothing = search.over && !failed && search.found === 0 && search.filter === '';
   return (
     <main>
       {browses(search.criteria) && <Crumbs app={app} folder={search.criteria.folders[0]!} />}
-      {!failed && <StatusLine app={app} search={search} />}
+      {!failed && <StatusLine app={app} search={search} actions={actions} />}
       {search.error && !failed && (
         <p class="wrong band" role="alert">
           {search.error}
@@ -183,6 +186,8 @@ function pageKey(app: App, event: KeyboardEvent, help: () => void): void {
     const field = document.querySelector<HTMLInputElement>('#pattern');
     field?.focus();
     field?.select();
+  } else if (event.key === 'n') {
+    document.querySelector<HTMLInputElement>('#narrow')?.focus();
   } else if (event.key === '?') {
     help();
   } else if (event.key === 'f') {
@@ -194,7 +199,17 @@ function pageKey(app: App, event: KeyboardEvent, help: () => void): void {
 }
 
 function rowActions(app: App): RowActions {
-  const download = (row: FileRow) => {
+  const downloadChosen = async ({ choice }: Shown) => {
+    if (!(app.shown instanceof Search)) return app.tell('Press Enter first, to have them all found.');
+    const refused = await downloadRows(app.shown, choice.spans);
+    if (refused) app.tell(refused);
+  };
+  const download = (row?: FileRow) => {
+    const { shown } = app;
+    if (shown && shown.choice.count > 0) void downloadChosen(shown);
+    else if (row) downloadOne(row);
+  };
+  const downloadOne = (row: FileRow) => {
     if (row.is_dir) app.tell('A folder cannot be downloaded. Search in it, and download its files.');
     else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
     else follow(fileAddress(row.path), row.name);
@@ -204,12 +219,19 @@ function rowActions(app: App): RowActions {
     open: (row) => {
       if (row.is_dir) app.browse(row.path);
       else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
-      else if (previewKind(row.name) === 'none') download(row);
+      else if (previewKind(row.name) === 'none') downloadOne(row);
       else window.open(fileAddress(row.path, true), '_blank', 'noopener');
     },
     copy: async (row) => {
-      const done = await copyText(row.path);
-      app.tell(done ? 'The path is copied.' : 'The browser did not let the path be copied.');
+      const { shown } = app;
+      const chosen = shown !== null && shown.choice.count > 0;
+      const text = chosen
+        ? (await chosenRows(shown, shown.choice.spans)).map(({ path }) => path).join('\n')
+        : row?.path;
+      if (text === undefined) return;
+      const done = await copyText(text);
+      const what = chosen ? plural(shown.choice.count, 'path') + ' copied.' : 'The path is copied.';
+      app.tell(done ? what : 'The browser did not let it be copied.');
     },
   };
 }

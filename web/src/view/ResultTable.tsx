@@ -2,11 +2,12 @@
 // model says where they stand. The table is one stop for the Tab key and the arrow keys move in it.
 import { useCallback, useEffect, useLayoutEffect, useMemo, useRef, useState } from 'preact/hooks';
 import type { FileRow } from '../api/types.ts';
+import { holds } from '../model/choice.ts';
 import { Highlighter } from '../model/highlight.ts';
 import type { ScrollModel } from '../model/scroll.ts';
 import type { App } from '../state/app.ts';
 import type { Shown } from '../state/shown.ts';
-import { COLUMNS } from './columns.ts';
+import { fittingColumns, type Column } from './columns.ts';
 import { Icon } from './icons.tsx';
 import { Row } from './Row.tsx';
 
@@ -16,8 +17,9 @@ const SETTLE_MS = 160;
 
 export interface RowActions {
   open: (row: FileRow) => void;
-  download: (row: FileRow) => void;
-  copy: (row: FileRow) => void;
+  // Of what is chosen, or else of the row.
+  download: (row?: FileRow) => void;
+  copy: (row?: FileRow) => void;
 }
 
 export function ResultTable({ app, search, actions }: { app: App; search: Shown; actions: RowActions }) {
@@ -27,8 +29,11 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   const [, redraw] = useState(0);
   const pattern = search.criteria?.pattern ?? '';
   const highlighter = useMemo(() => new Highlighter(pattern), [pattern]);
+  const { choice } = search;
+  const { spans } = choice;
   const rows = search.found;
-  const { rowHeight, viewport } = useMeasures(scroller);
+  const { rowHeight, viewport, width } = useMeasures(scroller);
+  const columns = useMemo(() => fittingColumns(app.columns, width), [app.columns, width]);
   const returns = useRef(0);
   if (model.resize({ rows, rowHeight, viewport })) ++returns.current;
   const returned = returns.current;
@@ -43,9 +48,12 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   useEffect(() => search.pages.show(model.first, model.last));
   useEffect(app.placed, [model.above, app.active]);
 
+  // `how` it changes what is chosen: that row alone, a span up to it, or nothing.
   const goTo = useCallback(
-    (index: number) => {
+    (index: number, how: 'alone' | 'span' | 'spans' | 'kept' = 'alone') => {
       const row = Math.min(Math.max(index, 0), total.current - 1);
+      if (how === 'alone') search.choice.start(row);
+      else if (how !== 'kept') search.choice.extend(row, how === 'spans');
       if (model.reveal(row) && scroller.current) scroller.current.scrollTop = model.settle();
       const detailed = app.detailed ? (search.pages.row(row) ?? app.detailed) : null;
       app.set({ active: row, detailed });
@@ -64,13 +72,21 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
       End: rows - 1,
     };
     const row = search.pages.row(app.active);
-    const copies = (event.ctrlKey || event.metaKey) && event.key === 'c' && getSelection()?.isCollapsed;
-    if (event.key in steps && !event.ctrlKey && !event.metaKey && !event.altKey) {
-      if (event.key === 'ArrowUp' && app.active <= 0) focusField();
-      else goTo(steps[event.key]!);
+    const control = event.ctrlKey || event.metaKey;
+    const copies = control && event.key === 'c' && getSelection()?.isCollapsed;
+    if (event.key in steps && !event.altKey) {
+      const how = event.shiftKey ? (control ? 'spans' : 'span') : control ? 'kept' : 'alone';
+      if (event.key === 'ArrowUp' && app.active <= 0 && how === 'alone') focusField();
+      else goTo(steps[event.key]!, how);
+    } else if (control && event.key === 'a') {
+      choice.all(rows);
+      app.changed();
+    } else if (control && event.key === ' ') {
+      choice.toggle(app.active);
+      app.changed();
     } else if (row && copies) {
       actions.copy(row);
-    } else if (event.ctrlKey || event.metaKey || event.altKey) {
+    } else if (control || event.altKey) {
       return;
     } else if (row && event.key === 'Enter') {
       actions.open(row);
@@ -82,7 +98,8 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
     } else if (row && event.key === 'c') {
       actions.copy(row);
     } else if (event.key === 'Escape') {
-      if (app.detailed) app.hideDetails();
+      if (choice.count > 0) app.choose(null);
+      else if (app.detailed) app.hideDetails();
       else focusField();
     } else {
       return;
@@ -90,6 +107,23 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
     event.preventDefault();
   };
 
+  const onClick = useCallback(
+    (event: MouseEvent, index: number, row: FileRow) => {
+      root.current?.focus({ preventScroll: true });
+      const control = event.ctrlKey || event.metaKey;
+      if (event.shiftKey) {
+        getSelection()?.removeAllRanges(); // of text, which the browser has drawn meanwhile
+        goTo(index, control ? 'spans' : 'span');
+      } else if (control || app.choosing) {
+        search.choice.toggle(index);
+        goTo(index, 'kept');
+      } else {
+        goTo(index);
+        app.showDetails(row);
+      }
+    },
+    [app, search, goTo],
+  );
   const first = Math.max(0, model.first - OVERSCAN);
   const last = Math.min(rows - 1, model.last + OVERSCAN);
   const indexes = Array.from({ length: Math.max(0, last - first + 1) }, (_, i) => first + i);
@@ -102,13 +136,15 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
       tabIndex={0}
       aria-label="Results"
       aria-rowcount={rows + 1}
-      aria-colcount={COLUMNS.length}
+      aria-colcount={columns.length}
+      style={{ '--columns': columns.map((column) => column.width).join(' ') }}
+      aria-multiselectable
       aria-busy={!search.over}
       aria-activedescendant={activeSeen ? `row-${app.active}` : undefined}
       onKeyDown={onKeyDown}
       onFocus={() => app.active < 0 && rows > 0 && app.set({ active: model.first })}
     >
-      <Head app={app} search={search} />
+      <Head app={app} search={search} columns={columns} />
       <div
         class="scroller"
         ref={scroller}
@@ -119,6 +155,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
           redraw((n) => n + 1);
         }}
       >
+        {rows === 0 && search.over && <p class="nopreview">No row fits.</p>}
         <div class="spacer" role="presentation" style={{ height: `${model.height}px` }}>
           {indexes.map((index) => (
             <Row
@@ -127,12 +164,10 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
               top={model.placeOf(index)}
               row={search.pages.row(index)}
               active={index === app.active}
+              chosen={holds(spans, index)}
+              columns={columns}
               highlighter={highlighter}
-              choose={(row) => {
-                root.current?.focus({ preventScroll: true });
-                goTo(index);
-                app.showDetails(row);
-              }}
+              choose={onClick}
               open={actions.open}
             />
           ))}
@@ -148,9 +183,9 @@ function focusField(): void {
   field?.select();
 }
 
-function Head({ app, search }: { app: App; search: Shown }) {
+function Head({ app, search, columns }: { app: App; search: Shown; columns: readonly Column[] }) {
   const { sort } = search;
-  const click = (column: (typeof COLUMNS)[number]) => {
+  const click = (column: Column) => {
     const first = Boolean(column.mostFirst);
     if (sort?.column !== column.column) app.setSort({ column: column.column, descending: first });
     else if (sort.descending === first) app.setSort({ column: column.column, descending: !first });
@@ -158,7 +193,7 @@ function Head({ app, search }: { app: App; search: Shown }) {
   };
   return (
     <div class="head" role="row" aria-rowindex={1}>
-      {COLUMNS.map((column) => {
+      {columns.map((column) => {
         const sorted = sort?.column === column.column;
         const direction = sort?.descending ? 'descending' : 'ascending';
         return (
@@ -181,15 +216,16 @@ function Head({ app, search }: { app: App; search: Shown }) {
 
 // The height of a row is the style sheet's to say; it differs on a phone.
 function useMeasures(scroller: { current: HTMLElement | null }) {
-  const [measures, setMeasures] = useState({ rowHeight: 30, viewport: 600 });
+  const [measures, setMeasures] = useState({ rowHeight: 30, viewport: 600, width: 1000 });
   useLayoutEffect(() => {
     const element = scroller.current!;
     const measure = () => {
       const rowHeight = parseFloat(getComputedStyle(element).getPropertyValue('--row')) || 30;
+      const { clientHeight: viewport, clientWidth: width } = element;
       setMeasures((old) =>
-        old.rowHeight === rowHeight && old.viewport === element.clientHeight
+        old.rowHeight === rowHeight && old.viewport === viewport && old.width === width
           ? old
-          : { rowHeight, viewport: element.clientHeight },
+          : { rowHeight, viewport, width },
       );
     };
     measure();

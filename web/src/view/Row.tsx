@@ -1,9 +1,12 @@
+import type { ComponentChildren } from 'preact';
 import { memo } from 'preact/compat';
 import type { FileRow } from '../api/types.ts';
+import type { SortColumn } from '../model/address.ts';
 import type { Highlighter } from '../model/highlight.ts';
 import { formatSize } from '../model/size.ts';
 import { folderOf, visible } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
+import type { Column } from './columns.ts';
 import { Icon, iconOf } from './icons.tsx';
 import { Name, Path } from './Name.tsx';
 
@@ -12,53 +15,79 @@ interface Props {
   top: number;
   row: FileRow | undefined;
   active: boolean;
+  chosen: boolean;
+  columns: readonly Column[];
   highlighter: Highlighter;
-  choose: (row: FileRow) => void;
+  choose: (event: MouseEvent, index: number, row: FileRow) => void;
   open: (row: FileRow) => void;
 }
 
-function DrawnRow({ index, top, row, active, highlighter, choose, open }: Props) {
+function DrawnRow({ index, top, row, active, chosen, columns, highlighter, choose, open }: Props) {
   return (
     <div
       id={`row-${index}`}
       role="row"
-      class={`row ${active ? 'active' : ''} ${row ? '' : 'waiting'}`}
+      class={`row ${active ? 'active' : ''} ${chosen ? 'chosen' : ''} ${row ? '' : 'waiting'}`}
       aria-rowindex={index + 2}
-      aria-selected={active}
+      aria-selected={chosen}
       style={{ transform: `translateY(${top}px)` }}
-      onClick={() => row && choose(row)}
-      onDblClick={() => row && open(row)}
+      onClick={(event) => row && choose(event, index, row)}
+      onDblClick={(event) => row && !event.ctrlKey && !event.metaKey && !event.shiftKey && open(row)}
     >
-      {row ? <Cells row={row} highlighter={highlighter} /> : <div class="cell name" role="gridcell">…</div>}
+      {row ? <Cells row={row} chosen={chosen} columns={columns} highlighter={highlighter} /> : <div class="cell name" role="gridcell">…</div>}
     </div>
   );
 }
 
-function Cells({ row, highlighter }: { row: FileRow; highlighter: Highlighter }) {
+type CellsProps = Pick<Props, 'chosen' | 'columns' | 'highlighter'> & { row: FileRow };
+
+function Cells({ row, chosen, columns, highlighter }: CellsProps) {
   return (
     <>
-      <div class="cell name" role="gridcell" title={visible(row.name)}>
-        <Icon name={iconOf(row.name, row.is_dir)} />
-        <span class="ellipsis">
-          <Name text={row.name} ranges={highlighter.ranges(row.name)} />
-        </span>
-      </div>
-      <div class="cell path" role="gridcell" title={visible(row.path)}>
+      {columns.map(({ column }) => (
+        <div class={`cell ${column}`} role="gridcell" key={column} title={titleOf(row, column)}>
+          {column === 'name' ? (
+            <>
+              <Icon name={chosen ? 'check' : iconOf(row.name, row.is_dir)} />
+              <span class="ellipsis">
+                <Name text={row.name} ranges={highlighter.ranges(row.name)} />
+              </span>
+            </>
+          ) : (
+            cellOf(row, column)
+          )}
+        </div>
+      ))}
+    </>
+  );
+}
+
+// What may be cut off.
+function titleOf(row: FileRow, column: SortColumn): string | undefined {
+  if (column === 'name') return visible(row.name);
+  if (column === 'path') return visible(row.path);
+  return column === 'user' ? visible(row.owner?.user ?? '') : undefined;
+}
+
+function cellOf(row: FileRow, column: Exclude<SortColumn, 'name'>): ComponentChildren {
+  switch (column) {
+    case 'path':
+      return (
         <span class="ellipsis">
           <Path path={folderOf(row.path)} />
         </span>
-      </div>
-      <div class="cell type" role="gridcell">
-        {row.is_dir ? 'Folder' : <Name text={row.type ?? ''} />}
-      </div>
-      <div class="cell size" role="gridcell">
-        {row.is_dir || row.size === undefined ? '' : formatSize(row.size)}
-      </div>
-      <div class="cell mtime" role="gridcell">
-        {row.time ? formatTime(row.time.mtime) : ''}
-      </div>
-    </>
-  );
+      );
+    case 'type':
+      return row.is_dir ? 'Folder' : <Name text={row.type ?? ''} />;
+    case 'size':
+      return row.is_dir || row.size === undefined ? '' : formatSize(row.size);
+    case 'mtime':
+      return row.time ? formatTime(row.time.mtime) : '';
+    case 'crtime':
+      return row.time?.crtime ? formatTime(row.time.crtime) : '';
+    case 'user':
+      return <Name text={row.owner?.user ?? ''} />;
+  }
 }
 
 export const Row = memo(
@@ -67,6 +96,8 @@ export const Row = memo(
     a.row === b.row &&
     a.top === b.top &&
     a.active === b.active &&
+    a.chosen === b.chosen &&
+    a.columns === b.columns &&
     a.index === b.index &&
     a.highlighter === b.highlighter,
 );

@@ -2,25 +2,30 @@
 // whole result.
 import { useEffect, useRef, useState } from 'preact/hooks';
 import type { Sort, SortColumn } from '../model/address.ts';
-import { elapsed, plural } from '../model/text.ts';
+import { browses } from '../model/criteria.ts';
+import { count, elapsed, plural } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import { exportResults, type ExportFormat } from '../state/export.ts';
 import type { Search } from '../state/search.ts';
 import { COLUMNS } from './columns.ts';
 import { Icon } from './icons.tsx';
 import { Popover } from './Popover.tsx';
+import type { RowActions } from './ResultTable.tsx';
 
 const TICK_MS = 100;
+// A pause in typing that ends a word.
+const TYPING_MS = 80;
 // How often a screen reader is told of the count while a search runs.
 const SPOKEN_MS = 5000;
 
-export function StatusLine({ app, search }: { app: App; search: Search }) {
+export function StatusLine({ app, search, actions }: { app: App; search: Search; actions: RowActions }) {
   const running = !search.over;
+  const chooses = app.choosing || search.choice.count > 0;
   const notText = search.walk.files.not_text;
   return (
     <div class={`status ${running ? 'running' : ''}`}>
       <p class="figures">
-        <strong>{plural(search.found, 'match', 'matches')}</strong>
+        <strong>{found(search)}</strong>
         {search.status === 'stopped' && <span class="word">stopped</span>}
         {search.status === 'failed' && <span class="word">failed</span>}
         <span class="aside">
@@ -34,11 +39,96 @@ export function StatusLine({ app, search }: { app: App; search: Search }) {
       </p>
       <Skipped search={search} />
       <span class="grow" />
+      {(search.filter !== '' || search.found > 1) && !chooses && <Narrow search={search} />}
+      {chooses && <Chosen app={app} count={search.choice.count} actions={actions} />}
+      {!chooses && search.pages.total > 0 && (
+        <button type="button" class="tool touch" onClick={() => app.choose(true)}>
+          Choose
+        </button>
+      )}
       <SortChoice app={app} search={search} />
+      <ColumnChoice app={app} />
       {search.pages.total > 0 && <Export app={app} search={search} />}
       {running && <div class="bar" role="progressbar" aria-label="Searching" />}
       <Spoken search={search} />
     </div>
+  );
+}
+
+function found(search: Search): string {
+  const all = browses(search.criteria) ? plural(search.matches, 'item') : plural(search.matches, 'match', 'matches');
+  return search.filter === '' ? all : `${count(search.found)} of ${all}`;
+}
+
+// Narrows the rows that were found to some of them; nothing is searched anew.
+function Narrow({ search }: { search: Search }) {
+  const timer = useRef(0);
+  const [text, setText] = useState(search.filter);
+  useEffect(() => setText(search.filter), [search]);
+  const narrow = (value: string, pause: number) => {
+    setText(value);
+    clearTimeout(timer.current);
+    timer.current = window.setTimeout(() => search.narrow(value), pause);
+  };
+  return (
+    <input
+      id="narrow"
+      type="text"
+      class="narrow"
+      placeholder="Narrow"
+      aria-label="Narrow these results"
+      title="Show those that fit this too (n)"
+      autocomplete="off"
+      autocapitalize="none"
+      spellcheck={false}
+      aria-invalid={search.filterWrong}
+      value={text}
+      onInput={(event) => narrow(event.currentTarget.value, TYPING_MS)}
+      onKeyDown={(event) => {
+        if (event.key === 'Escape') narrow('', 0);
+        else if (event.key !== 'Enter' && event.key !== 'ArrowDown') return;
+        else document.querySelector<HTMLElement>('.table')?.focus();
+        event.preventDefault();
+      }}
+    />
+  );
+}
+
+// The name is always there; on a narrow screen what fits is.
+function ColumnChoice({ app }: { app: App }) {
+  return (
+    <Popover className="tool columnchoice" panelClass="menu right" panelLabel="Columns" title="Columns" label={<Icon name="columns" size={14} />}>
+      {() =>
+        COLUMNS.slice(1).map(({ column, title }) => (
+          <label class="choice" key={column}>
+            <input
+              type="checkbox"
+              checked={app.columns.includes(column)}
+              onChange={(event) => app.showColumn(column, event.currentTarget.checked)}
+            />
+            {title}
+          </label>
+        ))
+      }
+    </Popover>
+  );
+}
+
+// What can be done with the rows that are chosen.
+function Chosen({ app, count, actions }: { app: App; count: number; actions: RowActions }) {
+  return (
+    <span class="chosenbar" role="group" aria-label="Chosen rows">
+      <strong role="status">{plural(count, 'row')} chosen</strong>
+      <button type="button" class="tool" disabled={count === 0} onClick={() => actions.download()}>
+        <Icon name="archive" size={14} /> Zip
+      </button>
+      <button type="button" class="tool" disabled={count === 0} onClick={() => actions.copy()}>
+        <Icon name="copy" size={14} /> Copy paths
+      </button>
+      <button type="button" class="quiet" aria-label="Choose nothing" title="Choose nothing (Esc)" onClick={() => app.choose(null)}>
+        <Icon name="close" size={14} />
+      </button>
+    </span>
   );
 }
 
@@ -53,12 +143,12 @@ function from(search: Search): string {
 // Above the answers while one types.
 export function InstantLine({ app }: { app: App }) {
   const { instant } = app;
-  const count = plural(instant.known, 'match', 'matches');
+  const known = plural(instant.known, 'match', 'matches');
   const best = instant.known > instant.found ? `the best ${instant.found} first` : '';
   return (
     <div class="status">
       <p class="figures" role="status">
-        <strong>{instant.complete ? count : `more than ${count}`}</strong>
+        <strong>{instant.complete ? known : `more than ${known}`}</strong>
         {best && <span class="aside">{best}</span>}
         <span class="aside">from the index</span>
       </p>
@@ -83,13 +173,13 @@ function Elapsed({ search }: { search: Search }) {
 // The only part that is announced; it changes seldom enough to be listened to.
 function Spoken({ search }: { search: Search }) {
   const said = useRef({ at: 0, text: '', search });
-  const found = plural(search.found, 'match', 'matches');
+  const told = found(search);
   const now = performance.now();
   if (said.current.search !== search) said.current = { at: 0, text: '', search };
   if (search.over || now - said.current.at > SPOKEN_MS) {
     const state = search.over ? { done: 'Finished', stopped: 'Stopped', failed: 'Failed' } : {};
     const word = (state as Record<string, string>)[search.status] ?? 'Searching';
-    said.current = { at: now, text: `${word}: ${found}`, search };
+    said.current = { at: now, text: `${word}: ${told}`, search };
   }
   return (
     <span class="visually-hidden" role="status">
