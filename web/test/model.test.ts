@@ -7,6 +7,7 @@ import { fromHash, toHash, type Address } from '../src/model/address.ts';
 import { begun, contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, type Criteria, type StartParams } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
+import { excludesOf, withExclude, withoutExclude } from '../src/model/excludes.ts';
 import { addressOf, offered, titleOf } from '../src/model/history.ts';
 import { formatSize } from '../src/model/size.ts';
 import { pieces, visible } from '../src/model/text.ts';
@@ -133,6 +134,25 @@ test('what a search is started with', async () => {
   }
   await assert.rejects(startParams(plain, [], same), CriterionError);
   await assert.rejects(startParams({ ...full, pattern: ' ' }, ['/a'], same), CriterionError);
+});
+
+test('what is left out is a term of the query, put in and taken out', () => {
+  const rows: [string, string[], string, string][] = [
+    // pattern, what it leaves out, with .git, without a
+    ['', [], 'exclude:.git', ''],
+    ['plan', [], 'plan exclude:.git', 'plan'],
+    ['plan exclude:a', ['a'], 'plan exclude:a exclude:.git', 'plan'],
+    ['exclude:a plan', ['a'], 'exclude:a plan exclude:.git', 'plan'],
+    ['EXCLUDE:a,.git x', ['a', '.git'], 'EXCLUDE:a,.git x', 'exclude:.git x'],
+    ['exclude:"a b",a x', ['"a b"', 'a'], 'exclude:"a b",a x exclude:.git', 'exclude:"a b" x'],
+    ['"say exclude:a"', [], '"say exclude:a" exclude:.git', '"say exclude:a"'],
+    ['exclude:a\\,b', ['a\\,b'], 'exclude:a\\,b exclude:.git', 'exclude:a\\,b'],
+  ];
+  for (const [pattern, names, more, less] of rows) {
+    assert.deepEqual(excludesOf(pattern), names, pattern);
+    assert.equal(withExclude(pattern, '.git'), more, pattern);
+    assert.equal(withoutExclude(pattern, 'a'), less, pattern);
+  }
 });
 
 test('past searches are offered as they were asked for, the pinned first', () => {

@@ -14,6 +14,7 @@ import {
 import { isDay, splitCustom, TIME_WORDS } from '../model/times.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
+import { ExcludeChoice } from './Excludes.tsx';
 import { Icon } from './icons.tsx';
 
 const LAST_DAY = '2038-01-18'; // the last whole day that a search can compare
@@ -36,6 +37,7 @@ export function CriteriaPanel({ app }: { app: App }) {
       {AFTER_SIZE.map((field) => (
         <Input key={field} app={app} field={field} />
       ))}
+      <ExcludeChoice app={app} />
       <footer>
         <p class="hint" role="alert">
           {error && error.field in CRITERIA ? <span class="wrong">{error.message}</span> : 'Write a size as 1.5 GB, and a time of your own as 2 weeks, 2026-07 or <2025.'}

@@ -15,6 +15,7 @@ import { Failed, Nothing, Welcome } from './Blank.tsx';
 import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
 import { Crumbs } from './Crumbs.tsx';
 import { Details } from './Details.tsx';
+import { ExcludeTags } from './Excludes.tsx';
 import { FolderPicker } from './FolderPicker.tsx';
 import { Gate } from './Gate.tsx';
 import { Help } from './Help.tsx';
@@ -66,6 +67,7 @@ export function Page({ app }: { app: App }) {
           <Icon name={app.unfolded ? 'up' : 'down'} size={11} />
         </button>
         <CriteriaTags app={app} />
+        <ExcludeTags app={app} />
       </section>
       {app.draftError && !inPanel(app.draftError) && (
         <p class="wrong band" role="alert">
