@@ -236,6 +236,9 @@ void Broker::Hear(std::uint64_t mark) {
   Message received;
   const MessageState state = ReceiveMessage(found->connection.get(), &received);
   if (state == MessageState::kNone) return;
+  // Closing does not end that where a watcher's child holds the connection too: what the peer has
+  // sent it would wake this process, over and over, for as long as the answer takes.
+  epoll_ctl(loop_.get(), EPOLL_CTL_DEL, found->connection.get(), nullptr);
   Message message;
   message.hello = received.hello;
   message.descriptors = {std::move(found->connection), std::move(received.descriptors[0])};

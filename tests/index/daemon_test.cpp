@@ -462,6 +462,29 @@ TEST_F(Bounds, OnQuestionsOfAUser) {
       << "a place that is free again is not given";
 }
 
+// How many descriptors the process waits for in all.
+size_t WatchedBy(pid_t pid) {
+  size_t count = 0;
+  for (const auto& one : fs::directory_iterator("/proc/" + std::to_string(pid) + "/fdinfo")) {
+    std::ifstream info(one.path());
+    for (std::string line; std::getline(info, line);) count += line.starts_with("tfd:") ? 1 : 0;
+  }
+  return count;
+}
+
+// What is said to a child that answers would wake the broker without end.
+TEST_F(Bounds, ABrokerHearsNothingOfAQuestionThatIsHandedOn) {
+  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
+  MountTree("tmpfs");
+  StartDaemon();
+  ASSERT_TRUE(Current());
+  const size_t idle = WatchedBy(daemon_);
+  EXPECT_GT(idle, 0U);
+  const nas::IndexAnswer held = Hold(tree_);
+  EXPECT_EQ(held.state, nas::kIndexCurrent);
+  EXPECT_EQ(WatchedBy(daemon_), idle);
+}
+
 TEST_F(Bounds, OnThoseWhoSayNothing) {
   SKIP_UNLESS_ROOT();
   MountTree("tmpfs");
