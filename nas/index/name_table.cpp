@@ -106,22 +106,19 @@ unsigned char NameTable::type(EntryId id) const {
   return static_cast<unsigned char>(IFTODT(columns_.class_rows[row].mode));
 }
 
-std::uint64_t NameTable::Size(EntryId id) const {
-  const std::uint32_t size = columns_.sizes[id];
-  if (size != kLargeSize) return size;
+std::uint64_t NameTable::LargeSize(EntryId id) const {
   const std::uint32_t* begin = columns_.large_entries;
   const std::uint32_t* at = std::lower_bound(begin, begin + large_count_, id);
-  return at != begin + large_count_ && *at == id ? columns_.large_sizes[at - begin] : size;
+  return at != begin + large_count_ && *at == id ? columns_.large_sizes[at - begin] : kLargeSize;
 }
 
 std::optional<NameTable::Attributes> NameTable::attributes(EntryId id) const {
   const std::uint16_t row = columns_.classes[id];
   if (row < kTypeClasses) return std::nullopt;
   const TableClass& access = columns_.class_rows[row];
-  const std::int32_t crtime = columns_.crtimes[id];
-  return Attributes{.size = Size(id),
-                    .mtime = columns_.mtimes[id],
-                    .crtime = crtime == kNoCrtime ? Attributes::kNoTime : crtime,
+  return Attributes{.size = size(id),
+                    .mtime = mtime(id),
+                    .crtime = crtime(id),
                     .mode = access.mode,
                     .uid = access.uid,
                     .gid = access.gid};

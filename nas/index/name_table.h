@@ -112,6 +112,17 @@ class NameTable {
   // or do not fit: times that do not fit into 32 bits, and where there are more than 65,000
   // different combinations of mode, user and group.
   std::optional<Attributes> attributes(EntryId id) const;
+  // Each by itself; without a meaning where class_row is below kTypeClasses, as nothing is known.
+  std::uint16_t class_row(EntryId id) const { return columns_.classes[id]; }
+  std::int64_t mtime(EntryId id) const { return columns_.mtimes[id]; }
+  std::int64_t crtime(EntryId id) const {
+    const std::int32_t time = columns_.crtimes[id];
+    return time == kNoCrtime ? Attributes::kNoTime : time;
+  }
+  std::uint64_t size(EntryId id) const {
+    const std::uint32_t size = columns_.sizes[id];
+    return size == kLargeSize ? LargeSize(id) : size;
+  }
   // The rows of mode, user and group that entries share (table_format.h).
   std::span<const TableClass> class_rows() const { return {columns_.class_rows, class_count_}; }
   // The entry of that name in the folder; entries() where there is none.
@@ -180,7 +191,7 @@ class NameTable {
     return {columns_.keys + columns_.key_begins[id],
             columns_.key_begins[id + 1] - columns_.key_begins[id]};
   }
-  std::uint64_t Size(EntryId id) const;
+  std::uint64_t LargeSize(EntryId id) const;
 
   const char* mapping_ = nullptr;
   size_t bytes_ = 0;

@@ -136,7 +136,7 @@ TableWriter::EntryId TableWriter::CopyEntries(const NameTable& from, EntryId beg
     AddEntry(from.name(id),
              from.texts(id, id + 1).substr(0, from.text_begin(id + 1) - from.text_begin(id) - 1),
              {.inode = from.inode(id),
-              .size = from.Size(id),
+              .size = from.size(id),
               .mtime = from.columns_.mtimes[id],
               .crtime = from.columns_.crtimes[id],
               .row = rows[from.columns_.classes[id]]});

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <iterator>
 
 #include "nas/match/required_texts.h"
 
@@ -30,6 +31,14 @@ std::shared_ptr<const RegexScan> ScanOf(const QueryNode& root) {
   return nullptr;
 }
 
+bool AsksName(const QueryNode& leaf) {
+  if (leaf.kind == QueryNode::Kind::kType) {
+    return std::ranges::any_of(leaf.types,
+                               [](const FileType& type) { return type.category.has_value(); });
+  }
+  return leaf.kind == QueryNode::Kind::kText || leaf.kind == QueryNode::Kind::kExtension;
+}
+
 bool IsOfRanges(const QueryNode& leaf) {
   return IsOfAttributes(leaf.kind) && leaf.kind != QueryNode::Kind::kEmpty;
 }
@@ -42,6 +51,7 @@ constexpr EntryId kNamesForNeedle = 8;
 IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& search)
     : snapshot_(snapshot),
       search_(search),
+      ranges_(snapshot),
       asks_attributes_(snapshot.attributes_current && search.criteria.ask_attributes) {
   const QueryNode& root = search.criteria.root;
   const auto is_regex = [](const QueryNode& leaf) { return leaf.text && leaf.text->is_regex(); };
@@ -57,11 +67,14 @@ IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& sear
   for (const std::string& text : texts) needles_.emplace_back(text);
   if (by_names && has_regex_) scan_ = ScanOf(root);
   decides_ = !needles_.empty() && root.children.size() == 1 && IsPlainText(root.children[0]);
-  if (finds()) return;
-  for (const QueryNode& child : root.children) {
-    if (IsOfRanges(child)) ranges_.push_back(&child);
+  asks_names_ = AnyLeaf(root, AsksName);
+  if (!finds()) {
+    for (const QueryNode& child : root.children) {
+      if (IsOfRanges(child)) ranges_.Add(child);
+    }
+    only_ranges_ = ranges_.size() == root.children.size();
   }
-  only_ranges_ = ranges_.size() == root.children.size();
+  if (asks_attributes_) ranges_.Prepare();
 }
 
 namespace {
@@ -80,27 +93,48 @@ EntryId EntryFrom(const NameTable& table, EntryId from, std::uint64_t offset) {
   return from;
 }
 
+// The entries of [begin, end) whose texts have the needle `lead` bytes before the place where it is
+// found; false once there are more than `most` of them in all.
+bool FindTexts(const NameTable& table, const TextFinder& needle, size_t lead, EntryId begin,
+               EntryId end, size_t most, std::vector<EntryId>* found) {
+  const std::string_view texts = table.texts(begin, end);
+  const std::uint64_t base = table.text_begin(begin);
+  EntryId entry = begin;
+  for (size_t at = 0; (at = needle.Find(texts, at)) != std::string_view::npos;) {
+    if (found->size() == most) return false;
+    entry = EntryFrom(table, entry, base + at + lead);
+    found->push_back(entry);
+    at = table.text_begin(entry + 1) - lead - base;
+  }
+  return true;
+}
+
 }  // namespace
 
 bool IndexFilter::FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
-  const NameTable& table = snapshot_.table;
-  const std::string_view texts = table.texts(begin, end);
-  const std::uint64_t base = table.text_begin(begin);
   const size_t most = scan_ ? (end - begin) / kNamesForNeedle : SIZE_MAX;
   for (const TextFinder& needle : needles_) {
-    EntryId entry = begin;
-    for (size_t at = 0; (at = needle.Find(texts, at)) != std::string_view::npos;) {
-      if (found->size() == most) return false;
-      entry = EntryFrom(table, entry, base + at);
-      found->push_back(entry);
-      at = table.text_begin(entry + 1) - base;
-    }
+    const auto middle = static_cast<std::ptrdiff_t>(found->size());
+    if (!FindTexts(snapshot_.table, needle, 0, begin, end, most, found)) return false;
+    std::inplace_merge(found->begin(), found->begin() + middle, found->end());
   }
-  if (needles_.size() > 1) {
-    std::ranges::sort(*found);
-    found->erase(std::unique(found->begin(), found->end()), found->end());
-  }
+  if (needles_.size() > 1) found->erase(std::unique(found->begin(), found->end()), found->end());
   return true;
+}
+
+void IndexFilter::FindBeginnings(const std::vector<std::string>& words, EntryId begin, EntryId end,
+                                 std::vector<EntryId>* found) const {
+  if (begin == end) return;
+  const NameTable& table = snapshot_.table;
+  found->clear();
+  for (const std::string& word : words) {
+    // Behind the end of the text before; the first one's is not among these.
+    if (table.texts(begin, begin + 1).starts_with(word)) found->push_back(begin);
+    const TextFinder needle('\0' + word);
+    FindTexts(table, needle, 1, begin, end, SIZE_MAX, found);
+  }
+  std::ranges::sort(*found);
+  found->erase(std::unique(found->begin(), found->end()), found->end());
 }
 
 // Where the search is given up every further name is to be asked by itself.
@@ -161,10 +195,14 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
                        const std::function<std::string_view(NameTable::FolderId)>& path_of,
                        std::vector<EntryId>* found) {
   const EntryId last = table_.entries_begin(end);
-  const bool hits = filter_.finds();
+  const bool hits = beginnings_ != nullptr || filter_.finds();
   const bool paths = filter_.search_.criteria.ask_paths;
   hits_.clear();
-  if (hits) filter_.Find(table_.entries_begin(begin), last, &hits_);
+  if (beginnings_ != nullptr) {
+    filter_.FindBeginnings(*beginnings_, table_.entries_begin(begin), last, &hits_);
+  } else if (hits) {
+    filter_.Find(table_.entries_begin(begin), last, &hits_);
+  }
   auto hit = hits_.begin();
   const auto next = [&](EntryId from) {
     if (!hits) return from;
@@ -180,20 +218,25 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
       behind = table_.entries_end(folder);
       may_match = Enter(path_of(folder));
     }
-    for (; may_match && entry < behind; entry = next(entry + 1)) {
+    if (may_match && !hits) FindAmong(entry, behind, found);
+    for (; may_match && hits && entry < behind; entry = next(entry + 1)) {
       if (MayMatch(entry)) found->push_back(entry);
     }
-    if (!may_match) entry = next(behind);
+    if (!may_match || !hits) entry = next(behind);
   }
 }
 
-// A folder's own attributes change with what is in it.
-bool EntryFilter::IsBelieved(EntryId entry, unsigned char type) const {
-  const Changes& changes = filter_.snapshot_.changes;
-  if (!changes.inodes().empty() && changes.inodes().contains(table_.inode(entry))) return false;
-  if (type != DT_DIR) return true;
-  const NameTable::FolderId folder = table_.folder_at(entry);
-  return folder != NameTable::kNoFolder && !changes.folders().contains(folder);
+void EntryFilter::FindAmong(EntryId begin, EntryId end, std::vector<EntryId>* found) {
+  const bool in_ranges = by_attributes_ && filter_.ranges_.size() > 0;
+  if (!in_ranges) {
+    for (EntryId entry = begin; entry < end; ++entry) {
+      if (MayMatch(entry)) found->push_back(entry);
+    }
+    return;
+  }
+  filter_.ranges_.Find(begin, end, &in_ranges_);
+  std::ranges::copy_if(in_ranges_, std::back_inserter(*found),
+                       [this](EntryId entry) { return filter_.only_ranges_ || MayMatch(entry); });
 }
 
 bool EntryFilter::LearnAttributes(EntryId entry) {
@@ -226,36 +269,21 @@ void EntryFilter::SetName(EntryId entry) {
   name_.SetFolded(folded, mark == std::string_view::npos ? folded : text.substr(mark + 1));
 }
 
-// What leaves an entry out by attributes is seldom in doubt, so that is asked last.
-bool EntryFilter::IsInRanges(EntryId entry, QuerySubject& subject) {
-  if (!LearnAttributes(entry)) return true;
-  subject.attributes = &attributes_;
-  const bool in = std::ranges::all_of(filter_.ranges_, [&subject](const QueryNode* range) {
-    return Ask(*range, subject) != Answer::kNo;
-  });
-  subject.attributes = nullptr;
-  return in || !IsBelieved(entry, table_.type(entry));
-}
-
 bool EntryFilter::MayMatch(EntryId entry) {
   if (filter_.decides_) return true;
   QuerySubject subject;
   const unsigned char type = table_.type(entry);
   subject.is_folder = type == DT_DIR;
   subject.is_file = type == DT_REG;
-  if (by_attributes_ && !filter_.ranges_.empty()) {
-    if (!IsInRanges(entry, subject)) return false;
-    if (filter_.only_ranges_) return true;
-  }
-  SetName(entry);
+  if (filter_.asks_names_) SetName(entry);
   subject.name = &name_;
   if (filter_.search_.criteria.ask_paths) {
     path_.SetEntry(table_.name(entry), subject.is_folder);
     subject.path = &path_;
   }
   if (filter_.search_.Ask(subject) == Answer::kNo) return false;
-  const bool ask = by_attributes_ && IsBelieved(entry, type) && LearnAttributes(entry);
-  if (!ask) return true;
+  if (!by_attributes_ || filter_.ranges_.Doubts(entry, type) || !LearnAttributes(entry))
+    return true;
   subject.attributes = &attributes_;
   return filter_.search_.Ask(subject) != Answer::kNo;
 }

@@ -11,6 +11,7 @@
 #include "nas/index/changes.h"
 #include "nas/match/regex_scan.h"
 #include "nas/match/text_finder.h"
+#include "nas/search/index_ranges.h"
 #include "nas/search/judge.h"
 
 namespace nas {
@@ -26,6 +27,9 @@ class IndexFilter {
   // The entries of [begin, end) that may have one, in order.
   void Find(NameTable::EntryId begin, NameTable::EntryId end,
             std::vector<NameTable::EntryId>* found) const;
+  // Those whose text (name_table.h) begins with one of the words.
+  void FindBeginnings(const std::vector<std::string>& words, NameTable::EntryId begin,
+                      NameTable::EntryId end, std::vector<NameTable::EntryId>* found) const;
 
  private:
   friend class EntryFilter;
@@ -42,10 +46,11 @@ class IndexFilter {
   std::vector<TextFinder> needles_;
   std::shared_ptr<const RegexScan> scan_;
   // What asks for attributes and holds of every match; where nothing is found by names.
-  std::vector<const QueryNode*> ranges_;
+  IndexRanges ranges_;
   bool only_ranges_ = false;      // there is nothing else
   bool asks_attributes_ = false;  // and the table's are believed
-  bool by_texts_ = false;         // texts say of names in ASCII what the names say
+  bool asks_names_ = false;
+  bool by_texts_ = false;  // texts say of names in ASCII what the names say
   bool has_regex_ = false;
   bool decides_ = false;  // what Find finds needs no further question
 };
@@ -55,6 +60,8 @@ class EntryFilter {
  public:
   EntryFilter(const IndexFilter& filter, const Location& location);
 
+  // From now on Find leaves out what does not begin with one of these; borrowed. Null: nothing.
+  void set_beginnings(const std::vector<std::string>* words) { beginnings_ = words; }
   // The entries of the folders [begin, end) that can match; `path_of` tells the path of a folder,
   // good until it is called again, and is asked where criteria do.
   void Find(NameTable::FolderId begin, NameTable::FolderId end,
@@ -67,20 +74,23 @@ class EntryFilter {
   bool Enter(std::string_view path, bool by_attributes = true);
   // Of one of a folder that was entered: whether the entry can match, as the table has it.
   bool MayMatch(NameTable::EntryId entry);
+  // All of [begin, end), in folders that were entered, that can match.
+  void FindAmong(NameTable::EntryId begin, NameTable::EntryId end,
+                 std::vector<NameTable::EntryId>* found);
 
  private:
   void SetName(NameTable::EntryId entry);
-  bool IsBelieved(NameTable::EntryId entry, unsigned char type) const;
   bool LearnAttributes(NameTable::EntryId entry);
-  bool IsInRanges(NameTable::EntryId entry, QuerySubject& subject);
 
   const IndexFilter& filter_;
   const NameTable& table_;
+  const std::vector<std::string>* beginnings_ = nullptr;
   FoldedName name_;
   EntryPath path_;
   bool by_attributes_ = true;
   QueryAttributes attributes_;
   std::vector<NameTable::EntryId> hits_;
+  std::vector<NameTable::EntryId> in_ranges_;
 };
 
 }  // namespace nas

@@ -138,16 +138,13 @@ void IndexVisit::CollectEntries(FolderId folder, const Special* special) {
   const EntryId end = table_.entries_end(folder);
   const std::string_view path = search_.criteria.ask_paths ? paths_.Of(folder) : std::string_view();
   if (!filter_.Enter(path, may_enter_)) return;
-  const auto consider = [&](EntryId entry) {
-    if (special != nullptr && special->Holds(table_.name(entry))) return;
-    if (filter_.MayMatch(entry)) entries_.push_back(entry);
-  };
-  if (!names_.filter_.finds()) {
-    for (EntryId entry = table_.entries_begin(folder); entry < end; ++entry) consider(entry);
-    return;
-  }
+  if (!names_.filter_.finds()) filter_.FindAmong(table_.entries_begin(folder), end, &entries_);
   while (next_hit_ < hits_.size() && hits_[next_hit_] < table_.entries_begin(folder)) ++next_hit_;
-  while (next_hit_ < hits_.size() && hits_[next_hit_] < end) consider(hits_[next_hit_++]);
+  for (; next_hit_ < hits_.size() && hits_[next_hit_] < end; ++next_hit_) {
+    if (filter_.MayMatch(hits_[next_hit_])) entries_.push_back(hits_[next_hit_]);
+  }
+  if (special == nullptr) return;
+  std::erase_if(entries_, [&](EntryId entry) { return special->Holds(table_.name(entry)); });
 }
 
 void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
