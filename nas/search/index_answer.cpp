@@ -24,8 +24,6 @@ namespace {
 
 // For a question to come once it was announced.
 constexpr int kQuestionMilliseconds = 10'000;
-// Of what an instant question costs, on a machine that does nothing else.
-constexpr std::chrono::milliseconds kInstantBudget(8);
 
 // Sends what a search finds. A connection that takes no more ends the search.
 class FrameSink : public RowSink, public CandidateSink {
@@ -98,8 +96,7 @@ void AnswerFrom(int connection, const IndexQuestion& question,
   IndexNames names(snapshot, {locations, folder, question.mounts, question.rules}, search);
   NoNames contents;
   if (question.best > 0) {
-    const BestCount count =
-        FindBest(names, snapshot, locations.front(), search, question.best, kInstantBudget);
+    const BestCount count = FindBest(names, snapshot, locations.front(), search, question.best);
     sink.End({reinterpret_cast<const char*>(&count), sizeof(count)});
     return;
   }

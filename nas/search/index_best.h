@@ -16,8 +16,18 @@ struct BestCount {
   bool more = false;          // there was no time for all of them
 };
 
-// The best go to the sink of `search`, in order. Throws what that throws.
+// On a machine that does nothing else it needs a fraction of that.
+struct BestBounds {
+  // Of each thread's processor time, for candidates to be put in order.
+  std::chrono::milliseconds ranking{16};
+  // From the beginning: for the best to be looked up, which is worth waiting for; and for others,
+  // which are only counted.
+  std::chrono::milliseconds best{200};
+  std::chrono::milliseconds further{4};
+};
+
+// The best go to the sink of `search`, in any order. Throws what that throws.
 BestCount FindBest(IndexNames& names, const IndexSnapshot& snapshot, const Location& location,
-                   SharedSearch& search, size_t most, std::chrono::milliseconds budget);
+                   SharedSearch& search, size_t most, const BestBounds& bounds = {});
 
 }  // namespace nas

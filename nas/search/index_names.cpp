@@ -122,14 +122,18 @@ std::string_view FolderPaths::Of(FolderId folder) {
   return path_;
 }
 
-bool IndexNames::NextCandidates(EntryFilter& filter, std::vector<EntryId>* found) {
-  const size_t number = next_++;
-  if (number >= pieces_) return false;
-  const Piece piece = PieceOf(number);
+size_t IndexNames::NextCandidates(EntryFilter& filter, std::vector<EntryId>* found) {
+  // A folder may fill several.
+  Piece piece;
+  do {
+    const size_t number = next_++;
+    if (number >= pieces_) return 0;
+    piece = PieceOf(number);
+  } while (table_.entries_begin(piece.begin) == table_.entries_begin(piece.end));
   FolderPaths paths(table_, top_, locations_.front().path);
   filter.Find(
       piece.begin, piece.end, [&paths](FolderId folder) { return paths.Of(folder); }, found);
-  return true;
+  return table_.entries_begin(piece.end) - table_.entries_begin(piece.begin);
 }
 
 std::vector<IndexNames::NotedName> IndexNames::NotedNames() const {

@@ -67,9 +67,11 @@ class IndexNames : public NameSource {
   IndexNames(const IndexSnapshot& snapshot, const Place& place, SharedSearch& search);
 
   // The entries that can match, as the table has them, in pieces of it that several threads may
-  // take at once: nothing of it is verified, so nobody may be told of it. False when there are no
-  // more pieces.
-  bool NextCandidates(EntryFilter& filter, std::vector<NameTable::EntryId>* found);
+  // take at once: nothing of it is verified, so nobody may be told of it. Returns how many entries
+  // were looked at; 0 when there are no more pieces.
+  size_t NextCandidates(EntryFilter& filter, std::vector<NameTable::EntryId>* found);
+  // All pieces come once more. While no thread takes any.
+  void StartOver() { next_ = 0; }
   const IndexFilter& filter() const { return filter_; }
   // The names that are noted as changed in the location, likewise.
   struct NotedName {

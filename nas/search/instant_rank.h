@@ -26,6 +26,8 @@ class InstantRanking {
   // `folded`: the name as it is compared (folded_name.h).
   InstantRank Rank(std::string_view folded, int depth, std::int64_t mtime) const;
   bool Begins(std::string_view folded) const;
+  // What names may begin with, folded.
+  const std::vector<std::string>& words() const { return words_; }
 
  private:
   void AddWords(const QueryNode& node);

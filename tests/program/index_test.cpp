@@ -433,6 +433,29 @@ TEST_F(Index, InstantAnswersAreTheBestOfWhatAWalkFinds) {
   }
 }
 
+// So many that those which begin with what is asked for leave no room for the others.
+TEST_F(Index, InstantAnswersAreTheBestOfVeryMany) {
+  constexpr int kMany = 5000;
+  for (int i = 0; i < kMany; ++i) WriteFile(tree_ + "/docs/deep/q" + std::to_string(i), "");
+  for (int i = 0; i < kMany; ++i) WriteFile(tree_ + "/docs/" + std::to_string(i) + "q", "");
+  WriteFile(tree_ + "/docs/q", "");
+  const WatchedTree index(share_, dir_);
+  std::vector<nas::Location> locations;
+  locations.push_back(std::move(*nas::OpenLocation("/share/tree")));
+  Answers answers(index, -1);
+  nas::InstantReply reply;
+  // A machine that does much else may not come that far at once.
+  for (int tries = 0; tries < 50 && reply.rows.size() < 100; ++tries) {
+    reply = nas::AskInstantly(locations, nas::Query::Parse("q")->root(), true, 100, {},
+                              [&](int location, bool) { return answers.Ask(location); })
+                .value_or({});
+    EXPECT_TRUE(reply.more);
+    for (const auto& row : reply.rows) EXPECT_TRUE(row.name.starts_with("q")) << row.name;
+  }
+  ASSERT_EQ(reply.rows.size(), 100U);
+  EXPECT_EQ(reply.rows.front().name, "q");
+}
+
 TEST_F(Index, AnswersOverAConnectionThatMayBreak) {
   for (int i = 0; i < 3000; ++i) WriteFile(tree_ + "/many-" + std::to_string(i) + ".txt", "");
   const WatchedTree index(share_, dir_);
