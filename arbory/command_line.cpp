@@ -21,8 +21,9 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
   command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
       ->type_name("EXT")
       ->allow_extra_args(false);
-  command->add_option("-t,--type", query->type, "file, dir, image, video, audio, document, archive")
-      ->type_name("TYPE");
+  command->add_option("-t,--type", query->types, "Types: f or file, or d,l; see below")
+      ->type_name("TYPE")
+      ->allow_extra_args(false);
   command->add_option("--size-from", query->size_from, "At least this large")->type_name("SIZE");
   command->add_option("--size-to", query->size_to, "At most this large")->type_name("SIZE");
   AddTimes(command, "mtime", "Modified", &query->mtime);
@@ -30,6 +31,24 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
   AddTimes(command, "atime", "Last read", &query->atime);
   command->add_option("--owner", query->owner, "Owned by this user")->type_name("USER");
   command->add_option("--group", query->group, "Of this group")->type_name("GROUP");
+  const CLI::Validator levels(
+      [](const std::string& text) {
+        const bool digits = !text.empty() && text.find_first_not_of("0123456789") == text.npos;
+        return digits ? std::string() : "'" + text + "' is not a number of levels";
+      },
+      "");
+  command->add_option("-d,--max-depth", query->max_depth, "At most N levels down; 1: in FOLDER")
+      ->type_name("N")
+      ->check(levels);
+  command->add_option("--min-depth", query->min_depth, "At least N levels down")
+      ->type_name("N")
+      ->check(levels);
+  command
+      ->add_option("-E,--exclude", query->excludes,
+                   "Leave out such names and all in such folders; as in .gitignore")
+      ->type_name("GLOB")
+      ->allow_extra_args(false);
+  command->add_flag("--no-hidden", query->no_hidden, "Leave out what begins with a dot");
   command->add_flag_function(
       "--no-recursive", [query](std::int64_t) { query->recursive = false; },
       "Do not enter the folders in FOLDER");
@@ -45,6 +64,9 @@ const char kQueryHelp[] =
     "word, regex: begins a regular expression and '' is every name. ext:jpg,png\n"
     "type:image size:>1GB modified:last-7-days owner:ann depth:<3 empty: content:word\n"
     "case:Word ask for more than a name. A -- ends the options.\n"
+    "\n"
+    "TYPE is f (file), d (dir), l (link), x (executable), e (empty), p (pipe),\n"
+    "s (socket), b or c (device), image, video, audio, document or archive.\n"
     "\n"
     "SIZE is bytes, or 10k, 5M, 1.5G (1024-based). TIME is 2026-01-31, 2026-07,\n"
     "yesterday, last-7-days, 2026-01-31T12:00, an age such as 30m, 12h or 7d, or\n"

@@ -79,7 +79,13 @@ struct SearchQuery {
   bool here = false;  // no folder was named, so it is the current one
 
   std::vector<std::string> extensions;
-  std::string type;
+  std::string type;  // one of the API's
+  // Of a command line, where they become terms of the pattern.
+  std::vector<std::string> types;
+  std::vector<std::string> excludes;
+  std::string min_depth;
+  std::string max_depth;
+  bool no_hidden = false;
   std::string size_from;
   std::string size_to;
   TimeRange mtime;

@@ -3,6 +3,7 @@
 #include "arbory/comparators.h"
 #include "arbory/locate.h"
 #include "arbory/parse.h"
+#include "arbory/search_terms.h"
 #include "nas/base/accounts.h"
 #include "nas/match/query.h"
 #include "nas/system/shares.h"
@@ -106,11 +107,12 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
                           std::time_t now) {
   Json::Value params(Json::objectValue);
   for (const std::string& location : locations) params["folder_path"].append(location);
+  const std::string pattern = PatternWithTerms(query);
   Of("pattern", [&] {
-    const auto parsed = nas::Query::Parse(query.pattern, now);
+    const auto parsed = nas::Query::Parse(pattern, now);
     if (!parsed) throw UsageError(parsed.error().path);
   });
-  params["pattern"] = query.pattern;
+  params["pattern"] = pattern;
   SetWords(query, &params);
   SetSizes(query, &params);
   Of("mtime", [&] { SetTimes(query.mtime, "mtime", now, &params); });

@@ -25,6 +25,8 @@ class EntryPath {
     const size_t skipped = base_.below_root.empty() ? 0 : base_.below_root.size() + 1;
     folder_ = below_root.substr(std::min(below_root.size(), skipped));
   }
+  // The same below the folder that is searched.
+  std::string_view folder() const { return folder_; }
   // `name` is borrowed.
   void SetEntry(std::string_view name, bool is_folder) {
     name_ = name;

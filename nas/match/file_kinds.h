@@ -12,6 +12,7 @@ enum class FileCategory { kImage, kVideo, kAudio, kDocument, kArchive };
 struct FileType {
   bool folder = false;
   std::optional<FileCategory> category = {};  // of a file; none: any file
+  unsigned char form = 0;  // DT_*, of what is that alone; 0: whatever is no folder
 };
 // "file", "dir", "image", "video", "audio", "document", "archive" in any letter case; nothing for
 // any other word.

@@ -83,7 +83,7 @@ std::string WithKnownPrefix(const std::string& word) {
   }
   constexpr size_t kShortest = 4;  // everything is near to less
   for (const char* ours : {"type", "size", "modified", "created", "opened", "owner", "group",
-                           "depth", "empty", "content", "regex"}) {
+                           "depth", "empty", "content", "regex", "exclude", "hidden"}) {
     if (name.size() >= kShortest && IsNear(name, ours)) return std::string(ours) + ":" + value;
   }
   return word;

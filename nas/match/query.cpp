@@ -2,9 +2,11 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <optional>
 #include <utility>
 
+#include "nas/match/query_match.h"
 #include "nas/match/query_prefix.h"
 
 namespace nas {
@@ -54,6 +56,7 @@ class Scanner {
   void TakeRegex(Piece& piece);
   void TakeQuoted(Piece& piece);
   void TakeValue(Piece& piece);
+  void TakeGlobs(Piece& piece);
   std::string_view TakeWord();
   void TakeMoreWords(Piece& piece, size_t from);
   bool EndsAt(size_t at) const {
@@ -178,8 +181,10 @@ std::string_view Scanner::TakeWord() {
   return word;
 }
 
-// A value that is no text: what quotes hold is part of it.
+// A value that is no text: what quotes hold is part of it. In one of globs a quote that is meant
+// stands behind a backslash.
 void Scanner::TakeValue(Piece& piece) {
+  if (piece.prefix->value == QueryPrefix::Value::kGlobs) return TakeGlobs(piece);
   const size_t from = at_;
   bool has_quotes = false;
   while (!closing_ && at_ < text_.size() && text_[at_] != ' ' && text_[at_] != '|') {
@@ -199,6 +204,22 @@ void Scanner::TakeValue(Piece& piece) {
     }
   }
   if (!has_quotes && !closing_) TakeMoreWords(piece, from);
+}
+
+void Scanner::TakeGlobs(Piece& piece) {
+  bool quoted = false;
+  for (; at_ < text_.size() && (quoted || (text_[at_] != ' ' && text_[at_] != '|')); ++at_) {
+    const bool escape = text_.substr(at_).starts_with("\\\"");
+    if (text_[at_] == '"') {
+      quoted = !quoted;
+    } else {
+      piece.value.push_back(text_[at_ += escape ? 1 : 0]);
+    }
+  }
+  while (!quoted && closing_ < open_ && piece.value.ends_with('>')) {
+    piece.value.pop_back();
+    ++closing_;
+  }
 }
 
 // "2 weeks ago" and "10 MB": words that go on with a value which is none without them, or which
@@ -322,6 +343,31 @@ class Builder {
   std::vector<Group> groups_;
 };
 
+// Brings those that one term stands for to the others of the root.
+void SpreadTermsOfWalk(QueryNode& root) {
+  std::vector<QueryNode> children;
+  for (QueryNode& child : root.children) {
+    const bool several = child.kind == Kind::kAll && std::ranges::all_of(child.children, IsOfWalk);
+    if (!several)
+      children.push_back(std::move(child));
+    else
+      std::ranges::move(child.children, std::back_inserter(children));
+  }
+  root.children = std::move(children);
+}
+
+Status TermsOfWalkAreAlone(QueryNode& root) {
+  SpreadTermsOfWalk(root);
+  for (const QueryNode& child : root.children) {
+    if (IsOfWalk(child) || !AnyLeaf(child, IsOfWalk)) continue;
+    return Error{kErrorIllegal, EINVAL,
+                 "'" + child.written +
+                     "': exclude: and hidden: hold for the whole search, so they "
+                     "stand by themselves: not behind !, beside | or in a group with others"};
+  }
+  return {};
+}
+
 Error Illegal(const char* why) { return {kErrorIllegal, EINVAL, why}; }
 
 }  // namespace
@@ -344,6 +390,7 @@ Result<Query> Query::Parse(std::string_view text, std::time_t now) {
   }
   Query query;
   query.root_ = builder.Finish();
+  if (const Status alone = TermsOfWalkAreAlone(query.root_); !alone) return alone.error();
   return query;
 }
 

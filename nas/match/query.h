@@ -8,8 +8,12 @@
 //   either = ["!"] ( "<" query ">" | prefix ":" value | text )
 //   text   = a word, in which wildcards speak (wildcards.h), or "quoted", in which nothing does;
 //            with a "/" it is about the path below the folder that is searched, else about the name
-//   prefix = ext type size modified created opened owner group depth empty content case regex, in
-//            any letter case; a value may be quoted, and is a list separated by "," but for texts
+//   prefix = ext type size modified created opened owner group depth empty content case regex
+//            exclude hidden, in any letter case; a value may be quoted, and is a list separated by
+//            "," but for texts
+//
+// The last line of prefixes says where a search goes, and so holds for all of it: such a term
+// stands by itself, neither left out nor beside a "|" nor in a group with others.
 //
 // Every text is a query but where a value cannot be understood. What could be meant otherwise is
 // text as ever: a "<" or ">" where not every group is closed, a prefix that is quoted or unknown, a
@@ -46,7 +50,10 @@ struct QueryNode {
     kOwner,  // numbers of users
     kGroup,
     kDepth,
-    kEmpty,  // a file of no bytes, a folder of no entries
+    kEmpty,       // a file of no bytes, a folder of no entries
+    kExecutable,  // a file that somebody may run
+    // From here on what holds for all of a search; among the children of the root alone.
+    kExclude,  // neither itself nor in a folder that has `text`
   };
   Kind kind = Kind::kAll;
   std::vector<QueryNode> children = {};
@@ -63,6 +70,9 @@ struct QueryNode {
 // restricts nothing.
 QueryNode ExtensionNode(std::string_view list);
 QueryNode BoundsNode(QueryNode::Kind kind, Bounds bounds);
+
+// Whether the term says where a search goes.
+inline bool IsOfWalk(const QueryNode& node) { return node.kind >= QueryNode::Kind::kExclude; }
 
 class Query {
  public:

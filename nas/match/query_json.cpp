@@ -10,7 +10,7 @@ namespace {
 using Kind = QueryNode::Kind;
 using Form = TextTerm::Form;
 
-constexpr std::array<std::pair<Kind, const char*>, 15> kKinds = {{
+constexpr std::array<std::pair<Kind, const char*>, 17> kKinds = {{
     {Kind::kAll, "all"},
     {Kind::kAny, "any"},
     {Kind::kNot, "not"},
@@ -26,12 +26,18 @@ constexpr std::array<std::pair<Kind, const char*>, 15> kKinds = {{
     {Kind::kGroup, "group"},
     {Kind::kDepth, "depth"},
     {Kind::kEmpty, "empty"},
+    {Kind::kExecutable, "executable"},
+    {Kind::kExclude, "exclude"},
 }};
-constexpr std::array<std::pair<Form, const char*>, 3> kForms = {
-    {{Form::kPlain, "plain"}, {Form::kLiteral, "literal"}, {Form::kRegex, "regex"}}};
+constexpr std::array<std::pair<Form, const char*>, 4> kForms = {{{Form::kPlain, "plain"},
+                                                                 {Form::kLiteral, "literal"},
+                                                                 {Form::kRegex, "regex"},
+                                                                 {Form::kWhole, "whole"}}};
 constexpr int kCategories = static_cast<int>(FileCategory::kArchive) + 1;
 constexpr int kAnyFile = -1;  // among the categories, as is
 constexpr int kFolder = -2;
+constexpr int kForm = 16;  // and the DT_* above it
+constexpr int kBehindForms = kForm + 16;
 
 // A group of the language becomes three nodes; the criteria around the pattern are a few more.
 constexpr size_t kDeepest = Query::kDeepestGroup * 3 + 8;
@@ -71,8 +77,10 @@ class Reader {
         return node.kind != Kind::kNot || node.children.size() == 1;
       case Kind::kText:
       case Kind::kContent:
+      case Kind::kExclude:
         return ReadText(json, node);
       case Kind::kEmpty:
+      case Kind::kExecutable:
         return json.size() == 1;
       default:
         break;
@@ -104,10 +112,17 @@ class Reader {
       return true;
     }
     if (node.kind == Kind::kType) {
-      if (!json.isInt() || json.asInt() < kFolder || json.asInt() >= kCategories) return false;
+      if (!json.isInt()) return false;
+      const int number = json.asInt();
+      const bool form = number > kForm && number < kBehindForms;
+      if (!form && (number < kFolder || number >= kCategories)) return false;
       FileType& type = node.types.emplace_back();
-      type.folder = json.asInt() == kFolder;
-      if (json.asInt() > kAnyFile) type.category = static_cast<FileCategory>(json.asInt());
+      type.folder = number == kFolder;
+      if (form) {
+        type.form = static_cast<unsigned char>(number - kForm);
+      } else if (number > kAnyFile) {
+        type.category = static_cast<FileCategory>(number);
+      }
       return true;
     }
     if (!json.isArray() || json.size() != 2 || !json[0].isInt64() || !json[1].isInt64()) {
@@ -133,9 +148,10 @@ Json::Value QueryToJson(const QueryNode& query) {
   }
   for (const std::string& suffix : query.suffixes) json.append(suffix);
   for (const FileType& type : query.types) {
-    json.append(type.folder     ? kFolder
-                : type.category ? static_cast<int>(*type.category)
-                                : kAnyFile);
+    json.append(type.folder      ? kFolder
+                : type.form != 0 ? kForm + type.form
+                : type.category  ? static_cast<int>(*type.category)
+                                 : kAnyFile);
   }
   for (const Bounds& bounds : query.bounds) {
     Json::Value& pair = json.append(Json::arrayValue);

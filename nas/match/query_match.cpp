@@ -1,5 +1,8 @@
 #include "nas/match/query_match.h"
 
+#include <dirent.h>
+#include <sys/stat.h>
+
 #include <algorithm>
 
 namespace nas {
@@ -33,11 +36,33 @@ bool HasExtension(const QueryNode& node, FoldedName& name) {
   });
 }
 
-bool IsOfType(const QueryNode& node, const QuerySubject& subject) {
-  return std::ranges::any_of(node.types, [&](const FileType& type) {
-    if (type.folder || subject.is_folder) return type.folder && subject.is_folder;
-    return !type.category || IsInCategory(ExtensionOf(subject.name->folded()), *type.category);
-  });
+Answer AskType(const FileType& type, const QuerySubject& subject) {
+  if (type.folder || subject.is_folder) return Known(type.folder && subject.is_folder);
+  if (type.form != 0) {
+    if (subject.is_file) return Known(type.form == DT_REG);
+    return subject.type == DT_UNKNOWN ? Answer::kMaybe : Known(subject.type == type.form);
+  }
+  return Known(!type.category || IsInCategory(ExtensionOf(subject.name->folded()), *type.category));
+}
+
+Answer AskTypes(const QueryNode& node, const QuerySubject& subject) {
+  if (subject.name == nullptr) return Answer::kMaybe;
+  Answer most = Known(node.types.empty());
+  for (const FileType& type : node.types) most = std::max(most, AskType(type, subject));
+  return most;
+}
+
+// What lies in a folder that is left out is left out with it; but most often the entry alone is to
+// be asked about, as nobody comes to what is in such a folder.
+Answer AskExclude(const QueryNode& node, const QuerySubject& subject) {
+  const TextTerm& text = *node.text;
+  if (subject.folder != nullptr) {
+    return text.FindsOnWay(*subject.folder) ? Answer::kNo : Answer::kMaybe;
+  }
+  if (subject.path == nullptr || subject.name == nullptr) return Answer::kMaybe;
+  if (subject.whole_way && text.FindsOnWay(*subject.path)) return Answer::kNo;
+  return Known(
+      !(text.of_path() ? text.FindsInPath(*subject.path) : text.FindsInName(*subject.name)));
 }
 
 bool HoldsOne(const QueryNode& node, std::int64_t value) {
@@ -57,6 +82,7 @@ Answer AskEmpty(const QuerySubject& subject) {
 // Of what an inode tells; folders have no size of their own.
 Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
   if (node.kind == Kind::kSize && subject.is_folder) return Answer::kNo;
+  if (node.kind == Kind::kExecutable && !subject.is_file) return Answer::kNo;
   if (subject.attributes == nullptr) return Answer::kMaybe;
   const QueryAttributes& file = *subject.attributes;
   switch (node.kind) {
@@ -73,6 +99,10 @@ Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
       return Known(HoldsOne(node, file.uid));
     case Kind::kGroup:
       return Known(HoldsOne(node, file.gid));
+    case Kind::kExecutable: {
+      constexpr std::uint32_t kAnybody = S_IXUSR | S_IXGRP | S_IXOTH;
+      return Known((file.mode & kAnybody) != 0);
+    }
     default:
       return AskEmpty(subject);
   }
@@ -80,7 +110,9 @@ Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
 
 }  // namespace
 
-bool IsOfAttributes(QueryNode::Kind kind) { return kind >= Kind::kSize && kind != Kind::kDepth; }
+bool IsOfAttributes(QueryNode::Kind kind) {
+  return kind >= Kind::kSize && kind < Kind::kExclude && kind != Kind::kDepth;
+}
 
 Answer Ask(const QueryNode& node, const QuerySubject& subject) {
   switch (node.kind) {
@@ -112,8 +144,9 @@ Answer Ask(const QueryNode& node, const QuerySubject& subject) {
       if (subject.name == nullptr) return Answer::kMaybe;
       return Known(node.suffixes.empty() || HasExtension(node, *subject.name));
     case Kind::kType:
-      if (subject.name == nullptr) return Answer::kMaybe;
-      return Known(node.types.empty() || IsOfType(node, subject));
+      return AskTypes(node, subject);
+    case Kind::kExclude:
+      return AskExclude(node, subject);
     case Kind::kDepth:
       return AskDepth(node, subject);
     default:

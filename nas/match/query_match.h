@@ -22,6 +22,7 @@ struct QueryAttributes {
   std::int64_t created = kNoTime;  // kNoTime: not recorded, and so never within bounds
   std::int64_t opened = 0;
   bool opened_known = true;
+  std::uint32_t mode = 0;
   std::uint32_t uid = 0;
   std::uint32_t gid = 0;
 };
@@ -34,7 +35,10 @@ struct QuerySubject {
   // Then it is asked whether there may be a match in it.
   EntryPath* folder = nullptr;
   bool is_folder = false;
-  bool is_file = false;  // a regular one, which alone has contents
+  bool is_file = false;    // a regular one, which alone has contents
+  unsigned char type = 0;  // DT_*; 0 is not known but for the two
+  // Whether folders on the way to the entry have not been asked about before.
+  bool whole_way = false;
   const QueryAttributes* attributes = nullptr;
   const std::function<bool()>* is_empty_folder = nullptr;
 

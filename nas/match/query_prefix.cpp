@@ -1,5 +1,7 @@
 #include "nas/match/query_prefix.h"
 
+#include <dirent.h>
+
 #include <algorithm>
 #include <cerrno>
 
@@ -17,7 +19,8 @@ constexpr std::string_view kTimeHelp =
 constexpr QueryPrefix kPrefixes[] = {
     {"ext:", Kind::kExtension, Value::kWords, "write extensions, as in ext:jpg,png"},
     {"type:", Kind::kType, Value::kWords,
-     "there are file, dir, image, video, audio, document and archive"},
+     "there are file, dir, link, executable, empty, pipe, socket, device, image, video, audio, "
+     "document and archive"},
     {"size:", Kind::kSize, Value::kSize, "write a size as in size:>10MB, size:1GB..2GB or size:0"},
     {"modified:", Kind::kModified, Value::kTime, kTimeHelp},
     {"created:", Kind::kCreated, Value::kTime, kTimeHelp},
@@ -30,6 +33,10 @@ constexpr QueryPrefix kPrefixes[] = {
     {"content:", Kind::kContent, Value::kText, "write a text, as in content:invoice"},
     {"case:", Kind::kText, Value::kExact, "write a name, as in case:README"},
     {"regex:", Kind::kText, Value::kRegex, ""},
+    {"exclude:", Kind::kExclude, Value::kGlobs,
+     "write names, as in exclude:node_modules or exclude:*.tmp,cache/"},
+    {"hidden:", Kind::kExclude, Value::kChoice,
+     "write hidden:no to leave out what begins with a dot"},
 };
 
 ValueReader ReaderOf(Value value, std::time_t now) {
@@ -71,17 +78,55 @@ Result<std::int64_t> AccountNumber(Kind kind, const std::string& name) {
                       : "users and groups cannot be looked up just now");
 }
 
-// Types go by several names, of one or of many.
+// Types go by several names, of one or of many, and by a letter.
 std::string TypeName(std::string_view word) {
   static constexpr std::pair<std::string_view, std::string_view> kNames[] = {
       {"folder", "dir"},  {"directory", "dir"}, {"directorie", "dir"}, {"picture", "image"},
       {"photo", "image"}, {"movie", "video"},   {"film", "video"},     {"music", "audio"},
-      {"sound", "audio"}, {"doc", "document"}};
+      {"sound", "audio"}, {"doc", "document"},  {"symlink", "link"},   {"fifo", "pipe"},
+      {"f", "file"},      {"d", "dir"},         {"l", "link"},         {"p", "pipe"},
+      {"s", "socket"},    {"b", "block"},       {"c", "char"},         {"x", "executable"},
+      {"e", "empty"}};
   std::string name = AsciiLower(word);
-  if (name.ends_with('s')) name.pop_back();
+  if (name.size() > 1 && name.ends_with('s')) name.pop_back();
   const auto* const known =
       std::ranges::find_if(kNames, [&](const auto& one) { return one.first == name; });
   return known == std::end(kNames) ? name : std::string(known->second);
+}
+
+// By what the file is, not by what its name says.
+void AddForms(std::string_view name, QueryNode& node) {
+  static constexpr std::pair<std::string_view, unsigned char> kForms[] = {
+      {"file", DT_REG},   {"link", DT_LNK},  {"pipe", DT_FIFO},  {"socket", DT_SOCK},
+      {"device", DT_BLK}, {"block", DT_BLK}, {"device", DT_CHR}, {"char", DT_CHR}};
+  for (const auto& [word, form] : kForms) {
+    if (word == name) node.types.push_back({.form = form});
+  }
+}
+
+// A type that takes more than the name to tell is a node of its own, beside the others.
+Status AddType(const QueryPrefix& prefix, std::string_view word, QueryNode& node) {
+  const std::string name = TypeName(word);
+  if (name == "executable" || name == "empty") {
+    node.children.push_back({.kind = name == "empty" ? Kind::kEmpty : Kind::kExecutable});
+    return {};
+  }
+  const size_t before = node.types.size();
+  AddForms(name, node);
+  if (node.types.size() > before) return {};
+  const auto type = ParseFileType(name);
+  if (!type) return Wrong(prefix);
+  node.types.push_back(*type);
+  return {};
+}
+
+// What AddType has made, as one node.
+QueryNode TypesNode(QueryNode node) {
+  if (node.children.empty()) return node;
+  QueryNode any{.kind = Kind::kAny};
+  any.children.swap(node.children);
+  if (!node.types.empty()) any.children.push_back(std::move(node));
+  return any;
 }
 
 Status AddWord(const QueryPrefix& prefix, std::string_view word, QueryNode& node) {
@@ -89,12 +134,7 @@ Status AddWord(const QueryPrefix& prefix, std::string_view word, QueryNode& node
     std::ranges::move(ExtensionNode(word).suffixes, std::back_inserter(node.suffixes));
     return {};
   }
-  if (prefix.kind == Kind::kType) {
-    const auto type = ParseFileType(TypeName(word));
-    if (!type) return Wrong(prefix);
-    node.types.push_back(*type);
-    return {};
-  }
+  if (prefix.kind == Kind::kType) return AddType(prefix, word, node);
   const auto number = AccountNumber(prefix.kind, std::string(word));
   if (!number) return number.error();
   node.bounds.push_back({*number, *number});
@@ -132,6 +172,51 @@ Result<QueryNode> EmptyNode(const QueryPrefix& prefix, std::string_view value) {
   return other;
 }
 
+// The place of the comma, or the end, behind a name that begins at `at`.
+size_t EndOfGlob(std::string_view value, size_t at) {
+  size_t open = 0;
+  for (; at < value.size(); ++at) {
+    if (value[at] == '\\')
+      ++at;
+    else if (value[at] == '{')
+      ++open;
+    else if (value[at] == '}' && open > 0)
+      --open;
+    else if (value[at] == ',' && open == 0)
+      return at;
+  }
+  return value.size();
+}
+
+Result<QueryNode> ExcludeNode(std::string_view glob) {
+  auto text = TextTerm::Make(glob, TextTerm::Form::kWhole, false);
+  if (!text) return text.error();
+  QueryNode node{.kind = Kind::kExclude};
+  node.text = std::move(*text);
+  return node;
+}
+
+Result<QueryNode> GlobsNode(const QueryPrefix& prefix, std::string_view value) {
+  QueryNode all;
+  for (size_t at = 0; at <= value.size();) {
+    const size_t end = EndOfGlob(value, at);
+    const std::string_view glob = value.substr(at, end - at);
+    at = end + 1;
+    if (glob.find_first_not_of('/') == std::string_view::npos) return Wrong(prefix);
+    auto node = ExcludeNode(glob);
+    if (!node) return node.error();
+    all.children.push_back(std::move(*node));
+  }
+  return all;
+}
+
+Result<QueryNode> ChoiceNode(const QueryPrefix& prefix, std::string_view value) {
+  const std::string word = AsciiLower(value);
+  if (word == "yes" || word == "true") return QueryNode();
+  if (word != "no" && word != "false") return Wrong(prefix);
+  return ExcludeNode(kHiddenGlob);
+}
+
 }  // namespace
 
 const QueryPrefix* FindPrefix(std::string_view text) {
@@ -149,6 +234,8 @@ bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t no
 
 Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
   if (prefix.value == Value::kNothing) return EmptyNode(prefix, value);
+  if (prefix.value == Value::kGlobs) return GlobsNode(prefix, value);
+  if (prefix.value == Value::kChoice) return ChoiceNode(prefix, value);
   QueryNode node{.kind = prefix.kind};
   for (size_t at = 0; at <= value.size();) {
     const size_t end = std::min(value.find(',', at), value.size());
@@ -157,7 +244,7 @@ Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, 
     at = end + 1;
   }
   if (node.kind == Kind::kExtension && node.suffixes.empty()) return Wrong(prefix);
-  return node;
+  return TypesNode(std::move(node));
 }
 
 QueryNode ExtensionNode(std::string_view list) {

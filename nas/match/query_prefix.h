@@ -13,12 +13,26 @@ namespace nas {
 
 struct QueryPrefix {
   // How its value is written: a text is one; others are lists.
-  enum class Value { kText, kRegex, kExact, kWords, kSize, kTime, kNumber, kNothing };
+  enum class Value {
+    kText,
+    kRegex,
+    kExact,
+    kWords,
+    kSize,
+    kTime,
+    kNumber,
+    kNothing,
+    kGlobs,  // words in which a comma in braces or behind a backslash parts nothing
+    kChoice,
+  };
   std::string_view name;  // with its colon
   QueryNode::Kind kind;
   Value value;
   std::string_view help;  // what would be right
 };
+
+// What "hidden:no" leaves out.
+inline constexpr std::string_view kHiddenGlob = ".*";
 
 // The prefix that `text` begins with, or null.
 const QueryPrefix* FindPrefix(std::string_view text);

@@ -23,12 +23,15 @@ Result<std::shared_ptr<const TextTerm>> TextTerm::Make(std::string_view text, Fo
     term->forms_.emplace_back();
     return std::shared_ptr<const TextTerm>(std::move(term));
   }
+  const bool whole = form == Form::kWhole;
+  const size_t slash = text.find('/');
+  if (whole && slash != 0 && slash < text.size() - 1) term->text_.insert(0, 1, '/');
   const bool speaks = form == Form::kPlain && Wildcards::Speak(text);
-  const bool wild = speaks && Wildcards::Remain(text);
+  const bool wild = whole || (speaks && Wildcards::Remain(text));
   if (speaks && !wild) term->text_ = Wildcards::Unescaped(text);
-  term->of_path_ = text.find('/') != std::string_view::npos;
+  term->of_path_ = slash != std::string_view::npos;
   // Who looks for "a{b,c}" in contents means these very bytes.
-  term->literal_ = !wild || !Glob::HasWildcard(text);
+  term->literal_ = !whole && (!wild || !Glob::HasWildcard(text));
   const std::string folded = FoldText(term->text_);
   term->plain_ = !exact && WithoutAccents(folded) == folded;
   std::vector<std::string> forms = {exact ? ComposeText(term->text_) : folded};
@@ -148,9 +151,23 @@ bool TextTerm::Begins(FoldedName& path, std::string_view root) const {
 }
 
 bool TextTerm::FindsInPath(EntryPath& path) const {
-  if (!text_.starts_with('/')) return FindsIn(path.below());
+  if (!text_.starts_with('/') || form_ == Form::kWhole) return FindsIn(path.below());
   return Begins(path.below(), "") || Begins(path.in_share(), path.base().in_share) ||
          Begins(path.on_disk(), path.base().on_disk);
+}
+
+bool TextTerm::FindsOnWay(const EntryPath& folder) const {
+  const std::string_view way = folder.folder();
+  FoldedName text;
+  std::string path;
+  for (size_t at = 0; at < way.size();) {
+    const size_t end = std::min(way.find('/', at), way.size());
+    if (of_path_) path.assign("/").append(way.substr(0, end)).append("/");
+    text.Set(of_path_ ? std::string_view(path) : way.substr(at, end - at));
+    if (FindsIn(text)) return true;
+    at = end + 1;
+  }
+  return false;
 }
 
 namespace {

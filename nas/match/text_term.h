@@ -23,6 +23,8 @@ class TextTerm {
     kPlain,    // wildcards speak
     kLiteral,  // they do not
     kRegex,    // of names only, whatever it holds
+    kWhole,    // wildcards speak, and without one too it is about the whole name; with a "/" before
+               // its end about the path from the folder that is searched, as in .gitignore
   };
   // `exact`: letter case and accents count. Fails with kErrorIllegal and a sentence about what is
   // wrong in the place of a path.
@@ -31,6 +33,8 @@ class TextTerm {
   bool FindsInName(FoldedName& name) const;
   // For terms that are about paths: those that hold a "/".
   bool FindsInPath(EntryPath& path) const;
+  // Of kWhole: whether something on the way to what lies in this folder has the term.
+  bool FindsOnWay(const EntryPath& folder) const;
   // Whether FindsInPath may say yes of something in a folder, whose path is given as that of an
   // entry in it without a name. Never no where it may.
   bool MayFindBelow(EntryPath& folder) const;

@@ -2,6 +2,7 @@
 
 #include "nas/results/row_query.h"
 
+#include <dirent.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -127,6 +128,7 @@ void ResultReader::FilterByQuery(const Query& query, std::vector<bool>& passes) 
     folded.Set(row.name);
     subject.is_folder = S_ISDIR(row.attributes->mode);
     subject.is_file = S_ISREG(row.attributes->mode);
+    subject.type = static_cast<unsigned char>(IFTODT(row.attributes->mode));
     path.SetBase({"/" + std::string(row.share_name), std::string(row.share_root), ""});
     path.SetFolder(row.folder);
     path.SetEntry(row.name, subject.is_folder);

@@ -13,6 +13,7 @@ inline QueryAttributes AttributesOf(const FileAttributes& file) {
           .modified = file.mtime,
           .created = file.crtime,
           .opened = file.atime,
+          .mode = file.mode,
           .uid = file.uid,
           .gid = file.gid};
 }

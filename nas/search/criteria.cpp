@@ -20,6 +20,7 @@ int CostOf(const QueryNode& node) {
   enum { kName, kTable, kPath, kInode, kFolder, kContents };
   switch (node.kind) {
     case Kind::kText:
+    case Kind::kExclude:
       return node.text->of_path() ? kPath : kName;
     case Kind::kExtension:
     case Kind::kType:
@@ -38,7 +39,8 @@ int CostOf(const QueryNode& node) {
 }
 
 bool AsksPath(const QueryNode& leaf) {
-  return leaf.kind == Kind::kDepth || (leaf.kind == Kind::kText && leaf.text->of_path());
+  return leaf.kind == Kind::kDepth || IsOfWalk(leaf) ||
+         (leaf.kind == Kind::kText && leaf.text->of_path());
 }
 
 }  // namespace
@@ -55,6 +57,7 @@ Criteria::Criteria(const std::vector<FileSearch::FindComp*>& comps) {
   std::ranges::stable_sort(root.children, {}, CostOf);
   ask_attributes = AnyLeaf(root, [](const QueryNode& leaf) { return IsOfAttributes(leaf.kind); });
   ask_paths = AnyLeaf(root, AsksPath);
+  pruning = Pruning::Of(root);
 }
 
 namespace {
@@ -90,6 +93,10 @@ Refusal WhyNotLeaf(const QueryNode& node, const QuerySubject& subject) {
       return Refusal::kDepth;
     case Kind::kEmpty:
       return Refusal::kNotEmpty;
+    case Kind::kExecutable:
+      return Refusal::kKind;
+    case Kind::kExclude:
+      return Refusal::kExcluded;
     default:
       return node.text != nullptr && node.text->of_path() ? Refusal::kPath : Refusal::kName;
   }

@@ -8,6 +8,7 @@
 
 #include "nas/match/query.h"
 #include "nas/match/query_match.h"
+#include "nas/search/pruning.h"
 #include "nas/search/refusal.h"
 #include "platform/filesearch.h"
 
@@ -34,6 +35,7 @@ struct Criteria {
   explicit Criteria(const std::vector<FileSearch::FindComp*>& comps);
 
   QueryNode root;  // all of them, cheapest first
+  Pruning pruning;
   bool ask_attributes = false;
   bool ask_paths = false;
 };

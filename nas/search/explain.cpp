@@ -56,7 +56,7 @@ Result<Explanation> Explain(const ExplainedSearch& asked, size_t number, std::st
   NoRows sink;
   SharedSearch search(asked.comps, sink, never);
   search.AskContents(asked.search_content);
-  const FolderGate gate(asked.locations, asked.recursive);
+  const FolderGate gate(asked.locations, asked.recursive, search.criteria.pruning);
   const Location& location = asked.locations[number];
   std::string at = location.path;
   FolderGate::Opened folder = gate.Open(location.fd.get(), ".");
@@ -73,7 +73,7 @@ Result<Explanation> Explain(const ExplainedSearch& asked, size_t number, std::st
       return found;
     }
     path.remove_prefix(name.size() + 1);
-    const Refusal below = gate.Below(entry->type);
+    const Refusal below = gate.Below(entry->type, location, folder_path, name);
     if (below == Refusal::kNoFolder) return Error{kErrorNoSuchFolder, ENOTDIR, at};
     if (below != Refusal::kNone) return Explanation{below, at};
     folder = gate.Open(folder.fd.get(), entry->name.data());

@@ -4,7 +4,7 @@
 // Symbolic links are results, never followed. A folder on another file system is entered unless it
 // is a pseudo file system (proc, sysfs and their like) below a location; the temporary folders
 // "@tmp" of volumes are never entered. A location inside another is entered as a location only, so
-// that its files are found once.
+// that its files are found once. What the search's own terms leave out stands in pruning.h.
 
 #include <dirent.h>
 #include <sys/types.h>
@@ -15,6 +15,7 @@
 
 #include "nas/base/unique_fd.h"
 #include "nas/search/location.h"
+#include "nas/search/pruning.h"
 #include "nas/search/refusal.h"
 
 namespace nas {
@@ -32,17 +33,21 @@ class FolderGate {
   // Looks where the volumes' temporary folders are.
   static Rules RulesFor(const std::vector<Location>& locations, bool recursive);
 
-  FolderGate(const std::vector<Location>& locations, bool recursive)
-      : FolderGate(RulesFor(locations, recursive)) {}
-  explicit FolderGate(Rules rules) : rules_(std::move(rules)) {}
+  FolderGate(const std::vector<Location>& locations, bool recursive, Pruning pruning)
+      : FolderGate(RulesFor(locations, recursive), std::move(pruning)) {}
+  FolderGate(Rules rules, Pruning pruning)
+      : rules_(std::move(rules)), pruning_(std::move(pruning)), prunes_(pruning_.restricts()) {}
 
   const Rules& rules() const { return rules_; }
 
-  // Whether an entry of this type (DT_*) is a folder whose own entries are searched too; kNone, or
-  // why not. Says nothing yet of that very folder: Open does.
-  Refusal Below(unsigned char type) const {
+  // Whether an entry of this type (DT_*), `name` in the folder at `parent` of that location, is a
+  // folder whose own entries are searched too; kNone, or why not. Says nothing yet of that very
+  // folder: Open does.
+  Refusal Below(unsigned char type, const Location& location, std::string_view parent,
+                std::string_view name) const {
     if (type != DT_DIR) return type == DT_LNK ? Refusal::kSymbolicLink : Refusal::kNoFolder;
-    return rules_.recursive ? Refusal::kNone : Refusal::kNotRecursive;
+    if (!rules_.recursive) return Refusal::kNotRecursive;
+    return prunes_ ? pruning_.MayEnter(location.path, parent, name) : Refusal::kNone;
   }
 
   // The folder to read, or why it is left out: with kFolderUnreadable errno says more.
@@ -58,6 +63,8 @@ class FolderGate {
   Refusal MayEnter(int fd, std::string_view name, bool crossed) const;
 
   const Rules rules_;
+  const Pruning pruning_;
+  const bool prunes_;
 };
 
 }  // namespace nas

@@ -8,10 +8,19 @@
 
 namespace nas {
 
+namespace {
+
+// Who asks what a search comes close to asks beyond what its terms leave out as well.
+Pruning PruningOf(const SharedSearch& search) {
+  return search.misses == nullptr ? search.criteria.pruning : Pruning();
+}
+
+}  // namespace
+
 static_assert(FolderStack::kMostThreads >= NameSource::kMostThreads);
 
 FolderWalk::FolderWalk(const std::vector<Location>& locations, bool recursive, SharedSearch& search)
-    : FolderWalk(locations, FolderGate(locations, recursive), search) {
+    : FolderWalk(locations, FolderGate(locations, recursive, PruningOf(search)), search) {
   std::set<std::pair<dev_t, ino_t>> known;
   for (size_t i = 0; i < locations.size(); ++i) {
     const bool added = known.emplace(locations[i].device, locations[i].inode).second;
@@ -56,7 +65,8 @@ void FolderWalk::Feed(size_t thread, Judge& judge) {
 }
 
 void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading& reading) {
-  const std::uint16_t location = item.batch->location;
+  const std::uint16_t number = item.batch->location;
+  const Location& location = locations_[number];
   std::string& path = reading.path;
   path = item.batch->parent_path;
   if (item.name != ".") {
@@ -67,17 +77,19 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
   std::uint64_t entries = 0;
   DirectoryReader::Entry entry;
   reading.reader.Start(fd.get());
-  reading.judge.Enter(fd.get(), location, locations_[location], path);
+  reading.judge.Enter(fd.get(), number, location, path);
   while (reading.reader.Next(entry) && !search_.stopping()) {
     ++entries;
-    if (gate_.Below(entry.type) == Refusal::kNone) below->names.append(entry.name).push_back('\0');
+    if (gate_.Below(entry.type, location, path, entry.name) == Refusal::kNone) {
+      below->names.append(entry.name).push_back('\0');
+    }
     reading.judge.Entry(entry);
   }
   if (reading.reader.failed() != 0) search_.progress.AddSkipped(reading.reader.failed());
   search_.progress.AddFolder(entries);
   reading.judge.Leave();
   if (below->names.empty()) return;
-  below->location = location;
+  below->location = number;
   below->parent_path = path;
   below->parent = std::move(fd);
   stack_.Push(reading.thread, std::move(below));

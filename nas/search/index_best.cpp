@@ -1,5 +1,7 @@
 #include "nas/search/index_best.h"
 
+#include <dirent.h>
+
 #include <algorithm>
 #include <atomic>
 #include <cstdint>
@@ -150,11 +152,11 @@ class Ranker {
     }
   }
 
-  // Types are not known: either may be it.
+  // Types are not known: any may be it.
   bool MayMatch(QuerySubject& subject) const {
-    for (const bool folder : {false, true}) {
-      subject.is_folder = folder;
-      subject.is_file = !folder;
+    for (const unsigned char type : {DT_REG, DT_DIR, DT_UNKNOWN}) {
+      subject.is_folder = type == DT_DIR;
+      subject.is_file = type == DT_REG;
       if (Ask(query_, subject) != Answer::kNo) return true;
     }
     return false;

@@ -246,6 +246,7 @@ bool EntryFilter::LearnAttributes(EntryId entry) {
                  .modified = known->mtime,
                  .created = known->crtime,
                  .opened_known = false,
+                 .mode = known->mode,
                  .uid = known->uid,
                  .gid = known->gid};
   return true;
@@ -275,6 +276,7 @@ bool EntryFilter::MayMatch(EntryId entry) {
   const unsigned char type = table_.type(entry);
   subject.is_folder = type == DT_DIR;
   subject.is_file = type == DT_REG;
+  subject.type = type;
   if (filter_.asks_names_) SetName(entry);
   subject.name = &name_;
   if (filter_.search_.criteria.ask_paths) {

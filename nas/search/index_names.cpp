@@ -40,7 +40,7 @@ IndexNames::IndexNames(const IndexSnapshot& snapshot, const Place& place, Shared
       top_(place.folder),
       end_(place.rules.recursive ? table_.subtree_end(top_) : top_ + 1),
       search_(search),
-      gate_(OnOneMount(place.rules)),
+      gate_(OnOneMount(place.rules), search.criteria.pruning),
       filter_(snapshot, search),
       walk_(locations_, gate_, search),
       pieces_(PiecesOf(table_.entries_begin(end_) - table_.entries_begin(top_))) {

@@ -203,8 +203,14 @@ void IndexVisit::ReadWhole(FolderId folder) {
   judge_.Leave();
 }
 
+// By its name, of a folder in the open one.
+bool IndexVisit::MayEnter(std::string_view name) const {
+  const Location& location = names_.locations_.front();
+  return names_.gate_.Below(DT_DIR, location, path_, name) == Refusal::kNone;
+}
+
 void IndexVisit::EnterFolder(const char* name, FolderId folder) {
-  if (names_.gate_.Below(DT_DIR) != Refusal::kNone) return;
+  if (!MayEnter(name)) return;
   const FolderGate::Opened opened = names_.gate_.Open(fd(), name);
   if (!opened.fd) {
     const bool tell = opened.refusal == Refusal::kFolderUnreadable && !IsGone(opened.error_number);
@@ -285,6 +291,10 @@ bool IndexVisit::OpenTop() {
 
 bool IndexVisit::OpenLevel(FolderId folder) {
   const std::string name(table_.folder_name(folder));
+  if (!MayEnter(name)) {
+    Skip(folder);
+    return false;
+  }
   FolderGate::Opened opened = names_.gate_.Open(fd(), name.c_str());
   if (!opened.fd) {
     Refused(folder, opened);

@@ -53,8 +53,8 @@ IndexedWalk::IndexedWalk(const std::vector<Location>& locations, Settings settin
     : locations_(locations),
       settings_(std::move(settings)),
       search_(search),
-      gate_(locations, settings_.recursive),
-      gate_to_mounts_(OnOneMount(gate_.rules())),
+      gate_(locations, settings_.recursive, search.criteria.pruning),
+      gate_to_mounts_(OnOneMount(gate_.rules()), search.criteria.pruning),
       asks_times_(AsksTimes(search.criteria.root)),
       walk_(locations, gate_, search) {
   std::set<std::pair<dev_t, ino_t>> known;
@@ -223,6 +223,7 @@ bool IndexedWalk::WalkMounts(size_t thread, std::uint16_t number,
     while (folder.fd && !rest.empty()) {
       const std::string name(rest.substr(0, rest.find('/')));
       rest.remove_prefix(std::min(name.size() + 1, rest.size()));
+      if (gate_.Below(DT_DIR, location, path, name) != Refusal::kNone) break;
       FolderGate::Opened below = gate_to_mounts_.Open(folder.fd.get(), name.c_str());
       const std::string below_path = path + (path.empty() ? "" : "/") + name;
       if (below.refusal == Refusal::kOtherMount && walked.insert(below_path).second) {

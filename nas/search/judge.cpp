@@ -81,6 +81,8 @@ void Judge::Meet(std::string_view name, unsigned char type) {
   subject_.name = &folded_;
   subject_.is_folder = type == DT_DIR;
   subject_.is_file = type == DT_REG;
+  subject_.type = type;
+  subject_.whole_way = search_.misses != nullptr;
   if (!search_.criteria.ask_paths) return;
   path_.SetEntry(name, subject_.is_folder);
   subject_.path = &path_;

@@ -68,6 +68,10 @@ const char* Words(Refusal refusal) {
       return "is on another file system, which is not searched by this way";
     case Refusal::kNotRecursive:
       return "is a folder in the one to search, and such are not entered";
+    case Refusal::kFolderExcluded:
+      return "is left out, with all that is in it";
+    case Refusal::kTooDeep:
+      return "lies as deep as the search goes";
     case Refusal::kSymbolicLink:
       return "is a symbolic link, which can be found but is not followed";
     case Refusal::kNoFolder:

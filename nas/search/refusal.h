@@ -40,6 +40,8 @@ enum class Refusal {
   kOtherLocation,
   kOtherMount,
   kNotRecursive,
+  kFolderExcluded,
+  kTooDeep,
   kSymbolicLink,
   kNoFolder,
 };

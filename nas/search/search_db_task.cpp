@@ -50,7 +50,8 @@ bool HasVanished(const std::string& path) {
 // What is written of a file holds neither its contents nor how deep it lies in what was searched.
 bool AsksMoreThanRows(const nas::QueryNode& leaf) {
   using Kind = nas::QueryNode::Kind;
-  return leaf.kind == Kind::kContent || leaf.kind == Kind::kDepth || leaf.kind == Kind::kEmpty;
+  return leaf.kind == Kind::kContent || leaf.kind == Kind::kDepth || leaf.kind == Kind::kEmpty ||
+         nas::IsOfWalk(leaf);
 }
 
 // Lends rows to a callback in the platform's form, row after row from the same memory.

@@ -58,6 +58,7 @@ class Queries : public testing::Test {
     subject.path = &entry_path;
     subject.is_folder = is_folder;
     subject.is_file = !is_folder;
+    subject.whole_way = true;
     // What is known of the name alone may leave a question open, but is never taken back.
     const Answer early = Ask(query.root(), subject);
     subject.attributes = &attributes;
@@ -182,6 +183,19 @@ TEST_F(Queries, Table) {
       {"caf\u00e9", "Caf\u00e9.txt", ""},
       {"caf\u00e8", "", "another accent"},
       {"case:cafe", "", ""},
+      // What is left out, wherever it stands and with all that is in it.
+      {"exclude:*.py py", "", ""},
+      {"exclude:lib,OTHER py", "src/test_1.py", "whole names, in any letter case"},
+      {"exclude:tes? py", "src/test_1.py src/lib/x/test_2.py other/src/test_3.py", ""},
+      {"exclude:/src py", "other/src/test_3.py", "from the folder that is searched"},
+      {"exclude:src/lib py", "src/test_1.py other/src/test_3.py", "so too with one inside"},
+      {"exclude:**/src/*.py py", "src/lib/x/test_2.py", ""},
+      {"exclude:src/** src", "src/", "what is below, not the folder"},
+      {"exclude:*/ type:file !jpg !p", "e.tar.gz Caf\u00e9.txt", "folders alone"},
+      {"exclude:{a,c}.*,\"?.pdf\" ?.*", "b.JPG e.tar.gz", "several values, and braces"},
+      {"exclude:\"a\\,b\",cafe* jp", "a.jpg b.JPG", "a comma that is meant"},
+      {"jpg exclude:a.jpg", "b.JPG", "anywhere in the query"},
+      {"hidden:no jpg", "a.jpg b.JPG", ""},
       // What is only a name.
       {"\"ext:jpg\"", "", ""},
       {"note:jpg", "", "an unknown word before a colon"},
@@ -208,10 +222,16 @@ TEST_F(Queries, AreRefusedInWords) {
       {"opened:5", "write a time"},
       {"created:>", "write a time"},
       {"modified:99999999999999999999d", "write a time"},
-      {"type:song", "'type:song': there are file, dir, image"},
+      {"type:song", "'type:song': there are file, dir, link, executable"},
       {"owner:nob0dy", "'owner:nob0dy': there is no user 'nob0dy'"},
       {"group:\"no such\"", "there is no group 'no such'"},
       {"depth:deep", "write a number of levels"},
+      {"exclude:", "write names, as in exclude:node_modules"},
+      {"exclude:a,,b", "write names"},
+      {"hidden:sometimes", "write hidden:no"},
+      {"!exclude:a", "'!exclude:a': exclude: and hidden: hold for the whole search"},
+      {"a|hidden:no b", "'a|hidden:no': exclude: and"},
+      {"<a exclude:b> c", "'<a exclude:b>': exclude: and"},
       {"empty:maybe", "it takes no value, or yes or no"},
       {"ext:,", "write extensions"},
       {"content: a", "'content:': write a text"},

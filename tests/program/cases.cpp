@@ -5,6 +5,8 @@
 #include <regex.h>
 #include <strings.h>
 
+#include <algorithm>
+
 #include "nas/base/json_text.h"
 
 namespace program_test {
@@ -118,6 +120,28 @@ const std::vector<Case>& Cases() {
        [](const Entry& e) { return Holds(e.path, "er/img1"); }},
       {"no accent finds any", R"({"pattern": "cafe"})",
        [](const Entry& e) { return IsCafe(e.name); }},
+      {"what is left out, and all in it",
+       R"({"pattern": "exclude:er,*.{jpg,gz} hidden:no exclude:/comma*/"})",
+       [](const Entry& e) {
+         return !Holds(e.path, "/deep/er") && !Ends(e.name, ".jpg") && !Ends(e.name, ".gz") &&
+                !e.name.starts_with('.') && !Holds(e.path, "/comma, folder");
+       }},
+      {"a name below a folder, and one at its place only",
+       R"({"pattern": "exclude:docs/**/IMG2.*,deep/er g"})",
+       [](const Entry& e) {
+         return Holds(e.name, "g") && !(Holds(e.path, "/docs/") && Holds(e.name, "img2."));
+       }},
+      {"two levels", R"({"pattern": "depth:<=2 txt"})",
+       [](const Entry& e) {
+         const std::string below = e.path.substr(e.path.find("/tree/"));
+         return std::ranges::count(below, '/') <= 3 && Holds(e.name, "txt");
+       }},
+      {"by what they are", R"({"pattern": "type:link,pipe"})",
+       [](const Entry& e) { return S_ISLNK(e.info.st_mode) || S_ISFIFO(e.info.st_mode); }},
+      {"what can be run", R"({"pattern": "type:x,dir !type:device"})",
+       [](const Entry& e) {
+         return e.is_dir() || (IsRegular(e) && (e.info.st_mode & S_IXUSR) != 0);
+       }},
       {"empty ones", R"({"pattern": "empty:"})",
        [](const Entry& e) {
          return e.is_dir() ? e.name == "empty" : IsRegular(e) && e.info.st_size == 0;

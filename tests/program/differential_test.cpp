@@ -32,6 +32,7 @@ std::vector<std::string> PathsOf(const Output& output) {
 // The same search as words of a command line.
 std::vector<std::string> Arguments(const Json::Value& params, const std::string& folder) {
   std::vector<std::string> words = {"search", "-a0"};
+  std::string pattern = params.get("pattern", "").asString();
   for (const std::string& name : params.getMemberNames()) {
     const Json::Value& value = params[name];
     std::string option = "--" + name;
@@ -41,12 +42,16 @@ std::vector<std::string> Arguments(const Json::Value& params, const std::string&
     } else if (name == "search_content") {
       if (value.asBool()) words.push_back("--content");
     } else if (name == "filetype") {
-      words.insert(words.end(), {"--type", value.asString()});
+      // "file" is whatever is no folder to the API, and a regular file to people.
+      if (value == "file")
+        pattern.insert(0, "!type:dir ");
+      else
+        words.insert(words.end(), {"--type", value.asString()});
     } else if (name != "pattern" && name != "folder_path") {
       words.insert(words.end(), {option, value.asString()});
     }
   }
-  words.insert(words.end(), {"--", params.get("pattern", "").asString(), folder});
+  words.insert(words.end(), {"--", pattern, folder});
   return words;
 }
 

@@ -86,6 +86,7 @@ void MakeHostileTree(const std::string& root) {
       if (number % 5 == 0) text += " the Needle is here";
       if (number % 10 == 0) text += '\0';
       nas_test::WriteFile(path, text);
+      if (name == "no_extension") chmod(path.c_str(), 0755);
       const timespec times[2] = {{kFirstTime - number, 0}, {kFirstTime + number, 0}};
       utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW);
       if (nas_test::AmRoot() && number % 3 == 0) {

@@ -9,7 +9,7 @@ export interface Word {
 
 const MOST_ALTERNATIVES = 256;
 const PREFIX =
-  /(ext|type|size|modified|created|opened|owner|group|depth|empty|content|case|regex):/iy;
+  /(ext|type|size|modified|created|opened|owner|group|depth|empty|content|case|regex|exclude|hidden):/iy;
 // Words that go on with a size or a time.
 const MORE =
   /(?: +(?:\d+|ago|[kmgtp]i?b|bytes|(?:sec(?:ond)?|min(?:ute)?|hr|hour|day|week|month|year)s?)(?:\.\.[^ |>]*)?(?=[ |>]|$))*/iy;

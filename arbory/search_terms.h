@@ -1,0 +1,15 @@
+#pragma once
+// What a command line asks of a search and its parameters cannot say, as terms of the query
+// language (docs/query.md).
+
+#include <string>
+
+#include "arbory/options.h"
+
+namespace arbory {
+
+// The query's pattern behind the terms that its other options stand for. Values are passed on as
+// they are: whoever parses the whole says what is wrong with one, and names it.
+std::string PatternWithTerms(const SearchQuery& query);
+
+}  // namespace arbory
