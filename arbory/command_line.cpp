@@ -16,6 +16,19 @@ void AddTimes(CLI::App* command, const std::string& name, const std::string& ver
   command->add_option("--" + name + "-to", range->to, verb + " then or earlier")->type_name("TIME");
 }
 
+// The last one given counts, so that an alias can be overruled.
+void AddLetters(CLI::App* command, SearchQuery* query) {
+  const auto add = [&](const char* names, const char* word, const char* what) {
+    command
+        ->add_flag_function(
+            names, [query, word](std::int64_t) { query->letters = word; }, what)
+        ->trigger_on_parse();
+  };
+  add("-s,--case-sensitive", "exact", "Letter case and accents count");
+  add("--smart-case", "smart", "They count in a word that has a capital letter");
+  add("-i,--ignore-case", "any", "They do not; as usual");
+}
+
 void AddCriteria(CLI::App* command, SearchQuery* query) {
   command->option_defaults()->group("Criteria");
   command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
@@ -49,6 +62,19 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
       ->type_name("GLOB")
       ->allow_extra_args(false);
   command->add_flag("--no-hidden", query->no_hidden, "Leave out what begins with a dot");
+  command->add_flag("--ignore-files", query->ignore_files,
+                    "Leave out what .gitignore, .ignore and .fdignore say");
+  command->add_flag("--one-file-system", query->one_file_system,
+                    "Do not enter what is mounted from another file system");
+  AddLetters(command, query);
+  command
+      ->add_flag_function("-L,--follow",
+                          [](std::int64_t) {
+                            throw UsageError(
+                                "symbolic links are found and not followed, as they may lead out "
+                                "of what is searched; name the folder that one leads to");
+                          })
+      ->group("");
   command->add_flag_function(
       "--no-recursive", [query](std::int64_t) { query->recursive = false; },
       "Do not enter the folders in FOLDER");

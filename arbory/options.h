@@ -86,6 +86,9 @@ struct SearchQuery {
   std::string min_depth;
   std::string max_depth;
   bool no_hidden = false;
+  bool ignore_files = false;
+  bool one_file_system = false;
+  std::string letters;  // "exact", "smart", "any"; empty: the usual
   std::string size_from;
   std::string size_to;
   TimeRange mtime;

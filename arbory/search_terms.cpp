@@ -59,6 +59,9 @@ std::string PatternWithTerms(const SearchQuery& query) {
   std::string terms;
   for (const std::string& glob : query.excludes) AddTerm("exclude:" + Quoted(glob), &terms);
   if (query.no_hidden) AddTerm("hidden:no", &terms);
+  if (query.ignore_files) AddTerm("ignored:no", &terms);
+  if (query.one_file_system) AddTerm("mounts:no", &terms);
+  if (!query.letters.empty()) AddTerm("letters:" + query.letters, &terms);
   if (!query.min_depth.empty()) AddTerm("depth:>=" + query.min_depth, &terms);
   if (!query.max_depth.empty()) AddTerm("depth:<=" + query.max_depth, &terms);
   AddTypes(query.types, &terms);

@@ -82,8 +82,9 @@ std::string WithKnownPrefix(const std::string& word) {
     if (name == other) return ours.empty() ? value : std::string(ours) + ":" + value;
   }
   constexpr size_t kShortest = 4;  // everything is near to less
-  for (const char* ours : {"type", "size", "modified", "created", "opened", "owner", "group",
-                           "depth", "empty", "content", "regex", "exclude", "hidden"}) {
+  for (const char* ours :
+       {"type", "size", "modified", "created", "opened", "owner", "group", "depth", "empty",
+        "content", "regex", "exclude", "hidden", "ignored", "mounts", "letters"}) {
     if (name.size() >= kShortest && IsNear(name, ours)) return std::string(ours) + ":" + value;
   }
   return word;

@@ -251,7 +251,9 @@ void Scanner::TakeMoreWords(Piece& piece, size_t from) {
 // Builds the tree of pieces, group within group.
 class Builder {
  public:
-  explicit Builder(std::time_t now) : now_(now) { groups_.emplace_back(); }
+  Builder(std::time_t now, Letters letters) : now_(now), letters_(letters) {
+    groups_.emplace_back();
+  }
 
   Status Add(Piece& piece) {
     switch (piece.kind) {
@@ -326,13 +328,15 @@ class Builder {
     const bool content = piece.prefix != nullptr && piece.prefix->kind == Kind::kContent;
     const bool is_text = piece.prefix == nullptr || content;
     if (!is_text && piece.prefix->value != QueryPrefix::Value::kExact) {
-      return PrefixNode(*piece.prefix, piece.value, now_);
+      return PrefixNode(*piece.prefix, piece.value, now_, letters_);
     }
     if (piece.value.empty()) {
       return Error{kErrorIllegal, EINVAL, std::string(piece.prefix->help)};
     }
     const Form form = content && piece.form == Form::kPlain ? Form::kLiteral : piece.form;
-    auto text = TextTerm::Make(piece.value, form, piece.exact);
+    const bool exact =
+        piece.exact || (!content && IsExact(letters_, piece.value, form == Form::kRegex));
+    auto text = TextTerm::Make(piece.value, form, exact);
     if (!text) return text.error();
     QueryNode node{.kind = content ? Kind::kContent : Kind::kText};
     node.text = std::move(*text);
@@ -340,6 +344,7 @@ class Builder {
   }
 
   const std::time_t now_;
+  const Letters letters_;
   std::vector<Group> groups_;
 };
 
@@ -362,10 +367,22 @@ Status TermsOfWalkAreAlone(QueryNode& root) {
     if (IsOfWalk(child) || !AnyLeaf(child, IsOfWalk)) continue;
     return Error{kErrorIllegal, EINVAL,
                  "'" + child.written +
-                     "': exclude: and hidden: hold for the whole search, so they "
-                     "stand by themselves: not behind !, beside | or in a group with others"};
+                     "': exclude:, hidden:, ignored:, mounts: and letters: hold for the whole "
+                     "search, so they stand by themselves: not behind !, beside | or in a group "
+                     "with others"};
   }
+  std::erase_if(root.children, [](const QueryNode& child) { return child.kind == Kind::kLetters; });
   return {};
+}
+
+// The last term wins that says it.
+Letters LettersOf(const std::vector<Piece>& pieces) {
+  Letters letters = Letters::kAny;
+  for (const Piece& piece : pieces) {
+    if (piece.prefix == nullptr || piece.prefix->kind != Kind::kLetters) continue;
+    letters = ParseLetters(piece.value).value_or(letters);
+  }
+  return letters;
 }
 
 Error Illegal(const char* why) { return {kErrorIllegal, EINVAL, why}; }
@@ -384,7 +401,7 @@ Result<Query> Query::Parse(std::string_view text, std::time_t now) {
   } else if (grouped.deepest() > kDeepestGroup) {
     return Illegal("groups lie too deep in one another");
   }
-  Builder builder(now);
+  Builder builder(now, LettersOf(pieces));
   for (Piece& piece : pieces) {
     if (const Status added = builder.Add(piece); !added) return added.error();
   }

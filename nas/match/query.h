@@ -9,11 +9,11 @@
 //   text   = a word, in which wildcards speak (wildcards.h), or "quoted", in which nothing does;
 //            with a "/" it is about the path below the folder that is searched, else about the name
 //   prefix = ext type size modified created opened owner group depth empty content case regex
-//            exclude hidden, in any letter case; a value may be quoted, and is a list separated by
-//            "," but for texts
+//            exclude hidden ignored mounts letters, in any letter case; a value may be quoted, and
+//            is a list separated by "," but for texts
 //
-// The last line of prefixes says where a search goes, and so holds for all of it: such a term
-// stands by itself, neither left out nor beside a "|" nor in a group with others.
+// The last line of prefixes holds for all of a search: such a term stands by itself, neither left
+// out nor beside a "|" nor in a group with others.
 //
 // Every text is a query but where a value cannot be understood. What could be meant otherwise is
 // text as ever: a "<" or ">" where not every group is closed, a prefix that is quoted or unknown, a
@@ -54,6 +54,9 @@ struct QueryNode {
     kExecutable,  // a file that somebody may run
     // From here on what holds for all of a search; among the children of the root alone.
     kExclude,  // neither itself nor in a folder that has `text`
+    kIgnored,  // ignore files are obeyed
+    kOneDisk,  // what is mounted from another file system is not entered
+    kLetters,  // says how texts are compared; gone when a query has been parsed
   };
   Kind kind = Kind::kAll;
   std::vector<QueryNode> children = {};

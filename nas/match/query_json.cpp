@@ -10,24 +10,17 @@ namespace {
 using Kind = QueryNode::Kind;
 using Form = TextTerm::Form;
 
-constexpr std::array<std::pair<Kind, const char*>, 17> kKinds = {{
-    {Kind::kAll, "all"},
-    {Kind::kAny, "any"},
-    {Kind::kNot, "not"},
-    {Kind::kText, "text"},
-    {Kind::kContent, "content"},
-    {Kind::kExtension, "ext"},
-    {Kind::kType, "type"},
-    {Kind::kSize, "size"},
-    {Kind::kModified, "modified"},
-    {Kind::kCreated, "created"},
-    {Kind::kOpened, "opened"},
-    {Kind::kOwner, "owner"},
-    {Kind::kGroup, "group"},
-    {Kind::kDepth, "depth"},
-    {Kind::kEmpty, "empty"},
-    {Kind::kExecutable, "executable"},
-    {Kind::kExclude, "exclude"},
+constexpr std::array<std::pair<Kind, const char*>, 19> kKinds = {{
+    {Kind::kAll, "all"},           {Kind::kAny, "any"},
+    {Kind::kNot, "not"},           {Kind::kText, "text"},
+    {Kind::kContent, "content"},   {Kind::kExtension, "ext"},
+    {Kind::kType, "type"},         {Kind::kSize, "size"},
+    {Kind::kModified, "modified"}, {Kind::kCreated, "created"},
+    {Kind::kOpened, "opened"},     {Kind::kOwner, "owner"},
+    {Kind::kGroup, "group"},       {Kind::kDepth, "depth"},
+    {Kind::kEmpty, "empty"},       {Kind::kExecutable, "executable"},
+    {Kind::kExclude, "exclude"},   {Kind::kIgnored, "ignored"},
+    {Kind::kOneDisk, "one disk"},
 }};
 constexpr std::array<std::pair<Form, const char*>, 4> kForms = {{{Form::kPlain, "plain"},
                                                                  {Form::kLiteral, "literal"},
@@ -80,6 +73,8 @@ class Reader {
       case Kind::kExclude:
         return ReadText(json, node);
       case Kind::kEmpty:
+      case Kind::kIgnored:
+      case Kind::kOneDisk:
       case Kind::kExecutable:
         return json.size() == 1;
       default:

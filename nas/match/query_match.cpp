@@ -59,7 +59,10 @@ Answer AskExclude(const QueryNode& node, const QuerySubject& subject) {
   if (subject.folder != nullptr) {
     return text.FindsOnWay(*subject.folder) ? Answer::kNo : Answer::kMaybe;
   }
-  if (subject.path == nullptr || subject.name == nullptr) return Answer::kMaybe;
+  if (subject.name == nullptr) return Answer::kMaybe;
+  if (subject.path == nullptr) {
+    return text.of_path() ? Answer::kMaybe : Known(!text.FindsInName(*subject.name));
+  }
   if (subject.whole_way && text.FindsOnWay(*subject.path)) return Answer::kNo;
   return Known(
       !(text.of_path() ? text.FindsInPath(*subject.path) : text.FindsInName(*subject.name)));
@@ -147,6 +150,10 @@ Answer Ask(const QueryNode& node, const QuerySubject& subject) {
       return AskTypes(node, subject);
     case Kind::kExclude:
       return AskExclude(node, subject);
+    case Kind::kIgnored:  // these are seen to on the way
+    case Kind::kOneDisk:
+    case Kind::kLetters:
+      return Answer::kYes;
     case Kind::kDepth:
       return AskDepth(node, subject);
     default:

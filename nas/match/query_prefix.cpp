@@ -1,6 +1,7 @@
 #include "nas/match/query_prefix.h"
 
 #include <dirent.h>
+#include <utf8proc.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -37,6 +38,11 @@ constexpr QueryPrefix kPrefixes[] = {
      "write names, as in exclude:node_modules or exclude:*.tmp,cache/"},
     {"hidden:", Kind::kExclude, Value::kChoice,
      "write hidden:no to leave out what begins with a dot"},
+    {"ignored:", Kind::kIgnored, Value::kChoice,
+     "write ignored:no to leave out what .gitignore and its like do"},
+    {"mounts:", Kind::kOneDisk, Value::kChoice, "write mounts:no to stay on one file system"},
+    {"letters:", Kind::kLetters, Value::kLetters,
+     "write letters:exact, letters:smart or letters:any"},
 };
 
 ValueReader ReaderOf(Value value, std::time_t now) {
@@ -188,22 +194,22 @@ size_t EndOfGlob(std::string_view value, size_t at) {
   return value.size();
 }
 
-Result<QueryNode> ExcludeNode(std::string_view glob) {
-  auto text = TextTerm::Make(glob, TextTerm::Form::kWhole, false);
+Result<QueryNode> ExcludeNode(std::string_view glob, Letters letters) {
+  auto text = TextTerm::Make(glob, TextTerm::Form::kWhole, IsExact(letters, glob, false));
   if (!text) return text.error();
   QueryNode node{.kind = Kind::kExclude};
   node.text = std::move(*text);
   return node;
 }
 
-Result<QueryNode> GlobsNode(const QueryPrefix& prefix, std::string_view value) {
+Result<QueryNode> GlobsNode(const QueryPrefix& prefix, std::string_view value, Letters letters) {
   QueryNode all;
   for (size_t at = 0; at <= value.size();) {
     const size_t end = EndOfGlob(value, at);
     const std::string_view glob = value.substr(at, end - at);
     at = end + 1;
     if (glob.find_first_not_of('/') == std::string_view::npos) return Wrong(prefix);
-    auto node = ExcludeNode(glob);
+    auto node = ExcludeNode(glob, letters);
     if (!node) return node.error();
     all.children.push_back(std::move(*node));
   }
@@ -214,7 +220,24 @@ Result<QueryNode> ChoiceNode(const QueryPrefix& prefix, std::string_view value) 
   const std::string word = AsciiLower(value);
   if (word == "yes" || word == "true") return QueryNode();
   if (word != "no" && word != "false") return Wrong(prefix);
-  return ExcludeNode(kHiddenGlob);
+  if (prefix.kind == Kind::kExclude) return ExcludeNode(kHiddenGlob, Letters::kAny);
+  return QueryNode{.kind = prefix.kind};
+}
+
+// Behind the escape of an expression that begins at `at`, or the name of a group.
+size_t BehindEscape(std::string_view text, size_t at) {
+  constexpr std::string_view kGroups[] = {"(?<", "(?P<", "(?'"};
+  if (text[at] == '\\') {
+    const bool property =
+        text.substr(at + 1).starts_with("p{") || text.substr(at + 1).starts_with("P{");
+    return property ? std::min(text.find('}', at), text.size() - 1) + 1 : at + 2;
+  }
+  for (const std::string_view group : kGroups) {
+    if (text.substr(at).starts_with(group)) {
+      return std::min(text.find_first_of(">'", at + group.size()), text.size() - 1) + 1;
+    }
+  }
+  return at;
 }
 
 }  // namespace
@@ -228,14 +251,45 @@ const QueryPrefix* FindPrefix(std::string_view text) {
   return found == std::end(kPrefixes) ? nullptr : found;
 }
 
+std::optional<Letters> ParseLetters(std::string_view value) {
+  const std::string word = AsciiLower(value);
+  if (word == "exact") return Letters::kExact;
+  if (word == "smart") return Letters::kSmart;
+  return word == "any" ? std::optional(Letters::kAny) : std::nullopt;
+}
+
+bool IsExact(Letters letters, std::string_view text, bool is_regex) {
+  if (letters != Letters::kSmart) return letters == Letters::kExact;
+  for (size_t at = 0; at < text.size();) {
+    if (is_regex) {
+      const size_t behind = BehindEscape(text, at);
+      if (behind > at) {
+        at = behind;
+        continue;
+      }
+    }
+    utf8proc_int32_t letter = 0;
+    const auto length = utf8proc_iterate(reinterpret_cast<const utf8proc_uint8_t*>(&text[at]),
+                                         static_cast<utf8proc_ssize_t>(text.size() - at), &letter);
+    if (length > 0 && utf8proc_isupper(letter) != 0) return true;
+    at += static_cast<size_t>(std::max<utf8proc_ssize_t>(length, 1));
+  }
+  return false;
+}
+
 bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
   return ReadBounds(value, ReaderOf(prefix.value, now)).has_value();
 }
 
-Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now) {
+Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now,
+                             Letters letters) {
   if (prefix.value == Value::kNothing) return EmptyNode(prefix, value);
-  if (prefix.value == Value::kGlobs) return GlobsNode(prefix, value);
+  if (prefix.value == Value::kGlobs) return GlobsNode(prefix, value, letters);
   if (prefix.value == Value::kChoice) return ChoiceNode(prefix, value);
+  if (prefix.value == Value::kLetters) {
+    if (!ParseLetters(value)) return Wrong(prefix);
+    return QueryNode{.kind = Kind::kLetters};
+  }
   QueryNode node{.kind = prefix.kind};
   for (size_t at = 0; at <= value.size();) {
     const size_t end = std::min(value.find(',', at), value.size());

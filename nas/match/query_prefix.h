@@ -22,8 +22,9 @@ struct QueryPrefix {
     kTime,
     kNumber,
     kNothing,
-    kGlobs,  // words in which a comma in braces or behind a backslash parts nothing
-    kChoice,
+    kGlobs,   // words in which a comma in braces or behind a backslash parts nothing
+    kChoice,  // yes or no
+    kLetters,
   };
   std::string_view name;  // with its colon
   QueryNode::Kind kind;
@@ -38,8 +39,19 @@ inline constexpr std::string_view kHiddenGlob = ".*";
 const QueryPrefix* FindPrefix(std::string_view text);
 // Whether `value` can be read; for values in which spaces may stand.
 bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t now);
+// How texts are compared of which no prefix says it.
+enum class Letters {
+  kAny,    // letter case does not count
+  kSmart,  // it does in a text that has a capital letter
+  kExact,
+};
+std::optional<Letters> ParseLetters(std::string_view value);
+// Whether letter case counts in the text, which may be a regular expression.
+bool IsExact(Letters letters, std::string_view text, bool is_regex);
+
 // The leaf for a value that is not a text. Fails as Query::Parse does, with a sentence that does
 // not name the term yet.
-Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now);
+Result<QueryNode> PrefixNode(const QueryPrefix& prefix, std::string_view value, std::time_t now,
+                             Letters letters = Letters::kAny);
 
 }  // namespace nas

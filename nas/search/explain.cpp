@@ -34,9 +34,10 @@ class Step {
 };
 
 Explanation JudgeEntry(SharedSearch& search, const Location& location, int folder,
-                       std::string_view folder_path, const DirectoryReader::Entry& entry) {
+                       std::string_view folder_path, const IgnoreFiles* ignores,
+                       const DirectoryReader::Entry& entry) {
   Judge judge(search, true);
-  judge.Enter(folder, 0, location, folder_path);
+  judge.Enter(folder, 0, location, folder_path, ignores);
   Explanation found;
   found.refusal = judge.Entry(entry);
   if (found.refusal == Refusal::kContentsUnread) {
@@ -59,21 +60,24 @@ Result<Explanation> Explain(const ExplainedSearch& asked, size_t number, std::st
   const FolderGate gate(asked.locations, asked.recursive, search.criteria.pruning);
   const Location& location = asked.locations[number];
   std::string at = location.path;
+  IgnoreFiles::Ptr ignores = gate.IgnoresAbove(location);
   FolderGate::Opened folder = gate.Open(location.fd.get(), ".");
   while (folder.fd) {
     Step step;
     const std::string_view name = path.substr(0, path.find('/'));
     const auto entry = step.Find(folder.fd.get(), name);
     const std::string folder_path = at;
+    ignores = gate.IgnoresOf(folder.fd.get(), folder_path, ignores);
     at.append(at.empty() ? "" : "/").append(name);
     if (!entry) return Error{entry.error().kind, entry.error().error_number, at};
     if (name.size() == path.size()) {
-      Explanation found = JudgeEntry(search, location, folder.fd.get(), folder_path, *entry);
+      Explanation found =
+          JudgeEntry(search, location, folder.fd.get(), folder_path, ignores.get(), *entry);
       found.path = at;
       return found;
     }
     path.remove_prefix(name.size() + 1);
-    const Refusal below = gate.Below(entry->type, location, folder_path, name);
+    const Refusal below = gate.Below(entry->type, location, folder_path, name, ignores.get());
     if (below == Refusal::kNoFolder) return Error{kErrorNoSuchFolder, ENOTDIR, at};
     if (below != Refusal::kNone) return Explanation{below, at};
     folder = gate.Open(folder.fd.get(), entry->name.data());

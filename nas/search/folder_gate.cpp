@@ -38,12 +38,24 @@ FolderGate::Opened FolderGate::Open(int parent, const char* name) const {
     fd.Reset(openat(parent, name, kFlags));
   }
   if (!fd) return {UniqueFd(), Refusal::kFolderUnreadable, errno};
-  const Refusal refusal = is_location ? Refusal::kNone : MayEnter(fd.get(), name, crossed);
+  const Refusal refusal = is_location ? Refusal::kNone : MayEnter(parent, fd.get(), name, crossed);
   if (refusal != Refusal::kNone) fd.Reset();
   return {std::move(fd), refusal, 0};
 }
 
-Refusal FolderGate::MayEnter(int fd, std::string_view name, bool crossed) const {
+namespace {
+
+// Parts of one file system may be on other devices without being mounted there, as a snapshot is.
+bool AreOnOneDisk(int one, int other) {
+  struct stat first;
+  struct stat second;
+  return fstat(one, &first) == 0 && fstat(other, &second) == 0 && first.st_dev == second.st_dev;
+}
+
+}  // namespace
+
+Refusal FolderGate::MayEnter(int parent, int fd, std::string_view name, bool crossed) const {
+  if (pruning_.one_disk && !AreOnOneDisk(parent, fd)) return Refusal::kOtherDisk;
   if (crossed && IsPseudoFileSystem(fd)) return Refusal::kPseudoFileSystem;
   const bool may_be_temporary = name == kTemporaryFolder && !rules_.temporary.empty();
   if (!may_be_temporary && rules_.locations.empty()) return Refusal::kNone;

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "nas/base/unique_fd.h"
+#include "nas/search/ignore_files.h"
 #include "nas/search/location.h"
 #include "nas/search/pruning.h"
 #include "nas/search/refusal.h"
@@ -36,7 +37,7 @@ class FolderGate {
   FolderGate(const std::vector<Location>& locations, bool recursive, Pruning pruning)
       : FolderGate(RulesFor(locations, recursive), std::move(pruning)) {}
   FolderGate(Rules rules, Pruning pruning)
-      : rules_(std::move(rules)), pruning_(std::move(pruning)), prunes_(pruning_.restricts()) {}
+      : rules_(std::move(rules)), pruning_(std::move(pruning)), prunes_(pruning_.by_names()) {}
 
   const Rules& rules() const { return rules_; }
 
@@ -44,10 +45,19 @@ class FolderGate {
   // folder whose own entries are searched too; kNone, or why not. Says nothing yet of that very
   // folder: Open does.
   Refusal Below(unsigned char type, const Location& location, std::string_view parent,
-                std::string_view name) const {
+                std::string_view name, const IgnoreFiles* ignores) const {
     if (type != DT_DIR) return type == DT_LNK ? Refusal::kSymbolicLink : Refusal::kNoFolder;
     if (!rules_.recursive) return Refusal::kNotRecursive;
+    if (ignores != nullptr && ignores->LeaveOut(parent, name, true)) return Refusal::kFolderIgnored;
     return prunes_ ? pruning_.MayEnter(location.path, parent, name) : Refusal::kNone;
+  }
+  // The ignore files above a location, and with those of a folder on the way; null where they are
+  // not to be obeyed.
+  IgnoreFiles::Ptr IgnoresAbove(const Location& location) const {
+    return pruning_.ignores ? IgnoreFiles::Above(location) : nullptr;
+  }
+  IgnoreFiles::Ptr IgnoresOf(int fd, std::string_view path, const IgnoreFiles::Ptr& above) const {
+    return pruning_.ignores ? IgnoreFiles::Of(fd, path, above) : nullptr;
   }
 
   // The folder to read, or why it is left out: with kFolderUnreadable errno says more.
@@ -60,7 +70,7 @@ class FolderGate {
   Opened Open(int parent, const char* name) const;
 
  private:
-  Refusal MayEnter(int fd, std::string_view name, bool crossed) const;
+  Refusal MayEnter(int parent, int fd, std::string_view name, bool crossed) const;
 
   const Rules rules_;
   const Pruning pruning_;

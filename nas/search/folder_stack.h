@@ -18,6 +18,7 @@
 #include <string_view>
 
 #include "nas/base/unique_fd.h"
+#include "nas/search/ignore_files.h"
 
 namespace nas {
 
@@ -25,8 +26,9 @@ namespace nas {
 struct FolderBatch {
   UniqueFd parent;
   std::uint16_t location = 0;
-  std::string parent_path;  // below the share's root
-  std::string names;        // NUL-ended; "." is the parent itself, where a walk begins
+  std::string parent_path;   // below the share's root
+  IgnoreFiles::Ptr ignores;  // of the parent, or those above it where a walk begins
+  std::string names;         // NUL-ended; "." is the parent itself, where a walk begins
 };
 
 class FolderStack {

@@ -12,7 +12,11 @@ namespace {
 
 // Who asks what a search comes close to asks beyond what its terms leave out as well.
 Pruning PruningOf(const SharedSearch& search) {
-  return search.misses == nullptr ? search.criteria.pruning : Pruning();
+  Pruning pruning = search.criteria.pruning;
+  if (search.misses == nullptr) return pruning;
+  pruning.excludes.clear();
+  pruning.deepest = INT_MAX;
+  return pruning;
 }
 
 }  // namespace
@@ -34,15 +38,17 @@ FolderWalk::FolderWalk(const std::vector<Location>& locations, FolderGate gate,
 
 void FolderWalk::Begin(size_t thread, std::uint16_t number) {
   const Location& location = locations_[number];
-  Add(thread, number, UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0)), location.path, ".");
+  Add(thread, number, UniqueFd(fcntl(location.fd.get(), F_DUPFD_CLOEXEC, 0)), location.path, ".",
+      gate_.IgnoresAbove(location));
 }
 
 void FolderWalk::Add(size_t thread, std::uint16_t number, UniqueFd parent, std::string parent_path,
-                     std::string_view name) {
+                     std::string_view name, IgnoreFiles::Ptr ignores) {
   auto batch = std::make_shared<FolderBatch>();
   batch->parent = std::move(parent);
   batch->location = number;
   batch->parent_path = std::move(parent_path);
+  batch->ignores = std::move(ignores);
   batch->names.append(name).push_back('\0');
   stack_.Push(thread, std::move(batch));
 }
@@ -57,7 +63,7 @@ void FolderWalk::Feed(size_t thread, Judge& judge) {
     } else if (folder.refusal == Refusal::kFolderUnreadable) {
       search_.progress.AddSkipped(folder.error_number);
     } else if (folder.refusal != Refusal::kOtherLocation &&
-               folder.refusal != Refusal::kOtherMount) {
+               folder.refusal != Refusal::kOtherMount && folder.refusal != Refusal::kOtherDisk) {
       search_.progress.AddLeftOut();
     }
     if (search_.stopping()) stack_.Abort();
@@ -73,14 +79,15 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
     if (!path.empty()) path.push_back('/');
     path.append(item.name);
   }
+  const IgnoreFiles::Ptr ignores = gate_.IgnoresOf(fd.get(), path, item.batch->ignores);
   auto below = std::make_shared<FolderBatch>();
   std::uint64_t entries = 0;
   DirectoryReader::Entry entry;
   reading.reader.Start(fd.get());
-  reading.judge.Enter(fd.get(), number, location, path);
+  reading.judge.Enter(fd.get(), number, location, path, ignores.get());
   while (reading.reader.Next(entry) && !search_.stopping()) {
     ++entries;
-    if (gate_.Below(entry.type, location, path, entry.name) == Refusal::kNone) {
+    if (gate_.Below(entry.type, location, path, entry.name, ignores.get()) == Refusal::kNone) {
       below->names.append(entry.name).push_back('\0');
     }
     reading.judge.Entry(entry);
@@ -91,6 +98,7 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
   if (below->names.empty()) return;
   below->location = number;
   below->parent_path = path;
+  below->ignores = ignores;
   below->parent = std::move(fd);
   stack_.Push(reading.thread, std::move(below));
 }

@@ -29,9 +29,9 @@ class FolderWalk : public NameSource {
   // A location, by its number.
   void Begin(size_t thread, std::uint16_t number);
   // The folder `name` of the one open at `parent`, whose path below the root of the location's
-  // share is `parent_path`.
+  // share is `parent_path`; with the ignore files of that one.
   void Add(size_t thread, std::uint16_t number, UniqueFd parent, std::string parent_path,
-           std::string_view name);
+           std::string_view name, IgnoreFiles::Ptr ignores);
 
   void Feed(size_t thread, Judge& judge) override;
   void Abort() override { stack_.Abort(); }

@@ -36,11 +36,13 @@ bool AsksName(const QueryNode& leaf) {
     return std::ranges::any_of(leaf.types,
                                [](const FileType& type) { return type.category.has_value(); });
   }
-  return leaf.kind == QueryNode::Kind::kText || leaf.kind == QueryNode::Kind::kExtension;
+  return leaf.kind == QueryNode::Kind::kText || leaf.kind == QueryNode::Kind::kExtension ||
+         leaf.kind == QueryNode::Kind::kExclude;
 }
 
 bool IsOfRanges(const QueryNode& leaf) {
-  return IsOfAttributes(leaf.kind) && leaf.kind != QueryNode::Kind::kEmpty;
+  return IsOfAttributes(leaf.kind) && leaf.kind != QueryNode::Kind::kEmpty &&
+         leaf.kind != QueryNode::Kind::kExecutable;
 }
 
 // Where more than one name of so many has a needle, an expression is as well run over all.

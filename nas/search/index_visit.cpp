@@ -150,7 +150,7 @@ void IndexVisit::CollectEntries(FolderId folder, const Special* special) {
 void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
   seen_ = 0;
   const bool may_tell = rights_.all() || !may_enter_;
-  judge_.Enter(fd(), 0, names_.locations_.front(), path_);
+  EnterJudge(judge_);
   for (const EntryId entry : entries_) {
     if (search_.stopping()) break;
     const DirectoryReader::Entry known{table_.name(entry), table_.inode(entry), table_.type(entry)};
@@ -176,6 +176,10 @@ void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
   if (seen_ > 0) search_.progress.AddFolder(seen_);
 }
 
+void IndexVisit::EnterJudge(Judge& judge) const {
+  judge.Enter(fd(), 0, names_.locations_.front(), path_, levels_.back().ignores.get());
+}
+
 NameTable::FolderId IndexVisit::FolderAt(FolderId parent, std::string_view name) const {
   const EntryId entry = table_.FindEntry(parent, name);
   return entry == table_.entries() ? NameTable::kNoFolder : table_.folder_at(entry);
@@ -192,7 +196,7 @@ void IndexVisit::ReadWhole(FolderId folder) {
   std::uint64_t entries = 0;
   DirectoryReader::Entry entry;
   reader_.Start(fd());
-  judge_.Enter(fd(), 0, names_.locations_.front(), path_);
+  EnterJudge(judge_);
   while (reader_.Next(entry) && !search_.stopping()) {
     ++entries;
     judge_.Entry(entry);
@@ -206,7 +210,8 @@ void IndexVisit::ReadWhole(FolderId folder) {
 // By its name, of a folder in the open one.
 bool IndexVisit::MayEnter(std::string_view name) const {
   const Location& location = names_.locations_.front();
-  return names_.gate_.Below(DT_DIR, location, path_, name) == Refusal::kNone;
+  return names_.gate_.Below(DT_DIR, location, path_, name, levels_.back().ignores.get()) ==
+         Refusal::kNone;
 }
 
 void IndexVisit::EnterFolder(const char* name, FolderId folder) {
@@ -227,7 +232,8 @@ void IndexVisit::EnterFolder(const char* name, FolderId folder) {
 }
 
 void IndexVisit::Walk(std::string_view name) {
-  names_.walk_.Add(thread_, 0, UniqueFd(fcntl(fd(), F_DUPFD_CLOEXEC, 0)), path_, name);
+  names_.walk_.Add(thread_, 0, UniqueFd(fcntl(fd(), F_DUPFD_CLOEXEC, 0)), path_, name,
+                   levels_.back().ignores);
 }
 
 bool IndexVisit::Open(FolderId folder) {
@@ -260,7 +266,7 @@ bool IndexVisit::VisitEntry(EntryId entry, Judge& judge) {
   const Special* special = names_.SpecialOf(folder);
   if (special != nullptr && special->Holds(name)) return false;
   if (!OpenInAnyOrder(folder)) return false;
-  judge.Enter(fd(), 0, names_.locations_.front(), path_);
+  EnterJudge(judge);
   const bool match =
       judge.KnownEntry({name, table_.inode(entry), table_.type(entry)}, false) == Refusal::kNone;
   judge.Leave();
@@ -269,7 +275,7 @@ bool IndexVisit::VisitEntry(EntryId entry, Judge& judge) {
 
 bool IndexVisit::VisitName(FolderId folder, const std::string& name, Judge& judge) {
   if (!OpenInAnyOrder(folder)) return false;
-  judge.Enter(fd(), 0, names_.locations_.front(), path_);
+  EnterJudge(judge);
   const unsigned char type = ReadType(fd(), name.c_str());
   const bool match = judge.KnownEntry({name, 0, type}, false) == Refusal::kNone;
   judge.Leave();
@@ -285,7 +291,9 @@ bool IndexVisit::OpenTop() {
     return false;
   }
   path_ = location.path;
-  levels_.push_back({names_.top_, std::move(opened.fd), path_.size()});
+  auto ignores =
+      names_.gate_.IgnoresOf(opened.fd.get(), path_, names_.gate_.IgnoresAbove(location));
+  levels_.push_back({names_.top_, std::move(opened.fd), path_.size(), std::move(ignores)});
   return true;
 }
 
@@ -308,7 +316,8 @@ bool IndexVisit::OpenLevel(FolderId folder) {
     return false;
   }
   path_.append(path_.empty() ? "" : "/").append(name);
-  levels_.push_back({folder, std::move(opened.fd), path_.size()});
+  auto ignores = names_.gate_.IgnoresOf(opened.fd.get(), path_, levels_.back().ignores);
+  levels_.push_back({folder, std::move(opened.fd), path_.size(), std::move(ignores)});
   return true;
 }
 

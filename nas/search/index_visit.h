@@ -51,6 +51,7 @@ class IndexVisit {
     FolderId folder;
     UniqueFd fd;
     size_t path_length;
+    IgnoreFiles::Ptr ignores;
   };
 
   void CollectLooks(FolderId begin, FolderId end);
@@ -80,6 +81,7 @@ class IndexVisit {
   FolderId FolderAt(FolderId parent, std::string_view name) const;
   void Walk(std::string_view name);
   int fd() const { return levels_.back().fd.get(); }
+  void EnterJudge(Judge& judge) const;
 
   IndexNames& names_;
   const NameTable& table_;

@@ -219,15 +219,17 @@ bool IndexedWalk::WalkMounts(size_t thread, std::uint16_t number,
   std::set<std::string> walked;
   for (std::string_view rest : mounts) {
     std::string path = location.path;
+    IgnoreFiles::Ptr ignores = gate_.IgnoresAbove(location);
     FolderGate::Opened folder = gate_to_mounts_.Open(location.fd.get(), ".");
     while (folder.fd && !rest.empty()) {
       const std::string name(rest.substr(0, rest.find('/')));
       rest.remove_prefix(std::min(name.size() + 1, rest.size()));
-      if (gate_.Below(DT_DIR, location, path, name) != Refusal::kNone) break;
+      ignores = gate_.IgnoresOf(folder.fd.get(), path, ignores);
+      if (gate_.Below(DT_DIR, location, path, name, ignores.get()) != Refusal::kNone) break;
       FolderGate::Opened below = gate_to_mounts_.Open(folder.fd.get(), name.c_str());
       const std::string below_path = path + (path.empty() ? "" : "/") + name;
       if (below.refusal == Refusal::kOtherMount && walked.insert(below_path).second) {
-        walk_.Add(thread, number, std::move(folder.fd), path, name);
+        walk_.Add(thread, number, std::move(folder.fd), path, name, ignores);
       }
       path = below_path;
       folder = std::move(below);

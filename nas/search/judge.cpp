@@ -65,14 +65,20 @@ EntryPath::Base PathBaseOf(const Location& location) {
   return {"/" + location.share.name + below, location.share.root + below, location.path};
 }
 
-void Judge::Enter(int fd, std::uint16_t number, const Location& location, std::string_view path) {
-  folder_ = {fd, number, path, false};
+void Judge::Enter(int fd, std::uint16_t number, const Location& location, std::string_view path,
+                  const IgnoreFiles* ignores) {
+  folder_ = {fd, number, path, ignores, false};
   if (!search_.criteria.ask_paths) return;
   if (path_base_ != number) {
     path_.SetBase(PathBaseOf(location));
     path_base_ = number;
   }
   path_.SetFolder(path);
+}
+
+bool Judge::IsIgnored(std::string_view name, unsigned char type) const {
+  return folder_.ignores != nullptr &&
+         folder_.ignores->LeaveOut(folder_.path, name, type == DT_DIR);
 }
 
 void Judge::Meet(std::string_view name, unsigned char type) {
@@ -97,6 +103,7 @@ Refusal Judge::Refuse(const char* name) {
 }
 
 Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
+  if (IsIgnored(entry.name, entry.type)) return Refusal::kIgnored;
   Meet(entry.name, entry.type);
   Answer answer = Ask();
   if (answer == Answer::kNo) return Refuse(entry.name.data());
@@ -136,6 +143,7 @@ Refusal Judge::KnownEntry(const DirectoryReader::Entry& entry, bool tell_forbidd
   }
   const auto type = static_cast<unsigned char>(IFTODT(attributes->mode));
   if (type != entry.type) Meet(entry.name, type);
+  if (IsIgnored(entry.name, type)) return Refusal::kIgnored;
   Learn(*attributes, entry.name.data());
   const Answer answer = Ask();
   if (answer == Answer::kNo) return Refuse(entry.name.data());

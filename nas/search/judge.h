@@ -20,6 +20,7 @@
 #include "nas/results/row_sink.h"
 #include "nas/search/candidate_list.h"
 #include "nas/search/criteria.h"
+#include "nas/search/ignore_files.h"
 #include "nas/search/location.h"
 #include "nas/search/refusal.h"
 #include "nas/search/walk_progress.h"
@@ -89,8 +90,10 @@ class Judge {
   explicit Judge(SharedSearch& search, bool explain = false) : search_(search), explain_(explain) {}
 
   // The entries that follow lie in the folder open at `fd`, at `path` below the root of the share
-  // of `location`, whose number is `number`. The path is borrowed until Leave.
-  void Enter(int fd, std::uint16_t number, const Location& location, std::string_view path);
+  // of `location`, whose number is `number`. The path is borrowed until Leave, and so are the
+  // ignore files that are to be obeyed.
+  void Enter(int fd, std::uint16_t number, const Location& location, std::string_view path,
+             const IgnoreFiles* ignores = nullptr);
   // Judges an entry by everything but contents; what passes has become a row, and what contents may
   // still decide (kContentsUnread) a candidate.
   Refusal Entry(const DirectoryReader::Entry& entry);
@@ -113,10 +116,12 @@ class Judge {
     int fd = -1;
     std::uint16_t location = 0;
     std::string_view path;
+    const IgnoreFiles* ignores = nullptr;
     bool named_in_rows = false;  // whether rows_ was told of this folder
   };
 
   void Meet(std::string_view name, unsigned char type);
+  bool IsIgnored(std::string_view name, unsigned char type) const;
   Answer Ask() const { return search_.Ask(subject_); }
   Refusal Decide(Answer answer, const DirectoryReader::Entry& entry,
                  const FileAttributes& attributes);

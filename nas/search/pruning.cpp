@@ -22,6 +22,8 @@ Pruning Pruning::Of(const QueryNode& root) {
   Pruning pruning;
   for (const QueryNode& child : root.children) {
     if (child.kind == Kind::kExclude) pruning.excludes.push_back(child.text);
+    pruning.ignores |= child.kind == Kind::kIgnored;
+    pruning.one_disk |= child.kind == Kind::kOneDisk;
     if (child.kind == Kind::kDepth) pruning.deepest = std::min(pruning.deepest, DeepestOf(child));
   }
   return pruning;

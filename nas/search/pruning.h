@@ -17,8 +17,10 @@ struct Pruning {
 
   std::vector<std::shared_ptr<const TextTerm>> excludes = {};
   int deepest = INT_MAX;  // of entries that can match; 1 lies directly in the location
+  bool ignores = false;   // ignore files are obeyed
+  bool one_disk = false;
 
-  bool restricts() const { return !excludes.empty() || deepest < INT_MAX; }
+  bool by_names() const { return !excludes.empty() || deepest < INT_MAX; }
   // Of a folder that is met: `name` in the folder at `parent` below the location's path `location`,
   // both below the share's root. Folders on the way to it have been asked about before.
   Refusal MayEnter(std::string_view location, std::string_view parent, std::string_view name) const;

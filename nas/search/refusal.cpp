@@ -42,6 +42,11 @@ const char* Words(Refusal refusal) {
       return "does not lie as deep as asked for";
     case Refusal::kNotEmpty:
       return "is not empty";
+    case Refusal::kIgnored:
+    case Refusal::kFolderIgnored:
+      return "is left out by an ignore file";
+    case Refusal::kOtherDisk:
+      return "is on another file system than the folder to search";
     case Refusal::kVanished:
       return "cannot be looked at";
     case Refusal::kContentsUnread:

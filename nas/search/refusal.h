@@ -25,6 +25,7 @@ enum class Refusal {
   kGroup,
   kDepth,
   kNotEmpty,
+  kIgnored,
   kVanished,        // it went away, or cannot be looked at, after its folder had named it
   kContentsUnread,  // not decided yet: its contents can stand in for its name
   // By its contents.
@@ -41,6 +42,8 @@ enum class Refusal {
   kOtherMount,
   kNotRecursive,
   kFolderExcluded,
+  kFolderIgnored,
+  kOtherDisk,
   kTooDeep,
   kSymbolicLink,
   kNoFolder,

@@ -45,7 +45,9 @@ QUESTIONS = [["report"], ["*.jpg"], ["jpg", "-t", "file"], ["regex:^[a-h].*t$"],
              ["!report"], ["f1/"], ["**/*.md"], ["size:>2k"], ["modified:today"], ["modified:2020"],
              ["size:0..100", "-t", "file"], ["owner:daemon"], ["", "-t", "dir"], ["empty:"],
              ["holiday", "--no-recursive"], ["case:IMG"], ["ext:txt,md size:<1k"], ["x y"],
-             ["zzz-nothing"], ["depth:<3"], ["created:today"], ["!<report|jpg>"], ["type:image"]]
+             ["exclude:*.md,f1* hidden:no"], ["ignored:no"], ["ignored:no depth:<=3 report"],
+             ["", "-E", "report*", "-d", "4"], ["type:l,x"], ["letters:smart IMG|holiday"],
+             ["mounts:no"], ["zzz-nothing"], ["depth:<3"], ["created:today"], ["!<report|jpg>"], ["type:image"]]
 MAKERS = {
     "ext4": (96, ["mkfs.ext4", "-q"], ["-o", "loop"]),
     "xfs": (320, ["mkfs.xfs", "-q"], ["-o", "loop"]),
@@ -189,6 +191,14 @@ class Tree:
         below = self.make_folder(self.any_folder())
         self.make_file(below)
 
+    def ignore(self):
+        folder = self.any_folder()
+        name = self.chance.choice([".gitignore", ".ignore", ".fdignore"])
+        with open(folder + b"/" + os.fsencode(name), "w") as file:
+            file.write(self.chance.choice(["*.txt\n!report*\n", "f*1/\n", "/moved*\n*.jpg\n"]))
+        if name == ".gitignore":
+            os.mkdir(folder + b"/.git")
+
     def write(self):
         with open(self.pick("file"), "ab") as file:
             file.write(b"more" * self.chance.choice([1, 800]))
@@ -297,9 +307,9 @@ class Tree:
         if self.chance.random() < 0.8:
             shutil.rmtree(top)
 
-    CHANGES = [create, create, create, create_folder, write, write, truncate, rename, rename, replace,
-               exchange, move_tree, move_tree, move_out, move_in, touch_outside, link, symlink, remove,
-               remove_tree, chmod, chown, acl, utime, hold_open, map, mount, unmount, snapshot]
+    CHANGES = [create, create, create, create_folder, ignore, write, write, truncate, rename,
+               rename, replace, exchange, move_tree, move_tree, move_out, move_in, touch_outside, link,
+               symlink, remove, remove_tree, chmod, chown, acl, utime, hold_open, map, mount, unmount, snapshot]
 
     def close(self):
         for file in self.open:

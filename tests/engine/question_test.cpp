@@ -35,6 +35,11 @@ TEST(Questions, QueriesComeThroughJson) {
       "src/**/*.{c,h}",
       "\"*?\"",
       "content:needle",
+      "type:file,link,x",
+      "exclude:a,b/ hidden:no",
+      "ignored:no",
+      "mounts:no",
+      "letters:exact plan",
       "caf\xc3\xa9/b",
   };
   std::set<Json::Value> different;

@@ -131,6 +131,14 @@ const std::vector<Case>& Cases() {
        [](const Entry& e) {
          return Holds(e.name, "g") && !(Holds(e.path, "/docs/") && Holds(e.name, "img2."));
        }},
+      {"what an ignore file says", R"({"pattern": "ignored:no"})",
+       [](const Entry& e) {
+         const bool docs = Holds(e.path, "/docs/");
+         return !Holds(e.path, "/docs/deep/er") &&
+                !(docs && e.name.ends_with(".gz") && e.name != "x.tar.gz");
+       }},
+      {"letters that count", R"({"pattern": "letters:smart IMG|txt"})",
+       [](const Entry& e) { return e.name.find("IMG") != e.name.npos || Holds(e.name, "txt"); }},
       {"two levels", R"({"pattern": "depth:<=2 txt"})",
        [](const Entry& e) {
          const std::string below = e.path.substr(e.path.find("/tree/"));

@@ -76,6 +76,8 @@ void MakeHostileTree(const std::string& root) {
       "",           "/docs",      "/docs/deep/er", "/comma, folder",
       "/br\xc3ken", "/\u00dcber", "/empty",        "/line\nfeed"};
   const std::vector<size_t> sizes = {0, 1, 1023, 1024, 1025, 70'000};
+  fs::create_directories(root + "/docs");
+  nas_test::WriteFile(root + "/docs/.ignore", "er/\n*.gz\n!x.tar.*\n");
   long number = 0;
   for (const std::string& folder : folders) {
     fs::create_directories(root + folder);

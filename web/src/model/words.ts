@@ -9,14 +9,28 @@ export interface Word {
 
 const MOST_ALTERNATIVES = 256;
 const PREFIX =
-  /(ext|type|size|modified|created|opened|owner|group|depth|empty|content|case|regex|exclude|hidden):/iy;
+  /(ext|type|size|modified|created|opened|owner|group|depth|empty|content|case|regex|exclude|hidden|ignored|mounts|letters):/iy;
 // Words that go on with a size or a time.
 const MORE =
   /(?: +(?:\d+|ago|[kmgtp]i?b|bytes|(?:sec(?:ond)?|min(?:ute)?|hr|hour|day|week|month|year)s?)(?:\.\.[^ |>]*)?(?=[ |>]|$))*/iy;
 
 export function wordsOf(pattern: string): Word[] {
   // Where not every group is closed there are none.
-  return scan(pattern, true) ?? scan(pattern, false) ?? [];
+  const words = scan(pattern, true) ?? scan(pattern, false) ?? [];
+  const letters = [...pattern.matchAll(LETTERS)].at(-1)?.[1]!.toLowerCase();
+  if (letters !== 'exact' && letters !== 'smart') return words;
+  return words.map((word) => {
+    const counts = letters === 'exact' || hasCapital(word);
+    return word.kind !== 'content' && counts ? { ...word, exact: true } : word;
+  });
+}
+
+const LETTERS = /(?<=^|[ |])letters:(exact|smart|any)(?=[ |]|$)/gi;
+// What an expression spells with letters that it does not look for.
+const SPELLED = /\\[pP]\{[^}]*\}|\\.|\(\?P?[<'][^>']*/gs;
+
+function hasCapital(word: Word): boolean {
+  return /\p{Lu}/u.test(word.kind === 'regex' ? word.text.replace(SPELLED, '') : word.text);
 }
 
 function scan(pattern: string, groups: boolean): Word[] | undefined {
