@@ -31,6 +31,8 @@ std::string ActingUser(const std::string& wanted) {
 Caller::Caller(const CommonOptions& options) : config_(nas::LoadConfig(options.config)) {
   for (const std::string& share : options.shares) config_.shares.push_back(ParseShare(share));
   config_.index_use = options.index_use;
+  config_.search_threads = options.threads;
+  config_.list_unread = options.show_errors;
   nas::Configure(config_);
   user_ = ActingUser(options.user);
 }

@@ -29,21 +29,8 @@ void AddLetters(CLI::App* command, SearchQuery* query) {
   add("-i,--ignore-case", "any", "They do not; as usual");
 }
 
-void AddCriteria(CLI::App* command, SearchQuery* query) {
-  command->option_defaults()->group("Criteria");
-  command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
-      ->type_name("EXT")
-      ->allow_extra_args(false);
-  command->add_option("-t,--type", query->types, "Types: f or file, or d,l; see below")
-      ->type_name("TYPE")
-      ->allow_extra_args(false);
-  command->add_option("--size-from", query->size_from, "At least this large")->type_name("SIZE");
-  command->add_option("--size-to", query->size_to, "At most this large")->type_name("SIZE");
-  AddTimes(command, "mtime", "Modified", &query->mtime);
-  AddTimes(command, "crtime", "Created", &query->crtime);
-  AddTimes(command, "atime", "Last read", &query->atime);
-  command->add_option("--owner", query->owner, "Owned by this user")->type_name("USER");
-  command->add_option("--group", query->group, "Of this group")->type_name("GROUP");
+// Where the search goes.
+void AddScope(CLI::App* command, SearchQuery* query) {
   const CLI::Validator levels(
       [](const std::string& text) {
         const bool digits = !text.empty() && text.find_first_not_of("0123456789") == text.npos;
@@ -75,6 +62,24 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
                                 "of what is searched; name the folder that one leads to");
                           })
       ->group("");
+}
+
+void AddCriteria(CLI::App* command, SearchQuery* query) {
+  command->option_defaults()->group("Criteria");
+  command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
+      ->type_name("EXT")
+      ->allow_extra_args(false);
+  command->add_option("-t,--type", query->types, "Types: f or file, or d,l; see below")
+      ->type_name("TYPE")
+      ->allow_extra_args(false);
+  command->add_option("--size-from", query->size_from, "At least this large")->type_name("SIZE");
+  command->add_option("--size-to", query->size_to, "At most this large")->type_name("SIZE");
+  AddTimes(command, "mtime", "Modified", &query->mtime);
+  AddTimes(command, "crtime", "Created", &query->crtime);
+  AddTimes(command, "atime", "Last read", &query->atime);
+  command->add_option("--owner", query->owner, "Owned by this user")->type_name("USER");
+  command->add_option("--group", query->group, "Of this group")->type_name("GROUP");
+  AddScope(command, query);
   command->add_flag_function(
       "--no-recursive", [query](std::int64_t) { query->recursive = false; },
       "Do not enter the folders in FOLDER");

@@ -50,6 +50,15 @@ std::string ShareRoot(const std::string& path) {
   return path.substr(0, (path + "/").find("/homes/"));
 }
 
+// The folder itself where it lies in none.
+std::string RepositoryOf(const std::string& path) {
+  struct stat status;
+  for (std::string top = path; !top.empty(); top.resize(top.rfind('/'))) {
+    if (stat((top + "/.git").c_str(), &status) == 0) return top;
+  }
+  return path;
+}
+
 }  // namespace
 
 const nas::Share* InnermostShare(const std::string& path, const std::vector<nas::Share>& shares) {
@@ -79,7 +88,7 @@ std::string FreeShareName(const std::string& real_path, const std::vector<std::s
 }
 
 Locations LocateFolders(const std::vector<std::string>& folders,
-                        const std::vector<nas::Share>& shares, bool recursive) {
+                        const std::vector<nas::Share>& shares, bool recursive, bool repositories) {
   Locations locations;
   std::vector<std::string> taken;
   for (const nas::Share& share : shares) taken.push_back(share.name);
@@ -88,7 +97,7 @@ Locations LocateFolders(const std::vector<std::string>& folders,
       locations.paths.push_back("/" + share->name + path.substr(share->root.size()));
       continue;
     }
-    const std::string root = ShareRoot(path);
+    const std::string root = ShareRoot(repositories ? RepositoryOf(path) : path);
     const std::string name = FreeShareName(root, taken);
     taken.push_back(name);
     locations.added.push_back({name, root.empty() ? "/" : root});

@@ -16,9 +16,12 @@ struct Locations {
 
 // A folder inside one of `shares` is reached through it (the innermost one), any other through a
 // share of its own. A folder given twice is searched once, and with `recursive` so is one inside
-// another. Throws UsageError for what is no folder or cannot be looked at.
+// another. With `repositories` a share of its own begins at the top of the repository that the
+// folder lies in, whose ignore files speak of it. Throws UsageError for what is no folder or cannot
+// be looked at.
 Locations LocateFolders(const std::vector<std::string>& folders,
-                        const std::vector<nas::Share>& shares, bool recursive);
+                        const std::vector<nas::Share>& shares, bool recursive,
+                        bool repositories = false);
 
 // The share that holds the folder at `real_path` (empty: the root directory), the innermost where
 // there are several; null where there is none.

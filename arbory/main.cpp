@@ -23,6 +23,7 @@
 #include "arbory/terminal.h"
 #include "arbory/why_command.h"
 #include "nas/search/index_question.h"
+#include "nas/search/name_source.h"
 
 namespace arbory {
 namespace {
@@ -129,6 +130,8 @@ CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
   return serve;
 }
 
+constexpr int kMostThreads = static_cast<int>(nas::NameSource::kMostThreads);
+
 // An empty `group` leaves them out of the help.
 void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   search->option_defaults()->group(group);
@@ -154,6 +157,11 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   search->add_flag("-a,--absolute", options->output.absolute, "Whole paths, as they are on disk");
   search->add_flag("-n,--line-number", options->line_number,
                    "First matching line of files found by their contents; means --content too");
+  search->add_flag("--show-errors", options->common.show_errors,
+                   "Name the folders that could not be read, and say why");
+  search->add_option("--threads", options->common.threads, "Walk with N threads")
+      ->type_name("N")
+      ->check(CLI::Range(1, kMostThreads).description(""));
   search->add_flag("-v,--verbose", options->verbose, "Say how the search was answered");
   const std::map<std::string, nas::IndexUse> uses = {{"auto", nas::IndexUse::kAuto},
                                                      {"always", nas::IndexUse::kAlways},

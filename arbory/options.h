@@ -41,6 +41,8 @@ struct CommonOptions {
   std::string user;                 // empty: the caller
   std::vector<std::string> shares;  // NAME=DIR
   nas::IndexUse index_use = nas::IndexUse::kAuto;
+  int threads = 0;           // 0: as many as are of use
+  bool show_errors = false;  // name folders that could not be read
 };
 
 struct CallOptions {

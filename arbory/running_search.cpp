@@ -42,6 +42,16 @@ void ReadWalk(Json::Value walk, RunningSearch* search) {
   const Json::Value& files = Member(walk, record::kFiles);
   search->unreadable_files = CountOf(Member(files, record::kUnreadable));
   search->not_text = CountOf(Member(files, record::kNotText));
+  const Json::Value& reading = Member(walk, record::kReading);
+  search->content_files = CountOf(Member(reading, record::kFiles));
+  search->content_of = CountOf(Member(reading, record::kOf));
+  search->content_bytes = CountOf(Member(reading, record::kBytes));
+  search->content_path = TextOf(Member(reading, record::kPath));
+  const Json::Value& unread = Member(walk, record::kUnread);
+  for (Json::ArrayIndex i = 0; unread.isArray() && i < unread.size(); ++i) {
+    search->unread_folders.push_back(
+        {TextOf(Member(unread[i], record::kPath)), IntOf(Member(unread[i], record::kUnreadErrno))});
+  }
   search->source = TextOf(Member(walk, record::kSource));
   search->index = TextOf(Member(walk, record::kIndex));
   search->walk.swap(walk);

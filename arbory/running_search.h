@@ -27,6 +27,15 @@ struct RunningSearch {
   Json::Value walk;  // as the walk reports it to clients, null until it has begun; below, its parts
   bool all_found = false;  // no more rows will come
   bool reads_contents = false;
+  std::uint64_t content_files = 0;  // read so far, of so many, and the one begun last
+  std::uint64_t content_of = 0;
+  std::uint64_t content_bytes = 0;
+  std::string content_path;
+  struct Unread {
+    std::string path;
+    int error_number = 0;
+  };
+  std::vector<Unread> unread_folders;  // the first, where they were asked for
   std::uint64_t folders = 0;
   std::uint64_t entries = 0;
   std::uint64_t matches = 0;

@@ -46,6 +46,8 @@ constexpr std::chrono::milliseconds kMostUnasked{1000};
 // found and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
+// Between two looks at whether the user's other searches leave a place.
+constexpr std::chrono::milliseconds kPlacePause{200};
 // Saying why nothing was found takes a part of the time that the search took, or that of a small
 // tree.
 constexpr int kHintShare = 4;
@@ -81,7 +83,7 @@ class Search {
   }
 
   int Run(const Json::Value& params) {
-    Start(params);
+    if (!Start(params)) return kExitInterrupted;
     int exit_code = kExitError;
     try {
       exit_code = Report(options_.sort_by.empty() ? Stream() : ListSorted());
@@ -103,12 +105,20 @@ class Search {
     return caller_.Call(caller_.Method(method), method, params, encode);
   }
 
-  void Start(const Json::Value& params) {
+  // False where it was interrupted before there was a place for it.
+  bool Start(const Json::Value& params) {
     const auto encode = [](int code, const Json::Value& data) {
       return nas::Reply{{.code = code}, code == 0 ? data["taskid"].asString() : ""};
     };
     // An interrupt waits for the search's id, without which the search could not be stopped.
-    const nas::Reply reply = Call("start", params, encode);
+    nas::Reply reply = Call("start", params, encode);
+    // Once more where a place may have become free since.
+    bool again = true;
+    while (reply.head.code != 0 && (AllPlacesTaken() || again)) {
+      again = AllPlacesTaken();
+      if (!WaitForPlace()) return false;
+      reply = Call("start", params, encode);
+    }
     if (reply.head.code == 0) {
       task_id_ = reply.body;
       // What is read of the search from here on, a database among it, is its user's to write.
@@ -117,7 +127,7 @@ class Search {
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
-      return;
+      return true;
     }
     if (reply.head.code == nas::kCodeBadRequest) {
       throw std::runtime_error("too many folders for one search");
@@ -125,6 +135,23 @@ class Search {
     const std::string why = WhyNoSearch(caller_);
     throw std::runtime_error("the search cannot be started: " +
                              (why.empty() ? "code " + std::to_string(reply.head.code) : why));
+  }
+
+  bool AllPlacesTaken() const {
+    const auto places = static_cast<size_t>(nas::CurrentConfig().searches_per_user);
+    return UnfinishedSearches(caller_.user()).size() >= places;
+  }
+
+  bool WaitForPlace() {
+    if (!waited_ && isatty(STDERR_FILENO) != 0) {
+      Complain("waiting for one of " + std::to_string(nas::CurrentConfig().searches_per_user) +
+               " searches that run for " + caller_.user() + " to end");
+    }
+    waited_ = true;
+    while (AllPlacesTaken()) {
+      if (Interrupted() || !Pause(static_cast<int>(kPlacePause.count()), -1)) return false;
+    }
+    return true;
   }
 
   // Prints rows as far as they have been found, until there are no more.
@@ -242,6 +269,9 @@ class Search {
   }
 
   static void TellOfSkipped(const RunningSearch& state) {
+    for (const RunningSearch::Unread& folder : state.unread_folders) {
+      Complain(folder.path + ": " + std::strerror(folder.error_number));
+    }
     const auto tell = [](std::uint64_t count, const char* one, const char* many, const char* what) {
       if (count > 0) Complain(Counted(count, one, many) + what);
     };
@@ -276,6 +306,7 @@ class Search {
   std::string failure_text_;  // of kFailed
   bool running_ = true;
   bool found_nothing_ = false;
+  bool waited_ = false;
   bool from_index_ = false;
   std::chrono::milliseconds ran_{0};
 };

@@ -83,11 +83,12 @@ void SetWords(const SearchQuery& query, Json::Value* params) {
     CheckText(Factory::FIND_EXTENSION, extensions, "list of extensions");
     (*params)["extension"] = extensions;
   });
+  const std::string type = TypeParameter(query);
   Of("filetype", [&] {
-    if (query.type.empty()) return;
-    CheckText(Factory::FIND_FILETYPE, query.type,
+    if (type.empty()) return;
+    CheckText(Factory::FIND_FILETYPE, type,
               "file type; there are file, dir, image, video, audio, document and archive");
-    (*params)["filetype"] = query.type;
+    (*params)["filetype"] = type;
   });
   Of("owner", [&] {
     if (query.owner.empty()) return;
@@ -124,7 +125,8 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
 }
 
 Json::Value PrepareSearch(const SearchQuery& query, Caller* caller) {
-  const Locations locations = LocateFolders(query.folders, nas::ListShares(), query.recursive);
+  const Locations locations =
+      LocateFolders(query.folders, nas::ListShares(), query.recursive, query.ignore_files);
   caller->AddShares(locations.added);
   return SearchRequest(query, locations.paths, std::time(nullptr));
 }

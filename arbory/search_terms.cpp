@@ -4,6 +4,8 @@
 #include <string_view>
 #include <vector>
 
+#include "nas/match/file_kinds.h"
+
 namespace arbory {
 namespace {
 
@@ -64,11 +66,18 @@ std::string PatternWithTerms(const SearchQuery& query) {
   if (!query.letters.empty()) AddTerm("letters:" + query.letters, &terms);
   if (!query.min_depth.empty()) AddTerm("depth:>=" + query.min_depth, &terms);
   if (!query.max_depth.empty()) AddTerm("depth:<=" + query.max_depth, &terms);
-  AddTypes(query.types, &terms);
+  if (TypeParameter(query).empty()) AddTypes(query.types, &terms);
   if (terms.empty()) return query.pattern;
   // A bar that nothing stands before would join what follows to the last of the terms.
   const size_t begin = query.pattern.find_first_not_of(" |");
   return terms + (begin == std::string::npos ? "" : query.pattern.substr(begin));
+}
+
+// "file" is whatever is no folder to the API, and a regular file to people.
+std::string TypeParameter(const SearchQuery& query) {
+  if (query.types.size() != 1) return query.type;
+  const auto type = nas::ParseFileType(query.types.front());
+  return type && (type->folder || type->category) ? query.types.front() : query.type;
 }
 
 }  // namespace arbory

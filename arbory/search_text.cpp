@@ -1,7 +1,10 @@
 #include "arbory/search_text.h"
 
+#include <cstdio>
 #include <exception>
+#include <iterator>
 
+#include "arbory/terminal.h"
 #include "platform/errors.h"
 #include "platform/task.h"
 #include "platform/task_record.h"
@@ -14,6 +17,18 @@ std::string Grouped(std::uint64_t number) {
   constexpr int kGroup = 3;
   std::string text = std::to_string(number);
   for (int at = static_cast<int>(text.size()) - kGroup; at > 0; at -= kGroup) text.insert(at, ",");
+  return text;
+}
+
+// "1.2 GB", 1024-based.
+std::string SizeText(std::uint64_t bytes) {
+  constexpr double kUnit = 1024;
+  const char* const units[] = {"bytes", "KB", "MB", "GB", "TB", "PB"};
+  auto size = static_cast<double>(bytes);
+  size_t unit = 0;
+  for (; size >= kUnit && unit + 1 < std::size(units); ++unit) size /= kUnit;
+  char text[sizeof("1023.9 bytes")];
+  std::snprintf(text, sizeof text, unit == 0 ? "%.0f %s" : "%.1f %s", size, units[unit]);
   return text;
 }
 
@@ -41,7 +56,10 @@ std::string ProgressText(const RunningSearch& search, long seconds) {
   if (search.walk.isNull()) return text;
   text += ": " + Counted(search.folders, "folder", "folders") + ", " +
           Counted(search.entries, "entry", "entries") + ", " + Grouped(search.matches) + " found";
-  if (search.reads_contents) text += ", reading contents";
+  if (!search.reads_contents) return text;
+  text = "Reading " + std::to_string(seconds) + " s: " + Grouped(search.content_files) + " of " +
+         Counted(search.content_of, "file", "files") + ", " + SizeText(search.content_bytes) +
+         ", " + Grouped(search.matches) + " found, " + Escaped(search.content_path);
   return text;
 }
 

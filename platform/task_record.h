@@ -16,6 +16,10 @@
 //                   "skipped" {"permission", "vanished", "other"}: folders that could not be read;
 //                   files that vanished are among those
 //                   "files" {"unreadable", "not_text"}: files left out
+//                   "reading" {"files", "of", "bytes", "path"}: in "contents", how many files have
+//                   been read, of how many, and which of them was begun last
+//                   "unread" [{"path", "errno"}]: the first folders that could not be read, where
+//                   somebody asked for them
 //                   "source" where names came from: "index", "walk", or "both" for parts of each
 //                   "index" why so: "current", or a few words about why there was no answer
 //
@@ -57,6 +61,12 @@ inline constexpr char kOther[] = "other";
 inline constexpr char kFiles[] = "files";
 inline constexpr char kUnreadable[] = "unreadable";
 inline constexpr char kNotText[] = "not_text";
+inline constexpr char kReading[] = "reading";
+inline constexpr char kOf[] = "of";
+inline constexpr char kBytes[] = "bytes";
+inline constexpr char kPath[] = "path";
+inline constexpr char kUnread[] = "unread";
+inline constexpr char kUnreadErrno[] = "errno";
 inline constexpr char kSource[] = "source";
 inline constexpr char kFromIndex[] = "index";
 inline constexpr char kFromWalk[] = "walk";

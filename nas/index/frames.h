@@ -23,6 +23,7 @@ enum class FrameType : unsigned char {
   kRows = 'r',        // daemon: a block of rows
   kCandidates = 'c',  // daemon: files whose contents the asker is to read
   kProgress = 'p',    // daemon: counts
+  kUnread = 'u',      // daemon: a folder that could not be read
   kEnd = 'e',         // daemon: that was all
 };
 

@@ -133,6 +133,7 @@ ContentScanner::Outcome ContentScanner::EachPiece(Units units, const Look& look)
         return Outcome::kFailed;
     }
     const std::string_view all = reader_.text();
+    if (bytes_ != nullptr) bytes_->fetch_add(all.size() - keep, std::memory_order_relaxed);
     size_t searched = all.size();
     size_t keep_from = all.size() - std::min(all.size(), query_.overlap_);
     if (units == Units::kLines && !reader_.at_end()) {

@@ -1,6 +1,7 @@
 #pragma once
 // The reading of one file to answer a content query: whether it matches, and where.
 
+#include <atomic>
 #include <cstdint>
 #include <functional>
 #include <optional>
@@ -28,6 +29,9 @@ struct MatchingLine {
 class ContentScanner {
  public:
   explicit ContentScanner(const ContentQuery& query, const int& stop_flag);
+
+  // Adds the bytes that are read from now on, as they are read. Borrowed.
+  void CountInto(std::atomic<std::uint64_t>* bytes) { bytes_ = bytes; }
 
   enum class Outcome { kMatch, kNoMatch, kBinary, kStopped, kFailed };
   // What is known of the file once these needles have been found, `all_read` to its end or not.
@@ -72,6 +76,7 @@ class ContentScanner {
   TextReader reader_;
   std::vector<bool> found_;
   bool keep_access_time_ = true;
+  std::atomic<std::uint64_t>* bytes_ = nullptr;
 };
 
 }  // namespace nas

@@ -22,7 +22,7 @@ void ContentReading::Read(const CandidateList::Record& record, Judge& judge) {
   if (below.starts_with('/')) below.remove_prefix(1);
   const UniqueFd fd = OpenBelow(location.fd.get(), below, O_PATH | O_DIRECTORY);
   if (!fd) {
-    search_.progress.AddSkipped(errno);
+    search_.CannotRead(errno, record.location, record.folder_path);
     return;
   }
   judge.Enter(fd.get(), record.location, location, record.folder_path);

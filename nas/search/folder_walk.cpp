@@ -19,6 +19,19 @@ Pruning PruningOf(const SharedSearch& search) {
   return pruning;
 }
 
+void SetPath(const FolderStack::Item& item, std::string& path) {
+  path = item.batch->parent_path;
+  if (item.name == ".") return;
+  if (!path.empty()) path.push_back('/');
+  path.append(item.name);
+}
+
+std::string PathOf(const FolderStack::Item& item) {
+  std::string path;
+  SetPath(item, path);
+  return path;
+}
+
 }  // namespace
 
 static_assert(FolderStack::kMostThreads >= NameSource::kMostThreads);
@@ -61,7 +74,7 @@ void FolderWalk::Feed(size_t thread, Judge& judge) {
     if (folder.fd) {
       ReadFolder(item, std::move(folder.fd), reading);
     } else if (folder.refusal == Refusal::kFolderUnreadable) {
-      search_.progress.AddSkipped(folder.error_number);
+      search_.CannotRead(folder.error_number, item.batch->location, PathOf(item));
     } else if (folder.refusal != Refusal::kOtherLocation &&
                folder.refusal != Refusal::kOtherMount && folder.refusal != Refusal::kOtherDisk) {
       search_.progress.AddLeftOut();
@@ -74,11 +87,7 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
   const std::uint16_t number = item.batch->location;
   const Location& location = locations_[number];
   std::string& path = reading.path;
-  path = item.batch->parent_path;
-  if (item.name != ".") {
-    if (!path.empty()) path.push_back('/');
-    path.append(item.name);
-  }
+  SetPath(item, path);
   const IgnoreFiles::Ptr ignores = gate_.IgnoresOf(fd.get(), path, item.batch->ignores);
   auto below = std::make_shared<FolderBatch>();
   std::uint64_t entries = 0;
@@ -92,7 +101,7 @@ void FolderWalk::ReadFolder(const FolderStack::Item& item, UniqueFd fd, Reading&
     }
     reading.judge.Entry(entry);
   }
-  if (reading.reader.failed() != 0) search_.progress.AddSkipped(reading.reader.failed());
+  if (reading.reader.failed() != 0) search_.CannotRead(reading.reader.failed(), number, path);
   search_.progress.AddFolder(entries);
   reading.judge.Leave();
   if (below->names.empty()) return;

@@ -26,7 +26,7 @@ namespace {
 constexpr int kQuestionMilliseconds = 10'000;
 
 // Sends what a search finds. A connection that takes no more ends the search.
-class FrameSink : public RowSink, public CandidateSink {
+class FrameSink : public RowSink, public CandidateSink, public UnreadSink {
  public:
   explicit FrameSink(int connection) : connection_(connection) {}
 
@@ -44,6 +44,13 @@ class FrameSink : public RowSink, public CandidateSink {
     payload_.assign(folder_path).push_back('\0');
     payload_.append(names);
     Send(FrameType::kCandidates, payload_);
+  }
+
+  void AddUnread(int error_number, std::uint16_t /*location*/, std::string_view path) override {
+    const std::lock_guard lock(mutex_);
+    payload_.assign(reinterpret_cast<const char*>(&error_number), sizeof(error_number));
+    payload_.append(path);
+    Send(FrameType::kUnread, payload_);
   }
 
   void Tell(const WalkProgress& progress) {
@@ -93,6 +100,7 @@ void AnswerFrom(int connection, const IndexQuestion& question,
   SharedSearch search({&query}, sink, stop);
   search.AskContents(question.texts_too);
   search.candidate_sink = &sink;
+  if (question.unread) search.unread = &sink;
   IndexNames names(snapshot, {locations, folder, question.mounts, question.rules}, search);
   NoNames contents;
   if (question.best > 0) {

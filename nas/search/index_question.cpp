@@ -19,6 +19,7 @@ constexpr char kShare[] = "share";
 constexpr char kMounts[] = "mounts";
 constexpr char kTemporary[] = "temporary";
 constexpr char kLocations[] = "locations";
+constexpr char kUnread[] = "unread";
 constexpr char kBest[] = "best";
 
 Json::Value IdsToJson(const FolderGate::FolderIds& ids) {
@@ -50,11 +51,14 @@ bool ReadTexts(const Json::Value& json, std::vector<std::string>& texts) {
 
 bool ReadAll(const Json::Value& json, IndexQuestion& question) {
   std::vector<std::string> share;
-  if (!json[kTextsToo].isBool() || !json[kRecursive].isBool()) return false;
+  for (const char* flag : {kTextsToo, kRecursive, kUnread}) {
+    if (!json[flag].isBool()) return false;
+  }
   if (!ReadTexts(json[kShare], share) || share.size() != 3) return false;
   if (!ReadTexts(json[kMounts], question.mounts)) return false;
   if (!json[kBest].isUInt() || json[kBest].asUInt() > kMostBest) return false;
   question.texts_too = json[kTextsToo].asBool();
+  question.unread = json[kUnread].asBool();
   question.share = {share[0], share[1], {}};
   question.path = share[2];
   question.rules.recursive = json[kRecursive].asBool();
@@ -74,6 +78,7 @@ std::string QuestionText(const IndexQuestion& question) {
   Json::Value json;
   json[kQuery] = QueryToJson(question.query);
   json[kTextsToo] = question.texts_too;
+  json[kUnread] = question.unread;
   json[kRecursive] = question.rules.recursive;
   for (const std::string& text : {question.share.name, question.share.root, question.path}) {
     json[kShare].append(text);

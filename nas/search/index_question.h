@@ -12,6 +12,7 @@
 //   "temporary", "locations"
 //                device and inode of folders that are not entered (folder_gate.h), one after the
 //                other
+//   "unread"     whether folders that cannot be read are to be named
 //   "best"       of an instant question: so many rows, the best first
 //
 // The answer is frames: blocks of rows (kRows: 32-bit lengths of folders and names, then the three
@@ -32,6 +33,7 @@ namespace nas {
 struct IndexQuestion {
   QueryNode query;
   bool texts_too = false;
+  bool unread = false;
   Share share;       // no volume
   std::string path;  // below the share's root
   std::vector<std::string> mounts;

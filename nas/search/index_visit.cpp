@@ -202,7 +202,7 @@ void IndexVisit::ReadWhole(FolderId folder) {
     judge_.Entry(entry);
     if (entry.type == DT_DIR) EnterFolder(entry.name.data(), FolderAt(folder, entry.name));
   }
-  if (reader_.failed() != 0) search_.progress.AddSkipped(reader_.failed());
+  if (reader_.failed() != 0) search_.CannotRead(reader_.failed(), 0, path_);
   search_.progress.AddFolder(entries);
   judge_.Leave();
 }
@@ -214,13 +214,18 @@ bool IndexVisit::MayEnter(std::string_view name) const {
          Refusal::kNone;
 }
 
+// Of an entry of the open folder.
+std::string IndexVisit::PathOf(std::string_view name) const {
+  return path_ + (path_.empty() ? "" : "/") + std::string(name);
+}
+
 void IndexVisit::EnterFolder(const char* name, FolderId folder) {
   if (!MayEnter(name)) return;
   const FolderGate::Opened opened = names_.gate_.Open(fd(), name);
   if (!opened.fd) {
     const bool tell = opened.refusal == Refusal::kFolderUnreadable && !IsGone(opened.error_number);
     if (tell && (folder == NameTable::kNoFolder || names_.Claim(folder))) {
-      search_.progress.AddSkipped(opened.error_number);
+      search_.CannotRead(opened.error_number, 0, PathOf(name));
     }
     return;
   }
@@ -287,7 +292,7 @@ bool IndexVisit::OpenTop() {
   FolderGate::Opened opened = names_.gate_.Open(location.fd.get(), ".");
   if (!opened.fd) {
     skip_until_ = names_.end_;
-    if (names_.Claim(names_.top_)) search_.progress.AddSkipped(opened.error_number);
+    if (names_.Claim(names_.top_)) search_.CannotRead(opened.error_number, 0, location.path);
     return false;
   }
   path_ = location.path;
@@ -327,7 +332,8 @@ void IndexVisit::Refused(FolderId folder, const FolderGate::Opened& opened) {
   Skip(folder);
   if (opened.refusal != Refusal::kFolderUnreadable || IsGone(opened.error_number)) return;
   const bool may_tell = rights_.all() || !IsForbidden(opened.error_number) || SeemsClosed(folder);
-  if (may_tell && names_.Claim(folder)) search_.progress.AddSkipped(opened.error_number);
+  if (!may_tell || !names_.Claim(folder)) return;
+  search_.CannotRead(opened.error_number, 0, PathOf(table_.folder_name(folder)));
 }
 
 bool IndexVisit::IsSame(FolderId folder, int fd, bool by_key) const {

@@ -75,6 +75,7 @@ class IndexVisit {
   void Refused(FolderId folder, const FolderGate::Opened& opened);
   bool IsSame(FolderId folder, int fd, bool by_key) const;
   bool MayEnter(std::string_view name) const;
+  std::string PathOf(std::string_view name) const;
   // What a walk does at a folder that it meets in the open one, but for what the table has of it:
   // `folder`, or kNoFolder.
   void EnterFolder(const char* name, FolderId folder);

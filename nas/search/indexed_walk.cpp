@@ -44,6 +44,7 @@ struct IndexedWalk::Receiving {
   std::uint64_t rows = 0;
   // What has been told, should the answer break off. Made with the first of it.
   std::unique_ptr<CandidateList> told = nullptr;
+  UnreadFolders unread = {};  // told once the answer is whole
   bool ended = false;
   std::string status = {};
 };
@@ -108,6 +109,7 @@ std::string IndexedWalk::QuestionAbout(const Location& location,
                                        const std::vector<std::string>& mounts) const {
   return QuestionText({.query = search_.criteria.root,
                        .texts_too = settings_.texts_too,
+                       .unread = search_.unread != nullptr,
                        .share = location.share,
                        .path = location.path,
                        .mounts = mounts,
@@ -136,7 +138,11 @@ bool IndexedWalk::TakeAnswer(std::uint16_t number, const std::vector<std::string
     }
     waited = 0;
     if (state != FrameReader::State::kFrame || !TakeFrame(frame, receiving)) break;
-    if (receiving.ended) return true;
+    if (!receiving.ended) continue;
+    for (const UnreadFolders::Folder& folder : receiving.unread.folders()) {
+      search_.unread->AddUnread(folder.error_number, number, folder.path);
+    }
+    return true;
   }
   if (!receiving.status.empty()) *why = receiving.status;
   if (!search_.stopping()) GiveUp(receiving);
@@ -168,6 +174,8 @@ bool IndexedWalk::TakeFrame(const Frame& frame, Receiving& receiving) {
       receiving.counts = counts;
       return true;
     }
+    case FrameType::kUnread:
+      return TakeUnread(frame.payload, receiving);
     case FrameType::kEnd:
       receiving.ended = true;
       return true;
@@ -196,13 +204,24 @@ bool IndexedWalk::TakeRows(std::string_view payload, Receiving& receiving) {
   return true;
 }
 
+bool IndexedWalk::TakeUnread(std::string_view payload, Receiving& receiving) const {
+  int error_number = 0;
+  if (search_.unread == nullptr || payload.size() < sizeof(error_number)) return false;
+  std::memcpy(&error_number, payload.data(), sizeof(error_number));
+  payload.remove_prefix(sizeof(error_number));
+  if (!RowBlock::IsAtOrBelow(payload, locations_[receiving.number].path)) return false;
+  receiving.unread.AddUnread(error_number, receiving.number, payload);
+  return true;
+}
+
 bool IndexedWalk::TakeCandidates(std::string_view payload, Receiving& receiving) {
   const auto folder = TakeText(&payload);
   if (!folder || search_.candidate_sink == nullptr) return false;
-  if (!RowBlock::IsAtOrBelow(*folder, locations_[receiving.number].path) ||
-      RowBlock::CountNames(payload).value_or(0) == 0) {
+  const std::uint64_t count = RowBlock::CountNames(payload).value_or(0);
+  if (!RowBlock::IsAtOrBelow(*folder, locations_[receiving.number].path) || count == 0) {
     return false;
   }
+  search_.progress.AddCandidates(count);
   if (!receiving.told) {
     receiving.told = std::make_unique<CandidateList>(settings_.temporary_folder);
   }

@@ -53,6 +53,7 @@ class IndexedWalk : public NameSource {
   bool TakeAnswer(std::uint16_t number, const std::vector<std::string>& mounts, std::string* why);
   bool TakeFrame(const Frame& frame, Receiving& receiving);
   bool TakeRows(std::string_view payload, Receiving& receiving);
+  bool TakeUnread(std::string_view payload, Receiving& receiving) const;
   bool TakeCandidates(std::string_view payload, Receiving& receiving);
   void GiveUp(Receiving& receiving);
   bool WalkMounts(size_t thread, std::uint16_t number, const std::vector<std::string>& mounts);

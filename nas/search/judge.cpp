@@ -184,7 +184,11 @@ void Judge::Skip(int error_number) {
 }
 
 Refusal Judge::Contents(const char* name) {
-  if (!scanner_) scanner_.emplace(*search_.content, search_.stop_flag);
+  if (!scanner_) {
+    scanner_.emplace(*search_.content, search_.stop_flag);
+    scanner_->CountInto(&search_.progress.content_bytes());
+  }
+  search_.progress.BeginContents(folder_.path, name);
   Meet(name, DT_REG);
   if (search_.criteria.ask_attributes && !Look(name)) return Refusal::kVanished;
   const auto decide = [this](const std::vector<bool>& found, bool all_read) {
@@ -219,6 +223,7 @@ Refusal Judge::Contents(const char* name) {
 void Judge::Leave() {
   if (candidates_.empty()) return;
   std::ranges::sort(candidates_);
+  search_.progress.AddCandidates(candidates_.size());
   std::string names;
   size_t count = 0;
   for (const auto& [inode, name] : candidates_) {

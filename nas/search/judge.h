@@ -23,6 +23,7 @@
 #include "nas/search/ignore_files.h"
 #include "nas/search/location.h"
 #include "nas/search/refusal.h"
+#include "nas/search/unread_folders.h"
 #include "nas/search/walk_progress.h"
 
 namespace nas {
@@ -67,6 +68,11 @@ struct SharedSearch {
   // What the criteria say of an entry, by its name or, where that is enough, by its contents.
   Answer Ask(const QuerySubject& subject) const;
   bool stopped() const { return __atomic_load_n(&stop_flag, __ATOMIC_RELAXED) != 0; }
+  // Of a folder, below the root of the share of that location.
+  void CannotRead(int error_number, std::uint16_t location, std::string_view path) {
+    progress.AddSkipped(error_number);
+    if (unread != nullptr) unread->AddUnread(error_number, location, path);
+  }
   bool stopping() const { return stopped() || failed.load(std::memory_order_relaxed); }
 
   const Criteria criteria;
@@ -76,6 +82,7 @@ struct SharedSearch {
   std::unique_ptr<CandidateList> candidates;  // of SearchContents
   CandidateSink* candidate_sink = nullptr;    // borrowed: that list, or somebody else's
   MissSink* misses = nullptr;                 // borrowed; null: nobody asks
+  UnreadSink* unread = nullptr;               // borrowed, likewise
   WalkProgress progress;
   ToldEntries told;
   std::atomic<bool> failed = false;  // a thread has thrown: the others shall end

@@ -90,7 +90,8 @@ bool SearchJob::Run(NameSource& names, NameSource& contents) {
 
 void SearchJob::RunPhase(NameSource& source) {
   source_ = &source;
-  const unsigned count = ThreadsAtFirst();
+  const unsigned count =
+      settings_.threads > 0 ? static_cast<unsigned>(settings_.threads) : ThreadsAtFirst();
   for (unsigned i = 0; i < count; ++i) StartThread(source);
   Tend(source);
   handles_.clear();
@@ -145,7 +146,8 @@ void SearchJob::Tend(NameSource& source) {
       }
       settings_.report(search_.progress);
       LookForStuckThreads(now);
-      if (disk.Waiting() && handles_.size() < kMostThreads) StartThread(source);
+      const bool more = settings_.threads == 0 && handles_.size() < kMostThreads;
+      if (disk.Waiting() && more) StartThread(source);
     } catch (...) {
       Fail(std::current_exception());
     }

@@ -27,7 +27,8 @@ class SearchJob {
     // flag: inside an expression that finds no end, or waiting for a file server that does not
     // answer. All rows are visible then. Run cannot return before those threads do, but a process
     // may choose to end.
-    std::function<void()> stuck;
+    std::function<void()> stuck = {};
+    int threads = 0;  // so many and no more; 0: as many as are of use
   };
 
   // `search` is borrowed.

@@ -107,6 +107,7 @@ class WfmSearchWalker::Impl {
   void Report(const nas::WalkProgress& progress, bool last);
   nas::IndexedWalk::Settings NameSettings(const Json::Value& options) const;
   bool RunJob(const Json::Value& options, nas::SharedSearch& search);
+  void TellUnread(Json::Value* walk) const;
   bool IsNamedInTask();
   bool stopped() const { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; }
   void WaitForSorting(pid_t child) const;
@@ -118,13 +119,14 @@ class WfmSearchWalker::Impl {
   const int& stop_flag_;
   std::vector<FindComp*> comps_;
   std::vector<nas::Location> locations_;
-  std::vector<int> unopened_;  // errno of each of the others
+  std::vector<nas::Error> unopened_;  // of each of the others, with the location's text
   std::string volume_;
   std::string folder_;
   std::string id_;
   std::optional<nas::ResultClaim> claim_;  // before the writer, which it has to outlive
   std::unique_ptr<nas::ResultWriter> writer_;
   nas::IndexedWalk* names_ = nullptr;  // of Walk
+  nas::UnreadFolders unread_;
   bool walked_ = false;
   bool current_only_ = false;
   bool told_ready_ = false;
@@ -160,7 +162,7 @@ nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>&
       locations_.push_back(std::move(*location));
       continue;
     }
-    unopened_.push_back(location.error().error_number);
+    unopened_.push_back(location.error());
     if (!first) first = location.error();
   }
   if (!locations_.empty()) return {};
@@ -221,11 +223,13 @@ nas::IndexedWalk::Settings WfmSearchWalker::Impl::NameSettings(const Json::Value
 }
 
 bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch& search) {
-  for (const int error_number : unopened_) search.progress.AddSkipped(error_number);
+  for (const nas::Error& error : unopened_) search.progress.AddSkipped(error.error_number);
+  if (nas::CurrentConfig().list_unread) search.unread = &unread_;
   search.SearchContents(folder_, options.get("search_content", false).asBool());
   nas::ContentReading contents(locations_, search);
   nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },
-                              .stuck = [this] { EndWorker(); }});
+                              .stuck = [this] { EndWorker(); },
+                              .threads = nas::CurrentConfig().search_threads});
   const bool completed = job.Run(*names_, contents);
   if (forsaken_) {
     Vanish();
@@ -262,6 +266,19 @@ void WfmSearchWalker::Impl::EndWorker() {
   _exit(0);
 }
 
+void WfmSearchWalker::Impl::TellUnread(Json::Value* walk) const {
+  Json::Value& all = (*walk)[task_record::kUnread] = Json::arrayValue;
+  const auto tell = [&all](const std::string& path, int error_number) {
+    Json::Value& one = all.append(Json::objectValue);
+    one[task_record::kPath] = path;
+    one[task_record::kUnreadErrno] = error_number;
+  };
+  for (const nas::Error& error : unopened_) tell(error.path, error.error_number);
+  for (const nas::UnreadFolders::Folder& folder : unread_.folders()) {
+    tell(locations_[folder.location].share.root + "/" + folder.path, folder.error_number);
+  }
+}
+
 void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {
   const Clock::time_point now = Clock::now();
   if (!last && told_ready_ && now - reported_ < kReportInterval) return;
@@ -269,6 +286,7 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   task_->beginUpdate();
   Json::Value walk = progress.ToJson();
   if (names_ != nullptr) names_->Tell(&walk);
+  if (nas::CurrentConfig().list_unread) TellUnread(&walk);
   task_->setProperty(task_record::kWalk, walk);
   if (!told_ready_) task_->setProperty(task_record::kResultReady, true);
   // A task that was removed meanwhile has nobody left to tell.

@@ -7,6 +7,9 @@
 #include <atomic>
 #include <cerrno>
 #include <cstdint>
+#include <mutex>
+#include <string>
+#include <string_view>
 
 #include "platform/task_record.h"
 
@@ -40,6 +43,16 @@ class WalkProgress {
   }
   // A file's contents were not looked into, because they are no text.
   void AddNotText() { not_text_.fetch_add(1, std::memory_order_relaxed); }
+  // Files whose contents are to be read, and one of them that is read now.
+  void AddCandidates(std::uint64_t count) {
+    candidates_.fetch_add(count, std::memory_order_relaxed);
+  }
+  void BeginContents(std::string_view folder, std::string_view name) {
+    content_files_.fetch_add(1, std::memory_order_relaxed);
+    const std::lock_guard lock(reading_mutex_);
+    reading_.assign(folder).append(folder.empty() ? "" : "/").append(name);
+  }
+  std::atomic<std::uint64_t>& content_bytes() { return content_bytes_; }
   // A folder that is never searched.
   void AddLeftOut() { left_out_.fetch_add(1, std::memory_order_relaxed); }
   void SetPhase(Phase phase) { phase_ = phase; }
@@ -86,6 +99,13 @@ class WalkProgress {
     json[record::kSkipped][record::kOther] = Json::UInt64{other_};
     json[record::kFiles][record::kUnreadable] = Json::UInt64{unreadable_files_};
     json[record::kFiles][record::kNotText] = Json::UInt64{not_text_};
+    if (phase_ != Phase::kContents) return json;
+    Json::Value& reading = json[record::kReading];
+    reading[record::kFiles] = Json::UInt64{content_files_};
+    reading[record::kOf] = Json::UInt64{candidates_};
+    reading[record::kBytes] = Json::UInt64{content_bytes_};
+    const std::lock_guard lock(reading_mutex_);
+    reading[record::kPath] = reading_;
     return json;
   }
 
@@ -104,6 +124,11 @@ class WalkProgress {
   std::atomic<std::uint64_t> unreadable_files_ = 0;
   std::atomic<std::uint64_t> not_text_ = 0;
   std::atomic<std::uint64_t> left_out_ = 0;
+  std::atomic<std::uint64_t> candidates_ = 0;
+  std::atomic<std::uint64_t> content_files_ = 0;
+  std::atomic<std::uint64_t> content_bytes_ = 0;
+  mutable std::mutex reading_mutex_;  // guards reading_
+  std::string reading_;               // below the share's root
 };
 
 }  // namespace nas

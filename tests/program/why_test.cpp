@@ -97,7 +97,7 @@ TEST_F(Why, EachWayToAFile) {
       {{"plan.txt/x", ""}, 2, "there is no 'plan.txt/x'"},
       {{"plan.txt", "", "none"}, 2, "cannot search 'none'"},
       {{"plan.txt", "regex:("}, 2, "'regex:(': missing closing parenthesis"},
-      {{"plan.txt", "", "-t", "song"}, 2, "'song' is no file type"},
+      {{"plan.txt", "", "-t", "song"}, 2, "there are file, dir, link, executable"},
       {{"plan.txt"}, 2, "PATTERN is required"},
   });
 }

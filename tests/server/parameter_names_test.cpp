@@ -257,9 +257,9 @@ TEST_F(ParameterNamesTest, TheDescriptionNamesWhatIsDocumented) {
 }
 
 TEST_F(ParameterNamesTest, TheTerminalOffersWhatIsDocumented) {
-  const std::map<std::string, std::string> samples = {{"EXT", "jpg"},   {"TYPE", "file"},
-                                                      {"SIZE", "1"},    {"TIME", "1"},
-                                                      {"USER", "root"}, {"GROUP", "root"}};
+  const std::map<std::string, std::string> samples = {
+      {"EXT", "jpg"},   {"TYPE", "dir"},   {"SIZE", "1"}, {"TIME", "1"},
+      {"USER", "root"}, {"GROUP", "root"}, {"GLOB", "x"}, {"N", "1"}};
   const auto request = [](std::vector<std::string> reversed_words) {
     CLI::App app;
     arbory::SearchQuery query;
@@ -274,6 +274,7 @@ TEST_F(ParameterNamesTest, TheTerminalOffersWhatIsDocumented) {
   arbory::AddQueryOptions(&app, &unused);
   for (const CLI::Option* option : app.get_options()) {
     if (option->get_positional() || option == app.get_help_ptr()) continue;
+    if (option->get_group().empty()) continue;  // offered to nobody
     std::vector<std::string> words = {"a", option->get_name()};
     if (option->get_items_expected_max() > 0) {
       words.insert(words.begin() + 1, samples.at(option->get_type_name()));
