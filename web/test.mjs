@@ -1,5 +1,5 @@
-// Bundles tests, since Node does not read TypeScript, and runs them: `node test.mjs [FOLDER [WORD]]`
-// takes the files FOLDER/*.WORD.ts. Node's own runner runs and counts them.
+// Bundles tests, since Node does not read TypeScript, and runs them: `node test.mjs [FOLDER [WORD
+// [NAME]]]` takes the files FOLDER/NAME*.WORD.ts. Node's own runner runs and counts them.
 import { build } from 'esbuild';
 import { spawnSync } from 'node:child_process';
 import { mkdtemp, readdir, rm } from 'node:fs/promises';
@@ -7,9 +7,9 @@ import { tmpdir } from 'node:os';
 import { join } from 'node:path';
 
 process.chdir(new URL('.', import.meta.url).pathname);
-const [folder = 'test', word = 'test'] = process.argv.slice(2);
+const [folder = 'test', word = 'test', only = ''] = process.argv.slice(2);
 const out = await mkdtemp(join(tmpdir(), 'arbory-page-tests-'));
-const tests = (await readdir(folder)).filter((name) => name.endsWith(`.${word}.ts`));
+const tests = (await readdir(folder)).filter((name) => name.startsWith(only) && name.endsWith(`.${word}.ts`));
 await build({
   entryPoints: tests.map((name) => join(folder, name)),
   absWorkingDir: process.cwd(),

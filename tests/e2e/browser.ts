@@ -7,19 +7,26 @@ const CHROMIUM = process.env.CHROMIUM ?? '/usr/bin/chromium';
 // A loaded machine is slow, not wrong.
 export const SOON_MS = 20_000;
 
-export function openBrowser(): Promise<Browser> {
-  return chromium.launch({
-    executablePath: CHROMIUM,
-    args: [
-      '--no-sandbox',
-      '--disable-gpu',
-      '--disable-quic',
-      '--no-first-run',
-      '--disable-background-networking',
-      '--disable-component-update',
-      '--disable-sync',
-    ],
-  });
+const LAUNCH = {
+  executablePath: CHROMIUM,
+  args: [
+    '--no-sandbox',
+    '--disable-gpu',
+    '--disable-quic',
+    '--no-first-run',
+    '--disable-background-networking',
+    '--disable-component-update',
+    '--disable-sync',
+  ],
+};
+
+export const openBrowser = (): Promise<Browser> => chromium.launch(LAUNCH);
+
+// One that can be killed without a word.
+export async function openMortalBrowser(): Promise<{ browser: Browser; kill: () => void }> {
+  const server = await chromium.launchServer(LAUNCH);
+  const browser = await chromium.connect(server.wsEndpoint());
+  return { browser, kill: () => server.process().kill('SIGKILL') };
 }
 
 export class Tab {
@@ -40,8 +47,8 @@ export class Tab {
     const { page, troubles } = this;
     page.on('pageerror', (error) => troubles.push(error.message));
     page.on('console', (message) => {
-      // A refused login is told by the browser itself too.
-      const expected = message.text().includes('401');
+      // Refusals are told by the browser itself too.
+      const expected = /\b40[13]\b|ERR_FAILED/.test(message.text());
       if (message.type() === 'error' && !expected) troubles.push(message.text());
     });
     page.on('request', (request) => {

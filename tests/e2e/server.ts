@@ -12,6 +12,7 @@ export interface Options {
   shares: Record<string, string>; // by name, folders as `Place.folder` gives them
   logins?: boolean; // as root, with people logging in by PAM
   settings?: string; // more lines of the [server] table
+  top?: string; // and before it
 }
 
 // A folder that the server may use, removed at the end.
@@ -55,7 +56,7 @@ export class Server {
     const shares = Object.entries(options.shares).map(([name, dir]) => `"${name}" = "${dir}"`);
     fs.writeFileSync(
       config,
-      `state_dir = "${state}"\nvolumes = []\n[shares]\n${shares.join('\n')}\n[server]\n` +
+      `state_dir = "${state}"\nvolumes = []\n${options.top ?? ''}[shares]\n${shares.join('\n')}\n[server]\n` +
         `listen = "127.0.0.1:0"\nweb_dir = "${process.env.ARBORY_PAGE}"\n${options.settings ?? ''}`,
     );
     const drop = process.getuid?.() === 0 && !options.logins;
@@ -67,8 +68,20 @@ export class Server {
     return new Server(child, await printedAddress(child));
   }
 
+  // Another address, once the one before has been used.
+  renewed(): Promise<string> {
+    const printed = printedAddress(this.child);
+    this.child.kill('SIGHUP');
+    return printed;
+  }
+
   stop(): Promise<void> {
     return stopped(this.child);
+  }
+
+  // Without a word.
+  kill(): void {
+    this.child.kill('SIGKILL');
   }
 }
 
@@ -93,6 +106,7 @@ export class Index {
 }
 
 async function stopped(child: ChildProcess): Promise<void> {
+  if (child.signalCode !== null || child.exitCode !== null) return;
   const ended = new Promise((done) => child.once('exit', done));
   child.kill('SIGTERM');
   await ended;

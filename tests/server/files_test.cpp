@@ -3,6 +3,7 @@
 #include "arbory/server/service/files.h"
 
 #include <cstdlib>
+#include <set>
 
 #include "arbory/server/transport/http_text.h"
 #include "tests/server/server_test.h"
@@ -51,6 +52,38 @@ TEST_F(FilesTest, NothingButReadableFilesOfTheShareComesOut) {
                            "photo/none", "photo/folder/below/file.txt/x", "none/x", "home/x"}) {
     get(path, 404);
   }
+}
+
+// Every row can be fetched, whatever bytes its name has, and what is text is told once.
+TEST_F(FilesTest, EveryListedFileIsReachedByTheAddressOfItsRow) {
+  const std::string names[] = {"plain name.txt",  "line\nbreak",     "\x01\x1b[31m\x7f",
+                               "broken \xff\xfe", "100% & # ? + \\", "caf\xe9/un\xc3\xa9t\xe9"};
+  MakeFolder("photo/caf\xe9");
+  for (const std::string& name : names) WriteFile(share_ + "/" + name, "in " + name);
+  Server server = Start();
+  server.Open();
+  const Json::Value begun =
+      server.Post("/searches", R"({"pattern":"type:file","folder_path":"/photo"})").json();
+  const std::string task = R"({"taskid":")" + begun["taskid"].asString() + R"("})";
+  Json::Value files;
+  EXPECT_TRUE(Eventually([&] {
+    files = server.Call("list", task).json()["data"]["files"];
+    return files.size() == std::size(names);
+  }));
+  std::set<std::string> read;
+  int encoded = 0;
+  for (const Json::Value& row : files) {
+    std::string address = row["path_encoded"].asString();
+    encoded += address.empty() ? 0 : 1;
+    if (address.empty()) {
+      address = "/photo/" + arbory::PercentEncoded(row["path"].asString().substr(7));
+    }
+    const Reply file = server.Get("/files" + address);
+    EXPECT_EQ(file.status, 200) << address;
+    read.insert(file.body);
+  }
+  EXPECT_EQ(encoded, 2) << "those that are no text";
+  for (const std::string& name : names) EXPECT_TRUE(read.contains("in " + name)) << name;
 }
 
 TEST_F(FilesTest, FirstLineOfWhatContentsHold) {

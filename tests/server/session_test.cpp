@@ -44,6 +44,16 @@ TEST_F(SessionTest, ATokenOpensOneSessionOnce) {
   EXPECT_EQ(server.Get(server.open_path).status, 403) << "the second time";
 
   server.cookie = cookie.substr(0, cookie.find(';'));
+  // A person who opens it again is led to the page, which says what to do.
+  Server stranger_by_browser = server;
+  stranger_by_browser.cookie.clear();
+  for (const auto& [who, page] : {std::pair(&server, "/"), {&stranger_by_browser, "/?used"}}) {
+    const Reply led =
+        who->Ask("GET", server.open_path, "", "Accept: text/html,application/xhtml+xml\r\n");
+    EXPECT_EQ(led.status, 303);
+    EXPECT_EQ(led.fields.at("location"), page);
+    EXPECT_FALSE(led.fields.contains("set-cookie"));
+  }
   const Json::Value session = server.Get("/session").json();
   EXPECT_EQ(session["user"], User());
   EXPECT_EQ(session["mode"], "single");

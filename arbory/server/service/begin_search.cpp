@@ -3,6 +3,7 @@
 #include <chrono>
 #include <thread>
 
+#include "arbory/server/service/row_addresses.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http.h"
 #include "arbory/server/transport/http_text.h"
@@ -48,7 +49,7 @@ Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Js
   for (;;) {
     int code = 0;
     Json::Value page =
-        DataOf(nas::RunCall(list, CallOf(outer, list, params), nas::EncodeJsonReply), &code);
+        DataOf(nas::RunCall(list, CallOf(outer, list, params), EncodeWithAddresses), &code);
     const bool waits = page.isObject() && page["files"].empty() && !page["finished"].asBool();
     if (!waits || steady_clock::now() > end) return page;
     std::this_thread::sleep_for(kLookAgain);

@@ -36,6 +36,20 @@ bool SameText(const std::string& a, const std::string& b) {
   return difference == 0;
 }
 
+// By a browser, which shows the page, and not by a program, which is told in a status.
+bool IsOpenedByPerson(const HttpRequest& request) {
+  const std::string* accept = request.Field("accept");
+  return request.method == "GET" && accept != nullptr &&
+         accept->find("text/html") != std::string::npos;
+}
+
+HttpReply ToPage(const char* address) {
+  HttpReply reply;
+  reply.status = kSeeOther;
+  reply.fields = {{"Location", address}, {"Cache-Control", "no-store"}};
+  return reply;
+}
+
 bool IsAbsurd(const std::string& text) {
   return text.size() > kMaxCredentialBytes || text.find('\0') != std::string::npos;
 }
@@ -104,6 +118,7 @@ Answer Entrance::OpenByToken(const HttpRequest& request) {
   const auto given = QueryValue(request.query(), "token");
   const bool good = !token_.empty() && given && SameText(*given, token_);
   if (rules_.single_user.empty() || !good) {
+    if (IsOpenedByPerson(request)) return ToPage(UserOf(request).empty() ? "/?used" : "/");
     return ErrorReply(kForbidden,
                       "This address opens the page only once. Print a new one: send the server "
                       "the signal HUP, or start it again.");
@@ -111,10 +126,8 @@ Answer Entrance::OpenByToken(const HttpRequest& request) {
   if (request.method != "GET") return NotAllowedReply("GET");
   token_.clear();
   const std::string id = sessions_.Begin(rules_.single_user, std::time(nullptr));
-  HttpReply reply;
-  reply.status = kSeeOther;
-  reply.fields = {
-      {"Location", "/"}, {"Set-Cookie", NewSessionCookie(id)}, {"Cache-Control", "no-store"}};
+  HttpReply reply = ToPage("/");
+  reply.fields.emplace_back("Set-Cookie", NewSessionCookie(id));
   return reply;
 }
 

@@ -104,7 +104,8 @@ constexpr char kComponents[] = R"({
     "Error": {"type": "object", "required": ["code", "error"], "properties": {
       "code": {"type": "integer"}, "error": {"type": "string"}}},
     "File": {"type": "object", "required": ["name", "path", "is_dir"], "properties": {
-      "name": {"type": "string"}, "path": {"type": "string"}, "is_dir": {"type": "boolean"},
+      "name": {"type": "string"}, "path": {"type": "string"},
+      "path_encoded": {"type": "string"}, "is_dir": {"type": "boolean"},
       "real_path": {"type": "string"}, "size": {"type": "integer"}, "type": {"type": "string"},
       "owner": {"type": "object"}, "time": {"type": "object"}, "perm": {"type": "object"}}}
   },

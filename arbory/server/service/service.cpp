@@ -3,6 +3,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <charconv>
 
 #include "arbory/caller.h"
@@ -12,11 +13,13 @@
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/past_searches.h"
+#include "arbory/server/service/row_addresses.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/children.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 #include "nas/system/child.h"
 
 namespace arbory {
@@ -48,6 +51,19 @@ auto ReaderOf(const std::string& body) {
     *params = std::move(*read);
     return std::nullopt;
   };
+}
+
+constexpr char kBadAddress[] = "This address is not well-formed; check its path.";
+
+// A file's name may hold any bytes but NUL; nothing else that is named here has such names.
+bool NamesFile(const Route& route) {
+  return std::string_view(route.pattern).ends_with("{path...}");
+}
+
+bool HasControls(const RequestPath& path) {
+  return std::ranges::any_of(path, [](const std::string& part) {
+    return std::ranges::any_of(part, [](char byte) { return nas::IsControl(byte); });
+  });
 }
 
 bool IsLeased(const HttpRequest& request) { return request.Field("arbory-lease") != nullptr; }
@@ -193,9 +209,11 @@ Answer Service::Handle(HttpRequest* request) {
   if (!host_trouble.empty()) return ErrorReply(kForbidden, host_trouble);
   const auto path = SplitPath(request->path());
   if (!path) {
-    return ErrorReply(kBadRequest, "This address is not well-formed; check its path.");
+    return ErrorReply(kBadRequest, kBadAddress);
   }
   const FoundRoute found = FindRoute(Routes(), request->method, *path);
+  const bool by_bytes = found.route != nullptr && NamesFile(*found.route);
+  if (!by_bytes && HasControls(*path)) return ErrorReply(kBadRequest, kBadAddress);
   if (found.route == nullptr) return NotAllowedReply(found.allowed);
   if (auto refusal = Refusal(*found.route, request)) return std::move(*refusal);
   return found.route->handler(*this, request, *path);
@@ -286,7 +304,7 @@ Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
         // The id is the key to the account, which no log line of the module needs to hold whole.
         constexpr size_t kShown = 8;
         call.session = session.substr(0, kShown);
-        return nas::StartCall(*row, call, nas::EncodeJsonReply);
+        return nas::StartCall(*row, call, EncodeWithAddresses);
       });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {
     child->make_reply = [make = std::move(child->make_reply)](const nas::ReplyHead* head) {

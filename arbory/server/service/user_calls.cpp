@@ -13,6 +13,7 @@
 #include "arbory/options.h"
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
+#include "arbory/server/service/row_addresses.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
 #include "nas/match/meant_query.h"
@@ -142,6 +143,7 @@ void InstantEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
     const auto answer = nas::AskInstantly(locations, criteria.root, recursive, kInstantRows);
     if (answer) {
       body = nas::InstantJson(*answer, locations);
+      AddAddresses(&body["rows"]);
     } else {
       body["wrong"]["criterion"] = "pattern";
       body["wrong"]["sentence"] = answer.error().path;

@@ -37,7 +37,7 @@ std::optional<std::string> Decoded(std::string_view text) {
 bool IsPlainSegment(const std::string& segment) {
   return !segment.empty() && segment != "." && segment != ".." &&
          std::none_of(segment.begin(), segment.end(),
-                      [](char byte) { return byte == '/' || nas::IsControl(byte); });
+                      [](char byte) { return byte == '/' || byte == '\0'; });
 }
 
 // The characters that turn the direction of what follows, each replaced by "_".

@@ -17,9 +17,9 @@
 namespace arbory {
 
 // The segments of a path, decoded once; none for "/". Nothing when it does not begin with "/", or a
-// segment is empty, even a final one, "." or "..", or holds after decoding a "/", a control
-// character or an incomplete escape: none may mean another place than it seems to, and a proxy's
-// rule for "/metrics" must not be passed by as "/metrics/".
+// segment is empty, even a final one, "." or "..", or holds after decoding a "/" or a NUL, or
+// an incomplete escape: none may mean another place than it seems to, and a proxy's rule for
+// "/metrics" must not be passed by as "/metrics/". They may hold any other byte, as names do.
 std::optional<std::vector<std::string>> SplitPath(std::string_view path);
 // The value of a parameter in a query; nothing when it is not there or badly encoded.
 std::optional<std::string> QueryValue(std::string_view query, std::string_view name);

@@ -2,6 +2,7 @@
 import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
   Begun,
+  FileRow,
   HistoryKind,
   InstantAnswer,
   Misses,
@@ -124,10 +125,23 @@ export const getShares = () => request('shares') as Promise<Shares>;
 export const logIn = (user: string, password: string) => post('login', { user, password });
 export const logOut = () => post('logout', { stop_searches: true });
 
-// Where a listed file is fetched from; `path` is as listed, "/SHARE/below".
-export function fileAddress(path: string, preview = false): string {
-  const segments = path.replace(/^\/+/, '').split('/').map(encodeURIComponent).join('/');
-  return `files/${segments}${preview ? '?preview=1' : ''}`;
+type Listed = Pick<FileRow, 'path' | 'path_encoded'>;
+
+// Where a listed file is fetched from.
+export function fileAddress({ path, path_encoded }: Listed, preview = false): string {
+  const segments = path_encoded ?? path.split('/').map(encodeURIComponent).join('/');
+  return `files/${segments.replace(/^\/+/, '')}${preview ? '?preview=1' : ''}`;
+}
+
+// Whether the file can be fetched, before a browser is sent for it, which would not say why not.
+// Rejects with the reason.
+export async function checkFile(row: Listed): Promise<void> {
+  const address = fileAddress(row);
+  const init: RequestInit = { method: 'HEAD', credentials: 'same-origin', cache: 'no-store' };
+  const looked = await fetch(address, init).catch(() => null);
+  if (looked?.ok) return;
+  // That has no words; these have.
+  await request(address, { headers: { Range: 'bytes=0-0' } });
 }
 
 export function zipAddress(taskid: string, rows: string, order: ListOrder): string {

@@ -2,6 +2,7 @@
 export interface FileRow {
   name: string;
   path: string;
+  path_encoded?: string; // of one that is no text, in its bytes
   is_dir: boolean;
   size?: number;
   type?: string;
@@ -57,7 +58,7 @@ export interface Begun {
 export type InstantAnswer =
   | {
       index: string; // "current", or a few words why it does not answer
-      rows: { path: string; name: string; is_dir: boolean; size: number; mtime: number }[];
+      rows: { path: string; path_encoded?: string; name: string; is_dir: boolean; size: number; mtime: number }[];
       found: number; // matches looked up
       more: boolean; // there may be more
       wrong?: undefined;

@@ -49,16 +49,17 @@ export function visible(text: string): string {
   return text.replace(UNSEEN, signFor);
 }
 
-// Why the file of a path cannot be asked for, as a sentence; empty when it can. Where the server
-// could not tell a name as text its real bytes are not known here, and it takes no control
-// characters in an address.
-export function whyNotFetched(path: string): string {
-  const held = path.includes('\ufffd')
-    ? 'bytes that are not text'
-    : /[\u0000-\u001f\u007f]/.test(path)
-      ? 'control characters'
-      : '';
-  return held && `This path holds ${held}, so it cannot be fetched from here. Rename it to reach it.`;
+// A path to paste elsewhere: as it is, or where that would be no text, or would do more than stand
+// there, as a word for a shell.
+export function copied({ path, path_encoded }: { path: string; path_encoded?: string }): string {
+  if (!path_encoded && !/[\u0000-\u001f\u007f]/.test(path)) return path;
+  const bytes = path_encoded
+    ? path_encoded.replace(/%(..)/g, (_, hex: string) => String.fromCharCode(parseInt(hex, 16)))
+    : path;
+  const escape = (c: string) =>
+    /['\\]/.test(c) ? '\\' + c : `\\x${c.charCodeAt(0).toString(16).padStart(2, '0')}`;
+  const unseen = path_encoded ? /[^ -~]|['\\]/g : /[\u0000-\u001f\u007f'\\]/g;
+  return `$'${bytes.replace(unseen, escape)}'`;
 }
 
 const counts = new Intl.NumberFormat('en');

@@ -25,9 +25,16 @@ import { Trail, type Step } from './trail.ts';
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
 
 const NOTICE_MS = 4000;
+const READING_MS = 80; // a letter of a longer one
 const PLACED_MS = 250;
 // As folders are looked through.
 const FOLDER_SORT: Sort = { column: 'name', descending: false };
+// What was asked for when the session ended, for the page that the next address opens.
+const RESUMED = 'resumed';
+// Where the server leads whoever opens a used address.
+const USED = '?used';
+// Asked again whether the server answers.
+const RETRY_MS = 5000;
 
 export class App {
   gate: Gate = 'loading';
@@ -46,6 +53,8 @@ export class App {
   detailed: FileRow | null = null; // the row shown beside the table
   notice = '';
   problem = ''; // why the page cannot work, when it cannot
+  ended = false; // the session, while the page was in use
+  readonly used = location.search === USED; // it was reached by an address that had been used
   // The search before, while the server reads what the present one asks for.
   private standing: Search | null | undefined;
   private readonly trail = new Trail();
@@ -80,8 +89,11 @@ export class App {
   async open(): Promise<void> {
     try {
       const [session, { shares, homes }] = await Promise.all([client.getSession(), client.getShares()]);
-      Object.assign(this, { session, shares, homes, gate: 'ready', problem: '' });
+      const same = this.ended && this.session?.user === session.user ? this.draft : null;
+      Object.assign(this, { session, shares, homes, gate: 'ready', problem: '', ended: false });
+      this.resume();
       this.followAddress();
+      if (same && !sameCriteria(same, this.draft)) this.edit(same);
       void this.past.load();
     } catch (error) {
       this.closeGate(error);
@@ -89,17 +101,31 @@ export class App {
     this.changed();
   }
 
+  // The address of what was asked for in a session that ended, or as it is.
+  private resume(): void {
+    const hash = recall(RESUMED);
+    remember(RESUMED, '');
+    if (hash && !location.hash) history.replaceState(null, '', location.pathname + hash);
+    else if (location.search) history.replaceState(null, '', location.pathname + location.hash);
+  }
+
   private closeGate(error: unknown): void {
     this.closeSearches();
     if (error instanceof ApiError && error.signedOut) {
+      const { session, draft } = this;
+      this.ended ||= session !== null;
       this.gate = error.mode === 'single' ? 'open-address' : 'sign-in';
+      // The same person's in any case; where others may sign in, it stays in this tab.
+      const kept = this.ended && session?.mode === 'single' && !sameCriteria(draft, NO_CRITERIA);
+      if (kept) remember(RESUMED, toHash({ criteria: draft, sort: parseSort(recall('sort')) }));
     } else {
+      setTimeout(() => this.gate === 'unreachable' && void this.open(), RETRY_MS);
       this.gate = 'unreachable';
       this.problem = error instanceof Error ? error.message : String(error);
     }
   }
 
-  private signedOut = (): void => {
+  signedOut = (): void => {
     // Asks the server how to sign in here, and shows that.
     void this.open();
   };
@@ -380,7 +406,8 @@ export class App {
   // A short word at the edge of the page.
   tell(notice: string): void {
     clearTimeout(this.noticeTimer);
-    this.noticeTimer = window.setTimeout(() => this.set({ notice: '' }), NOTICE_MS);
+    const pause = Math.max(NOTICE_MS, notice.length * READING_MS);
+    this.noticeTimer = window.setTimeout(() => this.set({ notice: '' }), pause);
     this.set({ notice });
   }
 }

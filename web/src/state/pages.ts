@@ -7,6 +7,8 @@ export const PAGE_ROWS = 200;
 // Some 100 bytes a row: a few megabytes, and enough to scroll back without waiting.
 const KEPT_PAGES = 80;
 const REQUESTS = 2;
+// A page that could not be fetched is asked for again so much later.
+const RETRY_MS = 2000;
 
 type Fetch = (offset: number, limit: number, signal: AbortSignal) => Promise<Page>;
 
@@ -29,6 +31,7 @@ export class Pages {
   private abort = new AbortController();
   private opened = false;
   private closed = false;
+  private resting = false;
 
   constructor(
     private readonly fetchPage: Fetch,
@@ -93,7 +96,7 @@ export class Pages {
   }
 
   private pump(): void {
-    while (this.opened && !this.closed && this.flying.size < REQUESTS) {
+    while (this.opened && !this.closed && !this.resting && this.flying.size < REQUESTS) {
       const page = this.wanted().find((number) => this.needs(number));
       if (page === undefined) return;
       void this.fetch(page);
@@ -127,8 +130,17 @@ export class Pages {
     } catch (error) {
       if (signal.aborted) return;
       this.flying.delete(number);
+      this.rest();
       this.failed(error);
     }
+  }
+
+  private rest(): void {
+    this.resting = true;
+    setTimeout(() => {
+      this.resting = false;
+      this.pump();
+    }, RETRY_MS);
   }
 
   private keep(number: number, page: Page, outgrown: boolean): void {

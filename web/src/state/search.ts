@@ -31,7 +31,8 @@ const wait = (ms: number) => new Promise((done) => setTimeout(done, ms));
 
 export class Search {
   status: Status = 'starting';
-  error = '';
+  error = ''; // why it failed, or ended early
+  trouble = ''; // why rows that are wanted are not there, for as long as that is so
   walk: Walk = {
     phase: 'names',
     folders: 0,
@@ -60,7 +61,11 @@ export class Search {
     private readonly signedOut: () => void,
   ) {
     this.pages = new Pages(
-      (offset, limit, signal) => this.list(offset, limit, signal),
+      async (offset, limit, signal) => {
+        const page = await this.list(offset, limit, signal);
+        this.trouble = '';
+        return page;
+      },
       changed,
       (error) => this.pageFailed(error),
     );
@@ -184,9 +189,7 @@ export class Search {
       this.filterWrong = true;
       return this.changed();
     }
-    // A running search asks again with its next progress; only the end is final, and of one that
-    // failed it is said why.
-    if (this.over && this.status !== 'failed') this.error = error instanceof Error ? error.message : String(error);
+    if (this.status !== 'failed') this.trouble = error instanceof Error ? error.message : String(error);
     this.changed();
   }
 

@@ -6,7 +6,7 @@ import type { FileRow } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
 import { previewKind, readStart, type TextStart } from '../model/preview.ts';
 import { formatSize } from '../model/size.ts';
-import { count, folderOf, visible, whyNotFetched } from '../model/text.ts';
+import { count, folderOf, visible } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
 import type { App } from '../state/app.ts';
 import { Icon } from './icons.tsx';
@@ -25,7 +25,6 @@ export function Details({ app, row, pattern, actions }: Props) {
     app.hideDetails();
     document.querySelector<HTMLElement>('.table')?.focus();
   };
-  const barred = row.is_dir ? '' : whyNotFetched(row.path);
   return (
     <aside class="details" aria-label={`About ${visible(row.name)}`} onKeyDown={(event) => event.key === 'Escape' && close()}>
       <header>
@@ -36,20 +35,20 @@ export function Details({ app, row, pattern, actions }: Props) {
           <Icon name="close" size={15} />
         </button>
       </header>
-      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} barred={barred !== ''} />}
+      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} />}
       <div class="actions">
         {row.is_dir && (
           <button type="button" class="tool" onClick={() => app.browse(row.path)}>
             <Icon name="folder" size={14} /> Open
           </button>
         )}
-        {!row.is_dir && !barred && (
+        {!row.is_dir && (
           <button type="button" class="tool" onClick={() => actions.download(row)}>
             <Icon name="download" size={14} /> Download
           </button>
         )}
-        {!row.is_dir && !barred && previewKind(row.name) !== 'none' && (
-          <a class="tool" href={fileAddress(row.path, true)} target="_blank" rel="noopener">
+        {!row.is_dir && previewKind(row.name) !== 'none' && (
+          <a class="tool" href={fileAddress(row, true)} target="_blank" rel="noopener">
             <Icon name="open" size={14} /> Open
           </a>
         )}
@@ -66,7 +65,6 @@ export function Details({ app, row, pattern, actions }: Props) {
           </button>
         )}
       </div>
-      {barred && <p class="hint">{barred}</p>}
       <Facts row={row} />
     </aside>
   );
@@ -106,16 +104,16 @@ function sizeFact(size: number): string {
   return size < 1000 ? `${size} bytes` : `${formatSize(size)} (${count(size)} bytes)`;
 }
 
-function Preview({ row, pattern, barred }: { row: FileRow; pattern: string; barred: boolean }) {
+function Preview({ row, pattern }: { row: FileRow; pattern: string }) {
   const [failed, setFailed] = useState(false);
-  const kind = barred ? 'none' : previewKind(row.name);
+  const kind = previewKind(row.name);
   if (kind === 'none' || row.size === 0) {
     return <p class="nopreview">{row.size === 0 ? 'Empty file' : 'No preview'}</p>;
   }
   if (failed) {
     return <p class="nopreview">This file cannot be shown: it may be gone, closed to you, or damaged.</p>;
   }
-  const address = fileAddress(row.path, true);
+  const address = fileAddress(row, true);
   if (kind === 'image') {
     return (
       <div class="preview">

@@ -12,6 +12,13 @@ export function Gate({ app }: { app: App }) {
       {app.gate === 'open-address' && (
         <>
           <h1>Open the printed address</h1>
+          {app.ended && (
+            <p role="alert">
+              Your session has ended. What you were looking for is kept, and searched for again once
+              you are back.
+            </p>
+          )}
+          {app.used && !app.ended && <p role="alert">The address that brought you here has been used before.</p>}
           <p>
             This page belongs to whoever started the server. Open the address that{' '}
             <code>arbory serve</code> printed when it started: it ends with a token that lets you in.
@@ -55,6 +62,7 @@ function SignIn({ app }: { app: App }) {
   return (
     <form onSubmit={(event) => void submit(event)}>
       <h1>Sign in</h1>
+      {app.ended && <p role="alert">Your session has ended. Your search is kept, and goes on once you are back.</p>}
       <label class="labelled">
         <span>User</span>
         <input ref={first} name="user" autocomplete="username" autocapitalize="none" spellcheck={false} required />

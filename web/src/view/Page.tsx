@@ -1,10 +1,11 @@
 // The page as a whole, and what the keyboard does anywhere on it.
 import { useEffect, useMemo, useState } from 'preact/hooks';
-import { fileAddress } from '../api/client.ts';
+import { checkFile, fileAddress } from '../api/client.ts';
+import { ApiError } from '../api/errors.ts';
 import type { FileRow } from '../api/types.ts';
 import { browses, type CriterionError } from '../model/criteria.ts';
 import { previewKind } from '../model/preview.ts';
-import { plural, visible, whyNotFetched } from '../model/text.ts';
+import { copied, plural, visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import { chosenRows, downloadRows } from '../state/chosen.ts';
 import { copyText, follow } from '../state/save.ts';
@@ -105,9 +106,9 @@ function Result({ app, actions }: { app: App; actions: RowActions }) {
     <main>
       {browses(search.criteria) && <Crumbs app={app} folder={search.criteria.folders[0]!} />}
       {!failed && <StatusLine app={app} search={search} actions={actions} />}
-      {search.error && !failed && (
+      {(search.error || search.trouble) && !failed && (
         <p class="wrong band" role="alert">
-          {search.error}
+          {search.error || search.trouble}
         </p>
       )}
       {failed && <Failed app={app} search={search} />}
@@ -201,6 +202,11 @@ function pageKey(app: App, event: KeyboardEvent, help: () => void): void {
 }
 
 function rowActions(app: App): RowActions {
+  const whenReadable = (row: FileRow, act: () => void) =>
+    void checkFile(row).then(act, (error: unknown) => {
+      if (error instanceof ApiError && error.signedOut) app.signedOut();
+      else app.tell(error instanceof Error ? error.message : String(error));
+    });
   const downloadChosen = async ({ choice }: Shown) => {
     if (!(app.shown instanceof Search)) return app.tell('Press Enter first, to have them all found.');
     const refused = await downloadRows(app.shown, choice.spans);
@@ -213,27 +219,26 @@ function rowActions(app: App): RowActions {
   };
   const downloadOne = (row: FileRow) => {
     if (row.is_dir) app.tell('A folder cannot be downloaded. Search in it, and download its files.');
-    else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
-    else follow(fileAddress(row.path), row.name);
+    else whenReadable(row, () => follow(fileAddress(row), row.name));
   };
   return {
     download,
     open: (row) => {
       if (row.is_dir) app.browse(row.path);
-      else if (whyNotFetched(row.path)) app.tell(whyNotFetched(row.path));
       else if (previewKind(row.name) === 'none') downloadOne(row);
-      else window.open(fileAddress(row.path, true), '_blank', 'noopener');
+      else whenReadable(row, () => window.open(fileAddress(row, true), '_blank', 'noopener'));
     },
     copy: async (row) => {
       const { shown } = app;
       const chosen = shown !== null && shown.choice.count > 0;
-      const text = chosen
-        ? (await chosenRows(shown, shown.choice.spans)).map(({ path }) => path).join('\n')
-        : row?.path;
-      if (text === undefined) return;
-      const done = await copyText(text);
-      const what = chosen ? plural(shown.choice.count, 'path') + ' copied.' : 'The path is copied.';
-      app.tell(done ? what : 'The browser did not let it be copied.');
+      const rows = chosen ? await chosenRows(shown, shown.choice.spans) : row ? [row] : [];
+      if (rows.length === 0) return;
+      const done = await copyText(rows.map(copied).join('\n'));
+      const quoted = rows.some((one) => copied(one) !== one.path);
+      const what = chosen ? `${plural(rows.length, 'path')} copied` : 'The path is copied';
+      if (!done) app.tell('The browser did not let it be copied.');
+      else if (quoted) app.tell(`${what} as a shell writes it: it holds bytes that are no text.`);
+      else app.tell(`${what}.`);
     },
   };
 }
