@@ -53,7 +53,9 @@ int fuzz::Target(std::string_view text) {
   const bool read = nas::ParseJson(text, &value);
   if (!read) DEMAND(value == untouched);
   Json::Value other;
-  if (ReadStrictly(text, &other) && text.find('/') == std::string_view::npos) {
+  // It takes comments, and a NUL in a string, which JSON has not.
+  const bool beyond = text.find_first_of(std::string_view("/\0", 2)) != std::string_view::npos;
+  if (ReadStrictly(text, &other) && !beyond) {
     DEMAND(read && value == other);
   }
   if (!read) return fuzz::kUsed;
