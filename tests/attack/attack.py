@@ -63,13 +63,13 @@ def commit(top):
 
 
 def write_row(top, name, campaign, outcome):
-    """Puts the campaign's row in the place of its older one, else at the table's end."""
+    """Puts the campaign's row in the place of its older one, else behind those of the others."""
     path = pathlib.Path(top, "docs/reliability.md")
     mark = f"| `scripts/attack {name}`: "
     row = (f"| {campaign.PROMISE} {mark}{campaign.ATTACK} | {outcome.measured()} | "
            f"{commit(top)} |")
     lines = path.read_text().splitlines()
-    rows = [number for number, line in enumerate(lines) if line.startswith("|")]
+    rows = [number for number, line in enumerate(lines) if "| `scripts/attack " in line]
     own = [number for number in rows if mark in lines[number]]
     if own:
         lines[own[0]] = row
