@@ -132,6 +132,7 @@ test('what was found is narrowed while one types, and columns are chosen', async
   await page.getByRole('button', { name: 'Columns' }).click();
   for (const name of ['Owner', 'Created']) await page.getByRole('checkbox', { name }).check();
   await page.getByRole('checkbox', { name: 'Type' }).uncheck();
+  await page.getByRole('checkbox', { name: 'Small pictures' }).check();
   await page.keyboard.press('Escape');
   assert.deepEqual(await heads(), ['Name', 'Folder', 'Size', 'Modified', 'Created', 'Owner']);
   const owner = execFileSync('stat', ['-c', '%U', join(place.root, 'files/plans/plan large.txt')], { encoding: 'utf8' }).trim();
@@ -144,5 +145,7 @@ test('what was found is narrowed while one types, and columns are chosen', async
   await page.setViewportSize({ width: 720, height: 700 });
   await page.waitForFunction(() => document.querySelectorAll('[role=columnheader]').length < 6);
   assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 720);
+  await page.goto(`${server.origin}/#q=view.png`);
+  await page.waitForFunction(() => document.querySelector<HTMLImageElement>('#row-0 .thumbnail')?.naturalWidth === 1);
   await tab.close();
 });

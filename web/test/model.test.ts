@@ -7,6 +7,7 @@ import { fromHash, toHash, type Address } from '../src/model/address.ts';
 import { begun, contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, type Criteria, type StartParams } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
+import { smallPicture } from '../src/model/exif.ts';
 import { excludesOf, withExclude, withoutExclude } from '../src/model/excludes.ts';
 import { addressOf, offered, titleOf } from '../src/model/history.ts';
 import { formatSize } from '../src/model/size.ts';
@@ -152,6 +153,38 @@ test('what is left out is a term of the query, put in and taken out', () => {
     assert.deepEqual(excludesOf(pattern), names, pattern);
     assert.equal(withExclude(pattern, '.git'), more, pattern);
     assert.equal(withoutExclude(pattern, 'a'), less, pattern);
+  }
+});
+
+test('the small picture of a photo is found, and nothing beyond the bytes there are', () => {
+  // A JPEG with another block before the one that counts; `little`: the order of bytes in that.
+  const photo = (little: boolean, from: number, length: number) => {
+    const tiff = Buffer.alloc(64);
+    const short = (at: number, n: number) => (little ? tiff.writeUInt16LE(n, at) : tiff.writeUInt16BE(n, at));
+    const long = (at: number, n: number) => (little ? tiff.writeUInt32LE(n, at) : tiff.writeUInt32BE(n, at));
+    tiff.write(little ? 'II' : 'MM');
+    long(4, 8); // the first directory: nothing in it, and where the next is
+    long(10, 14);
+    short(14, 2);
+    [[0x0201, from], [0x0202, length]].forEach(([tag, value], i) => (short(16 + 12 * i, tag!), long(24 + 12 * i, value!)));
+    Buffer.from([0xff, 0xd8, 7, 7, 0xff, 0xd9]).copy(tiff, 50);
+    const exif = Buffer.concat([Buffer.from('Exif\0\0'), tiff]);
+    return Buffer.concat([Buffer.from([0xff, 0xd8, 0xff, 0xe0, 0, 4, 1, 1, 0xff, 0xe1, 0, exif.length + 2]), exif, Buffer.from([0xff, 0xda])]);
+  };
+  const rows: [string, Buffer, number | null][] = [
+    ['little-endian', photo(true, 50, 6), 6],
+    ['big-endian', photo(false, 50, 6), 6],
+    ['longer than what there is', photo(true, 50, 60), null],
+    ['far away', photo(true, 2 ** 32 - 1, 6), null],
+    ['no picture there', photo(true, 20, 6), null],
+    ['empty', photo(true, 50, 0), null],
+    ['no JPEG', Buffer.from('GIF89a'), null],
+  ];
+  for (const [why, bytes, length] of rows) assert.equal(smallPicture(bytes)?.length ?? null, length, why);
+  const whole = photo(false, 50, 6);
+  for (let cut = 0; cut < whole.length; ++cut) smallPicture(whole.subarray(0, cut));
+  for (let at = 0; at < whole.length; ++at) {
+    for (const value of [0, 0xff]) smallPicture(Buffer.from(whole.map((byte, i) => (i === at ? value : byte))));
   }
 });
 

@@ -20,6 +20,7 @@ import { recall, remember } from './memory.ts';
 import { Past } from './past.ts';
 import { firstPage, Search } from './search.ts';
 import type { Shown } from './shown.ts';
+import { Thumbnails } from './thumbnails.ts';
 import { Trail, type Step } from './trail.ts';
 
 export type Gate = 'loading' | 'sign-in' | 'open-address' | 'unreachable' | 'ready';
@@ -48,6 +49,8 @@ export class App {
   readonly past: Past;
   unfolded = false;
   columns = parseColumns(recall('columns'));
+  pictures = recall('pictures') === 'shown';
+  readonly thumbnails: Thumbnails;
   choosing = false; // a tap chooses a row and does not open it
   active = -1; // the row the keyboard is at
   detailed: FileRow | null = null; // the row shown beside the table
@@ -64,6 +67,7 @@ export class App {
 
   constructor(private readonly draw: () => void) {
     this.instant = new Instant(this.changed, this.signedOut);
+    this.thumbnails = new Thumbnails(this.changed);
     this.past = new Past(() => this.everywhere, this.changed, this.failed);
     addEventListener('popstate', () => this.followAddress());
     addEventListener('pagehide', () => this.closeSearches());
@@ -150,6 +154,11 @@ export class App {
     const words = shown ? [...this.columns, column] : this.columns.filter((one) => one !== column);
     remember('columns', words.join());
     this.set({ columns: parseColumns(words.join()) });
+  }
+
+  showPictures(shown: boolean): void {
+    remember('pictures', shown ? 'shown' : '');
+    this.set({ pictures: shown });
   }
 
   // The table that is shown.

@@ -32,7 +32,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   const { choice } = search;
   const { spans } = choice;
   const rows = search.found;
-  const { rowHeight, viewport, width } = useMeasures(scroller);
+  const { rowHeight, viewport, width } = useMeasures(scroller, app.pictures);
   const columns = useMemo(() => fittingColumns(app.columns, width), [app.columns, width]);
   const returns = useRef(0);
   if (model.resize({ rows, rowHeight, viewport })) ++returns.current;
@@ -124,6 +124,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
     },
     [app, search, goTo],
   );
+  const pictureOf = (row: FileRow | undefined) => (app.pictures && row ? app.thumbnails.of(row) : null);
   const first = Math.max(0, model.first - OVERSCAN);
   const last = Math.min(rows - 1, model.last + OVERSCAN);
   const indexes = Array.from({ length: Math.max(0, last - first + 1) }, (_, i) => first + i);
@@ -131,7 +132,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   return (
     <div
       ref={root}
-      class="table"
+      class={`table ${app.pictures ? 'with-pictures' : ''}`}
       role="grid"
       tabIndex={0}
       aria-label="Results"
@@ -166,6 +167,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
               active={index === app.active}
               chosen={holds(spans, index)}
               columns={columns}
+              picture={pictureOf(search.pages.row(index))}
               highlighter={highlighter}
               choose={onClick}
               open={actions.open}
@@ -215,7 +217,7 @@ function Head({ app, search, columns }: { app: App; search: Shown; columns: read
 }
 
 // The height of a row is the style sheet's to say; it differs on a phone.
-function useMeasures(scroller: { current: HTMLElement | null }) {
+function useMeasures(scroller: { current: HTMLElement | null }, pictures: boolean) {
   const [measures, setMeasures] = useState({ rowHeight: 30, viewport: 600, width: 1000 });
   useLayoutEffect(() => {
     const element = scroller.current!;
@@ -232,7 +234,7 @@ function useMeasures(scroller: { current: HTMLElement | null }) {
     const observer = new ResizeObserver(measure);
     observer.observe(element);
     return () => observer.disconnect();
-  }, []);
+  }, [pictures]);
   return measures;
 }
 

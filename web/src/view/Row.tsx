@@ -6,6 +6,7 @@ import type { Highlighter } from '../model/highlight.ts';
 import { formatSize } from '../model/size.ts';
 import { folderOf, visible } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
+import type { Thumbnail } from '../state/thumbnails.ts';
 import type { Column } from './columns.ts';
 import { Icon, iconOf } from './icons.tsx';
 import { Name, Path } from './Name.tsx';
@@ -17,12 +18,13 @@ interface Props {
   active: boolean;
   chosen: boolean;
   columns: readonly Column[];
+  picture: Thumbnail | undefined; // null: none is shown
   highlighter: Highlighter;
   choose: (event: MouseEvent, index: number, row: FileRow) => void;
   open: (row: FileRow) => void;
 }
 
-function DrawnRow({ index, top, row, active, chosen, columns, highlighter, choose, open }: Props) {
+function DrawnRow({ index, top, row, active, chosen, columns, picture, highlighter, choose, open }: Props) {
   return (
     <div
       id={`row-${index}`}
@@ -34,21 +36,22 @@ function DrawnRow({ index, top, row, active, chosen, columns, highlighter, choos
       onClick={(event) => row && choose(event, index, row)}
       onDblClick={(event) => row && !event.ctrlKey && !event.metaKey && !event.shiftKey && open(row)}
     >
-      {row ? <Cells row={row} chosen={chosen} columns={columns} highlighter={highlighter} /> : <div class="cell name" role="gridcell">…</div>}
+      {row ? <Cells row={row} chosen={chosen} columns={columns} picture={picture} highlighter={highlighter} /> : <div class="cell name" role="gridcell">…</div>}
     </div>
   );
 }
 
-type CellsProps = Pick<Props, 'chosen' | 'columns' | 'highlighter'> & { row: FileRow };
+type CellsProps = Pick<Props, 'chosen' | 'columns' | 'picture' | 'highlighter'> & { row: FileRow };
 
-function Cells({ row, chosen, columns, highlighter }: CellsProps) {
+function Cells({ row, chosen, columns, picture, highlighter }: CellsProps) {
   return (
     <>
       {columns.map(({ column }) => (
         <div class={`cell ${column}`} role="gridcell" key={column} title={titleOf(row, column)}>
           {column === 'name' ? (
             <>
-              <Icon name={chosen ? 'check' : iconOf(row.name, row.is_dir)} />
+              {(chosen || !picture) && <Icon name={chosen ? 'check' : iconOf(row.name, row.is_dir)} />}
+              {picture && <img class="thumbnail" src={picture} alt="" decoding="async" />}
               <span class="ellipsis">
                 <Name text={row.name} ranges={highlighter.ranges(row.name)} />
               </span>
@@ -98,6 +101,7 @@ export const Row = memo(
     a.active === b.active &&
     a.chosen === b.chosen &&
     a.columns === b.columns &&
+    a.picture === b.picture &&
     a.index === b.index &&
     a.highlighter === b.highlighter,
 );

@@ -98,8 +98,8 @@ function Narrow({ search }: { search: Search }) {
 function ColumnChoice({ app }: { app: App }) {
   return (
     <Popover className="tool columnchoice" panelClass="menu right" panelLabel="Columns" title="Columns" label={<Icon name="columns" size={14} />}>
-      {() =>
-        COLUMNS.slice(1).map(({ column, title }) => (
+      {() => [
+        ...COLUMNS.slice(1).map(({ column, title }) => (
           <label class="choice" key={column}>
             <input
               type="checkbox"
@@ -108,8 +108,16 @@ function ColumnChoice({ app }: { app: App }) {
             />
             {title}
           </label>
-        ))
-      }
+        )),
+        <label class="choice pictures" key="pictures">
+          <input
+            type="checkbox"
+            checked={app.pictures}
+            onChange={(event) => app.showPictures(event.currentTarget.checked)}
+          />
+          Small pictures
+        </label>,
+      ]}
     </Popover>
   );
 }
