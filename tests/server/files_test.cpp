@@ -175,6 +175,48 @@ TEST_F(FilesTest, RowsOfASearchComeAsOneArchiveThatTellsItsEnd) {
   }
 }
 
+TEST_F(FilesTest, TheTextAroundALineIsReadInAnyEncoding) {
+  std::string lines;
+  for (int i = 1; lines.size() < 400'000; ++i) lines += "line " + std::to_string(i) + "\n";
+  WriteFile(share_ + "/late.txt", lines + "the needle\n" + lines);
+  WriteFile(share_ + "/latin.txt",
+            "Stra\xdf"
+            "e und \xc4pfel, sch\xf6ne Gr\xfc\xdf"
+            "e aus K\xf6ln\nzwei\n");
+  WriteFile(share_ + "/wide.txt", std::string("\xff\xfe"
+                                              "a\0b\0\n\0n\0\xe9\0",
+                                              12));
+  WriteFile(share_ + "/one.txt", std::string(300'000, 'x') + "\nneedle");
+  WriteFile(share_ + "/data.bin", std::string("a\0b", 3));
+  Server server = Start();
+  server.Open();
+  const struct {
+    const char* file;
+    const char* pattern;
+    int first_line;  // at least
+    const char* holds;
+    bool before, after;
+  } rows[] = {
+      {"late.txt", "needle", 30'000, "the needle\nline 1\n", true, true},
+      {"late.txt", "nowhere", 1, "line 1\nline 2\n", false, true},
+      {"latin.txt", "zwei", 1, "Straße und Äpfel", false, false},
+      {"wide.txt", "", 1, "ab\nné", false, false},
+      {"one.txt", "needle", 1, "xxx\nneedle", true, false},
+  };
+  for (const auto& row : rows) {
+    const Json::Value text =
+        server.Get(std::string("/lines/photo/") + row.file + "?text=1&pattern=" + row.pattern)
+            .json()["text"];
+    EXPECT_GE(text["first_line"].asInt(), row.first_line) << row.file;
+    EXPECT_NE(text["text"].asString().find(row.holds), std::string::npos) << row.file;
+    EXPECT_LE(text["text"].asString().size(), 128U << 10) << row.file;
+    EXPECT_EQ(text["before"].asBool(), row.before) << row.file;
+    EXPECT_EQ(text["after"].asBool(), row.after) << row.file;
+  }
+  EXPECT_TRUE(server.Get("/lines/photo/data.bin?text=1&pattern=a").json()["text"].isNull());
+  EXPECT_FALSE(server.Get("/lines/photo/late.txt?pattern=needle").json().isMember("text"));
+}
+
 TEST_F(FilesTest, OnlySafeTypesAreShown) {
   const char* const text = "text/plain; charset=utf-8";
   // Null for an attachment.

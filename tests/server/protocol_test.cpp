@@ -49,8 +49,8 @@ TEST_F(ProtocolTest, HostileTargetsAreRefusedOnEveryRoute) {
       for (const char* method : {"GET", "POST"}) {
         const std::string target = std::string(route) + end;
         const Reply reply = server.Ask(method, target, "", kJson);
-        const bool names_file = std::string_view(route).starts_with("/files/") &&
-                                std::string_view(method) == "GET";
+        const bool names_file =
+            std::string_view(route).starts_with("/files/") && std::string_view(method) == "GET";
         // A name may hold these; there is no such file.
         const std::string_view bytes = end;
         const bool is_name =

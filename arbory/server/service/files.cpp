@@ -15,6 +15,7 @@
 #include "nas/base/json_text.h"
 #include "nas/base/system_call.h"
 #include "nas/match/content_scanner.h"
+#include "nas/match/text_window.h"
 #include "nas/system/child.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
@@ -169,7 +170,22 @@ Json::Value LineJson(const std::optional<nas::MatchingLine>& line) {
   return body;
 }
 
-void ServeFirstLine(const FileRequest& request, const std::string& pattern, int pipe) {
+// What is shown of a text: enough to tell what it is, with the line in sight; more would make the
+// page slow, not the reader wiser.
+void AddText(int file, std::uint64_t line, Json::Value* body) {
+  constexpr size_t kBefore = size_t{16} << 10;
+  constexpr size_t kAfter = size_t{112} << 10;
+  const auto window = nas::TextAround(file, line, kBefore, kAfter);
+  Json::Value& text = (*body)["text"];
+  if (!window) return;
+  text["first_line"] = Json::UInt64{window->first_line};
+  text["before"] = window->before;
+  text["after"] = window->after;
+  text["text"] = window->text;
+}
+
+void ServeFirstLine(const FileRequest& request, const std::string& pattern, bool with_text,
+                    int pipe) {
   constexpr size_t kMostLineBytes = 400;  // more than a row of the page can show
   if (!BecomeForGood(request.user)) {
     return SendError(pipe, kUnavailable, "The server cannot act as this user.");
@@ -182,8 +198,10 @@ void ServeFirstLine(const FileRequest& request, const std::string& pattern, int 
   const int never = 0;
   std::optional<nas::MatchingLine> line;
   if (query) line = nas::ContentScanner(*query, never).FirstLine(file->fd.get(), kMostLineBytes);
-  const std::string body = nas::JsonText(LineJson(line), nas::JsonBytes::kClean);
-  nas::SendReply(pipe, AsChildsReply(JsonReply(kOk, body)));
+  Json::Value body = LineJson(line);
+  if (with_text) AddText(file->fd.get(), line ? line->number : 1, &body);
+  const std::string text = nas::JsonText(body, nas::JsonBytes::kClean);
+  nas::SendReply(pipe, AsChildsReply(JsonReply(kOk, text)));
 }
 
 bool ParseNumber(std::string_view text, std::uint64_t* number) {
@@ -197,8 +215,8 @@ nas::Child StartFile(const FileRequest& request) {
   return nas::StartChild([&](int pipe) { ServeFile(request, pipe); });
 }
 
-nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern) {
-  return nas::StartChild([&](int pipe) { ServeFirstLine(request, pattern, pipe); },
+nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern, bool with_text) {
+  return nas::StartChild([&](int pipe) { ServeFirstLine(request, pattern, with_text, pipe); },
                          nas::CurrentConfig().call_memory_bytes());
 }
 

@@ -26,8 +26,10 @@ nas::Child StartFile(const FileRequest& request);
 
 // Forks the child that looks for the first line of the file that holds what `pattern` asks for:
 // {"line": number, "parts": [text, marked text, text, ...]}, with `line` null where there is none.
-// Refuses a pattern that cannot be understood with 400, files as StartFile does.
-nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern);
+// `with_text`: and {"text": {"first_line", "text", "before", "after"}}, what lies around that line
+// or at the beginning, in whatever encoding the file is; null for what is no text. Refuses a
+// pattern that cannot be understood with 400, files as StartFile does.
+nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern, bool with_text);
 
 // The bytes that a Range field asks for of a file of `size` bytes. Nothing to ask for (no field,
 // several ranges, or none that is understood) gives the whole file; `satisfiable` tells whether the

@@ -364,8 +364,9 @@ Answer Service::GetFirstLine(const HttpRequest& request, const RequestPath& path
   const auto file = FileOf(request, path);
   if (!file) return ErrorReply(kNotFound, "Name a file: /lines/SHARE/PATH.");
   const std::string pattern = QueryValue(request.query(), "pattern").value_or("");
+  const bool with_text = QueryValue(request.query(), "text").value_or("") == "1";
   return calls_.Run(Calls::Kind::kCall, request.user, "lines",
-                    [&] { return StartFirstLine(*file, pattern); });
+                    [&] { return StartFirstLine(*file, pattern, with_text); });
 }
 
 Answer Service::GetArchive(const HttpRequest& request, const std::string& task_id) {

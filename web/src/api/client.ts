@@ -3,6 +3,7 @@ import { ApiError, asSentence, callFailure, UNREACHABLE } from './errors.ts';
 import type {
   Begun,
   FileRow,
+  FoundLine,
   HistoryKind,
   InstantAnswer,
   Misses,
@@ -131,6 +132,13 @@ type Listed = Pick<FileRow, 'path' | 'path_encoded'>;
 export function fileAddress({ path, path_encoded }: Listed, preview = false): string {
   const segments = path_encoded ?? path.split('/').map(encodeURIComponent).join('/');
   return `files/${segments.replace(/^\/+/, '')}${preview ? '?preview=1' : ''}`;
+}
+
+// With `text`, what of the file is shown beside the table too.
+export function foundLine(row: Listed, pattern: string, text: boolean, signal: AbortSignal): Promise<FoundLine> {
+  const query = new URLSearchParams({ pattern, ...(text && { text: '1' }) });
+  const address = fileAddress(row).replace(/^files/, 'lines');
+  return request(`${address}?${query}`, { signal }) as Promise<FoundLine>;
 }
 
 // Whether the file can be fetched, before a browser is sent for it, which would not say why not.

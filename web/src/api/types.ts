@@ -65,6 +65,13 @@ export type InstantAnswer =
     }
   | Wrong;
 
+// Where a file's contents hold what a pattern asks for: pieces of the line, every second one found.
+export interface FoundLine {
+  line: number | null;
+  parts: string[];
+  text?: { first_line: number; text: string; before: boolean; after: boolean } | null;
+}
+
 // What a search that found nothing came close to.
 export interface Misses {
   complete: boolean;

@@ -7,6 +7,7 @@ import type { Sort } from '../model/address.ts';
 import { Choice, spansText, type Spans } from '../model/choice.ts';
 import type { Criteria } from '../model/criteria.ts';
 import { ScrollModel } from '../model/scroll.ts';
+import { Lines } from './lines.ts';
 import { PAGE_ROWS, Pages } from './pages.ts';
 
 export type Status = 'starting' | 'running' | 'done' | 'stopped' | 'failed';
@@ -47,6 +48,7 @@ export class Search {
   readonly choice = new Choice(() => this.pages.order);
   filter = ''; // what the rows that are shown fit beside what was asked for
   filterWrong = false;
+  readonly lines?: Lines;
   private taskid = '';
   private closed = false;
   private stopAsked = false;
@@ -60,6 +62,8 @@ export class Search {
     private readonly changed: () => void,
     private readonly signedOut: () => void,
   ) {
+    const { contents, pattern } = criteria;
+    if (contents || /(^|[ |<!])content:/i.test(pattern)) this.lines = new Lines(pattern, changed);
     this.pages = new Pages(
       async (offset, limit, signal) => {
         const page = await this.list(offset, limit, signal);
@@ -240,6 +244,7 @@ export class Search {
     if (this.closed) return;
     this.closed = true;
     this.pages.close();
+    this.lines?.close();
     this.clean();
   }
 

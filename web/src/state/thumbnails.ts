@@ -5,7 +5,7 @@ import { fileAddress } from '../api/client.ts';
 import type { FileRow } from '../api/types.ts';
 import { smallPicture } from '../model/exif.ts';
 import { previewKind } from '../model/preview.ts';
-import { extensionOf, whyNotFetched } from '../model/text.ts';
+import { extensionOf } from '../model/text.ts';
 
 const BEGINNING = 96 * 1024; // holds what cameras write, which is 64 KB at most, and what may stand before
 const WHOLE = 64 * 1024;
@@ -71,7 +71,7 @@ async function load(row: FileRow): Promise<Thumbnail> {
   const isPhoto = /^jpe?g$/.test(extensionOf(row.name));
   if (size === 0 || (size > WHOLE && !isPhoto)) return null;
   const range = { Range: `bytes=0-${BEGINNING - 1}` };
-  const reply = await fetch(fileAddress(row.path, true), {
+  const reply = await fetch(fileAddress(row, true), {
     credentials: 'same-origin',
     headers: size > WHOLE ? range : {},
   });

@@ -1,16 +1,16 @@
 // One result beside the table: a preview where the browser can show it safely, what is known about
 // it, and what can be done with it.
-import { useEffect, useRef, useState } from 'preact/hooks';
-import { fileAddress } from '../api/client.ts';
-import type { FileRow } from '../api/types.ts';
+import { useEffect, useMemo, useRef, useState } from 'preact/hooks';
+import { fileAddress, foundLine } from '../api/client.ts';
+import type { FileRow, FoundLine } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
-import { previewKind, readStart, type TextStart } from '../model/preview.ts';
+import { previewKind, textPieces } from '../model/preview.ts';
 import { formatSize } from '../model/size.ts';
 import { count, folderOf, visible } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
 import type { App } from '../state/app.ts';
 import { Icon } from './icons.tsx';
-import { Name, Path } from './Name.tsx';
+import { FoundText, Name, Path } from './Name.tsx';
 import type { RowActions } from './ResultTable.tsx';
 
 interface Props {
@@ -128,29 +128,49 @@ function Preview({ row, pattern }: { row: FileRow; pattern: string }) {
       </div>
     );
   }
-  return <TextPreview address={address} pattern={pattern} fail={() => setFailed(true)} />;
+  return <TextPreview row={row} pattern={pattern} fail={() => setFailed(true)} />;
 }
 
-function TextPreview({ address, pattern, fail }: { address: string; pattern: string; fail: () => void }) {
-  const [start, setStart] = useState<TextStart | null>(null);
+// In whatever encoding it is written, with the first line in sight that holds what was asked for.
+function TextPreview({ row, pattern, fail }: { row: FileRow; pattern: string; fail: () => void }) {
+  const [found, setFound] = useState<FoundLine | null>(null);
   const box = useRef<HTMLDivElement>(null);
   useEffect(() => {
     const abort = new AbortController();
-    readStart(address, new Highlighter(pattern, 'contents'), abort.signal).then(setStart, () => {
-      if (!abort.signal.aborted) fail();
-    });
+    foundLine(row, pattern, true, abort.signal).then(
+      (reply) => (reply.text ? setFound(reply) : fail()),
+      () => abort.signal.aborted || fail(),
+    );
     return () => abort.abort();
-  }, [address, pattern]);
+  }, [row.path, pattern]);
+  const text = found?.text;
+  // Of a long file its lines are highlighted from where they are shown.
+  const lines = useMemo(() => {
+    if (!text) return [];
+    return textPieces(text.text, new Highlighter(pattern, 'contents'));
+  }, [text, pattern]);
   useEffect(() => {
-    const mark = box.current?.querySelector('mark');
-    if (mark && box.current) box.current.scrollTop = mark.offsetTop - box.current.clientHeight / 3;
-  }, [start]);
+    if (!box.current || !found?.text) return;
+    const { line, text } = found;
+    const mark = box.current.querySelector('mark');
+    const height = box.current.querySelector('pre')!.offsetHeight / Math.max(1, text.text.split('\n').length);
+    const top = line === null ? mark?.offsetTop : (line - text.first_line) * height;
+    const near = [...box.current.querySelectorAll('mark')].find((one) => one.offsetTop + height >= (top ?? 0));
+    const place = (line === null ? mark : (near ?? mark))?.offsetTop ?? top;
+    if (place !== undefined) box.current.scrollTop = place - box.current.clientHeight / 3;
+  }, [found]);
   return (
-    <div class="preview text" ref={box} tabIndex={0} aria-label="Text of the file" role="region">
-      <pre>
-        {start?.pieces.map((piece) => (piece.marked ? <mark>{piece.text}</mark> : piece.text))}
-      </pre>
-      {start?.cut && <p class="hint">Only the beginning is shown.</p>}
-    </div>
+    <>
+      {found && found.line !== null && (
+        <p class="found">
+          <span class="aside">Line {count(found.line)}:</span> <FoundText parts={found.parts} />
+        </p>
+      )}
+      <div class="preview text" ref={box} tabIndex={0} aria-label="Text of the file" role="region">
+        {text?.before && <p class="hint">From line {count(text.first_line)} on.</p>}
+        <pre>{lines.map((piece) => (piece.marked ? <mark>{piece.text}</mark> : piece.text))}</pre>
+        {text?.after && <p class="hint">The file goes on.</p>}
+      </div>
+    </>
   );
 }

@@ -29,3 +29,17 @@ export function Path({ path }: { path: string }) {
     </>
   );
 }
+
+// A line of a file, of which every second piece was found.
+export function FoundText({ parts }: { parts: string[] }) {
+  return (
+    <bdi class="line">
+      {parts.map((part, index) => {
+        const inner = pieces(part).map((piece) =>
+          piece.sign ? <span class="sign">{piece.text}</span> : piece.text,
+        );
+        return index % 2 === 1 ? <mark>{inner}</mark> : inner;
+      })}
+    </bdi>
+  );
+}

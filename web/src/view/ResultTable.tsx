@@ -46,6 +46,10 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
     redraw((n) => n + 1);
   }, [search, search.sort, returned]);
   useEffect(() => search.pages.show(model.first, model.last));
+  useEffect(() => {
+    const { first, last } = model;
+    search.lines?.want(Array.from({ length: Math.max(0, last - first + 1) }, (_, i) => search.pages.row(first + i)));
+  });
   useEffect(app.placed, [model.above, app.active]);
 
   // `how` it changes what is chosen: that row alone, a span up to it, or nothing.
@@ -132,7 +136,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   return (
     <div
       ref={root}
-      class={`table ${app.pictures ? 'with-pictures' : ''}`}
+      class={`table ${app.pictures ? 'with-pictures' : ''} ${search.lines ? 'with-lines' : ''}`}
       role="grid"
       tabIndex={0}
       aria-label="Results"
@@ -169,6 +173,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
               columns={columns}
               picture={pictureOf(search.pages.row(index))}
               highlighter={highlighter}
+              line={search.lines?.of(search.pages.row(index))}
               choose={onClick}
               open={actions.open}
             />

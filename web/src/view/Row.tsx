@@ -1,6 +1,6 @@
 import type { ComponentChildren } from 'preact';
 import { memo } from 'preact/compat';
-import type { FileRow } from '../api/types.ts';
+import type { FileRow, FoundLine } from '../api/types.ts';
 import type { SortColumn } from '../model/address.ts';
 import type { Highlighter } from '../model/highlight.ts';
 import { formatSize } from '../model/size.ts';
@@ -9,7 +9,7 @@ import { formatTime } from '../model/times.ts';
 import type { Thumbnail } from '../state/thumbnails.ts';
 import type { Column } from './columns.ts';
 import { Icon, iconOf } from './icons.tsx';
-import { Name, Path } from './Name.tsx';
+import { FoundText, Name, Path } from './Name.tsx';
 
 interface Props {
   index: number;
@@ -20,11 +20,12 @@ interface Props {
   columns: readonly Column[];
   picture: Thumbnail | undefined; // null: none is shown
   highlighter: Highlighter;
+  line: FoundLine | undefined;
   choose: (event: MouseEvent, index: number, row: FileRow) => void;
   open: (row: FileRow) => void;
 }
 
-function DrawnRow({ index, top, row, active, chosen, columns, picture, highlighter, choose, open }: Props) {
+function DrawnRow({ index, top, row, active, chosen, columns, picture, highlighter, line, choose, open }: Props) {
   return (
     <div
       id={`row-${index}`}
@@ -36,14 +37,14 @@ function DrawnRow({ index, top, row, active, chosen, columns, picture, highlight
       onClick={(event) => row && choose(event, index, row)}
       onDblClick={(event) => row && !event.ctrlKey && !event.metaKey && !event.shiftKey && open(row)}
     >
-      {row ? <Cells row={row} chosen={chosen} columns={columns} picture={picture} highlighter={highlighter} /> : <div class="cell name" role="gridcell">…</div>}
+      {row ? <Cells row={row} chosen={chosen} columns={columns} picture={picture} highlighter={highlighter} line={line} /> : <div class="cell name" role="gridcell">…</div>}
     </div>
   );
 }
 
-type CellsProps = Pick<Props, 'chosen' | 'columns' | 'picture' | 'highlighter'> & { row: FileRow };
+type CellsProps = Pick<Props, 'chosen' | 'columns' | 'picture' | 'highlighter' | 'line'> & { row: FileRow };
 
-function Cells({ row, chosen, columns, picture, highlighter }: CellsProps) {
+function Cells({ row, chosen, columns, picture, highlighter, line }: CellsProps) {
   return (
     <>
       {columns.map(({ column }) => (
@@ -54,6 +55,11 @@ function Cells({ row, chosen, columns, picture, highlighter }: CellsProps) {
               {picture && <img class="thumbnail" src={picture} alt="" decoding="async" />}
               <span class="ellipsis">
                 <Name text={row.name} ranges={highlighter.ranges(row.name)} />
+                {line && (
+                  <span class="found">
+                    <span class="number">{line.line}</span> <FoundText parts={line.parts} />
+                  </span>
+                )}
               </span>
             </>
           ) : (
@@ -97,6 +103,7 @@ export const Row = memo(
   DrawnRow,
   (a, b) =>
     a.row === b.row &&
+    a.line === b.line &&
     a.top === b.top &&
     a.active === b.active &&
     a.chosen === b.chosen &&
