@@ -39,7 +39,8 @@ void Merge(std::vector<std::pair<size_t, size_t>>* marks) {
   marks->swap(merged);
 }
 
-// Keeps `most` bytes around the first mark; `whole_before`: nothing was left out before.
+// Keeps `most` bytes around the first mark, or the first ones; `whole_before`: nothing was left out
+// before.
 MatchingLine Cut(std::string_view line, std::vector<std::pair<size_t, size_t>> marks, size_t most,
                  bool whole_before) {
   constexpr size_t kShareBefore = 4;
@@ -47,10 +48,11 @@ MatchingLine Cut(std::string_view line, std::vector<std::pair<size_t, size_t>> m
   size_t end = line.size();
   if (line.size() > most) {
     const size_t before = most / kShareBefore;
-    from = marks[0].first > before ? marks[0].first - before : 0;
+    const size_t first = marks.empty() ? 0 : marks[0].first;
+    from = first > before ? first - before : 0;
     end = std::min(line.size(), from + most);
-    while (from < marks[0].first && IsContinuation(line[from])) ++from;
-    while (end > marks[0].first && end < line.size() && IsContinuation(line[end])) --end;
+    while (from < first && IsContinuation(line[from])) ++from;
+    while (end > first && end < line.size() && IsContinuation(line[end])) --end;
   }
   MatchingLine found;
   if (from > 0 || !whole_before) found.text = kEllipsis;
@@ -120,7 +122,6 @@ ContentScanner::Outcome ContentScanner::Read(const Decide& decide, LineSearch* l
                    });
 }
 
-template <typename Look>
 ContentScanner::Outcome ContentScanner::EachPiece(Units units, const Look& look) {
   for (size_t keep = 0;;) {
     if (__atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0) return Outcome::kStopped;
@@ -136,12 +137,14 @@ ContentScanner::Outcome ContentScanner::EachPiece(Units units, const Look& look)
     if (bytes_ != nullptr) bytes_->fetch_add(all.size() - keep, std::memory_order_relaxed);
     size_t searched = all.size();
     size_t keep_from = all.size() - std::min(all.size(), query_.overlap_);
-    if (units == Units::kLines && !reader_.at_end()) {
-      const size_t line = all.rfind('\n');
-      const bool cut = line == npos || all.size() - line > kLongestLine;
-      if (!cut) searched = line + 1;
+    if (units != Units::kBytes && !reader_.at_end()) {
+      const size_t line = all.rfind('\n') + 1;  // begins there; npos + 1 is 0
+      const bool short_first = units == Units::kWholeLines && line == 0;
+      const bool cut = (line == 0 && !short_first) || all.size() - line > kLongestLine;
+      if (!cut) searched = line;
       const size_t overlap = std::min(all.size(), kLineOverlap);
       keep_from = std::min(cut ? all.size() - overlap : searched, keep_from);
+      if (units == Units::kWholeLines) keep_from = searched;
     }
     if (look(all.substr(0, searched), keep_from) || reader_.at_end()) return Outcome::kNoMatch;
     keep = all.size() - keep_from;
@@ -154,14 +157,17 @@ void ContentScanner::Search(std::string_view text) {
   }
 }
 
+// Opening something else, such as a device, may have effects.
+UniqueFd ContentScanner::OpenRegular(int folder, const char* name) {
+  struct stat info;
+  const bool regular =
+      fstatat(folder, name, &info, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(info.st_mode);
+  return UniqueFd(regular ? Open(folder, name) : -1);
+}
+
 std::optional<MatchingLine> ContentScanner::FirstLine(int folder, const char* name,
                                                       size_t most_bytes) {
-  // Opening something else, such as a device, may have effects.
-  struct stat info;
-  if (fstatat(folder, name, &info, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(info.st_mode)) {
-    return std::nullopt;
-  }
-  const UniqueFd fd(Open(folder, name));
+  const UniqueFd fd = OpenRegular(folder, name);
   return fd ? FirstLine(fd.get(), most_bytes) : std::nullopt;
 }
 
@@ -198,8 +204,17 @@ MatchingLine ContentScanner::LineAt(TextPlace first, std::string_view text,
   size_t end = std::min(text.find('\n', first.at), text.size());
   if (end > from && text[end - 1] == '\r') --end;
   const std::string_view line = text.substr(from, std::max(end, first.at) - from);
-  std::vector<std::pair<size_t, size_t>> marks{
-      {first.at - from, std::min(first.length, line.size() - (first.at - from))}};
+  MatchingLine found =
+      Marked(line, {{first.at - from, std::min(first.length, line.size() - (first.at - from))}},
+             lines.most_bytes, before != npos || lines.at_line_start);
+  found.number = lines.lines_before + 1 +
+                 static_cast<std::uint64_t>(std::ranges::count(text.substr(0, from), '\n'));
+  return found;
+}
+
+MatchingLine ContentScanner::Marked(std::string_view line,
+                                    std::vector<std::pair<size_t, size_t>> marks, size_t most_bytes,
+                                    bool whole_before) const {
   for (const auto& needle : query_.needles_) {
     if (needle.negated) continue;
     size_t at = 0;
@@ -210,11 +225,7 @@ MatchingLine ContentScanner::LineAt(TextPlace first, std::string_view text,
     }
   }
   Merge(&marks);
-  MatchingLine found =
-      Cut(line, std::move(marks), lines.most_bytes, before != npos || lines.at_line_start);
-  found.number = lines.lines_before + 1 +
-                 static_cast<std::uint64_t>(std::ranges::count(text.substr(0, from), '\n'));
-  return found;
+  return Cut(line, std::move(marks), most_bytes, whole_before);
 }
 
 }  // namespace nas

@@ -10,6 +10,7 @@
 #include <utility>
 #include <vector>
 
+#include "nas/base/unique_fd.h"
 #include "nas/match/content_query.h"
 #include "nas/match/text_reader.h"
 
@@ -22,6 +23,14 @@ struct MatchingLine {
   // something is left out. It always holds the first mark's beginning.
   std::string text;
   std::vector<std::pair<size_t, size_t>> marks;  // places and lengths in `text` of what was found
+};
+
+// Which lines of a file are told of.
+struct LinesWanted {
+  size_t most_bytes = 0;  // of each, as of MatchingLine
+  // How many lines before and after one that matches.
+  size_t before = 0;
+  size_t after = 0;
 };
 
 // Reads files for one thread. Query and flag are borrowed. Its buffer (256 KiB, more for a very
@@ -48,8 +57,18 @@ class ContentScanner {
   // The same of a file that is open at its beginning.
   std::optional<MatchingLine> FirstLine(int fd, size_t most_bytes);
 
+  // Is told a line that holds something the query asks for, or one near it, which `matches` tells
+  // apart; false: tell no more.
+  using TellLine = std::function<bool(const MatchingLine& line, bool matches)>;
+  // Tells the lines of the regular file of that name, in order; none where FirstLine would tell
+  // none. Of a line longer than the buffer only the first part that holds something is told. A file
+  // that several texts are looked for in is read twice.
+  void EachLine(int folder, const char* name, const LinesWanted& wanted, const TellLine& tell);
+
  private:
-  enum class Units { kBytes, kLines };
+  class LineTeller;
+  // kWholeLines: each line in one piece alone, as far as it is no longer than a buffer.
+  enum class Units { kBytes, kLines, kWholeLines };
   // The line that is looked for while a file is read.
   struct LineSearch {
     size_t most_bytes = 0;
@@ -58,17 +77,21 @@ class ContentScanner {
     std::optional<MatchingLine> line = {};
   };
   int Open(int folder, const char* name);
+  UniqueFd OpenRegular(int folder, const char* name);
   // `lines` may be null, here and below.
   Outcome ScanOpen(int fd, const Decide& decide, LineSearch* lines);
   Outcome Read(const Decide& decide, LineSearch* lines);
   // Hands the text over, in pieces that overlap so that nothing is cut in two: `look` is told a
   // piece and how much of it is not yet handed over again, and answers whether it has seen enough.
-  template <typename Look>
+  using Look = std::function<bool(std::string_view text, size_t done)>;
   Outcome EachPiece(Units units, const Look& look);
   void Search(std::string_view text);
   // As Search, while no line is known; `done` of the text are not handed over again.
   void SearchLine(std::string_view text, size_t done, LineSearch& lines);
   MatchingLine LineAt(TextPlace first, std::string_view text, const LineSearch& lines) const;
+  // The line with all that it has of the needles, and the marks that are already known.
+  MatchingLine Marked(std::string_view line, std::vector<std::pair<size_t, size_t>> marks,
+                      size_t most_bytes, bool whole_before) const;
 
   const ContentQuery& query_;
   const int& stop_flag_;

@@ -222,6 +222,52 @@ TEST_F(Contents, FirstLineReadsOnce) {
   EXPECT_EQ(line->number, 2U);
 }
 
+// As grep prints them: "12:" before a line that matches, "11-" before another.
+TEST_F(Contents, EachLineWithThoseAround) {
+  const std::string far(3 * kPiece, '\n');
+  const std::string number = std::to_string(3 * kPiece + 1);
+  const struct {
+    const char* why;
+    std::string pattern, content;
+    size_t before, after;
+    std::string told;
+  } rows[] = {
+      {"each line once", "a", "a a\nb\nA\n", 0, 0, "1:a a|3:A|"},
+      {"none", "x", "a\nb\n", 1, 1, ""},
+      {"around", "x", "a\nb\nx\nc\nd\n", 1, 1, "2-b|3:x|4-c|"},
+      {"those of two overlap", "x", "a\nx\nb\nx\nc", 2, 2, "1-a|2:x|3-b|4:x|5-c|"},
+      {"at the edges", "x", "x\r\nx", 2, 2, "1:x|2:x|"},
+      {"lines of the piece before", "x", far + "x", 1, 0,
+       std::to_string(3 * kPiece) + "-|" + number + ":x|"},
+      {"far away", "x", far + "x\n" + far + "x", 0, 0,
+       number + ":x|" + std::to_string(6 * kPiece + 2) + ":x|"},
+      {"any of the texts, where all are there", "x y", "x\nb\ny", 0, 0, "1:x|3:y|"},
+      {"one text is missing", "x y", "x\nb", 0, 0, ""},
+      {"what must not be there", "x !y", "x\nb", 0, 0, "1:x|"},
+      {"an expression", "regex:^b$", "ab\nb\nb", 0, 0, "2:b|3:b|"},
+      {"an expression over an end of a line", "regex:a\\sb", "a\nb\n", 0, 0, "1:a|"},
+      {"another encoding", "\u00e9", "a\nb\xe9\nc", 1, 0, "1-a|2:b\u00e9|"},
+      {"no text", "x", std::string("x\n\0", 3), 0, 0, ""},
+      {"a line longer than a piece", "x", std::string(3 * kPiece, 'b') + "x\nx", 0, 0, ""},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.why);
+    const auto query = ContentQuery::From(Query::Parse(row.pattern)->root(), true);
+    std::ofstream(folder_ + "/file", std::ios::binary) << row.content;
+    std::string told;
+    const auto tell = [&](const MatchingLine& line, bool matches) {
+      told += std::to_string(line.number) + (matches ? ":" : "-") + line.text.substr(0, 9) + "|";
+      return true;
+    };
+    ContentScanner(*query, stop_).EachLine(fd_.get(), "file", {100, row.before, row.after}, tell);
+    if (row.content.size() > 3 * kPiece && row.content[0] == 'b') {
+      EXPECT_TRUE(told.ends_with("|2:x|")) << told;
+    } else {
+      EXPECT_EQ(told, row.told);
+    }
+  }
+}
+
 TEST_F(Contents, StopsAndFails) {
   stop_ = 1;
   EXPECT_EQ(Scan("x", "x"), ContentScanner::Outcome::kStopped);
