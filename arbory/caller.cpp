@@ -48,6 +48,11 @@ void Caller::LeaveUnsorted() {
   nas::Configure(config_);
 }
 
+void Caller::LeaveAttributes() {
+  config_.keep_attributes = false;
+  nas::Configure(config_);
+}
+
 const nas::Module& Caller::module() {
   if (!module_) module_ = std::make_unique<nas::Module>(std::string());
   return *module_;

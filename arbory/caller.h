@@ -44,6 +44,8 @@ class Caller {
 
   // Nobody will ask for the results of searches begun from here on in the order of a column.
   void LeaveUnsorted();
+  // Nobody will ask for more of the results of searches begun from here on than names and types.
+  void LeaveAttributes();
 
   // Makes one call as this user; see nas::RunCall.
   nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,

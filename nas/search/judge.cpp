@@ -108,7 +108,9 @@ Refusal Judge::Entry(const DirectoryReader::Entry& entry) {
   Answer answer = Ask();
   if (answer == Answer::kNo) return Refuse(entry.name.data());
   FileAttributes attributes;
-  if (answer == Answer::kYes || search_.criteria.ask_attributes) {
+  if (answer == Answer::kYes && search_.names_alone && entry.type != DT_UNKNOWN) {
+    attributes.mode = DTTOIF(entry.type);
+  } else if (answer == Answer::kYes || search_.criteria.ask_attributes) {
     const Result<FileAttributes> read = Look(entry.name.data());
     if (!read) return Refusal::kVanished;
     attributes = *read;

@@ -81,6 +81,7 @@ struct SharedSearch {
   std::optional<ContentQuery> content;
   std::unique_ptr<CandidateList> candidates;  // of SearchContents
   CandidateSink* candidate_sink = nullptr;    // borrowed: that list, or somebody else's
+  bool names_alone = false;                   // rows tell of attributes no more than types
   MissSink* misses = nullptr;                 // borrowed; null: nobody asks
   UnreadSink* unread = nullptr;               // borrowed, likewise
   WalkProgress progress;

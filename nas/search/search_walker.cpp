@@ -202,6 +202,7 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
   walked_ = true;
   nas::SharedSearch search(comps_, *writer_, stop_flag_);
+  search.names_alone = !nas::CurrentConfig().keep_attributes;
   std::unique_ptr<nas::IndexedWalk> names;
   try {
     names = std::make_unique<nas::IndexedWalk>(locations_, NameSettings(options), search);

@@ -92,9 +92,10 @@ struct Config {
   ServerSettings server;
   // Of one run of the program; no file says them.
   IndexUse index_use = IndexUse::kAuto;
-  int search_threads = 0;      // that a search uses; 0: as many as are of use
-  bool list_unread = false;    // folders that could not be read are named in a search's record
-  bool keep_orderings = true;  // results may be listed later, sorted by any column
+  int search_threads = 0;       // that a search uses; 0: as many as are of use
+  bool list_unread = false;     // folders that could not be read are named in a search's record
+  bool keep_attributes = true;  // false: of results only names and types are asked for
+  bool keep_orderings = true;   // results may be listed later, sorted by any column
   IndexSettings index;
 
   bool operator==(const Config&) const = default;
