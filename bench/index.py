@@ -72,9 +72,11 @@ class Index:
     def figures(self):
         return self.status()["file_systems"][0]
 
+    def search_words(self, use="always"):
+        return [self.program, "search", "--config", self.config, "--index", use]
+
     def search(self, *words, use="always"):
-        return [self.program, "search", "--config", self.config, "--index", use, *words,
-                self.folder]
+        return [*self.search_words(use), *words, self.folder]
 
     def took(self, *words, use="always"):
         """Milliseconds of whole searches, the median."""

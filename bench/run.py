@@ -6,6 +6,7 @@ lines are counted: peers that disagree about what there is to find are marked.
 """
 
 import argparse
+import itertools
 import os
 import pathlib
 import re
@@ -17,6 +18,7 @@ import tempfile
 import time
 
 import index as name_index
+import rows as many_rows
 
 ROUNDS = 7
 COLD_ROUNDS = 3
@@ -153,6 +155,7 @@ def comparisons(args, trees):
         "ours": [*ours, "", names], "fd": [*fd, ".", names],
         "find": ["find", names, "-mindepth", "1"], "floor": floor("walk", names),
     }, {}
+    yield from many_rows.comparisons("", ours, names, fd)
     huge = trees.generated("huge", 200_000)
     yield "invoice in one huge folder", {
         "ours": [*ours, "invoice", huge], "fd": [*fd, "invoice", huge],
@@ -263,7 +266,10 @@ def main():
     if os.geteuid() == 0 and (args.only in "index" or args.only.startswith("index")):
         names = trees.generated("names", 1_000_000)
         index = name_index.Index(args.bin, names)
-        for name, commands, target in name_index.comparisons(index, ["fdfind", "-uu"]):
+        fd = ["fdfind", "-uu"]
+        for name, commands, target in itertools.chain(
+                name_index.comparisons(index, fd),
+                many_rows.comparisons("index: ", index.search_words(), names, fd)):
             if args.only in name:
                 rows += compare(name, commands, target)
                 print(*(" | ".join(row) for row in rows[-len(commands) + 1:]), sep="\n",
