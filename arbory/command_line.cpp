@@ -1,7 +1,10 @@
 #include "arbory/command_line.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <cstdint>
+
+#include "arbory/output_options.h"
 
 namespace arbory {
 namespace {
@@ -104,11 +107,12 @@ const char kQueryHelp[] =
     "seconds since 1970. Bounds are inclusive; a date alone means the whole day.\n";
 
 std::vector<std::string> MarkedArguments(int argc, char** argv) {
-  std::vector<std::string> arguments;
-  for (int at = argc - 1; at > 0; --at) {  // the parser wants them in reverse
-    const std::string argument = argv[at];
-    arguments.push_back(argument.starts_with('[') ? kMark + argument : argument);
+  std::vector<std::string> arguments(argv + std::min(argc, 1), argv + argc);
+  JoinCommands(&arguments);
+  for (std::string& argument : arguments) {
+    if (argument.starts_with('[')) argument.insert(0, 1, kMark);
   }
+  std::ranges::reverse(arguments);  // as the parser wants them
   return arguments;
 }
 
@@ -147,16 +151,6 @@ void AddFindQuery(CLI::App* command, FindOptions* find) {
     }
     for (std::string& folder : find->query.folders) Unmark(&folder);
   });
-}
-
-void AddFormat(CLI::App* command, OutputOptions* output) {
-  CLI::Option* long_format = command->add_flag("-l,--long", output->long_format,
-                                               "Mode, owner, group, size and time of each file");
-  CLI::Option* json = command->add_flag("--json", output->json, "One JSON object a line");
-  command->add_flag("-0,--print0", output->null_separated, "End each path with a NUL byte")
-      ->excludes(json)
-      ->excludes(long_format);
-  json->excludes(long_format);
 }
 
 }  // namespace arbory

@@ -30,9 +30,6 @@ void AddQueryOptions(CLI::App* command, SearchQuery* query);
 // no folder where none was given.
 void AddFindQuery(CLI::App* command, FindOptions* find);
 
-// -l, --json and -0, in the current group.
-void AddFormat(CLI::App* command, OutputOptions* output);
-
 // What PATTERN, SIZE and TIME may be; lines that fit a terminal of 80 columns.
 extern const char kQueryHelp[];
 

@@ -20,6 +20,7 @@
 #include "arbory/locate.h"
 #include "arbory/picker.h"
 #include "arbory/rows.h"
+#include "arbory/run_commands.h"
 #include "arbory/search_request.h"
 #include "arbory/search_text.h"
 #include "arbory/terminal.h"
@@ -135,6 +136,13 @@ int Print(const std::string& text) {
   throw std::runtime_error(std::string("cannot write the results: ") + std::strerror(errno));
 }
 
+int RunFor(const OutputOptions& options, const std::string& paths) {
+  CommandRunner commands(options);
+  const bool ran = commands.Take(paths) && commands.Finish();
+  if (Interrupted()) return kExitInterrupted;
+  return ran && commands.all_succeeded() && !paths.empty() ? kExitSuccess : kExitNothing;
+}
+
 int Pick(const FindOptions& options, std::string choices) {
   std::vector<std::string> arguments = options.arguments;
   if (!arguments.empty() && arguments.back() == "--") arguments.pop_back();
@@ -144,7 +152,8 @@ int Pick(const FindOptions& options, std::string choices) {
 }
 
 bool WantsPicker(const FindOptions& options) {
-  const bool paths = !options.output.json && !options.output.long_format;
+  const bool paths = !options.output.json && !options.output.long_format &&
+                     options.output.format.empty() && !options.output.runs();
   // Standard output may be taken by another program: vi "$(arbory find)".
   return options.words.empty() && paths && !options.choices && isatty(STDIN_FILENO) != 0 &&
          isatty(STDERR_FILENO) != 0;
@@ -164,7 +173,7 @@ int Find(const FindOptions& options) {
   if (picks || options.choices) format = {.kind = RowFormat::Kind::kChoice, .end = '\0'};
   std::string text = RowsText(*answer, shares, format);
   if (picks) return Pick(options, std::move(text));
-  const int code = Print(text);
+  const int code = options.output.runs() ? RunFor(options.output, text) : Print(text);
   TellOfMore(answer->reply);
   return code;
 }

@@ -8,9 +8,9 @@
 namespace arbory {
 namespace {
 
-volatile sig_atomic_t interrupted = 0;
+int interrupted = 0;
 
-void Note(int) { interrupted = 1; }
+void Note(int) { __atomic_store_n(&interrupted, 1, __ATOMIC_RELAXED); }
 
 }  // namespace
 
@@ -27,7 +27,9 @@ void WatchForInterrupt() {
   signal(SIGPIPE, SIG_IGN);
 }
 
-bool Interrupted() { return interrupted != 0; }
+bool Interrupted() { return __atomic_load_n(&interrupted, __ATOMIC_RELAXED) != 0; }
+
+const int& InterruptFlag() { return interrupted; }
 
 bool Pause(int milliseconds, int pidfd) {
   pollfd ended = {pidfd, POLLIN, 0};

@@ -8,6 +8,8 @@ namespace arbory {
 // at once. A reader that went away is a failed write instead of a signal.
 void WatchForInterrupt();
 bool Interrupted();
+// The same for what looks at a flag, atomically: not 0 once interrupted.
+const int& InterruptFlag();
 
 // Waits; an interrupt ends the wait early, and so does the end of the process that `pidfd` stands
 // for (-1: none). Returns whether the wait lasted to its end.

@@ -18,6 +18,7 @@
 #include "arbory/generate_command.h"
 #include "arbory/index_command.h"
 #include "arbory/options.h"
+#include "arbory/output_options.h"
 #include "arbory/search_command.h"
 #include "arbory/serve_command.h"
 #include "arbory/terminal.h"
@@ -41,13 +42,19 @@ constexpr char kSearchHelp[] =
     "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or\n"
     "crtime.\n"
     "\n"
-    "Exit status: 0 found, 1 nothing found, 2 error, 130 interrupted.\n"
+    "In COMMAND and TEXT {} is the path, {/} the name, {//} the folder, {.} and {/.}\n"
+    "path and name without the last extension; {{ and }} are braces. A COMMAND without\n"
+    "any gets the path at its end. No shell reads it, and it ends at a ; of its own.\n"
+    "\n"
+    "Exit status: 0 found, 1 nothing found or a command failed, 2 error, 130\n"
+    "interrupted.\n"
     "\n"
     "Examples:\n"
     "  arbory search '*.conf' /etc\n"
     "  arbory search holiday ~/photos -t image --mtime-from 2026-07-01 -l\n"
     "  arbory search '' . --size-from 1G --sort size --desc --limit 10\n"
-    "  arbory search 'error code' /var/log --content\n";
+    "  arbory search 'error code' /var/log --content\n"
+    "  arbory search ext:tif -x convert {} {.}.png\n";
 
 constexpr char kCallHelp[] =
     "JSON is an object of parameters. Prints {\"code\":N,\"data\":...} in one line.\n"
@@ -141,22 +148,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
           ->check(CLI::IsMember({"name", "path", "size", "type", "user", "group", "mode", "mtime",
                                  "atime", "ctime", "crtime"}));
   search->add_flag("--desc", options->descending, "Largest, latest or last first")->needs(sort);
-  const CLI::Validator count(
-      [](const std::string& text) {
-        const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
-        return digits ? std::string() : "'" + text + "' is not a number of files";
-      },
-      "");
-  search->add_option("--limit", options->limit, "Print at most N files")
-      ->type_name("N")
-      ->check(count);
-  search->add_option("--offset", options->offset, "Leave out the first N files")
-      ->type_name("N")
-      ->check(count);
-  AddFormat(search, &options->output);
-  search->add_flag("-a,--absolute", options->output.absolute, "Whole paths, as they are on disk");
-  search->add_flag("-n,--line-number", options->line_number,
-                   "First matching line of files found by their contents; means --content too");
+  AddSearchOutput(search, options);
   search->add_flag("--show-errors", options->common.show_errors,
                    "Name the folders that could not be read, and say why");
   search->add_option("--threads", options->common.threads, "Walk with N threads")
@@ -246,6 +238,14 @@ CLI::App* AddGenerate(CLI::App* app, GenerateOptions* options) {
   return generate;
 }
 
+// Of the program, whatever the command.
+void AddVersion(CLI::App* app) {
+  app->set_version_flag("-V,--version", std::string("arbory ") + ARBORY_VERSION,
+                        "Print the version")
+      ->group(app->get_help_ptr()->get_group());
+  for (CLI::App* command : app->get_subcommands({})) AddVersion(command);
+}
+
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
   const auto chosen = app.get_subcommands();
   if (chosen.empty()) {
@@ -267,7 +267,6 @@ int Run(int argc, char** argv) {
   const auto formatter = std::make_shared<Formatter>();
   formatter->column_width(kHelpColumn);
   app.formatter(formatter);
-  app.set_version_flag("--version", std::string("arbory ") + ARBORY_VERSION, "Print the version");
   app.require_subcommand(1);
   app.footer(kProgramHelp);
   CallOptions call_options;
@@ -285,6 +284,7 @@ int Run(int argc, char** argv) {
   CLI::App* why = AddWhy(&app, &why_options);
   GenerateOptions generate_options;
   CLI::App* generate = AddGenerate(&app, &generate_options);
+  AddVersion(&app);
   try {
     app.parse(MarkedArguments(argc, argv));
   } catch (const CLI::Success& asked) {
@@ -304,7 +304,8 @@ int Run(int argc, char** argv) {
     Unmark(&why_options.file);
     return RunWhyCommand(why_options);
   }
-  search_options.query.content |= search_options.line_number;
+  search_options.query.content |= search_options.output.lines;
+  if (search_options.output.quiet) search_options.limit = 1;
   return RunSearchCommand(search_options);
 }
 

@@ -102,12 +102,27 @@ struct SearchQuery {
   bool content = false;
 };
 
-// How what is found is printed.
+enum class ColorUse { kAuto, kAlways, kNever };
+
+// What is done with what is found: how it is printed, or what is run for it.
 struct OutputOptions {
   bool long_format = false;
   bool json = false;
   bool null_separated = false;
   bool absolute = false;
+  bool count = false;
+  bool quiet = false;
+  std::string format;  // as PathTemplate has it
+  ColorUse color = ColorUse::kAuto;
+  bool lines = false;  // tell the lines of what matches by its contents
+  size_t before = 0;   // lines around them
+  size_t after = 0;
+  // The words of a command, for each path or for all.
+  std::vector<std::string> exec;
+  std::vector<std::string> exec_batch;
+  size_t jobs = 0;  // commands at a time; 0: as many as processors
+
+  bool runs() const { return !exec.empty() || !exec_batch.empty(); }
 };
 
 struct SearchOptions {
@@ -119,8 +134,7 @@ struct SearchOptions {
   std::uint64_t limit = 0;  // 0: all
   std::uint64_t offset = 0;
   OutputOptions output;
-  bool verbose = false;      // say how the search was answered
-  bool line_number = false;  // tell the first line of what matches by its contents
+  bool verbose = false;  // say how the search was answered
 };
 
 struct FindOptions {

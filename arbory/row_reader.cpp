@@ -8,6 +8,7 @@ namespace {
 
 // Few enough to be printed while the search goes on.
 constexpr std::uint64_t kMostRows = 4096;
+constexpr size_t kMostBytes = 1 << 20;
 
 std::uint64_t EndOf(const SearchOptions& options) {
   constexpr std::uint64_t kMost = std::numeric_limits<std::uint64_t>::max();
@@ -18,7 +19,12 @@ std::uint64_t EndOf(const SearchOptions& options) {
 }  // namespace
 
 RowReader::RowReader(const std::string& path, const SearchOptions& options, const RowFormat& format)
-    : options_(options), reader_(path), writer_(format), at_(options.offset), end_(EndOf(options)) {
+    : options_(options),
+      reader_(path),
+      counts_only_(format.kind == RowFormat::Kind::kNone),
+      writer_(format),
+      at_(options.offset),
+      end_(EndOf(options)) {
   if (!options.sort_by.empty()) Sort();
 }
 
@@ -37,7 +43,11 @@ RowReader::Rows RowReader::Next() {
   const bool sorted = !options_.sort_by.empty();
   const std::uint64_t there = std::min(end_, sorted ? sorted_.size() : reader_.rows());
   const std::uint64_t stop = at_ < there ? at_ + std::min(kMostRows, there - at_) : at_;
-  for (; at_ < stop; ++at_) {
+  if (counts_only_) {
+    rows.count = stop - at_;
+    at_ = stop;
+  }
+  for (; at_ < stop && rows.text.size() < kMostBytes; ++at_) {
     writer_.Append(reader_.Row(sorted ? sorted_[at_] : static_cast<std::uint32_t>(at_)),
                    &rows.text);
     ++rows.count;

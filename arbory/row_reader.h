@@ -35,6 +35,7 @@ class RowReader {
 
   const SearchOptions& options_;
   nas::ResultReader reader_;
+  const bool counts_only_;
   RowWriter writer_;
   std::vector<std::uint32_t> sorted_;
   std::uint64_t at_;   // the next row

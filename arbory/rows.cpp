@@ -5,145 +5,97 @@
 #include <unistd.h>
 
 #include <array>
-#include <charconv>
-#include <cstdio>
-#include <ctime>
+#include <cstdlib>
 
+#include "arbory/interrupt.h"
 #include "arbory/terminal.h"
 #include "nas/base/hex.h"
-#include "nas/base/json_text.h"
-#include "nas/base/utf8.h"
-#include "nas/match/file_kinds.h"
 
 namespace arbory {
 namespace {
 
-constexpr mode_t kPermissions = 07777;
+// As grep colours what it prints.
+constexpr std::string_view kPathColour = "35";
+constexpr std::string_view kNumberColour = "32";
+constexpr std::string_view kMarkColour = "36";  // of what stands between
+constexpr std::string_view kFoundColour = "01;31";
 
-void AppendNumber(std::int64_t number, std::string* out) {
-  std::array<char, sizeof("-9223372036854775808")> text;
-  out->append(text.data(), std::to_chars(text.begin(), text.end(), number).ptr);
+constexpr size_t kMostLineBytes = 4096;
+// Held of a row with very many lines.
+constexpr size_t kSpillBytes = 1 << 20;
+
+void BeginColour(std::string_view code, std::string* out) {
+  if (!code.empty()) out->append("\033[").append(code) += 'm';
 }
-
-char LetterOf(mode_t mode) {
-  switch (mode & S_IFMT) {
-    case S_IFDIR:
-      return 'd';
-    case S_IFLNK:
-      return 'l';
-    case S_IFIFO:
-      return 'p';
-    case S_IFSOCK:
-      return 's';
-    case S_IFCHR:
-      return 'c';
-    case S_IFBLK:
-      return 'b';
-    default:
-      return '-';
-  }
+void EndColour(std::string_view code, std::string* out) {
+  if (!code.empty()) *out += "\033[0m";
 }
-
-// "drwxr-xr-x", as ls shows it.
-void AppendMode(mode_t mode, std::string* out) {
-  *out += LetterOf(mode);
-  constexpr char kLetters[] = "rwx";
-  constexpr int kBits = 9;
-  for (int bit = 0; bit < kBits; ++bit) {
-    const bool set = (mode >> (kBits - 1 - bit) & 1) != 0;
-    *out += set ? kLetters[bit % 3] : '-';
-  }
-}
-
-std::string LocalTime(std::time_t seconds) {
-  std::tm local = {};
-  localtime_r(&seconds, &local);
-  char text[sizeof("-2147483648-12-31 23:59")];
-  return {text, std::strftime(text, sizeof text, "%Y-%m-%d %H:%M", &local)};
-}
-
-void AppendPadded(const std::string& text, size_t width, std::string* out) {
+void AppendColoured(std::string_view text, std::string_view code, std::string* out) {
+  BeginColour(code, out);
   *out += text;
-  if (text.size() < width) out->append(width - text.size(), ' ');
-  *out += ' ';
+  EndColour(code, out);
 }
 
-// Whether the JSON text holds a control character at that place, as only DEL and those of the
-// second set still stand in one; how many bytes it has.
-size_t ControlAt(std::string_view text, size_t at) {
-  constexpr unsigned char kLead = 0xC2;
-  constexpr unsigned char kBehindLast = 0xA0;
-  const auto byte = static_cast<unsigned char>(text[at]);
-  if (nas::IsControl(byte)) return 1;
-  const bool second_set = byte == kLead && at + 1 < text.size() &&
-                          static_cast<unsigned char>(text[at + 1]) < kBehindLast;
-  return second_set ? 2 : 0;
+std::string_view Environment(const char* name) {
+  const char* const value = getenv(name);
+  return value == nullptr ? std::string_view() : value;
 }
 
-void AppendEscapedJson(std::string_view text, std::string* out) {
-  for (size_t at = 0; at < text.size();) {
-    const size_t length = ControlAt(text, at);
-    if (length == 0) {
-      *out += text[at++];
-      continue;
+bool WantsColours(const OutputOptions& options, bool terminal) {
+  if (options.color != ColorUse::kAuto) return options.color == ColorUse::kAlways;
+  return terminal && !options.null_separated && Environment("NO_COLOR").empty() &&
+         Environment("TERM") != "dumb";
+}
+
+void CheckOnlyOne(const OutputOptions& options) {
+  const std::pair<bool, const char*> forms[] = {{options.long_format, "--long"},
+                                                {options.json, "--json"},
+                                                {!options.format.empty(), "--format"},
+                                                {options.count, "--count"},
+                                                {options.quiet, "--quiet"},
+                                                {!options.exec.empty(), "--exec"},
+                                                {!options.exec_batch.empty(), "--exec-batch"},
+                                                {options.lines && !options.json, "--line-number"}};
+  const char* first = nullptr;
+  for (const auto& [given, name] : forms) {
+    if (!given) continue;
+    if (first != nullptr) {
+      throw UsageError(std::string(first) + " and " + name + " exclude each other");
     }
-    char escape[sizeof("\\u009b")];
-    std::snprintf(escape, sizeof escape, "\\u%04x",
-                  static_cast<unsigned char>(text[at + length - 1]));
-    *out += escape;
-    at += length;
+    first = name;
+  }
+  const bool whole_paths = options.format.empty() && first != nullptr;
+  if (options.null_separated && whole_paths) {
+    throw UsageError(std::string("--print0 and ") + first + " exclude each other");
   }
 }
 
-// The members of an object, one after the other.
-class JsonMembers {
- public:
-  explicit JsonMembers(std::string* out) : out_(*out) {}
-  std::string* Name(const char* name) {
-    out_ += first_ ? "{\"" : ",\"";
-    out_ += name;
-    out_ += "\":";
-    first_ = false;
-    return &out_;
-  }
-  void Text(const char* name, std::string_view text) {
-    nas::AppendJsonString(text, nas::JsonBytes::kClean, Name(name));
-  }
-  void Number(const char* name, std::int64_t number) { AppendNumber(number, Name(name)); }
-  void End() { out_ += '}'; }
-
- private:
-  std::string& out_;
-  bool first_ = true;
-};
-
-void AppendTimes(const nas::FileAttributes& file, std::string* out) {
-  JsonMembers time(out);
-  time.Number("atime", file.atime);
-  if (file.crtime == nas::FileAttributes::kNoTime) {
-    *time.Name("crtime") += "null";
-  } else {
-    time.Number("crtime", file.crtime);
-  }
-  time.Number("ctime", file.ctime);
-  time.Number("mtime", file.mtime);
-  time.End();
-}
-
-std::string UpperCase(std::string_view text) {
-  std::string upper(text);
-  for (char& c : upper) c = static_cast<char>(toupper(static_cast<unsigned char>(c)));
-  return upper;
+RowFormat::Kind KindOf(const OutputOptions& options) {
+  if (options.count || options.quiet) return RowFormat::Kind::kNone;
+  if (options.json) return RowFormat::Kind::kJson;
+  if (options.long_format) return RowFormat::Kind::kLong;
+  const bool shaped = !options.format.empty() || options.runs();
+  return shaped ? RowFormat::Kind::kTemplate : RowFormat::Kind::kPath;
 }
 
 }  // namespace
 
 RowFormat FormatOf(const OutputOptions& options) {
+  CheckOnlyOne(options);
   RowFormat format;
-  if (options.json) format.kind = RowFormat::Kind::kJson;
-  if (options.long_format) format.kind = RowFormat::Kind::kLong;
-  if (options.null_separated) format.end = '\0';
-  format.escape = isatty(STDOUT_FILENO) != 0 && !options.null_separated;
+  const bool terminal = isatty(STDOUT_FILENO) != 0;
+  format.kind = KindOf(options);
+  if (options.null_separated || options.runs()) format.end = '\0';
+  format.escape = terminal && format.end != '\0';
+  if (format.kind == RowFormat::Kind::kTemplate) {
+    format.shape = std::make_shared<PathTemplate>(options.runs() ? "{}" : options.format);
+  }
+  const bool colourful =
+      format.kind == RowFormat::Kind::kPath || format.kind == RowFormat::Kind::kLong;
+  if (colourful && WantsColours(options, terminal)) {
+    format.colors = std::make_shared<LsColors>(Environment("LS_COLORS"));
+  }
+  format.lines_wanted = {kMostLineBytes, options.before, options.after};
   return format;
 }
 
@@ -162,8 +114,15 @@ std::string PathOfChoice(std::string_view line) {
 }
 
 RowWriter::RowWriter(const RowFormat& format) : format_(format) {
-  static const int never = 0;
-  if (format.lines) scanner_.emplace(*format.lines, never);
+  if (format.lines) scanner_.emplace(*format.lines, InterruptFlag());
+}
+
+void RowWriter::AppendText(std::string_view text, std::string* out) const {
+  if (format_.escape) {
+    AppendEscaped(text, out);
+  } else {
+    *out += text;
+  }
 }
 
 void RowWriter::EnterFolder(const nas::ResultRow& row) {
@@ -175,119 +134,143 @@ void RowWriter::EnterFolder(const nas::ResultRow& row) {
   real_folder_ = real + "/";
   shown_folder_.clear();
   format_.paths.AppendFolder(real, &shown_folder_);
-  if (format_.escape) shown_folder_ = Escaped(shown_folder_);
+  text_folder_.clear();
+  const bool ls = format_.colors != nullptr && format_.lines == nullptr && !shown_folder_.empty();
+  const std::string_view code = ls ? format_.colors->folder() : std::string_view();
+  BeginColour(code, &text_folder_);
+  AppendText(shown_folder_, &text_folder_);
+  EndColour(code, &text_folder_);
+  if (format_.kind == RowFormat::Kind::kJson) json_.EnterFolder(real_folder_, shown_folder_);
 }
 
-void RowWriter::AppendShown(const nas::ResultRow& row, std::string* out) const {
-  *out += shown_folder_;
-  if (format_.escape) {
-    AppendEscaped(row.name, out);
-  } else {
-    *out += row.name;
+void RowWriter::AppendShown(const nas::ResultRow& row, bool slash, std::string* out) {
+  *out += text_folder_;
+  const bool ls = format_.colors != nullptr && format_.lines == nullptr;
+  const std::string_view code =
+      ls ? format_.colors->Of(row.name, row.attributes->mode, path_.c_str()) : std::string_view();
+  BeginColour(code, out);
+  AppendText(row.name, out);
+  if (slash && S_ISDIR(row.attributes->mode)) *out += '/';
+  EndColour(code, out);
+}
+
+// Where a symbolic link leads to, as ls shows it.
+void RowWriter::AppendTarget(std::string* out) const {
+  std::array<char, 4096> target;  // no link is longer
+  const ssize_t length = readlink(path_.c_str(), target.data(), target.size());
+  if (length <= 0) return;
+  *out += " -> ";
+  AppendText({target.data(), static_cast<size_t>(length)}, out);
+}
+
+void RowWriter::AppendTemplate(const nas::ResultRow& row, std::string* out) {
+  text_.assign(shown_folder_).append(row.name);
+  AppendText(format_.shape->Of(text_), out);
+}
+
+void RowWriter::AppendChoice(std::string* out) const {
+  for (const char byte : path_) {
+    nas::AppendHex(static_cast<unsigned char>(byte), nas::kLowerHex, out);
   }
+  *out += '\t';
+  AppendEscaped(path_, out);
 }
 
-// Columns have fixed least widths, as rows are printed before the next ones are known.
-void RowWriter::AppendLong(const nas::ResultRow& row, std::string* out) {
-  const nas::FileAttributes& file = *row.attributes;
-  constexpr size_t kNameWidth = 8;
-  constexpr size_t kSizeWidth = 12;
-  AppendMode(file.mode, out);
-  *out += ' ';
-  AppendPadded(Escaped(owners_.User(file.uid)), kNameWidth, out);
-  AppendPadded(Escaped(owners_.Group(file.gid)), kNameWidth, out);
-  const std::string size = std::to_string(file.size);
-  if (size.size() < kSizeWidth) out->append(kSizeWidth - size.size(), ' ');
-  *out += size + " " + LocalTime(file.mtime) + " ";
-  AppendShown(row, out);
+bool RowWriter::Spill(std::string* out) const {
+  return out->size() < kSpillBytes || !format_.spill || format_.spill(out);
 }
 
-// ":NUMBER:TEXT", on a terminal with what was found in bold red.
-void RowWriter::AppendLine(const nas::MatchingLine& line, std::string* out) const {
-  constexpr char kMarked[] = "\033[1;31m";
-  constexpr char kUnmarked[] = "\033[m";
+void RowWriter::EachLine(const nas::ResultRow& row, const nas::ContentScanner::TellLine& tell) {
+  if (!scanner_ || !S_ISREG(row.attributes->mode)) return;
+  scanner_->EachLine(AT_FDCWD, path_.c_str(), format_.lines_wanted, tell);
+}
+
+// "12:TEXT", or "11-TEXT" of a line that only stands near one that matches.
+void RowWriter::AppendLine(const nas::MatchingLine& line, bool matches, std::string* out) const {
+  const bool colours = format_.colors != nullptr;
+  const auto code = [&](std::string_view colour) { return colours ? colour : std::string_view(); };
+  const std::string_view mark = matches ? ":" : "-";
+  AppendColoured(mark, code(kMarkColour), out);
+  AppendColoured(std::to_string(line.number), code(kNumberColour), out);
+  AppendColoured(mark, code(kMarkColour), out);
   const std::string_view text = line.text;
-  *out += ":" + std::to_string(line.number) + ":";
-  if (!format_.escape) {
-    *out += text;
-    return;
-  }
   size_t at = 0;
   for (const auto& [from, length] : line.marks) {
-    AppendEscaped(text.substr(at, from - at), out);
-    *out += kMarked;
-    AppendEscaped(text.substr(from, length), out);
-    *out += kUnmarked;
+    AppendText(text.substr(at, from - at), out);
+    BeginColour(code(kFoundColour), out);
+    AppendText(text.substr(from, length), out);
+    EndColour(code(kFoundColour), out);
     at = from + length;
   }
-  AppendEscaped(text.substr(at), out);
+  AppendText(text.substr(at), out);
+  *out += format_.end;
 }
 
-void RowWriter::AppendJson(const nas::ResultRow& row, const Line& line, std::string* out) {
-  const nas::FileAttributes& file = *row.attributes;
-  const bool is_folder = S_ISDIR(file.mode);
-  json_.clear();
-  JsonMembers members(&json_);
-  *members.Name("is_dir") += is_folder ? "true" : "false";
-  if (line) {
-    JsonMembers found(members.Name("line"));
-    found.Number("number", static_cast<std::int64_t>(line->number));
-    found.Text("text", line->text);
-    found.End();
-  }
-  members.Text("name", row.name);
-  JsonMembers owner(members.Name("owner"));
-  owner.Number("gid", file.gid);
-  owner.Text("group", owners_.Group(file.gid));
-  owner.Number("uid", file.uid);
-  owner.Text("user", owners_.User(file.uid));
-  owner.End();
-  members.Text("path", "/" + std::string(row.share_name) + path_.substr(row.share_root.size()));
-  char mode[sizeof("\"07777\"")];
-  std::snprintf(mode, sizeof mode, "\"%04o\"", file.mode & kPermissions);
-  JsonMembers permissions(members.Name("perm"));
-  *permissions.Name("mode") += mode;
-  permissions.End();
-  members.Text("real_path", path_);
-  members.Number("size", static_cast<std::int64_t>(file.size));
-  AppendTimes(file, members.Name("time"));
-  members.Text("type", is_folder ? "" : UpperCase(nas::ExtensionOf(row.name)));
-  members.End();
-  if (format_.escape) {
-    AppendEscapedJson(json_, out);
-  } else {
-    *out += json_;
-  }
+bool RowWriter::AppendLines(const nas::ResultRow& row, std::string* out) {
+  const bool colours = format_.colors != nullptr;
+  const auto code = [&](std::string_view colour) { return colours ? colour : std::string_view(); };
+  std::string path;
+  BeginColour(code(kPathColour), &path);
+  AppendShown(row, false, &path);
+  EndColour(code(kPathColour), &path);
+  const bool groups = format_.lines_wanted.before > 0 || format_.lines_wanted.after > 0;
+  std::uint64_t last = 0;
+  EachLine(row, [&](const nas::MatchingLine& line, bool matches) {
+    if (groups && told_lines_ && (last == 0 || line.number != last + 1)) {
+      AppendColoured("--", code(kMarkColour), out);
+      *out += format_.end;
+    }
+    *out += path;
+    AppendLine(line, matches, out);
+    last = line.number;
+    told_lines_ = true;
+    return Spill(out);
+  });
+  return last > 0;
+}
+
+void RowWriter::AppendJson(const nas::ResultRow& row, std::string* out) {
+  text_.clear();
+  std::string& json = format_.escape ? text_ : *out;
+  json_.Append(row, &json);
+  bool first = true;
+  EachLine(row, [&](const nas::MatchingLine& line, bool matches) {
+    JsonRows::AppendLine(line, !matches, std::exchange(first, false), &json);
+    return format_.escape || Spill(out);
+  });
+  json += first ? "}" : "]}";
+  if (format_.escape) AppendShownJson(text_, out);
+  *out += format_.end;
 }
 
 void RowWriter::Append(const nas::ResultRow& row, std::string* out) {
-  constexpr size_t kMostLineBytes = 4096;
+  if (format_.kind == RowFormat::Kind::kNone) return;
   EnterFolder(row);
-  path_.assign(real_folder_).append(row.name);
-  Line line;
-  if (scanner_ && S_ISREG(row.attributes->mode)) {
-    line = scanner_->FirstLine(AT_FDCWD, path_.c_str(), kMostLineBytes);
-  }
+  const bool on_disk = format_.colors || format_.lines ||
+                       format_.kind == RowFormat::Kind::kChoice ||
+                       format_.kind == RowFormat::Kind::kLong;
+  if (on_disk) path_.assign(real_folder_).append(row.name);
   switch (format_.kind) {
+    case RowFormat::Kind::kNone:
+      return;
     case RowFormat::Kind::kPath:
-      AppendShown(row, out);
-      if (S_ISDIR(row.attributes->mode)) *out += '/';
+      if (format_.lines && AppendLines(row, out)) return;
+      AppendShown(row, true, out);
       break;
     case RowFormat::Kind::kLong:
-      AppendLong(row, out);
+      columns_.Append(*row.attributes, out);
+      AppendShown(row, false, out);
+      if (S_ISLNK(row.attributes->mode)) AppendTarget(out);
       break;
     case RowFormat::Kind::kJson:
-      AppendJson(row, line, out);
+      return AppendJson(row, out);
+    case RowFormat::Kind::kTemplate:
+      AppendTemplate(row, out);
       break;
     case RowFormat::Kind::kChoice:
-      for (const char byte : path_) {
-        nas::AppendHex(static_cast<unsigned char>(byte), nas::kLowerHex, out);
-      }
-      *out += '\t';
-      AppendEscaped(path_, out);
+      AppendChoice(out);
       break;
   }
-  if (line && format_.kind != RowFormat::Kind::kJson) AppendLine(*line, out);
   *out += format_.end;
 }
 

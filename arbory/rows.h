@@ -1,14 +1,18 @@
 #pragma once
 // The rows of a search as they are printed.
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "arbory/ls_colors.h"
 #include "arbory/options.h"
+#include "arbory/path_template.h"
+#include "arbory/row_json.h"
+#include "arbory/row_long.h"
 #include "arbory/shown_paths.h"
-#include "nas/base/accounts.h"
 #include "nas/match/content_query.h"
 #include "nas/match/content_scanner.h"
 #include "nas/results/block_reader.h"
@@ -16,19 +20,30 @@
 namespace arbory {
 
 struct RowFormat {
-  // kPath ends folders with a "/". kChoice is for a picker that shows text and cannot be trusted
-  // with a path's bytes: the path in hexadecimal digits, a tab, and the path as a terminal may show
-  // it.
-  enum class Kind { kPath, kLong, kJson, kChoice };
+  // kNone counts rows only. kPath ends folders with a "/". kChoice is for a picker that shows text
+  // and cannot be trusted with a path's bytes: the path in hexadecimal digits, a tab, and the path
+  // as a terminal may show it.
+  enum class Kind { kNone, kPath, kLong, kJson, kTemplate, kChoice };
   Kind kind = Kind::kPath;
-  ShownPaths paths = {};  // not of kJson and kChoice, which hold paths as they are on disk
+  ShownPaths paths = {};
   char end = '\n';
-  bool escape = false;  // for a terminal
-  // Where given, the first line is told of each file whose contents hold what it asks for.
-  std::shared_ptr<const nas::ContentQuery> lines = {};
+  bool escape = false;                                  // for a terminal
+  std::shared_ptr<const LsColors> colors = {};          // null: none
+  std::shared_ptr<const PathTemplate> shape = {};       // of kTemplate
+  std::shared_ptr<const nas::ContentQuery> lines = {};  // null: no lines are told
+  nas::LinesWanted lines_wanted = {};
+  // Takes what has come together within a row that tells of very many lines; false: no more is
+  // wanted.
+  std::function<bool(std::string* text)> spill = {};
+
+  // Whether a row's name and type are all that is printed of it.
+  bool names_alone() const {
+    const bool names = kind == Kind::kPath || kind == Kind::kTemplate || kind == Kind::kNone;
+    return names && colors == nullptr;
+  }
 };
 
-// For standard output.
+// For standard output. Throws UsageError for options that exclude each other.
 RowFormat FormatOf(const OutputOptions& options);
 
 // The path of a line of kChoice, without its end; empty for any other line.
@@ -43,24 +58,32 @@ class RowWriter {
   void Append(const nas::ResultRow& row, std::string* out);
 
  private:
-  using Line = std::optional<nas::MatchingLine>;
-
   void EnterFolder(const nas::ResultRow& row);
-  void AppendShown(const nas::ResultRow& row, std::string* out) const;
-  void AppendLong(const nas::ResultRow& row, std::string* out);
-  void AppendJson(const nas::ResultRow& row, const Line& line, std::string* out);
-  void AppendLine(const nas::MatchingLine& line, std::string* out) const;
+  void AppendText(std::string_view text, std::string* out) const;
+  void AppendShown(const nas::ResultRow& row, bool slash, std::string* out);
+  void AppendTarget(std::string* out) const;
+  void AppendTemplate(const nas::ResultRow& row, std::string* out);
+  void AppendJson(const nas::ResultRow& row, std::string* out);
+  void AppendChoice(std::string* out) const;
+  // False where nothing was told.
+  bool AppendLines(const nas::ResultRow& row, std::string* out);
+  void AppendLine(const nas::MatchingLine& line, bool matches, std::string* out) const;
+  void EachLine(const nas::ResultRow& row, const nas::ContentScanner::TellLine& tell);
+  bool Spill(std::string* out) const;
 
   const RowFormat& format_;
-  nas::AccountTexts owners_;
+  LongColumns columns_;
+  JsonRows json_;
   std::optional<nas::ContentScanner> scanner_;
+  bool told_lines_ = false;  // of any row
   // Of the row before, whose folder most rows share.
   std::string share_root_;
   std::string folder_;
   std::string real_folder_;   // on disk, with a final "/"
-  std::string shown_folder_;  // as it is printed
+  std::string shown_folder_;  // as it is named
+  std::string text_folder_;   // as it is printed
   std::string path_;          // of the row, on disk
-  std::string json_;
+  std::string text_;
 };
 
 }  // namespace arbory

@@ -20,6 +20,7 @@
 #include "arbory/nothing_found.h"
 #include "arbory/row_reader.h"
 #include "arbory/rows.h"
+#include "arbory/run_commands.h"
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
 #include "arbory/search_text.h"
@@ -66,7 +67,7 @@ std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
 ShownPaths PathsFor(const SearchOptions& options) {
   if (options.output.absolute) return {};
   if (!options.query.here) return ShownPaths(options.query.folders);
-  return ShownPaths({options.output.null_separated ? "." : ""});
+  return ShownPaths({options.output.null_separated || options.output.runs() ? "." : ""});
 }
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
@@ -79,7 +80,10 @@ class Search {
         started_(Clock::now()),
         format_(FormatOf(options.output)) {
     format_.paths = PathsFor(options);
-    if (options.line_number) format_.lines = LinesOf(options.query.pattern);
+    if (options.output.lines) format_.lines = LinesOf(options.query.pattern);
+    format_.spill = [this](std::string* text) { return Spill(text); };
+    if (options.output.runs()) commands_.emplace(options.output);
+    if (format_.names_alone() && options.sort_by.empty()) caller->LeaveAttributes();
   }
 
   int Run(const Json::Value& params) {
@@ -191,14 +195,22 @@ class Search {
     return Stream();
   }
 
-  // False when standard output does not take it.
+  // False when standard output does not take it, or no more commands are to be run.
   bool Print(const RowReader::Rows& rows) {
-    if (rows.count == 0) return true;
-    progress_.Clear();
     printed_ += rows.count;
-    if (WriteOut(STDOUT_FILENO, rows.text)) return true;
-    failure_ = errno;
-    return false;
+    if (rows.text.empty()) return true;
+    progress_.Clear();
+    errno = 0;
+    const bool taken = commands_ ? commands_->Take(rows.text) : WriteOut(STDOUT_FILENO, rows.text);
+    failure_ = taken ? 0 : errno;
+    return taken;
+  }
+
+  bool Spill(std::string* text) {
+    progress_.Clear();
+    const bool written = WriteOut(STDOUT_FILENO, *text);
+    text->clear();
+    return written;
   }
 
   void Wait() {
@@ -236,20 +248,27 @@ class Search {
     if (ending == Ending::kUnwritable) {
       // A reader that has seen enough, such as head, is no failure.
       if (failure_ == EPIPE) return kExitSuccess;
+      if (commands_ && !commands_->all_succeeded()) return kExitNothing;
       Complain(std::string("cannot write the results: ") + std::strerror(failure_));
       return kExitError;
     }
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
-    TellOfSkipped(state);
+    if (commands_ && !commands_->Finish() && Interrupted()) return kExitInterrupted;
+    if (options_.output.count) WriteOut(STDOUT_FILENO, std::to_string(printed_) + "\n");
+    if (!options_.output.quiet || printed_ == 0) TellOfSkipped(state);
     if (options_.verbose) Complain("answered " + SourceText(state));
     found_nothing_ = ending == Ending::kComplete && state.exists && state.matches == 0;
     from_index_ = state.source == task_record::kFromIndex;
     ran_ = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
-    return printed_ > 0 ? kExitSuccess : kExitNothing;
+    const bool failed = commands_ && !commands_->all_succeeded();
+    return printed_ > 0 && !failed ? kExitSuccess : kExitNothing;
   }
 
   // What answers at once shall not walk for a script, which reads no advice.
-  bool IsWorthExplaining() const { return !from_index_ || isatty(STDERR_FILENO) != 0; }
+  bool IsWorthExplaining() const {
+    if (options_.output.quiet) return false;
+    return !from_index_ || isatty(STDERR_FILENO) != 0;
+  }
 
   bool CameToEnd(Ending ending, const RunningSearch& state) {
     const bool walk_refused = options_.common.index_use == nas::IndexUse::kAlways &&
@@ -295,6 +314,7 @@ class Search {
   const SearchOptions& options_;
   const Clock::time_point started_;
   RowFormat format_;
+  std::optional<CommandRunner> commands_;
   ProgressLine progress_;
   std::string task_id_;
   nas::UniqueFd asking_;  // by it the search knows that this program lives

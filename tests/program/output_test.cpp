@@ -1,7 +1,14 @@
 // What a person or a script gets to see, and the values they may write.
 
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
 #include <cstdlib>
 #include <ctime>
+#include <map>
 
 #include "arbory/locate.h"
 #include "arbory/options.h"
@@ -153,25 +160,88 @@ TEST_F(PrintedRows, JsonIsOneValidObjectALine) {
   ASSERT_EQ(lines.size(), 4U);
   const Json::Value broken = Json_(lines[0]);
   EXPECT_EQ(broken["name"], "bro\uFFFDken\n.jpg");
-  EXPECT_EQ(broken["path"], "/share/bro\uFFFDken\n.jpg");
+  EXPECT_EQ(broken["path"], "bro\uFFFDken\n.jpg");
+  EXPECT_EQ(broken["path_base64"], "YnJv/2tlbgouanBn");
   const Json::Value file = Json_(lines[3]);
+  EXPECT_EQ(file["path"], "img10.jpg");
   EXPECT_EQ(file["real_path"], share_ + "/img10.jpg");
+  EXPECT_FALSE(file.isMember("real_path_base64"));
   EXPECT_EQ(file["size"], 100);
-  EXPECT_EQ(file["type"], "JPG");
   EXPECT_EQ(file["owner"]["user"], nas_test::Me());
-  EXPECT_TRUE(file["time"].isMember("mtime"));
   EXPECT_EQ(file["perm"]["mode"], "0644");
 }
 
+// What files are, and times that no clock showed.
+TEST_F(PrintedRows, TypesAndTimesAsTheyAre) {
+  const std::string odd = MakeFolder("volume1/share/odd");
+  ASSERT_EQ(mkfifo((odd + "/pipe").c_str(), 0600), 0);
+  ASSERT_EQ(symlink("nowhere", (odd + "/link").c_str()), 0);
+  sockaddr_un address = {.sun_family = AF_UNIX, .sun_path = "socket"};
+  const nas::UniqueFd folder(open(odd.c_str(), O_PATH | O_CLOEXEC));
+  snprintf(address.sun_path, sizeof address.sun_path, "/proc/self/fd/%d/socket", folder.get());
+  const nas::UniqueFd listener(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(bind(listener.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  WriteFile(odd + "/old", "");
+  constexpr long kLongAgo = -300'000'000;  // 1960
+  const timespec times[] = {{kLongAgo, 0}, {kLongAgo, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, (odd + "/old").c_str(), times, 0), 0);
+  ASSERT_EQ(chmod((odd + "/old").c_str(), 06711), 0);
+  std::map<std::string, Json::Value> rows;
+  for (const std::string& line : Pieces(Run({"search", "--json", "", "odd"}).out, '\n')) {
+    const Json::Value row = Json_(line);
+    rows[row["name"].asString()] = row;
+  }
+  for (const char* type : {"pipe", "link", "socket"}) EXPECT_EQ(rows[type]["type"], type);
+  EXPECT_EQ(rows["old"]["type"], "file");
+  EXPECT_EQ(rows["old"]["time"]["mtime"].asInt64(), kLongAgo);
+  const std::string table = "\n" + Run({"search", "-l", "", "odd"}).out;
+  EXPECT_THAT(table, HasSubstr("-rws--s--x "));
+  EXPECT_THAT(table, HasSubstr(" 1960-06-"));
+  EXPECT_THAT(table, HasSubstr(" odd/link -> nowhere\n"));
+  EXPECT_THAT(table, HasSubstr("\np"));
+  EXPECT_THAT(table, HasSubstr("\ns"));
+}
+
+TEST_F(PrintedRows, Colours) {
+  MakeFolder("volume1/share/in/deep");
+  for (const char* name : {"in/a.TXT", "in/run", "in/b.md", "in/c.md~"}) {
+    WriteFile(share_ + "/" + name, "");
+  }
+  ASSERT_EQ(chmod((share_ + "/in/run").c_str(), 0755), 0);
+  ASSERT_EQ(symlink("nowhere", (share_ + "/in/lost").c_str()), 0);
+  ASSERT_EQ(symlink("run", (share_ + "/in/to").c_str()), 0);
+  // The escapes are shown as braces. A code that is none is not taken.
+  setenv("LS_COLORS", "di=34:*.txt=33:*.md=36:*~=0:or=31:ln=target:fi=\033[2J", 1);
+  std::string out = Run({"search", "", "in", "--sort", "name", "--color", "always"}).out;
+  const std::string none = Run({"search", "", "in", "--sort", "name"}).out;
+  unsetenv("LS_COLORS");
+  for (size_t at; (at = out.find("\033[")) != std::string::npos;) {
+    const bool end = out.compare(at, 4, "\033[0m") == 0;
+    const size_t m = out.find('m', at);
+    out.replace(at, m + 1 - at, end ? "}" : "{" + out.substr(at + 2, m - at - 2) + " ");
+  }
+  EXPECT_EQ(out,
+            "{34 in/}{33 a.TXT}\n{34 in/}{36 b.md}\n{34 in/}c.md~\n{34 in/}{34 deep/}\n"
+            "{34 in/}{31 lost}\n{34 in/}{01;32 run}\n{34 in/}{01;32 to}\n");
+  EXPECT_THAT(none, testing::Not(HasSubstr("\033")));
+}
+
 TEST_F(PrintedRows, LinesOfContents) {
-  WriteFile(share_ + "/old.txt", "one\ntwo caf\xe9\xc9");
+  WriteFile(share_ + "/old.txt", "one\ntwo caf\xe9\xc9\n\nthree CAF\xe9");
   WriteFile(share_ + "/caf\u00e9.bin", std::string(3, '\0'));
   WriteFile(share_ + "/other.bin", std::string(3, '\0'));
   const Output output = Run({"search", "-n", "caf\u00e9", "--sort", "name"});
-  EXPECT_EQ(output.out, "caf\u00e9.bin\nold.txt:2:two caf\u00e9\u00c9\n");
+  EXPECT_EQ(output.out,
+            "caf\u00e9.bin\nold.txt:2:two caf\u00e9\u00c9\nold.txt:4:three CAF\u00e9\n");
   EXPECT_EQ(output.err, "arbory: 1 file is not text\n");
-  const Json::Value row = Json_(Run({"search", "-n", "one", "--json"}).out);
-  EXPECT_EQ(row["line"], Json_(R"({"number": 1, "text": "one"})"));
+  const Json::Value row = Json_(Run({"search", "-A1", "one", "--json"}).out);
+  EXPECT_EQ(row["lines"], Json_(R"([{"number": 1, "text": "one"},
+                      {"number": 2, "text": "two caf\uFFFD\uFFFD", "context": true}])"));
+  const std::string coloured =
+      Run({"search", "-n", "one", "--color", "always", "--index", "never"}).out;
+  EXPECT_EQ(coloured,
+            "\033[35mold.txt\033[0m\033[36m:\033[0m\033[32m1\033[0m\033[36m:\033[0m"
+            "\033[01;31mone\033[0m\n");
 }
 
 TEST_F(PrintedRows, LongRowsTellModeOwnerSizeAndTime) {
