@@ -10,6 +10,7 @@
 #include "arbory/server/service/service.h"
 #include "arbory/server/transport/http_server.h"
 #include "arbory/terminal.h"
+#include "nas/system/confine.h"
 #include "nas/system/shares.h"
 #include "nas/webapi/runner.h"
 
@@ -40,6 +41,17 @@ void OfferSample(Caller* caller) {
   Say("No share is configured: offering the sample share in " + *folder);
 }
 
+// A disk that is not mounted, or a slip of the pen: the server runs without the share, which is
+// there as soon as its folder is.
+void WarnOfMissingShares() {
+  for (const nas::ShareSetting& share : nas::CurrentConfig().shares) {
+    if (nas::FindShare(share.name)) continue;
+    const std::string place = share.origin.empty() ? std::string() : share.origin + ": ";
+    Complain(place + "the share " + share.name + " is not offered: there is no folder " +
+             share.directory);
+  }
+}
+
 // The program as root without --user: people log in, and each request runs as its user.
 bool HasLogins(const ServeOptions& options) {
   return geteuid() == 0 && options.common.user.empty();
@@ -56,6 +68,13 @@ Service::Setup SetupOf(const ServeOptions& options, const nas::ServerSettings& s
   setup.web_dir = FindWebFolder(settings.web_dir);
   setup.counts = [&server] { return server.counts(); };
   return setup;
+}
+
+void WarnOfMissingHelpers() {
+  if (nas::CanConfine()) return;
+  Complain(
+      "bubblewrap is not installed: removing all searches of a user at once will leave their "
+      "results where they are");
 }
 
 void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& settings,
@@ -79,6 +98,8 @@ void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& set
 int RunServeCommand(const ServeOptions& options) {
   Caller caller(options.common);
   OfferSample(&caller);
+  WarnOfMissingShares();
+  WarnOfMissingHelpers();
   const nas::ServerSettings settings = SettingsOf(options);
   HttpServer server(settings);
   Service service(SetupOf(options, settings, caller, server), caller.module());

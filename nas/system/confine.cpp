@@ -8,6 +8,8 @@
 // and nothing else: no home, no share, no network, no other process. A volume that is not itself
 // called /volume-something appears under an unused /volumeN, so that "/volume*" reaches it.
 
+#include "nas/system/confine.h"
+
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
@@ -142,6 +144,7 @@ Result<int> RunConfined(const std::vector<const char*>& command) {
   // its inner half waits for it.
   const UniqueFd status(memfd_create("status", MFD_CLOEXEC));
   if (!status) return ErrnoError();
+  if (!CanConfine()) return ErrnoError(kBubblewrap);
   CommandLine line = Confine(command, status.get());
   const std::vector<char*> words = line.Pointers();
   const pid_t child = fork();
@@ -173,6 +176,9 @@ Result<int> RunForGood(const char* program, const std::vector<const char*>& comm
 }
 
 }  // namespace
+
+bool CanConfine() { return access(kBubblewrap, X_OK) == 0; }
+
 }  // namespace nas
 
 int NLIBCExec(const char* program, const char* arg1, const char* arg2, const char* arg3,

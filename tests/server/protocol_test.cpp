@@ -3,6 +3,9 @@
 
 #include <sys/socket.h>
 
+#include <boost/asio/io_context.hpp>
+#include <boost/asio/ip/tcp.hpp>
+
 #include "arbory/server/service/guard.h"
 #include "arbory/server/transport/addresses.h"
 #include "arbory/server/transport/http_text.h"
@@ -304,6 +307,30 @@ TEST(AddressesTest, TheClientIsTheLastWhomAProxyNames) {
                                          {"", ""}}) {
     EXPECT_EQ(arbory::NetworkOf(address), network);
   }
+}
+
+// What is printed for a server on all addresses leads to it.
+TEST_F(ProtocolTest, AServerOnAllAddressesIsReachedAtOneOfThem) {
+  namespace asio = boost::asio;
+  asio::io_context context;
+  const std::string own = arbory::OwnAddress("0.0.0.0");
+  ASSERT_NE(own, "0.0.0.0");
+  asio::ip::tcp::acceptor all(context, {asio::ip::make_address("0.0.0.0"), 0});
+  asio::ip::tcp::socket socket(context);
+  boost::system::error_code error;
+  socket.connect({asio::ip::make_address(own), all.local_endpoint().port()}, error);
+  EXPECT_FALSE(error) << own << ": " << error.message();
+}
+
+// A disk that is not mounted is no reason not to serve the others.
+TEST_F(ProtocolTest, AShareWithoutItsFolderIsToldOfAtTheStart) {
+  const std::string gone = dir_ + "/gone";
+  share_lines_ += "gone = \"" + gone + "\"\n";
+  Server server = Start();
+  EXPECT_NE(Log().find(":5: the share gone is not offered: there is no folder " + gone),
+            std::string::npos)
+      << Log();
+  EXPECT_EQ(Log().find("the share photo"), std::string::npos) << Log();
 }
 
 TEST(GuardTest, HostsAndOriginsFollowTheirTable) {

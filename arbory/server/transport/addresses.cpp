@@ -1,7 +1,13 @@
 #include "arbory/server/transport/addresses.h"
 
+#include <ifaddrs.h>
+#include <net/if.h>
+#include <netinet/in.h>
+
 #include <algorithm>
 #include <boost/asio/ip/address.hpp>
+#include <cstring>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 
@@ -72,6 +78,48 @@ std::string NetworkOf(const std::string& address) {
   auto bytes = parsed->to_v6().to_bytes();
   std::fill(bytes.begin() + kNetworkBytes, bytes.end(), 0);
   return ip::make_address_v6(bytes).to_string();
+}
+
+namespace {
+
+// Empty for what nobody would type: another family, and addresses of one link alone.
+std::string TextOf(const sockaddr* address) {
+  if (address == nullptr) return {};
+  if (address->sa_family == AF_INET) {
+    sockaddr_in v4;
+    std::memcpy(&v4, address, sizeof(v4));
+    return ip::address_v4(ntohl(v4.sin_addr.s_addr)).to_string();
+  }
+  if (address->sa_family != AF_INET6) return {};
+  sockaddr_in6 v6;
+  std::memcpy(&v6, address, sizeof(v6));
+  ip::address_v6::bytes_type bytes;
+  std::memcpy(bytes.data(), &v6.sin6_addr, bytes.size());
+  const ip::address_v6 text(bytes);
+  return text.is_link_local() ? std::string() : text.to_string();
+}
+
+}  // namespace
+
+std::string OwnAddress(const std::string& any) {
+  const bool v6 = any.find(':') != std::string::npos;
+  ifaddrs* list = nullptr;
+  if (getifaddrs(&list) != 0) list = nullptr;
+  const std::unique_ptr<ifaddrs, void (*)(ifaddrs*)> held(list, freeifaddrs);
+  std::string best = v6 ? "::1" : "127.0.0.1";
+  bool same_family = false;
+  for (const ifaddrs* at = list; at != nullptr; at = at->ifa_next) {
+    const std::string text = TextOf(at->ifa_addr);
+    if (text.empty() || (at->ifa_flags & IFF_UP) == 0 || (at->ifa_flags & IFF_LOOPBACK) != 0) {
+      continue;
+    }
+    // A socket for all IPv6 addresses takes IPv4 too.
+    const bool same = (at->ifa_addr->sa_family == AF_INET6) == v6;
+    if (same_family || (!same && !v6)) continue;
+    best = text;
+    same_family = same;
+  }
+  return best;
 }
 
 }  // namespace arbory

@@ -34,4 +34,8 @@ class Proxies {
 // has one such address has them all. The text itself where it is no address.
 std::string NetworkOf(const std::string& address);
 
+// Where this machine can be reached when a server listens on all of its addresses, which
+// `any` is: one that is not loopback, else loopback. IPv6 ones without brackets.
+std::string OwnAddress(const std::string& any);
+
 }  // namespace arbory

@@ -58,8 +58,9 @@ tcp::endpoint ParseAddress(const std::string& text) {
 }
 
 std::string AddressText(const tcp::endpoint& endpoint) {
-  const std::string address = endpoint.address().to_string();
-  const std::string host = endpoint.address().is_v6() ? "[" + address + "]" : address;
+  std::string address = endpoint.address().to_string();
+  if (endpoint.address().is_unspecified()) address = OwnAddress(address);
+  const std::string host = address.find(':') == std::string::npos ? address : "[" + address + "]";
   return host + ":" + std::to_string(endpoint.port());
 }
 

@@ -34,7 +34,8 @@ class HttpServer {
   HttpServer(const HttpServer&) = delete;
   HttpServer& operator=(const HttpServer&) = delete;
 
-  // Where it listens, with the port that the system chose for port 0; IPv6 in brackets.
+  // Where it is reached, with the port that the system chose for port 0; IPv6 in brackets. Of a
+  // server that listens on all addresses, one of them.
   const std::string& address() const;  // "127.0.0.1:8750"
   int port() const;
   bool on_loopback() const;
