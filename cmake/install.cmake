@@ -9,7 +9,6 @@ install(DIRECTORY web/dist/ DESTINATION share/arbory/web OPTIONAL)
 install(DIRECTORY packaging/sample DESTINATION share/arbory)
 install(FILES packaging/arbory.service packaging/arbory-index.service DESTINATION lib/systemd/system)
 install(DIRECTORY ${CMAKE_BINARY_DIR}/manual/ DESTINATION share PATTERN made EXCLUDE)
-install(FILES docs/api.md docs/deploy.md docs/http.md docs/index.md docs/query.md packaging/arbory.toml
-              packaging/nginx.conf
-        DESTINATION share/doc/arbory)
-install(FILES packaging/pam/arbory DESTINATION share/doc/arbory/pam)
+install(FILES docs/api.md docs/deploy.md docs/http.md docs/index.md docs/query.md DESTINATION share/doc/arbory)
+install(FILES packaging/arbory.toml packaging/nginx.conf DESTINATION share/doc/arbory/examples)
+install(FILES packaging/pam/arbory DESTINATION share/doc/arbory/examples/pam)

@@ -5,8 +5,13 @@ add_library(program_objects OBJECT ${PROGRAM_SOURCES})
 target_link_libraries(program_objects PUBLIC arbory_nas PkgConfig::JSONCPP PkgConfig::PAM
                                              PkgConfig::ARCHIVE PkgConfig::ZLIB
                                              Threads::Threads)
+# What is not installed beside the program is looked for in the tree that it was built from.
+set(ARBORY_TREE ${CMAKE_SOURCE_DIR})
+if(ARBORY_PACKAGE)
+  set(ARBORY_TREE /usr/share/arbory)
+endif()
 target_compile_definitions(program_objects PRIVATE ARBORY_VERSION="${PROJECT_VERSION}"
-                           ARBORY_SOURCE_DIR="${CMAKE_SOURCE_DIR}")
+                           ARBORY_SOURCE_DIR="${ARBORY_TREE}")
 # Half of the time these take to compile is the optimiser's, which gains nothing there: they wait
 # for clients.
 set_source_files_properties(arbory/server/transport/connection.cpp arbory/server/transport/http_server.cpp

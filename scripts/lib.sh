@@ -58,3 +58,9 @@ build_failed() {
   say "The build failed."
   exit 2
 }
+
+# Debian's packages, from where this machine has its own: lines for sources.list.
+debian_sources() {
+  apt-get indextargets --format 'deb $(REPO_URI) $(RELEASE) $(COMPONENT)' \
+    'Created-By: Packages' 'Origin: Debian' | sort -u
+}

@@ -24,7 +24,7 @@ export class Thumbnails {
 
   // Undefined while it is not known.
   of(row: FileRow): Thumbnail | undefined {
-    if (row.is_dir || previewKind(row.name) !== 'image' || whyNotFetched(row.path)) return null;
+    if (row.is_dir || previewKind(row.name) !== 'image') return null;
     const key = keyOf(row);
     const known = this.kept.get(key);
     if (known === undefined && !this.flying.has(key)) {
