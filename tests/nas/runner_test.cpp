@@ -422,7 +422,7 @@ TEST(ReplyReader, RefusesWhatIsNoFrame) {
       {"more than a number", Frame("200 0x\n\n"), State::kBroken},
       {"a field without a value", Frame("200 0\nName\n\n"), State::kBroken},
       {"a head without an end", Frame(std::string(17 << 10, 'x')), State::kBroken},
-      {"a length that cannot be", std::string(100, '\xFF'), State::kBroken},
+      {"a length that cannot be", std::string(100, '\x7F'), State::kBroken},
   };
   for (const auto& [why, bytes, state] : rows)
     EXPECT_EQ(nas::ReplyReader().Feed(bytes), state) << why;
