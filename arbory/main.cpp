@@ -15,6 +15,7 @@
 #include "arbory/command_line.h"
 #include "arbory/command_tree.h"
 #include "arbory/find_command.h"
+#include "arbory/fleet_command.h"
 #include "arbory/generate_command.h"
 #include "arbory/index_command.h"
 #include "arbory/options.h"
@@ -135,6 +136,15 @@ CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
   AddCommonOptions(serve, &options->common);
   serve->footer(kServeHelp);
   return serve;
+}
+
+// What the command line asks of a fleet.
+CLI::App* AddFleetKey(CLI::App* app, FleetOptions* options) {
+  CLI::App* fleet = app->add_subcommand("fleet", "Look after a fleet of machines");
+  fleet->require_subcommand(1);
+  CLI::App* key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
+  key->add_option("FILE", options->key_file, "Where the secret one goes; a new file")->required();
+  return key;
 }
 
 constexpr int kMostThreads = static_cast<int>(nas::NameSource::kMostThreads);
@@ -274,6 +284,8 @@ int Run(int argc, char** argv) {
   ServeOptions serve_options;
   CLI::App* call = AddCall(&app, &call_options);
   CLI::App* serve = AddServe(&app, &serve_options);
+  FleetOptions fleet_options;
+  CLI::App* fleet_key = AddFleetKey(&app, &fleet_options);
   IndexOptions index_options;
   CLI::App* index = AddIndex(&app, &index_options);
   FindOptions find_options;
@@ -296,6 +308,7 @@ int Run(int argc, char** argv) {
     Unmark(&call_options.params);
     return RunCallCommand(call_options);
   }
+  if (fleet_key->parsed()) return RunFleetKeyCommand(fleet_options);
   if (index->parsed()) return RunIndexCommand(index_options);
   if (find->parsed()) return RunFindCommand(find_options);
   if (generate->parsed()) return RunGenerateCommand(generate_options, Describe(&app));

@@ -58,6 +58,10 @@ struct ServeOptions {
   std::string listen;  // HOST:PORT; empty: as configured
 };
 
+struct FleetOptions {
+  std::string key_file;
+};
+
 struct IndexOptions {
   CommonOptions common;
   // One of these, or none: be the daemon.

@@ -8,3 +8,11 @@ target_link_libraries(
   PRIVATE PkgConfig::SQLITE PkgConfig::UCHARDET PkgConfig::UTF8PROC PkgConfig::PCRE2 PkgConfig::ACL PkgConfig::TOML
           PkgConfig::XXHASH
           Threads::Threads ${CMAKE_DL_LIBS})
+
+# What only machines of a fleet load.
+pkg_check_modules(SODIUM REQUIRED IMPORTED_TARGET libsodium)
+pkg_check_modules(CURL REQUIRED IMPORTED_TARGET libcurl)
+file(GLOB FLEET_SOURCES CONFIGURE_DEPENDS nas/fleet/plugin/*.cpp)
+add_library(arbory_fleet MODULE ${FLEET_SOURCES})
+set_target_properties(arbory_fleet PROPERTIES LINKER_LANGUAGE CXX CXX_VISIBILITY_PRESET hidden)
+target_link_libraries(arbory_fleet PRIVATE PkgConfig::SODIUM PkgConfig::CURL)

@@ -67,6 +67,50 @@ struct IndexSettings {
   bool operator==(const IndexSettings&) const = default;
 };
 
+// Another machine's `arbory serve` that asks this one for people who are logged in there.
+struct FrontSetting {
+  std::string name;
+  std::string key;    // its Ed25519 public key in hexadecimal
+  std::string realm;  // of the people it names: USER@REALM, or USER where there is none
+  // Whom it may speak for: these, and the members of these groups.
+  std::vector<std::string> users;
+  std::vector<std::string> groups;
+  int searches = 32;  // running at once
+
+  bool operator==(const FrontSetting&) const = default;
+};
+
+// What `arbory serve` answers fronts by; nobody without any of them.
+struct BoxSettings {
+  std::string name;  // that fronts know it by
+  // Below are the system's own accounts, for whom no front may speak; nor for root.
+  int lowest_uid = 1000;
+  std::vector<FrontSetting> fronts;
+
+  bool operator==(const BoxSettings&) const = default;
+};
+
+// A machine that a front asks.
+struct FleetBox {
+  std::string name;
+  std::string address;  // "http://HOST:PORT", or with https
+
+  bool operator==(const FleetBox&) const = default;
+};
+
+// What a front asks boxes by; none without any of them.
+struct FleetSettings {
+  std::string front;  // what boxes know it by
+  std::string realm;
+  std::string key_file;  // its secret key, for root or its user alone
+  std::string proxy;     // socket of a proxy that knows every box by its name; empty: no such thing
+  int deadline_ms = 2000;        // for a box to say something
+  int rows_per_box = 1'000'000;  // of one search; what is over stays where it is
+  std::vector<FleetBox> boxes;
+
+  bool operator==(const FleetSettings&) const = default;
+};
+
 // Where root's state is unless configured otherwise.
 inline constexpr char kSystemStateDir[] = "/var/lib/arbory";
 
@@ -97,6 +141,8 @@ struct Config {
   bool keep_attributes = true;  // false: of results only names and types are asked for
   bool keep_orderings = true;   // results may be listed later, sorted by any column
   IndexSettings index;
+  BoxSettings box;
+  FleetSettings fleet;  // of `arbory serve --fleet`, from a file of its own
 
   bool operator==(const Config&) const = default;
 };
@@ -110,6 +156,8 @@ class ConfigError : public std::runtime_error {
 // /etc/arbory/arbory.toml and $XDG_CONFIG_HOME/arbory/arbory.toml; without any of them, defaults
 // for the calling user. A file named by `path` or $ARBORY_CONFIG must exist. Throws ConfigError.
 Config LoadConfig(const std::string& path);
+// Reads what a front asks boxes by. Throws ConfigError.
+FleetSettings LoadFleet(const std::string& path);
 // The configuration without any file.
 Config DefaultConfig();
 

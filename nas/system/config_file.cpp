@@ -9,6 +9,18 @@
 //   listen = "127.0.0.1:8750"
 //   [index]
 //   folders = ["photo", "/srv/music"]
+//   [fleet]
+//   name = "box1"
+//   [fleet.fronts.office]
+//   key = "..."
+//   groups = ["staff"]
+//
+// and of the file that says what a front asks:
+//
+//   front = "office"
+//   key_file = "/etc/arbory/office.key"
+//   [boxes]
+//   box1 = "http://box1.example.net:8750"
 //
 // A key that is not known is an error, so that a misspelt one is noticed.
 
@@ -91,8 +103,30 @@ class Reader {
          [&](const toml::node& node) { config->large_calls_per_user = Limit(node); }},
         {"server", [&](const toml::node& node) { ReadServer(node, &config->server); }},
         {"index", [&](const toml::node& node) { ReadIndex(node, &config->index); }},
+        {"fleet", [&](const toml::node& node) { ReadBox(node, &config->box); }},
     };
     ReadTable(document, keys);
+  }
+
+  void ReadFleet(FleetSettings* fleet) {
+    const auto text = ReadWholeFile(AT_FDCWD, file_, kMaxFileBytes);
+    if (!text) throw ConfigError(text.error().Text());
+    Keys keys = {
+        {"front",
+         [&](const toml::node& node) { fleet->front = FleetName(node.source(), Text(node)); }},
+        {"realm", [&](const toml::node& node) { fleet->realm = Text(node); }},
+        {"key_file", [&](const toml::node& node) { fleet->key_file = Path(node); }},
+        {"proxy", [&](const toml::node& node) { fleet->proxy = PathOrNone(node); }},
+        {"boxes", [&](const toml::node& node) { fleet->boxes = Boxes(node); }},
+    };
+    AddLimits({{"deadline_ms", &fleet->deadline_ms}, {"rows_per_box", &fleet->rows_per_box}},
+              &keys);
+    ReadTable(Parse(*text), keys);
+    for (const auto& [missing, what] :
+         {std::pair(fleet->front.empty(), "front"), std::pair(fleet->key_file.empty(), "key_file"),
+          std::pair(fleet->boxes.empty(), "boxes")}) {
+      if (missing) throw ConfigError(file_ + ": \"" + what + "\" is missing");
+    }
   }
 
  private:
@@ -179,6 +213,73 @@ class Reader {
     ReadTable(Table(node), keys);
   }
 
+  void ReadBox(const toml::node& node, BoxSettings* box) {
+    Keys keys = {
+        {"name",
+         [&](const toml::node& value) { box->name = FleetName(value.source(), Text(value)); }},
+        {"fronts",
+         [&](const toml::node& value) {
+           for (const auto& [name, front] : Table(value)) {
+             box->fronts.push_back(Front(FleetName(name.source(), std::string(name.str())), front));
+           }
+         }},
+    };
+    AddLimits({{"lowest_uid", &box->lowest_uid}}, &keys);
+    ReadTable(Table(node), keys);
+    if (box->name.empty()) Fail(node.source(), "the name that fronts know this box by is missing");
+  }
+
+  FrontSetting Front(const std::string& name, const toml::node& node) {
+    FrontSetting front;
+    front.name = name;
+    Keys keys = {
+        {"key", [&](const toml::node& value) { front.key = Key(value); }},
+        {"realm", [&](const toml::node& value) { front.realm = Text(value); }},
+        {"users", [&](const toml::node& value) { front.users = Texts(value); }},
+        {"groups", [&](const toml::node& value) { front.groups = Texts(value); }},
+    };
+    AddLimits({{"searches", &front.searches}}, &keys);
+    ReadTable(Table(node), keys);
+    if (front.key.empty()) Fail(node.source(), "the front's public key is missing");
+    return front;
+  }
+
+  std::vector<FleetBox> Boxes(const toml::node& node) {
+    std::vector<FleetBox> boxes;
+    for (const auto& [name, address] : Table(node)) {
+      const std::string text = Text(address);
+      if (!text.starts_with("http://") && !text.starts_with("https://")) {
+        Fail(address.source(), "an address such as http://box1.example.net:8750 is expected here");
+      }
+      boxes.push_back({FleetName(name.source(), std::string(name.str())), text});
+    }
+    return boxes;
+  }
+
+  // It is a folder's name in locations and a part of addresses; those of homes mean something else.
+  std::string FleetName(const toml::source_region& source, const std::string& name) {
+    constexpr std::string_view kAllowed =
+        "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789-_";
+    constexpr size_t kMostBytes = 64;
+    const bool good = !name.empty() && name.size() <= kMostBytes &&
+                      name.find_first_not_of(kAllowed) == std::string::npos;
+    if (!good || name == "home" || name == "homes") {
+      Fail(source, "a name of letters, digits, '-' and '_' is expected here, no \"home\"");
+    }
+    return name;
+  }
+
+  std::string Key(const toml::node& node) {
+    constexpr size_t kKeyDigits = 64;
+    const std::string key = Text(node);
+    if (key.size() != kKeyDigits ||
+        key.find_first_not_of("0123456789abcdef") != std::string::npos) {
+      Fail(node.source(),
+           "64 hexadecimal digits are expected here, as arbory fleet key prints them");
+    }
+    return key;
+  }
+
   std::string Text(const toml::node& node) {
     const auto* text = node.as_string();
     if (text == nullptr) Fail(node.source(), "a text is expected here");
@@ -253,6 +354,12 @@ Config LoadConfig(const std::string& path) {
   const std::string file = FindFile(path);
   if (!file.empty()) Reader(file).Read(&config);
   return config;
+}
+
+FleetSettings LoadFleet(const std::string& path) {
+  FleetSettings fleet;
+  Reader(path).ReadFleet(&fleet);
+  return fleet;
 }
 
 }  // namespace nas

@@ -61,6 +61,9 @@ std::string g_spool_folder;
 const std::string& SpoolFolder() { return g_spool_folder; }
 
 Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode) {
+  if (call.admit) {
+    if (auto refusal = call.admit()) return std::move(*refusal);
+  }
   if (const Status entered = EnterUserState(call.user); !entered) {
     Report(entered.error());
     return encode(WfmLibGetErr(), Json::Value());

@@ -27,6 +27,9 @@ struct ApiCall {
   std::function<std::optional<Reply>(Json::Value* params)> read_params = {};
   // Where given, what becomes of the reply before it is sent; in the request child too.
   std::function<Reply(Reply)> finish = {};
+  // Where given, is asked in the request child before that becomes the user, and gives the reply
+  // where it may not be.
+  std::function<std::optional<Reply>()> admit = {};
 };
 
 // Turns the entry function's reply into what is sent. Runs in the request child, so that a caller

@@ -62,6 +62,11 @@ TEST_F(ConfigTest, NamesTheLineOfTheTrouble) {
       {"[server]\nbehind_tls = 1\n", ":2: true or false"},
       {"[server]\norigins = \"https://nas\"\n", ":2: a list"},
       {"[server]\nweb_dir = \"web\"\n", ":2: an absolute path"},
+      {"[fleet]\nlowest_uid = 500\n", ":1: the name"},
+      {"[fleet]\nname = \"home\"\n", ":2: a name"},
+      {"[fleet]\nname = \"a/b\"\n", ":2: a name"},
+      {"[fleet]\nname = \"b\"\n[fleet.fronts.o]\nusers = []\n", ":3: the front's public key"},
+      {"[fleet]\nname = \"b\"\n[fleet.fronts.o]\nkey = \"6B\"\n", ":4: 64 hexadecimal"},
   };
   for (const auto& row : rows) {
     const std::string trouble = Trouble(row.content);

@@ -34,7 +34,8 @@ void GiveTo(const std::string& path, const std::string& user) {
   ASSERT_EQ(chown(path.c_str(), account->pw_uid, account->pw_gid), 0);
 }
 
-[[noreturn]] void Exec(const std::string& config, const std::string& log, int out, bool step_down) {
+[[noreturn]] void Exec(const std::string& config, const std::string& fleet, const std::string& log,
+                       int out, bool step_down) {
   const int null = open("/dev/null", O_RDONLY);
   const int err = open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0666);
   dup2(null, STDIN_FILENO);
@@ -43,9 +44,11 @@ void GiveTo(const std::string& path, const std::string& user) {
   prctl(PR_SET_PDEATHSIG, SIGTERM);  // a test that crashes leaves no server behind
   // Root serves the other user without becoming it first: that user may not be able to enter the
   // tree.
-  const char* user = step_down ? "--user" : nullptr;
-  execl(ARBORY_BIN_DIR "/arbory", "arbory", "serve", "--config", config.c_str(), user,
-        nas_test::kOtherUser, nullptr);
+  std::vector<const char*> words = {"arbory", "serve", "--config", config.c_str()};
+  if (!fleet.empty()) words.insert(words.end(), {"--fleet", fleet.c_str()});
+  if (step_down) words.insert(words.end(), {"--user", nas_test::kOtherUser});
+  words.push_back(nullptr);
+  execv(ARBORY_BIN_DIR "/arbory", const_cast<char**>(words.data()));
   _exit(98);
 }
 
@@ -179,6 +182,7 @@ std::string ServerTest::User() { return AmRoot() ? nas_test::kOtherUser : nas_te
 
 void ServerTest::SetUp() {
   PlatformTest::SetUp();
+  root_state_ = dir_ + "/root-state";
   share_ = MakeFolder("photo");
   share_lines_ = "[shares]\nphoto = \"" + share_ + "\"\n";
   MakeFolder("state");
@@ -194,7 +198,7 @@ void ServerTest::TearDown() {
 
 Server ServerTest::Start(const std::string& server_lines, const std::string& top_lines, As as) {
   const bool logins = as == As::kRootWithLogins;
-  const std::string state = logins ? dir_ + "/root-state" : state_;
+  const std::string state = logins ? root_state_ : state_;
   const std::string config = dir_ + "/server.toml";
   WriteFile(config, "state_dir = \"" + state + "\"\nvolumes = [\"" + dir_ + "/volume*\"]\n" +
                         top_lines + share_lines_ + "[server]\nlisten = \"127.0.0.1:0\"\n" +
@@ -206,7 +210,7 @@ Server ServerTest::Start(const std::string& server_lines, const std::string& top
   const nas::UniqueFd out(ends[0]);
   Server server;
   server.pid = fork();
-  if (server.pid == 0) Exec(config, dir_ + "/log", ends[1], AmRoot() && !logins);
+  if (server.pid == 0) Exec(config, fleet_file_, dir_ + "/log", ends[1], AmRoot() && !logins);
   close(ends[1]);
   servers_.push_back(server.pid);
   std::string said;

@@ -47,11 +47,13 @@ Calls::Calls(int calls, bool several_users, Metrics* metrics)
       downloads_((calls + 1) / 2, several_users),
       logins_(kLogins, /*shared=*/true),
       checks_(kChecks, /*shared=*/false),
+      fronts_((calls + 1) / 2, /*shared=*/true),
       metrics_(*metrics) {}
 
 Places& Calls::PlacesOf(Kind kind) {
   if (kind == Kind::kLogin) return logins_;
   if (kind == Kind::kCheck) return checks_;
+  if (kind == Kind::kFront) return fronts_;
   return kind == Kind::kDownload ? downloads_ : calls_;
 }
 

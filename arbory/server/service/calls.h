@@ -34,14 +34,16 @@ class Places {
 class Calls {
  public:
   // Each kind has places of its own: a download lasts as long as its client likes, and a login must
-  // be possible whatever the others do.
-  enum class Kind { kCall, kDownload, kLogin, kCheck };
+  // be possible whatever the others do; fronts, each with the people of a whole company behind it,
+  // have places among themselves.
+  enum class Kind { kCall, kDownload, kLogin, kCheck, kFront };
 
   // `calls` is the number of calls at once; `several_users`: they are shared among users. What is
   // given must outlive this object, and this object the children it started.
   Calls(int calls, bool several_users, Metrics* metrics);
 
-  // Has the child that `start` forks answer for `who`, a user or where a login comes from; 503 when
+  // Has the child that `start` forks answer for `who`, a user, a front or where a login comes
+  // from; 503 when
   // too many run or none can be forked. `name` names the call in the counts: a route or a row of
   // the module, never what a client made up; empty for what is not counted. Nor is what turns out
   // malformed in the child. A child that ends without a reply is answered for with 503.
@@ -51,7 +53,7 @@ class Calls {
  private:
   Places& PlacesOf(Kind kind);
 
-  Places calls_, downloads_, logins_, checks_;
+  Places calls_, downloads_, logins_, checks_, fronts_;
   Metrics& metrics_;
 };
 

@@ -123,6 +123,7 @@ std::string AccessLine(const HttpRequest& request, int status, std::uint64_t byt
   line["path"] = Visible(request.path().substr(0, kMaxPath));
   line["status"] = status;
   line["user"] = request.user;
+  if (!request.front.empty()) line["front"] = request.front;
   line["ms"] = std::round(spent.count() * kTenths) / kTenths;
   line["bytes"] = Json::UInt64{bytes};
   return nas::JsonText(line, nas::JsonBytes::kClean) + "\n";

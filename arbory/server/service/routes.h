@@ -23,6 +23,7 @@ enum class Access {
   kEverybody,
   kThisMachine,  // clients on the machine itself
   kLoggedIn,     // with a session; the request's user is filled in
+  kFront,        // with a front's token; the request's user and front are filled in
 };
 
 struct Route {

@@ -9,6 +9,7 @@
 #include "arbory/caller.h"
 #include "arbory/server/service/archives.h"
 #include "arbory/server/service/begin_search.h"
+#include "arbory/server/service/fleet_search.h"
 #include "arbory/server/service/gzip.h"
 #include "arbory/server/service/openapi.h"
 #include "arbory/server/service/pages.h"
@@ -116,8 +117,9 @@ std::span<const Route> Service::Routes() {
        "Who is logged in and until when", kJson},
       {kGet, "/shares", Access::kLoggedIn,
        [](Self self, Request request, Path) {
-         return self.calls_.Run(Calls::Kind::kCall, request->user, "shares",
-                                [&] { return StartListShares(request->user); });
+         return self.calls_.Run(Calls::Kind::kCall, request->user, "shares", [&] {
+           return StartListShares({"", {}, request->user, "server"});
+         });
        },
        "The shares the user can enter", kJson},
       {kPost, "/searches", Access::kLoggedIn,
@@ -160,6 +162,26 @@ std::span<const Route> Service::Routes() {
       {kGet, "/lines/{share}/{path...}", Access::kLoggedIn,
        [](Self self, Request request, Path path) { return self.GetFirstLine(*request, path); },
        "The first line of a file that holds what ?pattern= asks for", kJson},
+      {kPost, "/fleet/search", Access::kFront,
+       [](Self self, Request request, Path) {
+         return self.AskForFront(
+             *request, "fleet/search", /*leased=*/true,
+             [&](const nas::ApiCall& call) { return StartFleetSearch(request->front, call); });
+       },
+       nullptr, nullptr},
+      {kPost, "/fleet/rows", Access::kFront,
+       [](Self self, Request request, Path) {
+         return self.AskForFront(*request, "fleet/rows", /*leased=*/false, StartFleetRows);
+       },
+       nullptr, nullptr},
+      {kPost, "/fleet/end", Access::kFront,
+       [](Self self, Request request, Path) { return self.EndForFront(*request); }, nullptr,
+       nullptr},
+      {kGet, "/fleet/shares", Access::kFront,
+       [](Self self, Request request, Path) {
+         return self.AskForFront(*request, "fleet/shares", /*leased=*/false, StartListShares);
+       },
+       nullptr, nullptr},
       {kGet, "/api", Access::kEverybody,
        [](Self self, Request, Path) -> Answer { return JsonReply(kOk, self.api_list_); },
        "The rows of the method table", kJson},
@@ -187,6 +209,7 @@ Service::Service(Setup setup, const nas::Module& module)
       calls_(setup_.settings.max_calls, setup_.single_user.empty(), &metrics_),
       bodies_(BodyLimitsOf(setup_)),
       entrance_(RulesOf(setup_), module, &calls_, &metrics_),
+      fronts_(nas::CurrentConfig().box),
       api_list_(ListRows(module)),
       openapi_(OpenApiText(module, Routes(), setup_.cookie)) {}
 
@@ -228,6 +251,7 @@ std::optional<HttpReply> Service::Refusal(const Route& route, HttpRequest* reque
     }
   }
   if (route.access == Access::kLoggedIn) return entrance_.LetIn(request);
+  if (route.access == Access::kFront) return fronts_.LetIn(request, std::time(nullptr));
   if (route.access == Access::kThisMachine && !request->from_loopback) {
     return ErrorReply(kForbidden, "Read the metrics on the machine itself.");
   }
@@ -273,6 +297,31 @@ Answer Service::BeginSearch(const HttpRequest& request) {
   }
   return Ask(request, "begin",
              [&](const nas::ApiCall& call) { return StartBegin(call, *start, *list); });
+}
+
+nas::ApiCall Service::CallOfFront(const HttpRequest& request, bool leased) {
+  nas::ApiCall call = {"", Json::Value(Json::objectValue), request.user, "server", leased};
+  if (!request.body.empty()) call.read_params = ReaderOf(request.body);
+  call.admit = [front = request.front, user = request.user] { return Admit(front, user); };
+  return call;
+}
+
+Answer Service::AskForFront(const HttpRequest& request, const std::string& name, bool leased,
+                            const std::function<nas::Child(const nas::ApiCall&)>& start) {
+  return WithRoom(request, [&] {
+    return calls_.Run(Calls::Kind::kFront, request.front, name,
+                      [&] { return start(CallOfFront(request, leased)); });
+  });
+}
+
+// As people end theirs.
+Answer Service::EndForFront(const HttpRequest& request) {
+  const NUVA::APIMethod* clean = module_.Find(kSearchApi, kSearchVersion, "clean");
+  if (clean == nullptr) return ErrorReply(kUnavailable, "Searches cannot be ended here.");
+  return AskForFront(request, "fleet/end", /*leased=*/false, [&](nas::ApiCall call) {
+    call.method = clean->method;
+    return nas::StartCall(*clean, call, nas::EncodeJsonReply);
+  });
 }
 
 Answer Service::WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of) {

@@ -11,6 +11,7 @@
 #include "arbory/server/service/calls.h"
 #include "arbory/server/service/entrance.h"
 #include "arbory/server/service/files.h"
+#include "arbory/server/service/fronts.h"
 #include "arbory/server/service/guard.h"
 #include "arbory/server/service/metrics.h"
 #include "arbory/server/service/routes.h"
@@ -54,6 +55,11 @@ class Service : public HttpService {
   // A call of the server's own, whose parameters are read from `body` where there is one.
   static nas::ApiCall OwnCall(const HttpRequest& request, const std::string* body);
   static Answer WithRoom(const HttpRequest& request, const std::function<Answer()>& answer_of);
+  static nas::ApiCall CallOfFront(const HttpRequest& request, bool leased);
+  // The same for a front, if that may speak for the user.
+  Answer AskForFront(const HttpRequest& request, const std::string& name, bool leased,
+                     const std::function<nas::Child(const nas::ApiCall&)>& start);
+  Answer EndForFront(const HttpRequest& request);
   Answer StartCall(const HttpRequest& request, const RequestPath& path);
   Answer NoSuchRow(const RequestPath& path, const nas::ApiCall& call);
   HttpReply NoSuchRowReply(const RequestPath& path) const;
@@ -72,6 +78,7 @@ class Service : public HttpService {
   Calls calls_;
   Bodies bodies_;
   Entrance entrance_;
+  Fronts fronts_;
   const std::string api_list_;
   const std::string openapi_;
 };

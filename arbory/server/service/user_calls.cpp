@@ -248,7 +248,12 @@ void StopSearchesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   response->SetError(kOk, body);
 }
 
-// The code is the HTTP status and the data its JSON body.
+nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
+  return StartOwn(entry, {"", params, user, "server"});
+}
+
+}  // namespace
+
 nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
   if (!data.isNull() && code >= kOk)
     return {{code, code}, nas::JsonText(data, nas::JsonBytes::kClean)};
@@ -258,12 +263,6 @@ nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
       ErrorReply(kUnavailable, "The user's state folder cannot be used; the system log says why.")
           .body};
 }
-
-nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Value& params) {
-  return StartOwn(entry, {"", params, user, "server"});
-}
-
-}  // namespace
 
 nas::Child StartOwn(NUVA::APIEntry entry, const nas::ApiCall& call) {
   return nas::StartCall({"arbory", 1, "", entry}, call, EncodeOwnReply);
@@ -286,6 +285,10 @@ bool BecomeCaller(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   return false;
 }
 
+void RefuseOwn(NUVA::APIResponse* response, int status, const char* sentence) {
+  response->SetError(status, OwnError(status, sentence));
+}
+
 nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply) {
   const NUVA::APIMethod row = {"arbory", 1, "",
                                [](NUVA::APIRequest* /*request*/, NUVA::APIResponse* response) {
@@ -295,9 +298,7 @@ nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply) {
                         [&](int /*code*/, const Json::Value& /*data*/) { return reply; });
 }
 
-nas::Child StartListShares(const std::string& user) {
-  return Start(ListSharesEntry, user, Json::Value());
-}
+nas::Child StartListShares(const nas::ApiCall& call) { return StartOwn(ListSharesEntry, call); }
 
 nas::Child StartReadSearch(const std::string& user, const std::string& task_id) {
   Json::Value params;

@@ -17,9 +17,13 @@ nas::Child StartOwn(NUVA::APIEntry entry, const nas::ApiCall& call);
 bool BecomeCaller(NUVA::APIRequest* request, NUVA::APIResponse* response);
 Json::Value OwnError(int status, const char* sentence);
 inline constexpr char kWrongType[] = "A field has a wrong type; docs/http.md names them.";
+// The code is the HTTP status and the data its JSON body.
+nas::Reply EncodeOwnReply(int code, const Json::Value& data);
+// Answers with an error's status and sentence.
+void RefuseOwn(NUVA::APIResponse* response, int status, const char* sentence);
 
 // {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list.
-nas::Child StartListShares(const std::string& user);
+nas::Child StartListShares(const nas::ApiCall& call);
 
 // {"taskid","finished","progress","errno","location","walk"} of the user's search; 404 when there
 // is none of that id.

@@ -65,6 +65,7 @@ struct HttpRequest {
 
   // For the access log, filled in by the service.
   std::string user;
+  std::string front;  // that asks for the user; empty for people
 
   // The first field of that name (in lower case); null when there is none.
   const std::string* Field(std::string_view name) const;

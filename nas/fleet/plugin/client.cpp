@@ -1,0 +1,148 @@
+// Asking over HTTP/1.1 by libcurl's multi interface.
+
+#include "nas/fleet/plugin/client.h"
+
+#include <curl/curl.h>
+
+#include <map>
+#include <memory>
+#include <utility>
+
+namespace nas {
+namespace {
+
+// Bounds how long Run takes to see its stop flag.
+constexpr int kTickMilliseconds = 25;
+
+struct EasyEnd {
+  void operator()(CURL* easy) const { curl_easy_cleanup(easy); }
+};
+struct ListEnd {
+  void operator()(curl_slist* list) const { curl_slist_free_all(list); }
+};
+
+// One request under way.
+struct Exchange {
+  std::unique_ptr<CURL, EasyEnd> easy{curl_easy_init()};
+  std::unique_ptr<curl_slist, ListEnd> fields;
+  std::string body;  // sent
+  FleetReply reply;
+  size_t most_bytes = 0;
+  FleetClient::Done done;
+};
+
+size_t TakeBody(char* bytes, size_t size, size_t count, void* context) {
+  auto& exchange = *static_cast<Exchange*>(context);
+  const size_t length = size * count;
+  if (exchange.reply.body.size() + length > exchange.most_bytes) {
+    exchange.reply.outcome = FleetReply::Outcome::kTooLong;
+    return 0;
+  }
+  exchange.reply.body.append(bytes, length);
+  return length;
+}
+
+class CurlClient : public FleetClient {
+ public:
+  CurlClient(std::string socket, size_t most_bytes)
+      : socket_(std::move(socket)), most_bytes_(most_bytes), multi_(curl_multi_init()) {}
+  ~CurlClient() override {
+    BreakOff();
+    curl_multi_cleanup(multi_);
+  }
+  CurlClient(const CurlClient&) = delete;
+  CurlClient& operator=(const CurlClient&) = delete;
+
+  void Ask(const FleetRequest& request, Done done) override;
+  void Run(const std::function<bool()>& stop) override;
+
+ private:
+  void TakeEnded();
+  void BreakOff();
+
+  const std::string socket_;
+  const size_t most_bytes_;
+  CURLM* const multi_;
+  std::map<CURL*, std::unique_ptr<Exchange>> under_way_;
+};
+
+void CurlClient::Ask(const FleetRequest& request, Done done) {
+  auto exchange = std::make_unique<Exchange>();
+  CURL* easy = exchange->easy.get();
+  exchange->body = request.body;
+  exchange->most_bytes = most_bytes_;
+  exchange->done = std::move(done);
+  const auto add = [&](const std::string& field) {
+    curl_slist* longer = curl_slist_append(exchange->fields.get(), field.c_str());
+    (void)exchange->fields.release();
+    exchange->fields.reset(longer);
+  };
+  add("Authorization: Arbory-Fleet " + request.token);
+  if (!request.host.empty()) add("Host: " + request.host);
+  add("Expect:");
+  if (request.method == "POST") {
+    add("Content-Type: application/json");
+    curl_easy_setopt(easy, CURLOPT_POSTFIELDS, exchange->body.data());
+    curl_easy_setopt(easy, CURLOPT_POSTFIELDSIZE_LARGE,
+                     static_cast<curl_off_t>(exchange->body.size()));
+  }
+  curl_easy_setopt(easy, CURLOPT_URL, (request.address + request.target).c_str());
+  curl_easy_setopt(easy, CURLOPT_PATH_AS_IS, 1L);
+  if (!socket_.empty()) curl_easy_setopt(easy, CURLOPT_UNIX_SOCKET_PATH, socket_.c_str());
+  curl_easy_setopt(easy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
+  curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
+  curl_easy_setopt(easy, CURLOPT_PROXY, "");  // whatever the environment says
+  curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
+  curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, static_cast<long>(request.deadline_ms));
+  curl_easy_setopt(easy, CURLOPT_HTTPHEADER, exchange->fields.get());
+  curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, TakeBody);
+  curl_easy_setopt(easy, CURLOPT_WRITEDATA, exchange.get());
+  curl_multi_add_handle(multi_, easy);
+  under_way_.emplace(easy, std::move(exchange));
+}
+
+void CurlClient::Run(const std::function<bool()>& stop) {
+  while (!under_way_.empty() && !stop()) {
+    int running = 0;
+    curl_multi_perform(multi_, &running);
+    TakeEnded();
+    if (!under_way_.empty()) curl_multi_poll(multi_, nullptr, 0, kTickMilliseconds, nullptr);
+  }
+  BreakOff();
+}
+
+void CurlClient::TakeEnded() {
+  int left = 0;
+  while (const CURLMsg* message = curl_multi_info_read(multi_, &left)) {
+    if (message->msg != CURLMSG_DONE) continue;
+    const CURLcode result = message->data.result;
+    const auto ended = under_way_.extract(message->easy_handle);
+    curl_multi_remove_handle(multi_, ended.key());
+    Exchange& exchange = *ended.mapped();
+    FleetReply& reply = exchange.reply;
+    if (result == CURLE_OK) {
+      long status = 0;
+      curl_easy_getinfo(ended.key(), CURLINFO_RESPONSE_CODE, &status);
+      reply.outcome = FleetReply::Outcome::kReply;
+      reply.status = static_cast<int>(status);
+    } else if (reply.outcome != FleetReply::Outcome::kTooLong) {
+      reply.outcome = result == CURLE_OPERATION_TIMEDOUT ? FleetReply::Outcome::kLate
+                                                         : FleetReply::Outcome::kDown;
+    }
+    exchange.done(std::move(reply));
+  }
+}
+
+void CurlClient::BreakOff() {
+  for (const auto& [easy, exchange] : under_way_) curl_multi_remove_handle(multi_, easy);
+  under_way_.clear();
+}
+
+}  // namespace
+
+FleetClient* NewFleetClient(const std::string& socket, size_t most_bytes) {
+  curl_global_init(CURL_GLOBAL_DEFAULT);
+  return new CurlClient(socket, most_bytes);
+}
+
+}  // namespace nas

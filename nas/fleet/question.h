@@ -1,0 +1,113 @@
+#pragma once
+// What a front asks a box and what it is told: the bodies of /fleet/search and /fleet/rows
+// (docs/fleet.md). JSON whose strings keep their bytes, as names need not be UTF-8. Owners travel
+// as names, since every machine has numbers of its own.
+//
+// A page, as a box sends it:
+//
+//   "protocol"   kFleetProtocol
+//   "version"    of the box's program
+//   "task"       for further pages
+//   "finished"   whether no more rows will be found
+//   "error"      a platform error's number, of a search that failed
+//   "source", "index"   where names come from, as in the task property "walk"
+//   "total"      rows found so far
+//   "next"       the row after the last one here: "after" of the next request
+//   "users", "groups"   names
+//   "folders"    [share, path below its root]
+//   "rows"       [folder, name, mode, user, group, size, modified, opened, changed, created]:
+//                folder, user and group by their places above; created is null where none is known
+//
+// Rows come in the order found, numbered from 0, so that a page neither repeats a row nor leaves
+// one out while the search goes on.
+
+#include <json/value.h>
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "nas/base/accounts.h"
+#include "nas/base/error.h"
+#include "nas/files/attributes.h"
+#include "nas/match/query.h"
+#include "nas/results/block_reader.h"
+
+namespace nas {
+
+// Of what both ends say; a box that does not know a word of a question refuses it.
+inline constexpr int kFleetProtocol = 1;
+// Of one page, which fits a few hundred kilobytes.
+inline constexpr unsigned kMostFleetRows = 2000;
+// That a box may be asked to wait for rows.
+inline constexpr int kMostFleetWaitMs = 1000;
+
+struct FleetPageRequest {
+  unsigned limit = kMostFleetRows;
+  int wait_ms = 0;          // for as many rows, or the search's end
+  std::uint64_t after = 0;  // the first row wanted
+};
+
+struct FleetQuestion {
+  QueryNode query;
+  bool contents = false;  // contents can stand in for names
+  bool recursive = true;
+  std::vector<std::string> locations;  // "/SHARE/below", as the box has them
+  FleetPageRequest page;
+};
+
+std::string FleetQuestionText(const FleetQuestion& question);
+// kErrorIllegal for what is no question of this protocol. Looks accounts up.
+Result<FleetQuestion> ReadFleetQuestion(const Json::Value& json);
+
+Json::Value FleetPageRequestJson(const FleetPageRequest& page);
+Result<FleetPageRequest> ReadFleetPageRequest(const Json::Value& json);
+
+// Collects a page's rows.
+class FleetPageWriter {
+ public:
+  void Add(const ResultRow& row);
+  // Moves "users", "groups", "folders" and "rows" there.
+  void Finish(Json::Value* page);
+
+ private:
+  static unsigned Place(Json::Value& names, std::map<std::string, unsigned>& known,
+                        const std::string& name);
+
+  AccountTexts accounts_;
+  Json::Value users_{Json::arrayValue};
+  Json::Value groups_{Json::arrayValue};
+  Json::Value folders_{Json::arrayValue};
+  Json::Value rows_{Json::arrayValue};
+  std::map<std::string, unsigned> known_users_;
+  std::map<std::string, unsigned> known_groups_;
+  std::string last_folder_;  // share, NUL, path
+};
+
+// A row as it came, valid as long as the page. Nothing of it is believed but that it is in order.
+struct FleetRow {
+  std::string share;
+  std::string folder;
+  std::string name;
+  std::string user;
+  std::string group;
+  FileAttributes attributes;  // without owners and folder
+};
+
+struct FleetPage {
+  std::string version;
+  std::string task;
+  std::string index;
+  std::string source;
+  bool finished = false;
+  int error = 0;
+  std::uint64_t total = 0;
+  std::uint64_t next = 0;
+  std::vector<FleetRow> rows;
+};
+
+// kErrorIllegal for what is no page: among others names that hold "/" or NUL, or mean a folder.
+Result<FleetPage> ReadFleetPage(std::string_view text);
+
+}  // namespace nas
