@@ -43,6 +43,11 @@ void Caller::AddShares(const std::vector<nas::ShareSetting>& shares) {
   nas::Configure(config_);
 }
 
+void Caller::AskFleet(nas::FleetSettings fleet) {
+  config_.fleet = std::move(fleet);
+  nas::Configure(config_);
+}
+
 void Caller::LeaveUnsorted() {
   config_.keep_orderings = false;
   nas::Configure(config_);

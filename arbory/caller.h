@@ -26,6 +26,8 @@ class Caller {
 
   // Offers more shares, for this run; calls begun before do not know them.
   void AddShares(const std::vector<nas::ShareSetting>& shares);
+  // Searches other machines too, in this run.
+  void AskFleet(nas::FleetSettings fleet);
 
   const std::string& user() const { return user_; }
   // Loads the module when first asked for. Throws std::runtime_error.

@@ -4,16 +4,116 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
+#include <ctime>
+#include <utility>
+#include <vector>
 
 #include "arbory/terminal.h"
+#include "nas/base/accounts.h"
 #include "nas/base/file_io.h"
+#include "nas/base/json_text.h"
 #include "nas/base/unique_fd.h"
+#include "nas/fleet/asker.h"
 #include "nas/fleet/library.h"
+#include "nas/fleet/signer.h"
 #include "nas/fleet/token.h"
 
 namespace arbory {
+namespace {
+
+constexpr size_t kMostStatusBytes = size_t{64} << 10;
+
+// "box1.example.net:8750" and whether TLS is spoken there.
+std::pair<std::string, bool> ServerOf(const nas::FleetBox& box) {
+  constexpr char kUsualPort[] = ":80";
+  constexpr char kTlsPort[] = ":443";
+  const bool tls = box.address.starts_with("https://");
+  std::string host = box.address.substr(box.address.find("://") + 3);
+  host = host.substr(0, host.find('/'));
+  const size_t bracket = host.rfind(']');
+  const bool has_port = host.find(':', bracket == std::string::npos ? 0 : bracket) != host.npos;
+  return {has_port ? host : host + (tls ? kTlsPort : kUsualPort), tls};
+}
+
+// Each box has a backend of its own: a pool of connections that are kept, and a check that makes a
+// dead one be told of at once.
+std::string ProxyConfig(const nas::FleetSettings& fleet) {
+  std::string text =
+      "# Printed by `arbory fleet config`. The socket is open to all: tokens are what boxes go "
+      "by.\n"
+      "defaults\n"
+      "    mode http\n"
+      "    timeout connect 1s\n"
+      "    timeout client 1m\n"
+      "    timeout server 1m\n"
+      "    http-reuse always\n"
+      "    option httpchk GET /health\n"
+      "    default-server check inter 2s fall 2 rise 1\n"
+      "\n"
+      "frontend arbory_fleet\n"
+      "    bind unix@" +
+      fleet.proxy +
+      " mode 666\n"
+      "    use_backend arbory_%[req.hdr(host)]\n";
+  for (const nas::FleetBox& box : fleet.boxes) {
+    const auto [server, tls] = ServerOf(box);
+    const std::string host = server.substr(0, server.rfind(':'));
+    text += "\nbackend arbory_" + box.name + "\n    http-check send hdr Host " + server +
+            "\n    http-request set-header Host " + server + "\n    server " + box.name + " " +
+            server;
+    if (tls) {
+      text +=
+          " ssl verify required ca-file /etc/arbory/fleet/ca.pem crt /etc/arbory/fleet/front.pem"
+          " verifyhost " +
+          host + " sni str(" + host + ")";
+    }
+    text += "\n";
+  }
+  return text;
+}
+
+// What is told of one box.
+struct BoxLine {
+  std::string name;
+  bool answered = false;
+  std::string state = nas::BoxStateName(nas::BoxState::kAsked);
+  std::string version = "-";
+  std::string clock = "-";  // seconds that the box is ahead
+  std::string spent = "-";  // milliseconds
+  std::string why;
+
+  void Take(const nas::BoxAnswer& answer, std::chrono::steady_clock::duration time) {
+    Json::Value said;
+    state = nas::BoxStateName(answer.state);
+    why = answer.why;
+    answered = answer.state == nas::BoxState::kAnswered && nas::ParseJson(answer.body, &said) &&
+               said.isObject() && said["version"].isString() && said["now"].isInt64();
+    if (!answered) return;
+    version = said["version"].asString();
+    clock = std::to_string(said["now"].asInt64() - std::time(nullptr));
+    spent = std::to_string(std::chrono::ceil<std::chrono::milliseconds>(time).count());
+  }
+
+  static std::string Row(const std::vector<std::string>& cells) {
+    constexpr size_t kWidths[] = {20, 10, 12, 8, 6};
+    std::string text;
+    for (size_t i = 0; i < cells.size(); ++i) {
+      text += cells[i];
+      if (i + 1 == cells.size()) break;
+      text.append(cells[i].size() < kWidths[i] ? kWidths[i] - cells[i].size() : 1, ' ');
+    }
+    while (text.ends_with(' ')) text.pop_back();
+    return text + "\n";
+  }
+  static std::string Head() { return Row({"BOX", "STATE", "VERSION", "CLOCK", "MS", "WHY"}); }
+  std::string Text() const { return Row({name, state, version, clock, spent, why}); }
+};
+
+}  // namespace
 
 int RunFleetKeyCommand(const FleetOptions& options) {
   std::string secret;
@@ -31,6 +131,40 @@ int RunFleetKeyCommand(const FleetOptions& options) {
   }
   WriteOut(STDOUT_FILENO, nas::ToHex(open_part) + "\n");
   return kExitSuccess;
+}
+
+int RunFleetConfigCommand(const FleetOptions& options) {
+  const nas::FleetSettings fleet = nas::LoadFleet(options.file);
+  if (fleet.proxy.empty()) {
+    throw UsageError("name the proxy's socket in " + options.file +
+                     ", such as proxy = \"/run/haproxy/arbory.sock\"");
+  }
+  WriteOut(STDOUT_FILENO, ProxyConfig(fleet));
+  return kExitSuccess;
+}
+
+int RunFleetStatusCommand(const FleetOptions& options) {
+  nas::Config config = nas::DefaultConfig();
+  config.fleet = nas::LoadFleet(options.file);
+  nas::Configure(std::move(config));
+  const auto caller = nas::FindAccount(geteuid());
+  if (!caller) throw UsageError("the calling user has no name here");
+  nas::StartFleetSigner(caller->name);
+  const nas::FleetSettings& fleet = nas::CurrentConfig().fleet;
+  nas::FleetAsker asker(fleet, kMostStatusBytes);
+  std::vector<BoxLine> lines(fleet.boxes.size());
+  const auto begun = std::chrono::steady_clock::now();
+  for (size_t i = 0; i < fleet.boxes.size(); ++i) {
+    lines[i].name = fleet.boxes[i].name;
+    asker.Ask(fleet.boxes[i], {"GET", "/fleet/status"}, [&, i](const nas::BoxAnswer& answer) {
+      lines[i].Take(answer, std::chrono::steady_clock::now() - begun);
+    });
+  }
+  asker.Run([] { return false; });
+  std::string text = BoxLine::Head();
+  for (const BoxLine& line : lines) text += line.Text();
+  WriteOut(STDOUT_FILENO, text);
+  return std::ranges::all_of(lines, &BoxLine::answered) ? kExitSuccess : kExitNothing;
 }
 
 }  // namespace arbory

@@ -9,4 +9,12 @@ namespace arbory {
 // Throws UsageError where the file is there already or cannot be written.
 int RunFleetKeyCommand(const FleetOptions& options);
 
+// `arbory fleet config`: prints what HAProxy needs to stand between the front and its boxes. Throws
+// nas::ConfigError.
+int RunFleetConfigCommand(const FleetOptions& options);
+
+// `arbory fleet status`: asks every box and prints a line of each; exit code 1 where one does not
+// answer. Throws nas::ConfigError.
+int RunFleetStatusCommand(const FleetOptions& options);
+
 }  // namespace arbory

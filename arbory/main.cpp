@@ -133,18 +133,33 @@ CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
   CLI::App* serve = app->add_subcommand("serve", "Serve the search page and the API over HTTP");
   serve->add_option("--listen", options->listen, "Address to listen on; 127.0.0.1:8750 by default")
       ->type_name("HOST:PORT");
+  serve->add_option("--fleet", options->fleet, "Search the machines too that this file names")
+      ->type_name("FILE");
   AddCommonOptions(serve, &options->common);
   serve->footer(kServeHelp);
   return serve;
 }
 
-// What the command line asks of a fleet.
-CLI::App* AddFleetKey(CLI::App* app, FleetOptions* options) {
+// The commands that look after a fleet.
+struct FleetCommands {
+  CLI::App* key = nullptr;
+  CLI::App* config = nullptr;
+  CLI::App* status = nullptr;
+};
+
+FleetCommands AddFleet(CLI::App* app, FleetOptions* options) {
   CLI::App* fleet = app->add_subcommand("fleet", "Look after a fleet of machines");
   fleet->require_subcommand(1);
-  CLI::App* key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
-  key->add_option("FILE", options->key_file, "Where the secret one goes; a new file")->required();
-  return key;
+  FleetCommands commands;
+  commands.key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
+  commands.key->add_option("FILE", options->key_file, "Where the secret one goes; a new file")
+      ->required();
+  commands.config = fleet->add_subcommand("config", "Print the configuration of HAProxy");
+  commands.status = fleet->add_subcommand("status", "Tell of every box how it is");
+  for (CLI::App* command : {commands.config, commands.status}) {
+    command->add_option("FILE", options->file, "The file that names the boxes")->required();
+  }
+  return commands;
 }
 
 constexpr int kMostThreads = static_cast<int>(nas::NameSource::kMostThreads);
@@ -285,7 +300,7 @@ int Run(int argc, char** argv) {
   CLI::App* call = AddCall(&app, &call_options);
   CLI::App* serve = AddServe(&app, &serve_options);
   FleetOptions fleet_options;
-  CLI::App* fleet_key = AddFleetKey(&app, &fleet_options);
+  const FleetCommands fleet = AddFleet(&app, &fleet_options);
   IndexOptions index_options;
   CLI::App* index = AddIndex(&app, &index_options);
   FindOptions find_options;
@@ -308,7 +323,9 @@ int Run(int argc, char** argv) {
     Unmark(&call_options.params);
     return RunCallCommand(call_options);
   }
-  if (fleet_key->parsed()) return RunFleetKeyCommand(fleet_options);
+  if (fleet.key->parsed()) return RunFleetKeyCommand(fleet_options);
+  if (fleet.config->parsed()) return RunFleetConfigCommand(fleet_options);
+  if (fleet.status->parsed()) return RunFleetStatusCommand(fleet_options);
   if (index->parsed()) return RunIndexCommand(index_options);
   if (find->parsed()) return RunFindCommand(find_options);
   if (generate->parsed()) return RunGenerateCommand(generate_options, Describe(&app));

@@ -56,10 +56,12 @@ struct CallOptions {
 struct ServeOptions {
   CommonOptions common;
   std::string listen;  // HOST:PORT; empty: as configured
+  std::string fleet;   // the file that names the boxes to ask; empty: none are
 };
 
 struct FleetOptions {
   std::string key_file;
+  std::string file;  // that names the boxes
 };
 
 struct IndexOptions {

@@ -10,6 +10,7 @@
 #include "arbory/server/service/service.h"
 #include "arbory/server/transport/http_server.h"
 #include "arbory/terminal.h"
+#include "nas/fleet/library.h"
 #include "nas/system/confine.h"
 #include "nas/system/shares.h"
 #include "nas/webapi/runner.h"
@@ -97,7 +98,13 @@ void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& set
 
 int RunServeCommand(const ServeOptions& options) {
   Caller caller(options.common);
-  OfferSample(&caller);
+  if (options.fleet.empty()) {
+    OfferSample(&caller);
+  } else {
+    caller.AskFleet(nas::LoadFleet(options.fleet));
+    // Inherited by every child that asks.
+    nas::LoadFleetLibrary();
+  }
   WarnOfMissingShares();
   WarnOfMissingHelpers();
   const nas::ServerSettings settings = SettingsOf(options);

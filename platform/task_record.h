@@ -22,6 +22,9 @@
 //                   somebody asked for them
 //                   "source" where names came from: "index", "walk", or "both" for parts of each
 //                   "index" why so: "current", or a few words about why there was no answer
+//                   "fleet" of a search that asks other machines: "total", and of those how many
+//                   have "answered" to the end, are "late", "down", "refused" or "old" so far
+//                   (nas/fleet/asker.h); "boxes": "name", "state", "why" of those four kinds
 //
 // After the first write only the worker writes, and always the whole of "data": it reads the object
 // back, adds to it and writes it. A stopped worker marks the task finished and writes nothing, so
@@ -72,5 +75,6 @@ inline constexpr char kFromIndex[] = "index";
 inline constexpr char kFromWalk[] = "walk";
 inline constexpr char kFromBoth[] = "both";
 inline constexpr char kIndex[] = "index";
+inline constexpr char kFleet[] = "fleet";
 
 }  // namespace task_record

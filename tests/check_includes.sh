@@ -23,7 +23,7 @@ nas/fleet/plugin         : nas/fleet <sodium.h> <curl>
 nas/search               : nas/base nas/files nas/match nas/results nas/index nas/fleet nas/system platform
 nas/tasks                : nas/base nas/system platform
 nas/records              : nas/base nas/system platform
-nas/webapi               : nas/base nas/system platform
+nas/webapi               : nas/base nas/fleet nas/system platform
 arbory                   : nas platform arbory/server <CLI>
 arbory/server/transport  : nas platform <boost>
 arbory/server/service    : nas platform arbory arbory/server/transport <security> <zlib.h> <archive.h> <archive_entry.h>

@@ -13,6 +13,8 @@
 //                                            root
 //   attributes(first, data)                  FileAttributes for each row, as in memory
 //   purged(row)                              rows whose file has vanished
+//   account(id, name)                        accounts of other machines, where rows came from those
+//                                            (foreign_accounts.h)
 //   complete(rows)                           one row once no more rows will follow
 //   ordering(id, data)                       all rows in ascending order of a column, as 32-bit
 //                                            numbers in pieces of kOrderingPiece, so that a page is

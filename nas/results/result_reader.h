@@ -15,6 +15,7 @@
 #include "nas/base/sqlite.h"
 #include "nas/match/query.h"
 #include "nas/results/block_reader.h"
+#include "nas/results/foreign_accounts.h"
 #include "nas/results/row_sorter.h"
 
 namespace nas {
@@ -53,6 +54,8 @@ class ResultReader {
   // How many rows there are, purged ones included; they are numbered from 0.
   std::uint64_t rows() const { return blocks_.rows(); }
   ResultRow Row(std::uint32_t number) { return blocks_.Row(number); }
+  // Throws SqliteError.
+  ForeignAccounts Accounts() { return ForeignAccounts(db_); }
 
   // Sorts by every column and keeps the orderings that are not yet kept, so that listings need not.
   // Stops between columns where a file is not complete or has been deleted.

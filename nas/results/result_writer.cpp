@@ -1,5 +1,7 @@
 #include "nas/results/result_writer.h"
 
+#include "nas/results/foreign_accounts.h"
+
 namespace nas {
 namespace {
 
@@ -43,6 +45,11 @@ void ResultWriter::AddLocation(std::uint16_t id, const std::string& share_name,
       .BindBlob(2, share_name)
       .BindBlob(3, share_root)
       .Run();
+}
+
+void ResultWriter::AddAccount(std::uint32_t id, const std::string& name) {
+  const std::lock_guard lock(mutex_);
+  AddForeignAccount(db_, id, name);
 }
 
 void ResultWriter::Append(RowBlock& block) {

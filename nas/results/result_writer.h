@@ -17,6 +17,8 @@ class ResultWriter : public RowSink {
 
   // Registers where rows lie; to be called before any block that names it. Throws SqliteError.
   void AddLocation(std::uint16_t id, const std::string& share_name, const std::string& share_root);
+  // Names an account of another machine (foreign_accounts.h). Throws SqliteError.
+  void AddAccount(std::uint32_t id, const std::string& name);
   // The rows are visible to listings at once. Throws SqliteError.
   void Append(RowBlock& block) override;
   // Says that no rows will follow, so that orderings are worth keeping. Throws SqliteError.

@@ -8,8 +8,8 @@
 #include <unordered_map>
 #include <vector>
 
-#include "nas/base/accounts.h"
 #include "nas/match/file_kinds.h"
+#include "nas/results/foreign_accounts.h"
 
 namespace nas {
 namespace {
@@ -102,9 +102,12 @@ Ordering RowSorter::MakeOrdering(SortColumn column) {
     case SortColumn::kType:
       return OrderByType();
     case SortColumn::kUser:
-      return OrderByOwner(&FileAttributes::uid, UserText);
+      return OrderByOwner(&FileAttributes::uid,
+                          [accounts = ForeignAccounts(db_)](auto id) { return accounts.User(id); });
     case SortColumn::kGroup:
-      return OrderByOwner(&FileAttributes::gid, GroupText);
+      return OrderByOwner(&FileAttributes::gid, [accounts = ForeignAccounts(db_)](auto id) {
+        return accounts.Group(id);
+      });
     default: {
       std::vector<std::uint64_t> keys(blocks_.rows());
       blocks_.ForEachAttributes([&](std::uint32_t row, const FileAttributes& attributes) {

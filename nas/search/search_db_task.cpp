@@ -15,6 +15,7 @@
 #include "nas/base/error.h"
 #include "nas/match/file_kinds.h"
 #include "nas/match/query_match.h"
+#include "nas/results/foreign_accounts.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
 #include "nas/system/identity.h"
@@ -41,8 +42,10 @@ std::string RealPath(const nas::ResultRow& row) {
 }
 
 // Listings take a file for vanished when it cannot be reached, but a dangling symbolic link and a
-// file in a folder that was closed meanwhile are still there.
+// file in a folder that was closed meanwhile are still there, and one on another machine is not
+// here.
 bool HasVanished(const std::string& path) {
+  if (path.starts_with(nas::kFleetRoot)) return false;
   struct stat info;
   return lstat(path.c_str(), &info) != 0 && (errno == ENOENT || errno == ENOTDIR);
 }
@@ -57,7 +60,8 @@ bool AsksMoreThanRows(const nas::QueryNode& leaf) {
 // Lends rows to a callback in the platform's form, row after row from the same memory.
 class Lender {
  public:
-  Lender(SelectCallback callback, void* context) : callback_(callback), context_(context) {}
+  Lender(nas::ForeignAccounts foreign, SelectCallback callback, void* context)
+      : foreign_(std::move(foreign)), callback_(callback), context_(context) {}
 
   BOOL Lend(const nas::ResultRow& row) {
     const nas::FileAttributes& file = *row.attributes;
@@ -71,8 +75,10 @@ class Lender {
     data.relative_path = relative_path_.data();
     data.extension = Keep(extension_, nas::ExtensionOf(row.name));
     data.mode = file.mode;
-    data.owner_name = Keep(owner_, owners_.User(file.uid));
-    data.group_name = Keep(group_, owners_.Group(file.gid));
+    const std::string* user = foreign_.Foreign(file.uid);
+    const std::string* group = foreign_.Foreign(file.gid);
+    data.owner_name = Keep(owner_, user != nullptr ? *user : owners_.User(file.uid));
+    data.group_name = Keep(group_, group != nullptr ? *group : owners_.Group(file.gid));
     data.uid = file.uid;
     data.gid = file.gid;
     data.is_dir = S_ISDIR(file.mode);
@@ -90,6 +96,7 @@ class Lender {
     return kept.data();
   }
 
+  const nas::ForeignAccounts foreign_;
   nas::AccountTexts owners_;
   const SelectCallback callback_;
   void* const context_;
@@ -145,7 +152,7 @@ bool WfmSearchDBTask::Impl::Query(unsigned long offset, unsigned long limit,
   }
   const nas::ResultReader::Page page = reader.Select(selection, offset, limit);
   *total = page.total;
-  Lender lender(callback, context);
+  Lender lender(reader.Accounts(), callback, context);
   purges_.clear();
   const struct Selecting {
     std::optional<std::uint32_t>& current;

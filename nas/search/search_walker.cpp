@@ -10,6 +10,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <chrono>
 #include <system_error>
@@ -17,10 +18,12 @@
 #include "nas/base/error.h"
 #include "nas/base/file_io.h"
 #include "nas/base/unique_fd.h"
+#include "nas/results/foreign_accounts.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
 #include "nas/search/content_reading.h"
+#include "nas/search/fleet_search.h"
 #include "nas/search/indexed_walk.h"
 #include "nas/search/location.h"
 #include "nas/search/search_job.h"
@@ -86,6 +89,27 @@ pid_t StartSorting(const std::string& path) {
       .pid;
 }
 
+// What is on this machine and what is on others, at the same time.
+class AllNames : public nas::NameSource {
+ public:
+  // Either may be null.
+  AllNames(nas::IndexedWalk* here, nas::FleetSearch* fleet) : here_(here), fleet_(fleet) {}
+
+  void Feed(size_t thread, nas::Judge& judge) override {
+    // One thread is enough for all boxes, as it only waits for them.
+    if (fleet_ != nullptr && !asking_.exchange(true)) fleet_->Run();
+    if (here_ != nullptr) here_->Feed(thread, judge);
+  }
+  void Abort() override {
+    if (here_ != nullptr) here_->Abort();
+  }
+
+ private:
+  nas::IndexedWalk* const here_;
+  nas::FleetSearch* const fleet_;
+  std::atomic<bool> asking_ = false;
+};
+
 }  // namespace
 
 class WfmSearchWalker::Impl {
@@ -105,6 +129,8 @@ class WfmSearchWalker::Impl {
  private:
   nas::Status OpenLocations(const std::vector<std::string>& texts);
   void Report(const nas::WalkProgress& progress, bool last);
+  void AddLocations();
+  void AskFleet(const Json::Value& options, nas::SharedSearch& search);
   nas::IndexedWalk::Settings NameSettings(const Json::Value& options) const;
   bool RunJob(const Json::Value& options, nas::SharedSearch& search);
   void TellUnread(Json::Value* walk) const;
@@ -118,7 +144,8 @@ class WfmSearchWalker::Impl {
   OKT::Task* const task_;
   const int& stop_flag_;
   std::vector<FindComp*> comps_;
-  std::vector<nas::Location> locations_;
+  std::vector<nas::Location> locations_;             // on this machine
+  std::vector<nas::FleetLocation> fleet_locations_;  // on others, numbered behind those
   std::vector<nas::Error> unopened_;  // of each of the others, with the location's text
   std::string volume_;
   std::string folder_;
@@ -127,6 +154,7 @@ class WfmSearchWalker::Impl {
   std::unique_ptr<nas::ResultWriter> writer_;
   nas::IndexedWalk* names_ = nullptr;  // of Walk
   nas::UnreadFolders unread_;
+  std::optional<nas::FleetSearch> fleet_;
   bool walked_ = false;
   bool current_only_ = false;
   bool told_ready_ = false;
@@ -154,10 +182,18 @@ bool WfmSearchWalker::Impl::IsNamedInTask() try {
 // whoever stops a search may still ask for its results.
 nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>& texts) {
   std::optional<nas::Error> first;
+  const auto any = [this] { return !locations_.empty() || !fleet_locations_.empty(); };
   for (const std::string& text : texts) {
-    if (stopped() && (first || !locations_.empty())) break;
+    if (stopped() && (first || any())) break;
     nas::Result<nas::Location> location = nas::Error{nas::kErrorOther, E2BIG, text};
-    if (locations_.size() < kMostLocations) location = nas::OpenLocation(text);
+    if (locations_.size() + fleet_locations_.size() < kMostLocations) {
+      auto elsewhere = nas::FindFleetLocation(text);
+      if (elsewhere && *elsewhere) {
+        fleet_locations_.push_back(std::move(**elsewhere));
+        continue;
+      }
+      location = elsewhere ? elsewhere->error() : nas::OpenLocation(text);
+    }
     if (location) {
       locations_.push_back(std::move(*location));
       continue;
@@ -165,7 +201,7 @@ nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>&
     unopened_.push_back(location.error());
     if (!first) first = location.error();
   }
-  if (!locations_.empty()) return {};
+  if (any()) return {};
   return first ? *first : nas::Error{nas::kErrorNoSuchFolder, ENOENT};
 }
 
@@ -177,7 +213,8 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
     nas::Report(opened.error());
     return false;
   }
-  const auto volume = nas::ResultVolume(locations_.front().share.volume, user_);
+  const std::string preferred = locations_.empty() ? "" : locations_.front().share.volume;
+  const auto volume = nas::ResultVolume(preferred, user_);
   if (!volume) {
     nas::Report(volume.error());
     return false;
@@ -189,14 +226,34 @@ bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
   const std::string path = nas::ResultPath(folder_, id_);
   claim_.emplace(path);
   writer_ = std::make_unique<nas::ResultWriter>(path);
-  for (size_t i = 0; i < locations_.size(); ++i) {
-    writer_->AddLocation(static_cast<std::uint16_t>(i), locations_[i].share.name,
-                         locations_[i].share.root);
-  }
+  AddLocations();
   return true;
 } catch (...) {
   SetErrorFromException();
   return false;
+}
+
+void WfmSearchWalker::Impl::AddLocations() {
+  std::uint16_t number = 0;
+  for (const nas::Location& location : locations_) {
+    writer_->AddLocation(number++, location.share.name, location.share.root);
+  }
+  for (nas::FleetLocation& location : fleet_locations_) {
+    const std::string name = location.box->name + "/" + location.share;
+    location.number = number;
+    writer_->AddLocation(number++, name, nas::kFleetRoot + name);
+  }
+}
+
+void WfmSearchWalker::Impl::AskFleet(const Json::Value& options, nas::SharedSearch& search) {
+  if (fleet_locations_.empty()) return;
+  nas::FleetSearch::Settings settings;
+  settings.recursive = !current_only_;
+  settings.contents = options.get("search_content", false).asBool();
+  settings.add_account = [this](std::uint32_t id, const std::string& name) {
+    writer_->AddAccount(id, name);
+  };
+  fleet_.emplace(fleet_locations_, std::move(settings), search);
 }
 
 bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
@@ -207,6 +264,7 @@ bool WfmSearchWalker::Impl::Walk(const Json::Value& options) {
   try {
     names = std::make_unique<nas::IndexedWalk>(locations_, NameSettings(options), search);
     names_ = names.get();
+    AskFleet(options, search);
     return RunJob(options, search);
   } catch (...) {
     SetErrorFromException();
@@ -231,13 +289,18 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
   nas::SearchJob job(search, {.report = [this](const auto& progress) { Report(progress, false); },
                               .stuck = [this] { EndWorker(); },
                               .threads = nas::CurrentConfig().search_threads});
-  const bool completed = job.Run(*names_, contents);
+  AllNames all(locations_.empty() ? nullptr : names_, fleet_ ? &*fleet_ : nullptr);
+  bool completed = job.Run(all, contents);
   if (forsaken_) {
     Vanish();
     return false;
   }
   writer_->Complete();
   Report(search.progress, true);
+  if (completed && fleet_ && locations_.empty() && fleet_->failed()) {
+    nas::SetLastError(nas::kErrorOther);
+    completed = false;
+  }
   if (writer_->rows() >= kWorthSorting && nas::CurrentConfig().keep_orderings) {
     writer_.reset();
     WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
@@ -288,6 +351,7 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   Json::Value walk = progress.ToJson();
   if (names_ != nullptr) names_->Tell(&walk);
   if (nas::CurrentConfig().list_unread) TellUnread(&walk);
+  if (fleet_) fleet_->Tell(&walk);
   task_->setProperty(task_record::kWalk, walk);
   if (!told_ready_) task_->setProperty(task_record::kResultReady, true);
   // A task that was removed meanwhile has nobody left to tell.

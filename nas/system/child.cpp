@@ -1,6 +1,7 @@
 #include "nas/system/child.h"
 
 #include <fcntl.h>
+#include <sys/socket.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -88,6 +89,18 @@ bool ParseNumbers(std::string_view line, ReplyHead* head) {
   return code.ec == std::errc() && code.ptr == end;
 }
 
+// Takes both ends: the first is the caller's, the other the child's.
+Child Fork(const int (&ends)[2], const std::function<void(int pipe)>& body,
+           std::uint64_t memory_bytes) {
+  Child child;
+  child.fd = UniqueFd(ends[0]);
+  const UniqueFd childs(ends[1]);
+  child.pid = fork();
+  if (child.pid == 0) RunChild(body, memory_bytes, childs.get());
+  if (child.pid < 0) child.fd.Reset();
+  return child;
+}
+
 }  // namespace
 
 void ResetSignals() {
@@ -107,15 +120,14 @@ void OfferToOutOfMemoryKiller() {
 }
 
 Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes) {
-  Child child;
   int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) return child;
-  child.fd = UniqueFd(ends[0]);
-  const UniqueFd writable(ends[1]);
-  child.pid = fork();
-  if (child.pid == 0) RunChild(body, memory_bytes, writable.get());
-  if (child.pid < 0) child.fd.Reset();
-  return child;
+  return pipe2(ends, O_CLOEXEC) == 0 ? Fork(ends, body, memory_bytes) : Child();
+}
+
+Child StartAnsweringChild(const std::function<void(int connection)>& body) {
+  int ends[2];
+  const bool made = socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, ends) == 0;
+  return made ? Fork(ends, body, 0) : Child();
 }
 
 bool SendHead(int pipe, const ReplyHead& head, std::uint64_t body_bytes) {

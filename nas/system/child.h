@@ -70,6 +70,9 @@ struct Child {
 // child cannot take more memory of its own than that (LimitMemory); 0: no bound. For a process of
 // one thread.
 Child StartChild(const std::function<void(int pipe)>& body, std::uint64_t memory_bytes = 0);
+// The same with a connection (SOCK_SEQPACKET) in the place of the pipe, for a child that answers
+// more than once: it ends when the other end is closed everywhere.
+Child StartAnsweringChild(const std::function<void(int connection)>& body);
 
 // What StartChild does to its children, for those that are made otherwise: default handlers and an
 // empty mask, SIGPIPE and SIGXFSZ ignored; and to be among the first to go where memory runs out,

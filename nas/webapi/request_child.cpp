@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "nas/base/error.h"
+#include "nas/fleet/signer.h"
 #include "nas/system/lease.h"
 #include "nas/system/request_bounds.h"
 #include "nas/system/user_state.h"
@@ -64,6 +65,7 @@ Reply ServeCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
   if (call.admit) {
     if (auto refusal = call.admit()) return std::move(*refusal);
   }
+  if (call.asks_fleet) StartFleetSigner(call.user);
   if (const Status entered = EnterUserState(call.user); !entered) {
     Report(entered.error());
     return encode(WfmLibGetErr(), Json::Value());

@@ -27,6 +27,8 @@ struct ApiCall {
   std::function<std::optional<Reply>(Json::Value* params)> read_params = {};
   // Where given, what becomes of the reply before it is sent; in the request child too.
   std::function<Reply(Reply)> finish = {};
+  // The call may ask the boxes of a fleet in the user's name (nas/fleet/signer.h).
+  bool asks_fleet = false;
   // Where given, is asked in the request child before that becomes the user, and gives the reply
   // where it may not be.
   std::function<std::optional<Reply>()> admit = {};

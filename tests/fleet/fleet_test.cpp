@@ -24,12 +24,22 @@ Box FleetTest::StartBox(const std::string& name, const std::string& more,
   root_state_ = dir_ + "/" + name + "-root-state";
   state_ = MakeFolder(name + "-state");
   share_lines_ = "[shares]\ndata = \"" + box.share + "\"\n";
-  const std::string lines = "access_log = true\n[fleet]\nname = \"" + name + "\"\n" + more +
+  const std::string lines = PamLines() + "[fleet]\nname = \"" + name + "\"\n" + more +
                             "[fleet.fronts.office]\nkey = \"" + nas::ToHex(public_key_) +
                             "\"\nrealm = \"OFFICE\"\nusers = [\"" + User() + "\", \"" + kBob +
                             "\", \"root\"]\n" + of_front;
   box.server = Start(lines, "", AmRoot() ? As::kRootWithLogins : As::kOrdinaryUser);
   return box;
+}
+
+std::string FleetTest::PamLines() {
+  const std::string check = dir_ + "/check";
+  nas_test::WriteFile(check, "#!/bin/sh\nread -r given || :\n[ \"$given\" = right ]\n");
+  chmod(check.c_str(), 0755);
+  nas_test::WriteFile(MakeFolder("pam") + "/arbory",
+                      "auth required pam_exec.so quiet expose_authtok " + check +
+                          "\naccount required pam_permit.so\n");
+  return "pam_dir = \"" + dir_ + "/pam\"\n";
 }
 
 void FleetTest::MakeFile(const Box& box, const std::string& path, const std::string& user,

@@ -31,6 +31,8 @@ class FleetTest : public server_test::ServerTest {
   // of the front, and `of_front` into the latter. Root's, where the tests are root's.
   Box StartBox(const std::string& name, const std::string& more = "lowest_uid = 1\n",
                const std::string& of_front = "");
+  // Of a server's settings: everybody's password is "right".
+  std::string PamLines();
   // A file of a box's share, `user`'s own and closed to others where a user is given.
   static void MakeFile(const Box& box, const std::string& path, const std::string& user = "",
                        const std::string& text = "");

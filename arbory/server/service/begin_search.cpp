@@ -68,8 +68,9 @@ nas::Reply Begin(const nas::ApiCall& call, const NUVA::APIMethod& start,
   Json::Value listing = body["params"]["list"];
   body["params"].removeMember("list");
   int code = 0;
-  const Json::Value begun =
-      DataOf(nas::RunCall(start, CallOf(call, start, body["params"]), nas::EncodeJsonReply), &code);
+  nas::ApiCall starting = CallOf(call, start, body["params"]);
+  starting.asks_fleet = true;
+  const Json::Value begun = DataOf(nas::RunCall(start, starting, nas::EncodeJsonReply), &code);
   if (code != 0) {
     body = Json::Value();
     body["code"] = code;

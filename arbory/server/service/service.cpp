@@ -21,6 +21,7 @@
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
 #include "nas/base/utf8.h"
+#include "nas/fleet/question.h"
 #include "nas/system/child.h"
 
 namespace arbory {
@@ -31,6 +32,7 @@ constexpr int kNoSuchApi = 102;
 constexpr int kNoSuchMethod = 103;
 constexpr int kNoSuchVersion = 104;
 constexpr char kRetrySeconds[] = "1";
+constexpr char kStartMethod[] = "start";
 
 std::string ListRows(const nas::Module& module) {
   Json::Value rows(Json::arrayValue);
@@ -68,6 +70,21 @@ bool HasControls(const RequestPath& path) {
 }
 
 bool IsLeased(const HttpRequest& request) { return request.Field("arbory-lease") != nullptr; }
+
+nas::ApiCall ForSharesOf(const std::string& user) {
+  nas::ApiCall call = {"", {}, user, "server"};
+  call.asks_fleet = true;
+  return call;
+}
+
+// Of the machine alone, so nobody need be looked up for it.
+HttpReply FrontStatusReply() {
+  Json::Value body;
+  body["version"] = ARBORY_VERSION;
+  body["protocol"] = nas::kFleetProtocol;
+  body["now"] = Json::Int64{std::time(nullptr)};
+  return JsonReply(kOk, nas::JsonText(body, nas::JsonBytes::kClean));
+}
 
 // So many of the largest bodies: a person's page sends small ones, one after the other.
 constexpr std::uint64_t kLargestOfOneUser = 2;
@@ -117,9 +134,8 @@ std::span<const Route> Service::Routes() {
        "Who is logged in and until when", kJson},
       {kGet, "/shares", Access::kLoggedIn,
        [](Self self, Request request, Path) {
-         return self.calls_.Run(Calls::Kind::kCall, request->user, "shares", [&] {
-           return StartListShares({"", {}, request->user, "server"});
-         });
+         return self.calls_.Run(Calls::Kind::kCall, request->user, "shares",
+                                [&] { return StartListShares(ForSharesOf(request->user)); });
        },
        "The shares the user can enter", kJson},
       {kPost, "/searches", Access::kLoggedIn,
@@ -182,6 +198,8 @@ std::span<const Route> Service::Routes() {
          return self.AskForFront(*request, "fleet/shares", /*leased=*/false, StartListShares);
        },
        nullptr, nullptr},
+      {kGet, "/fleet/status", Access::kFront,
+       [](Self, Request, Path) -> Answer { return FrontStatusReply(); }, nullptr, nullptr},
       {kGet, "/api", Access::kEverybody,
        [](Self self, Request, Path) -> Answer { return JsonReply(kOk, self.api_list_); },
        "The rows of the method table", kJson},
@@ -353,6 +371,7 @@ Answer Service::StartCall(const HttpRequest& request, const RequestPath& path) {
         // The id is the key to the account, which no log line of the module needs to hold whole.
         constexpr size_t kShown = 8;
         call.session = session.substr(0, kShown);
+        call.asks_fleet = row->method == std::string(kStartMethod);
         return nas::StartCall(*row, call, EncodeWithAddresses);
       });
   if (auto* child = std::get_if<ChildAnswer>(&answer)) {

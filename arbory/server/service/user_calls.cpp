@@ -16,6 +16,7 @@
 #include "arbory/server/service/row_addresses.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
+#include "nas/fleet/asker.h"
 #include "nas/match/meant_query.h"
 #include "nas/search/criteria.h"
 #include "nas/search/instant.h"
@@ -39,8 +40,7 @@ bool CanList(const std::string& folder) {
   return faccessat(AT_FDCWD, folder.empty() ? "/" : folder.c_str(), R_OK | X_OK, AT_EACCESS) == 0;
 }
 
-void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  if (!BecomeCaller(request, response)) return;
+Json::Value ListShares(const std::string& user) {
   Json::Value body;
   body["shares"] = Json::Value(Json::arrayValue);
   for (const nas::Share& share : nas::ListShares()) {
@@ -51,8 +51,20 @@ void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
     body["shares"].append(entry);
   }
   char home[PATH_MAX];
-  const std::string user = request->GetLoginUserName();
   body["homes"] = NUVAServiceHomePathGet(user.c_str(), home, sizeof home) == 0 && CanList(home);
+  return body;
+}
+
+void ListSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (BecomeCaller(request, response))
+    response->SetError(kOk, ListShares(request->GetLoginUserName()));
+}
+
+void ListFleetSharesEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
+  if (!BecomeCaller(request, response)) return;
+  Json::Value body = ListShares(request->GetLoginUserName());
+  body["boxes"] = Json::Value(Json::objectValue);
+  nas::AppendFleetShares(&body["shares"], &body["boxes"]);
   response->SetError(kOk, body);
 }
 
@@ -298,7 +310,10 @@ nas::Child StartReply(const nas::ApiCall& call, const nas::Reply& reply) {
                         [&](int /*code*/, const Json::Value& /*data*/) { return reply; });
 }
 
-nas::Child StartListShares(const nas::ApiCall& call) { return StartOwn(ListSharesEntry, call); }
+nas::Child StartListShares(const nas::ApiCall& call) {
+  const bool all = call.asks_fleet && !nas::CurrentConfig().fleet.boxes.empty();
+  return StartOwn(all ? ListFleetSharesEntry : ListSharesEntry, call);
+}
 
 nas::Child StartReadSearch(const std::string& user, const std::string& task_id) {
   Json::Value params;

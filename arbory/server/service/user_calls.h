@@ -22,7 +22,9 @@ nas::Reply EncodeOwnReply(int code, const Json::Value& data);
 // Answers with an error's status and sentence.
 void RefuseOwn(NUVA::APIResponse* response, int status, const char* sentence);
 
-// {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list.
+// {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list. With
+// `asks_fleet` those of a fleet's boxes too, as "BOX/SHARE", and in "boxes" the "state" and "why"
+// of each that has not answered, by name.
 nas::Child StartListShares(const nas::ApiCall& call);
 
 // {"taskid","finished","progress","errno","location","walk"} of the user's search; 404 when there

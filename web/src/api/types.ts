@@ -31,6 +31,14 @@ export interface Walk {
   files: { unreadable: number; not_text: number };
   source?: 'index' | 'walk' | 'both'; // where names came from, and a few words why
   index?: string;
+  fleet?: Fleet;
+}
+
+// Of a search that asks other machines: how many, and those that have not answered.
+export interface Fleet {
+  total: number;
+  answered: number;
+  boxes: { name: string; state: 'late' | 'down' | 'refused' | 'old'; why: string }[];
 }
 
 export interface Progress {

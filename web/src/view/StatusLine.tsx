@@ -32,12 +32,19 @@ export function StatusLine({ app, search, actions }: { app: App; search: Search;
           {running && search.walk.phase === 'contents' ? 'reading files' : 'in'} <Elapsed search={search} />
         </span>
         <span class="aside seen">
-          {plural(search.walk.entries, 'name')} seen in {plural(search.walk.folders, 'folder')}
-          {from(search)}
+          {search.walk.fleet && `${search.walk.fleet.answered} of ${plural(search.walk.fleet.total, 'machine')} answered`}
+          {(!search.walk.fleet || search.walk.entries > 0) && (
+            <>
+              {search.walk.fleet && '; '}
+              {plural(search.walk.entries, 'name')} seen in {plural(search.walk.folders, 'folder')}
+              {from(search)}
+            </>
+          )}
           {notText > 0 && `; ${plural(notText, 'file is', 'files are')} not text`}
         </span>
       </p>
       <Skipped search={search} />
+      <Silent search={search} />
       <span class="grow" />
       {(search.filter !== '' || search.found > 1) && !chooses && <Narrow search={search} />}
       {chooses && <Chosen app={app} count={search.choice.count} actions={actions} />}
@@ -234,6 +241,39 @@ function Skipped({ search }: { search: Search }) {
               again; if it stays, tell who runs the server.
             </p>
           )}
+        </>
+      )}
+    </Popover>
+  );
+}
+
+// Machines of a fleet whose files are missing from the result, or some of them.
+function Silent({ search }: { search: Search }) {
+  const boxes = search.walk.fleet?.boxes ?? [];
+  if (boxes.length === 0) return null;
+  const title = `${plural(boxes.length, 'machine')} did not answer`;
+  return (
+    <Popover
+      className="tool caution"
+      panelLabel={title}
+      panelClass="note"
+      label={
+        <>
+          <Icon name="warning" size={14} />
+          {title}
+        </>
+      }
+    >
+      {() => (
+        <>
+          <p>There are at least as many matches as are shown; what these have is missing:</p>
+          <ul>
+            {boxes.map(({ name, why }) => (
+              <li key={name}>
+                {name}: {why}
+              </li>
+            ))}
+          </ul>
         </>
       )}
     </Popover>

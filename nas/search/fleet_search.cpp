@@ -1,0 +1,228 @@
+#include "nas/search/fleet_search.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <utility>
+
+#include "nas/base/deadline.h"
+#include "nas/base/json_text.h"
+#include "nas/results/foreign_accounts.h"
+#include "platform/task_record.h"
+
+namespace nas {
+namespace {
+
+// That a box may wait for rows before it answers. Bounds how late rows are, and how often a box
+// that has none is asked.
+constexpr int kWaitMs = 250;
+// All pages of all boxes that may be under way at once, as far as their rows are ordinary ones.
+constexpr unsigned kMostRowsUnderWay = 50'000;
+constexpr unsigned kFewestRows = 100;
+// A row of a name of 255 bytes, each of them escaped, in a folder of its own.
+constexpr size_t kMostRowBytes = 2048;
+constexpr size_t kMostPageBytes = size_t{4} << 20;
+// For boxes to be told that a search was stopped; those that do not hear it end it by its lease.
+constexpr int kEndMs = 50;
+
+unsigned PageLimit(size_t boxes) {
+  const auto share = kMostRowsUnderWay / static_cast<unsigned>(std::max<size_t>(boxes, 1));
+  return std::clamp(share, kFewestRows, kMostFleetRows);
+}
+
+bool IsIn(const FleetRow& row, const FleetLocation& location) {
+  return row.share == location.share && RowBlock::IsAtOrBelow(row.folder, location.path);
+}
+
+std::string LocationText(const FleetLocation& location) {
+  return "/" + location.share + (location.path.empty() ? "" : "/" + location.path);
+}
+
+}  // namespace
+
+std::optional<Result<FleetLocation>> FindFleetLocation(const std::string& text) {
+  const auto& boxes = CurrentConfig().fleet.boxes;
+  if (boxes.empty() || !text.starts_with('/') || text.find('\0') != std::string::npos) {
+    return std::nullopt;
+  }
+  std::vector<std::string> parts;
+  for (size_t at = 0; at < text.size();) {
+    const size_t end = std::min(text.find('/', at + 1), text.size());
+    const std::string part = text.substr(at + 1, end - at - 1);
+    at = end;
+    if (!part.empty() && part != ".") parts.push_back(part);
+  }
+  const auto box =
+      parts.empty() ? boxes.end() : std::ranges::find(boxes, parts.front(), &FleetBox::name);
+  if (box == boxes.end()) return std::nullopt;
+  if (std::ranges::find(parts, "..") != parts.end()) return Error{kErrorIllegal, EINVAL, text};
+  if (parts.size() == 1) return Error{kErrorNoSuchFolder, ENOENT, text};
+  FleetLocation location;
+  location.box = &*box;
+  location.share = parts[1];
+  for (size_t i = 2; i < parts.size(); ++i) {
+    location.path += (location.path.empty() ? "" : "/") + parts[i];
+  }
+  return location;
+}
+
+FleetSearch::FleetSearch(std::vector<FleetLocation> locations, Settings settings,
+                         SharedSearch& search)
+    : locations_(std::move(locations)),
+      settings_(std::move(settings)),
+      search_(search),
+      fleet_(CurrentConfig().fleet),
+      next_id_(kFirstForeignId) {
+  for (const FleetLocation& location : locations_) {
+    auto box = std::ranges::find(boxes_, location.box, &Box::box);
+    if (box == boxes_.end()) {
+      box = boxes_.emplace(boxes_.end());
+      box->box = location.box;
+    }
+    box->locations.push_back(&location);
+  }
+  page_.limit = PageLimit(boxes_.size());
+  page_.wait_ms = kWaitMs;
+}
+
+void FleetSearch::Run() {
+  const size_t most_bytes = std::min(kMostPageBytes, page_.limit * kMostRowBytes);
+  asker_.emplace(fleet_, most_bytes);
+  for (Box& box : boxes_) {
+    asker_->Ask(*box.box, {"POST", "/fleet/search", QuestionFor(box), kWaitMs},
+                [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
+  }
+  asker_->Run([this] { return search_.stopping(); });
+  search_.sink.Append(block_);
+  if (search_.stopping()) EndSearches();
+}
+
+std::string FleetSearch::QuestionFor(const Box& box) const {
+  FleetQuestion question;
+  question.query = search_.criteria.root;
+  question.contents = settings_.contents;
+  question.recursive = settings_.recursive;
+  question.page = page_;
+  for (const FleetLocation* location : box.locations) {
+    question.locations.push_back(LocationText(*location));
+  }
+  return FleetQuestionText(question);
+}
+
+void FleetSearch::Took(Box& box, BoxAnswer answer) {
+  if (answer.state != BoxState::kAnswered) {
+    const bool lost = answer.state == BoxState::kOld && !box.task.empty();
+    return lost ? Finish(box, BoxState::kDown, "has lost the search")
+                : Finish(box, answer.state, answer.why);
+  }
+  const auto page = ReadFleetPage(answer.body);
+  if (!page || !TakePage(box, *page)) {
+    return Finish(box, BoxState::kDown, "says what is no answer");
+  }
+  // At once: a page that somebody looks at waits for it.
+  search_.sink.Append(block_);
+  if (page->finished && page->next == page->total) {
+    if (page->error == kErrorNone) return Finish(box, BoxState::kAnswered, "");
+    const bool folder = page->error == kErrorNoSuchFolder || page->error == kErrorPermission;
+    return Finish(box, BoxState::kRefused, folder ? "no such folder" : "the search failed there");
+  }
+  if (page->next >= static_cast<std::uint64_t>(fleet_.rows_per_box)) {
+    asker_->Ask(*box.box, {"POST", "/fleet/end", "{\"taskid\":\"" + box.task + "\"}"},
+                [](const BoxAnswer&) {});
+    return Finish(box, BoxState::kRefused, "has more rows than are asked for");
+  }
+  AskMore(box);
+}
+
+bool FleetSearch::TakePage(Box& box, const FleetPage& page) {
+  const bool agrees = page.next >= box.next && page.total >= page.next &&
+                      page.rows.size() <= page.next - box.next && page.rows.size() <= page_.limit;
+  if (!agrees) return false;
+  for (const FleetRow& row : page.rows) {
+    if (!TakeRow(box, row)) return false;
+  }
+  search_.progress.AddMatches(page.rows.size());
+  box.task = page.task;
+  box.next = page.next;
+  return true;
+}
+
+bool FleetSearch::TakeRow(const Box& box, const FleetRow& row) {
+  const auto location = std::ranges::find_if(
+      box.locations, [&row](const FleetLocation* asked) { return IsIn(row, *asked); });
+  if (location == box.locations.end()) return false;
+  FileAttributes attributes = row.attributes;
+  attributes.uid = IdOf(row.user, true);
+  attributes.gid = IdOf(row.group, false);
+  if (block_.full()) search_.sink.Append(block_);
+  block_.SetFolder((*location)->number, row.folder);
+  block_.Add(row.name, attributes);
+  return true;
+}
+
+void FleetSearch::AskMore(Box& box) {
+  FleetPageRequest page = page_;
+  page.after = box.next;
+  Json::Value body = FleetPageRequestJson(page);
+  body["task"] = box.task;
+  asker_->Ask(*box.box, {"POST", "/fleet/rows", JsonText(body, JsonBytes::kRaw), kWaitMs},
+              [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
+}
+
+void FleetSearch::EndSearches() {
+  for (Box& box : boxes_) {
+    if (box.state != BoxState::kAsked || box.task.empty()) continue;
+    asker_->Ask(*box.box, {"POST", "/fleet/end", "{\"taskid\":\"" + box.task + "\"}"},
+                [](const BoxAnswer&) {});
+  }
+  const Deadline end(kEndMs);
+  asker_->Run([&end] { return end.passed(); });
+}
+
+void FleetSearch::Finish(Box& box, BoxState state, const std::string& why) {
+  const std::lock_guard lock(mutex_);
+  box.state = state;
+  box.why = why;
+}
+
+// Of an account that both machines have, this one's number, so that a listing can be narrowed down
+// by it.
+std::uint32_t FleetSearch::IdOf(const std::string& name, bool user) {
+  const auto [known, added] = ids_.try_emplace({user, name});
+  if (!added) return known->second;
+  if (user) {
+    if (const auto account = FindAccount(name)) return known->second = account->uid;
+  } else if (const auto group = FindGroup(name)) {
+    return known->second = group->gid;
+  }
+  settings_.add_account(next_id_, name);
+  return known->second = next_id_++;
+}
+
+bool FleetSearch::failed() const {
+  const std::lock_guard lock(mutex_);
+  return std::ranges::none_of(
+      boxes_, [](const Box& box) { return box.state == BoxState::kAnswered || box.next > 0; });
+}
+
+void FleetSearch::Tell(Json::Value* walk) const {
+  const std::lock_guard lock(mutex_);
+  Json::Value& fleet = (*walk)[task_record::kFleet];
+  fleet["total"] = Json::UInt64{boxes_.size()};
+  std::map<BoxState, unsigned> counts;
+  Json::Value troubles(Json::arrayValue);
+  for (const Box& box : boxes_) {
+    ++counts[box.state];
+    if (box.state == BoxState::kAsked || box.state == BoxState::kAnswered) continue;
+    Json::Value& trouble = troubles.append(Json::objectValue);
+    trouble["name"] = box.box->name;
+    trouble["state"] = BoxStateName(box.state);
+    trouble["why"] = box.why;
+  }
+  for (const BoxState state : {BoxState::kAnswered, BoxState::kLate, BoxState::kDown,
+                               BoxState::kRefused, BoxState::kOld}) {
+    fleet[BoxStateName(state)] = counts[state];
+  }
+  fleet["boxes"].swap(troubles);
+}
+
+}  // namespace nas

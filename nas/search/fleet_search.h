@@ -1,0 +1,91 @@
+#pragma once
+// The rows that the boxes of a fleet find, as a third kind of source beside the walk and the index:
+// they come judged, and go to the search's sink as they are. Each box is asked for the same search
+// in its own locations, in the user's name; it decides by its own kernel what it tells.
+//
+// Nothing that a box says is believed but that it found these rows: names and folders must be some
+// that were asked for, counts must agree with what came, and after rows_per_box of them it is asked
+// no further. So a box that lies costs its own rows alone.
+
+#include <json/value.h>
+
+#include <functional>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "nas/fleet/asker.h"
+#include "nas/fleet/question.h"
+#include "nas/results/row_block.h"
+#include "nas/search/judge.h"
+
+namespace nas {
+
+// "/BOX/SHARE/below", taken apart.
+struct FleetLocation {
+  const FleetBox* box = nullptr;
+  std::string share;
+  std::string path;          // below the share's root
+  std::uint16_t number = 0;  // in the result file
+};
+
+// Nothing for a text that names no box of the configuration; kErrorIllegal and kErrorNoSuchFolder
+// for one that is no location in it.
+std::optional<Result<FleetLocation>> FindFleetLocation(const std::string& text);
+
+class FleetSearch {
+ public:
+  struct Settings {
+    bool recursive = true;
+    bool contents = false;
+    // Gives the name of an account that this machine does not have its number in the result file.
+    std::function<void(std::uint32_t id, const std::string& name)> add_account;
+  };
+  // The search is borrowed.
+  FleetSearch(std::vector<FleetLocation> locations, Settings settings, SharedSearch& search);
+
+  // Asks until every box has ended or the search is stopping. Throws what the sink throws, and
+  // std::runtime_error where nobody can be asked.
+  void Run();
+  // Whether every box failed; a search of which nothing can be known has failed too.
+  bool failed() const;
+  // Adds "fleet" to the task property "walk". Callable from any thread.
+  void Tell(Json::Value* walk) const;
+
+ private:
+  // One box, as far as it has come.
+  struct Box {
+    const FleetBox* box = nullptr;
+    std::vector<const FleetLocation*> locations;
+    std::string task;
+    std::uint64_t next = 0;
+    BoxState state = BoxState::kAsked;
+    std::string why;
+  };
+
+  std::string QuestionFor(const Box& box) const;
+  void Took(Box& box, BoxAnswer answer);
+  bool TakePage(Box& box, const FleetPage& page);
+  bool TakeRow(const Box& box, const FleetRow& row);
+  void AskMore(Box& box);
+  void EndSearches();
+  void Finish(Box& box, BoxState state, const std::string& why);
+  std::uint32_t IdOf(const std::string& name, bool user);
+
+  const std::vector<FleetLocation> locations_;
+  const Settings settings_;
+  SharedSearch& search_;
+  const FleetSettings& fleet_;
+  FleetPageRequest page_;
+  std::optional<FleetAsker> asker_;
+  RowBlock block_;
+  std::map<std::pair<bool, std::string>, std::uint32_t> ids_;  // by kind and name
+  std::uint32_t next_id_;
+
+  mutable std::mutex mutex_;  // guards state and why of each
+  std::vector<Box> boxes_;
+};
+
+}  // namespace nas
