@@ -51,7 +51,7 @@ std::string ProxyConfig(const nas::FleetSettings& fleet) {
       "    timeout client 1m\n"
       "    timeout server 1m\n"
       "    http-reuse always\n"
-      "    option httpchk GET /health\n"
+      "    option httpchk\n"
       "    default-server check inter 2s fall 2 rise 1\n"
       "\n"
       "frontend arbory_fleet\n"
@@ -62,7 +62,8 @@ std::string ProxyConfig(const nas::FleetSettings& fleet) {
   for (const nas::FleetBox& box : fleet.boxes) {
     const auto [server, tls] = ServerOf(box);
     const std::string host = server.substr(0, server.rfind(':'));
-    text += "\nbackend arbory_" + box.name + "\n    http-check send hdr Host " + server +
+    text += "\nbackend arbory_" + box.name +
+            "\n    http-check send meth GET uri /health ver HTTP/1.1 hdr Host " + server +
             "\n    http-request set-header Host " + server + "\n    server " + box.name + " " +
             server;
     if (tls) {
