@@ -87,7 +87,7 @@ test('pictures', async () => {
       await tab.page.context().addCookies(cookies);
       await tab.page.goto(`${server.origin}/${hash}`);
       await tab.page.waitForSelector('#pattern');
-      if (hash.includes('q=') && name !== 'page-running') await tab.over();
+      if (hash.includes('q=') && name !== 'page-running' && name !== 'page-error') await tab.over();
       await act?.(tab);
       await tab.page.evaluate(() => document.fonts.ready);
       await tab.page.waitForTimeout(400);
