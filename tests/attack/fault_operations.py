@@ -140,7 +140,7 @@ def ends_by_right(attack, status, err):
     faults = attack.faults
     if status == -signal.SIGABRT and faults.wants("identity"):
         return "cannot take its user's identity" in err
-    by_library = b" by libc.so" in faults.control.what and faults.wants("alloc")
+    by_library = faults.wants("alloc") and b" by libc.so" in faults.control.what
     ended = by_library and status in (-signal.SIGABRT, -signal.SIGSEGV)
     attack.ended += ended
     return ended
