@@ -39,15 +39,6 @@ const char* TypeOf(mode_t mode) {
   }
 }
 
-bool IsUtf8(std::string_view text) {
-  while (!text.empty()) {
-    const nas::Utf8Step step = nas::NextUtf8(text);
-    if (!step.valid) return false;
-    text.remove_prefix(step.length);
-  }
-  return true;
-}
-
 // Whether the JSON text holds a control character at that place, as only DEL and those of the
 // second set still stand in one; how many bytes it has.
 size_t ControlAt(std::string_view text, size_t at) {
@@ -80,7 +71,7 @@ void AppendTimes(const nas::FileAttributes& file, std::string* out) {
 
 void JsonRows::Set(std::string_view bytes, Text* text) {
   text->bytes = bytes;
-  text->whole = IsUtf8(bytes);
+  text->whole = nas::IsUtf8(bytes);
   std::string& json = text->json;
   json.clear();
   nas::AppendJsonString(bytes, nas::JsonBytes::kClean, &json);

@@ -46,4 +46,13 @@ Utf8Step NextUtf8(std::string_view text) {
   return {lead.following + 1, true};
 }
 
+bool IsUtf8(std::string_view text) {
+  while (!text.empty()) {
+    const Utf8Step step = NextUtf8(text);
+    if (!step.valid) return false;
+    text.remove_prefix(step.length);
+  }
+  return true;
+}
+
 }  // namespace nas

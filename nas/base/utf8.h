@@ -18,6 +18,9 @@ struct Utf8Step {
 // Surrogates, overlong forms and values beyond U+10FFFF are bad.
 Utf8Step NextUtf8(std::string_view text);
 
+// Whether no sequence in it is bad.
+bool IsUtf8(std::string_view text);
+
 // Whether the byte is one of ASCII's control characters.
 constexpr bool IsControl(unsigned char byte) {
   constexpr unsigned char kFirstPrintable = 0x20;

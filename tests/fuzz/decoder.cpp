@@ -3,6 +3,7 @@
 
 #include <algorithm>
 
+#include "nas/base/utf8.h"
 #include "nas/match/text_decoder.h"
 #include "tests/fuzz/fuzz.h"
 
@@ -31,8 +32,8 @@ void CheckForeign(std::string_view bytes) {
   size_t cut = 0;
   const size_t at = nas::FindForeign(bytes, &cut);
   DEMAND(cut <= bytes.size());
-  DEMAND((at == std::string_view::npos && cut == 0) == fuzz::IsValidUtf8(bytes));
-  DEMAND(fuzz::IsValidUtf8(bytes.substr(0, std::min(at, bytes.size() - cut))));
+  DEMAND((at == std::string_view::npos && cut == 0) == nas::IsUtf8(bytes));
+  DEMAND(nas::IsUtf8(bytes.substr(0, std::min(at, bytes.size() - cut))));
 }
 
 }  // namespace
@@ -54,9 +55,9 @@ int fuzz::Target(std::string_view input) {
   const std::string_view text = input.substr(kHead);
   CheckForeign(text);
   const std::string whole = Decoded(encoding, text, text.size());
-  DEMAND(fuzz::IsValidUtf8(whole));
+  DEMAND(nas::IsUtf8(whole));
   DEMAND(Decoded(encoding, text, step) == whole);
   const std::string guessed = nas::GuessEncoding(text);
-  DEMAND(guessed.empty() || fuzz::IsValidUtf8(Decoded(guessed, text, step)));
+  DEMAND(guessed.empty() || nas::IsUtf8(Decoded(guessed, text, step)));
   return kUsed;
 }

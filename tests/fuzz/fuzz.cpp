@@ -53,15 +53,6 @@ void WriteFile(const std::string& path, std::string_view bytes) {
   std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
 }
 
-bool IsValidUtf8(std::string_view text) {
-  while (!text.empty()) {
-    const nas::Utf8Step step = nas::NextUtf8(text);
-    if (!step.valid) return false;
-    text.remove_prefix(step.length);
-  }
-  return true;
-}
-
 }  // namespace fuzz
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {

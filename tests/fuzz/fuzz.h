@@ -30,8 +30,6 @@ void Demand(bool kept, const char* promise, const char* file, int line);
 const std::string& Scratch();
 void WriteFile(const std::string& path, std::string_view bytes);
 
-bool IsValidUtf8(std::string_view text);
-
 }  // namespace fuzz
 
 #define DEMAND(condition) fuzz::Demand((condition), #condition, __FILE__, __LINE__)

@@ -5,6 +5,7 @@
 #include <memory>
 
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 #include "tests/fuzz/fuzz.h"
 
 namespace {
@@ -35,7 +36,7 @@ void CheckRoundTrip(const Json::Value& value) {
   DEMAND(nas::JsonText(again, JsonBytes::kRaw) == raw);
 
   const std::string clean = nas::JsonText(value, JsonBytes::kClean);
-  DEMAND(fuzz::IsValidUtf8(clean));
+  DEMAND(nas::IsUtf8(clean));
   Json::Value cleaned;
   DEMAND(nas::ParseJson(clean, &cleaned));
   // Cleaned names may come in another order, or two of them become one; once more changes nothing.

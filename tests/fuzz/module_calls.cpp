@@ -11,6 +11,7 @@
 
 #include "module/table.h"
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 #include "nas/system/config.h"
 #include "nas/system/user_state.h"
 #include "platform/system.h"
@@ -156,7 +157,7 @@ Outcome Make(const Call& call) {
   if (outcome.ended) DEMAND(call.side != Side::kParent);
   const std::string text = nas::JsonText(outcome.data, nas::JsonBytes::kClean);
   Json::Value again;
-  DEMAND(IsValidUtf8(text) && nas::ParseJson(text, &again));
+  DEMAND(nas::IsUtf8(text) && nas::ParseJson(text, &again));
   return outcome;
 }
 

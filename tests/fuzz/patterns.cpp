@@ -167,7 +167,7 @@ int fuzz::Target(std::string_view rest) {
     return fuzz::kUsed;
   }
   // The bytes of a broken query may be part of a name's character.
-  bool known = fuzz::IsValidUtf8(text);
+  bool known = nas::IsUtf8(text);
   const bool expected = MatchesByTheLanguage(query->root(), name, &known);
   const Answer found = Matches(*query, name);
   if (known) DEMAND(found == (expected ? Answer::kYes : Answer::kNo));

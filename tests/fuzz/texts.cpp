@@ -5,6 +5,7 @@
 
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
+#include "nas/base/utf8.h"
 #include "nas/match/folded_name.h"
 #include "nas/system/share_names.h"
 #include "platform/webfm.h"
@@ -21,13 +22,13 @@ std::string Clean(const std::string& text) {
 
 void CheckFolding(const std::string& text) {
   const std::string clean = Clean(text);
-  const bool was_valid = fuzz::IsValidUtf8(text);
-  DEMAND(fuzz::IsValidUtf8(clean) && Clean(clean) == clean && (clean == text) == was_valid);
+  const bool was_valid = nas::IsUtf8(text);
+  DEMAND(nas::IsUtf8(clean) && Clean(clean) == clean && (clean == text) == was_valid);
   // A NUL cannot be in a name.
   if (text.find('\0') != std::string::npos) return;
   bool valid = false;
   const std::string folded = nas::FoldText(text, &valid);
-  DEMAND(valid == was_valid && (!valid || fuzz::IsValidUtf8(folded)));
+  DEMAND(valid == was_valid && (!valid || nas::IsUtf8(folded)));
   nas::FoldedName name;
   name.Set(text);
   DEMAND(name.folded() == folded && name.valid_utf8() == valid);

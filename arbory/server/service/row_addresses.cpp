@@ -12,20 +12,11 @@ namespace {
 constexpr char kPath[] = "path";
 constexpr char kFiles[] = "files";
 
-bool IsText(std::string_view bytes) {
-  while (!bytes.empty()) {
-    const nas::Utf8Step step = nas::NextUtf8(bytes);
-    if (!step.valid) return false;
-    bytes.remove_prefix(step.length);
-  }
-  return true;
-}
-
 bool NeedsAddress(const Json::Value& row) {
   const char* begin = nullptr;
   const char* end = nullptr;
   return row.isObject() && row[kPath].getString(&begin, &end) &&
-         !IsText({begin, static_cast<size_t>(end - begin)});
+         !nas::IsUtf8({begin, static_cast<size_t>(end - begin)});
 }
 
 std::string AddressOf(std::string_view path) {

@@ -38,15 +38,6 @@ bool IsPacked(std::string_view name) {
          std::end(kExtensions);
 }
 
-bool IsUtf8(std::string_view text) {
-  while (!text.empty()) {
-    const nas::Utf8Step step = nas::NextUtf8(text);
-    if (!step.valid) return false;
-    text.remove_prefix(step.length);
-  }
-  return true;
-}
-
 }  // namespace
 
 struct ZipStream::Chunks {
@@ -84,7 +75,7 @@ ZipStream::~ZipStream() {
 
 bool ZipStream::Begin(const std::string& name, const struct stat& info, bool packs) {
   if (broken_) return false;
-  std::setlocale(LC_CTYPE, IsUtf8(name) ? kUtf8Locale : "C");
+  std::setlocale(LC_CTYPE, nas::IsUtf8(name) ? kUtf8Locale : "C");
   if (packs) {
     archive_write_zip_set_compression_deflate(archive_);
   } else {
