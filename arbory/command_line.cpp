@@ -34,12 +34,7 @@ void AddLetters(CLI::App* command, SearchQuery* query) {
 
 // Where the search goes.
 void AddScope(CLI::App* command, SearchQuery* query) {
-  const CLI::Validator levels(
-      [](const std::string& text) {
-        const bool digits = !text.empty() && text.find_first_not_of("0123456789") == text.npos;
-        return digits ? std::string() : "'" + text + "' is not a number of levels";
-      },
-      "");
+  const CLI::Validator levels = NumberOf("levels");
   command->add_option("-d,--max-depth", query->max_depth, "At most N levels down; 1: in FOLDER")
       ->type_name("N")
       ->check(levels);
@@ -118,6 +113,15 @@ std::vector<std::string> MarkedArguments(int argc, char** argv) {
 
 void Unmark(std::string* text) {
   if (text->starts_with(kMark)) text->erase(0, 1);
+}
+
+CLI::Validator NumberOf(const char* what) {
+  return {[what](const std::string& text) {
+            const bool digits =
+                !text.empty() && text.find_first_not_of("0123456789") == std::string::npos;
+            return digits ? std::string() : "'" + text + "' is not a number of " + what;
+          },
+          ""};
 }
 
 void AddCommonOptions(CLI::App* command, CommonOptions* common) {

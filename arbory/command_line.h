@@ -8,7 +8,8 @@
 
 namespace CLI {
 class App;
-}
+class Validator;
+}  // namespace CLI
 
 namespace arbory {
 
@@ -17,6 +18,9 @@ namespace arbory {
 // all in reverse, as the parser wants them; the second takes a mark off again.
 std::vector<std::string> MarkedArguments(int argc, char** argv);
 void Unmark(std::string* text);
+
+// Refuses what is not digits alone, as no number of `what`, which has to live on.
+CLI::Validator NumberOf(const char* what);
 
 // --user, --share and --config, in the current group of `command`.
 void AddCommonOptions(CLI::App* command, CommonOptions* common);

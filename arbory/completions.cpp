@@ -183,7 +183,7 @@ complete -F _arbory arbory
 
 // --- zsh ---
 
-// In a specification of _arguments, brackets and colons have a meaning.
+// In what _arguments is given, brackets and colons have a meaning.
 std::string ZshEscaped(const std::string& text) {
   std::string escaped;
   for (const char c : text) {

@@ -4,6 +4,8 @@
 #include <algorithm>
 #include <map>
 
+#include "arbory/command_line.h"
+
 namespace arbory {
 namespace {
 
@@ -29,15 +31,6 @@ void AddCommand(CLI::App* command, const char* letter, const char* name,
           std::string(letter) + "," + name,
           [=](const std::string& text) { *words = WordsOf(text, name); }, description)
       ->type_name("COMMAND");
-}
-
-CLI::Validator NumberOf(const char* what) {
-  return {[what](const std::string& text) {
-            const bool digits =
-                !text.empty() && text.find_first_not_of("0123456789") == std::string::npos;
-            return digits ? std::string() : "'" + text + "' is not a number of " + what;
-          },
-          ""};
 }
 
 void AddLines(CLI::App* search, OutputOptions* output) {
