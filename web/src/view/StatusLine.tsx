@@ -1,5 +1,6 @@
 // How the search goes: the count, the time, what could not be read; and what can be done with the
 // whole result.
+import type { ComponentChildren } from 'preact';
 import { useEffect, useRef, useState } from 'preact/hooks';
 import type { Sort, SortColumn } from '../model/address.ts';
 import { browses } from '../model/criteria.ts';
@@ -203,6 +204,25 @@ function Spoken({ search }: { search: Search }) {
   );
 }
 
+// What is missing from the result, in a few words that open to more.
+function Caution({ title, children }: { title: string; children: ComponentChildren }) {
+  return (
+    <Popover
+      className="tool caution"
+      panelLabel={title}
+      panelClass="note"
+      label={
+        <>
+          <Icon name="warning" size={14} />
+          {title}
+        </>
+      }
+    >
+      {() => <>{children}</>}
+    </Popover>
+  );
+}
+
 function Skipped({ search }: { search: Search }) {
   const { permission, other } = search.walk.skipped;
   const folders = permission + other;
@@ -214,36 +234,22 @@ function Skipped({ search }: { search: Search }) {
   ];
   const title = `${what.join(' and ')} could not be read`;
   return (
-    <Popover
-      className="tool caution"
-      panelLabel={title}
-      panelClass="note"
-      label={
-        <>
-          <Icon name="warning" size={14} />
-          {title}
-        </>
-      }
-    >
-      {() => (
-        <>
-          <p>The result may not be complete.</p>
-          {files > 0 && <p>The contents of {plural(files, 'file')} could not be looked into.</p>}
-          {permission > 0 && (
-            <p>
-              {plural(permission, 'folder')} {permission === 1 ? 'is' : 'are'} closed to you. Ask the owner for
-              permission to read.
-            </p>
-          )}
-          {other > 0 && (
-            <p>
-              {plural(other, 'folder')} could not be read for another reason, such as a faulty disk. Search
-              again; if it stays, tell who runs the server.
-            </p>
-          )}
-        </>
+    <Caution title={title}>
+      <p>The result may not be complete.</p>
+      {files > 0 && <p>The contents of {plural(files, 'file')} could not be looked into.</p>}
+      {permission > 0 && (
+        <p>
+          {plural(permission, 'folder')} {permission === 1 ? 'is' : 'are'} closed to you. Ask the owner for
+          permission to read.
+        </p>
       )}
-    </Popover>
+      {other > 0 && (
+        <p>
+          {plural(other, 'folder')} could not be read for another reason, such as a faulty disk. Search
+          again; if it stays, tell who runs the server.
+        </p>
+      )}
+    </Caution>
   );
 }
 
@@ -253,30 +259,16 @@ function Silent({ search }: { search: Search }) {
   if (boxes.length === 0) return null;
   const title = `${plural(boxes.length, 'machine')} did not answer`;
   return (
-    <Popover
-      className="tool caution"
-      panelLabel={title}
-      panelClass="note"
-      label={
-        <>
-          <Icon name="warning" size={14} />
-          {title}
-        </>
-      }
-    >
-      {() => (
-        <>
-          <p>There are at least as many matches as are shown; what these have is missing:</p>
-          <ul>
-            {boxes.map(({ name, why }) => (
-              <li key={name}>
-                {name}: {why}
-              </li>
-            ))}
-          </ul>
-        </>
-      )}
-    </Popover>
+    <Caution title={title}>
+      <p>There are at least as many matches as are shown; what these have is missing:</p>
+      <ul>
+        {boxes.map(({ name, why }) => (
+          <li key={name}>
+            {name}: {why}
+          </li>
+        ))}
+      </ul>
+    </Caution>
   );
 }
 
