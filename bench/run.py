@@ -274,11 +274,13 @@ def main():
                 rows += compare(name, commands, target)
                 print(*(" | ".join(row) for row in rows[-len(commands) + 1:]), sep="\n",
                       file=sys.stderr)
-        if os.access("/proc/sys/vm/drop_caches", os.W_OK):
+        can_drop = os.access("/proc/sys/vm/drop_caches", os.W_OK)
+        if can_drop:
             cold = name_index.cold_comparison(index, ["fdfind", "-uu"])
             rows += compare(*cold, {}, COLD_ROUNDS, drop_caches)
         measured = [[name, value, judged(must, "", value)] for name, value, must
-                    in name_index.measures(index, args.bin, trees.growing(args.large))]
+                    in name_index.measures(index, args.bin, trees.growing(args.large),
+                                           drop_caches if can_drop else None)]
     tables = [(head, rows), (["the name index", "measured", "must"], measured)]
     if args.only in "service":
         tables.append((["as a client of the module", "measured", "must"],

@@ -7,6 +7,7 @@
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -117,6 +118,15 @@ void AddLine(std::string_view line, Changes& changes) {
   if (inode != 0) changes.AddInode(inode);
 }
 
+// Whether /proc shows the processes of the whole machine: in a container it shows the container's,
+// while others may have its files mapped.
+bool SeesAllProcesses() {
+  // Of the first namespace, as the kernel has it (PROC_PID_INIT_INO); others get higher numbers.
+  constexpr ino_t kFirst = 0xEFFFFFFC;
+  struct stat status;
+  return stat("/proc/self/ns/pid", &status) == 0 && status.st_ino == kFirst;
+}
+
 }  // namespace
 
 Status BecomePeer(const Peer& peer) {
@@ -149,6 +159,7 @@ pid_t StartQuestion(const Question& question, const NameTable& table, Changes& c
 }
 
 bool AddMappedInodes(Changes& changes) {
+  if (!SeesAllProcesses()) return false;
   const auto names = NamesIn(AT_FDCWD, "/proc");
   if (!names) return false;
   char* line = nullptr;

@@ -1,10 +1,13 @@
 // The index daemon as a whole: what its answers are based on after each kind of change, whose
 // process gives them, and what it does when it or the queue of events breaks.
 
+#include <sched.h>
 #include <sys/mman.h>
+#include <sys/mount.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 
 #include <grp.h>
 #include <pwd.h>
@@ -14,6 +17,7 @@
 
 #include "nas/index/broker.h"
 #include "nas/index/daemon_socket.h"
+#include "nas/index/question_child.h"
 #include "nas/index/table_folders.h"
 #include "nas/index/watcher_process.h"
 #include "platform/system.h"
@@ -265,6 +269,31 @@ TEST_F(Life, DoesNotBelieveMappedFiles) {
   EXPECT_FALSE(Tells(See(tree_, false)["inodes"], path)) << "looked for though nobody asks";
   munmap(mapping, 1);
   EXPECT_FALSE(Tells(See(tree_, true)["inodes"], path));
+}
+
+// Whoever has a file mapped may be outside.
+TEST(Mapped, IsNotToldFromWithinAContainer) {
+  const pid_t outside = fork();
+  if (outside == 0) {
+    constexpr int kNoRoot = 2;
+    if (unshare(CLONE_NEWNS | CLONE_NEWPID) != 0 ||
+        mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+      _exit(kNoRoot);
+    }
+    const pid_t inside = fork();
+    if (inside == 0) {
+      if (mount("proc", "/proc", "proc", 0, nullptr) != 0) _exit(kNoRoot);
+      nas::Changes changes;
+      _exit(nas::AddMappedInodes(changes) ? 1 : 0);
+    }
+    int status = 0;
+    waitpid(inside, &status, 0);
+    _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 1);
+  }
+  int status = 0;
+  ASSERT_EQ(waitpid(outside, &status, 0), outside);
+  if (WIFEXITED(status) && WEXITSTATUS(status) == 2) GTEST_SKIP() << "needs root";
+  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
 }
 
 // A copy has its original's id, and both may be there at once.
