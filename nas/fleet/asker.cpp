@@ -1,5 +1,6 @@
 #include "nas/fleet/asker.h"
 
+#include <algorithm>
 #include <cstdlib>
 #include <ctime>
 #include <map>
@@ -13,11 +14,13 @@ namespace nas {
 namespace {
 
 constexpr int kOk = 200;
+constexpr int kPartial = 206;
 constexpr int kBadRequest = 400;
 constexpr int kUnauthorized = 401;
 constexpr int kForbidden = 403;
 constexpr int kNotFound = 404;
 constexpr int kNotAllowed = 405;
+constexpr int kNotSatisfiable = 416;
 constexpr int kUnavailable = 503;
 
 // Of a list of shares.
@@ -37,6 +40,8 @@ BoxAnswer AnswerOf(FleetReply reply) {
   const int status = reply.status;
   switch (status) {
     case kOk:
+    case kPartial:
+    case kNotSatisfiable:
       return {BoxState::kAnswered, "", status, std::move(reply.body)};
     case kBadRequest:
     case kNotFound:
@@ -85,6 +90,8 @@ void FleetAsker::Send(const FleetBox& box, const Request& request, int clock_off
   sent.body = request.body;
   sent.token = FleetTokenFor(box, hash, clock_offset);
   sent.deadline_ms = fleet_.deadline_ms + request.wait_ms;
+  sent.take_head = request.take_head;
+  sent.take_piece = request.take_piece;
   client_->Ask(sent, [this, &box, request, done](FleetReply reply) {
     if (reply.outcome == FleetReply::Outcome::kReply && reply.status == kUnauthorized &&
         SendAgain(box, request, reply, done)) {
@@ -104,6 +111,12 @@ bool FleetAsker::SendAgain(const FleetBox& box, const Request& request, const Fl
   offsets_[box.name] = static_cast<int>(offset);
   Send(box, request, offsets_[box.name], done);
   return true;
+}
+
+const FleetBox* FindFleetBox(const std::string& name) {
+  const auto& boxes = CurrentConfig().fleet.boxes;
+  const auto box = std::ranges::find(boxes, name, &FleetBox::name);
+  return box == boxes.end() ? nullptr : &*box;
 }
 
 void AppendFleetShares(Json::Value* shares, Json::Value* troubles) {

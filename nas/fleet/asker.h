@@ -44,6 +44,9 @@ class FleetAsker {
     std::string target;
     std::string body = {};
     int wait_ms = 0;  // that the box may take beyond the deadline, as it was asked to
+    // As of FleetRequest.
+    std::function<bool(const FleetHead& head)> take_head = {};
+    std::function<bool(std::string_view piece)> take_piece = {};
   };
   using Done = std::function<void(BoxAnswer answer)>;
   // `done` is called from Run, once, and may ask again. A box whose clock is off by no more than
@@ -60,6 +63,9 @@ class FleetAsker {
   std::unique_ptr<FleetClient> client_;
   std::map<std::string, int> offsets_;  // of boxes' clocks, in seconds
 };
+
+// The box of that name in the configuration; null where there is none.
+const FleetBox* FindFleetBox(const std::string& name);
 
 // The shares of all boxes that the user can enter, as "BOX/SHARE", appended to `shares`; and of
 // each box that has not answered its state, in `troubles`.

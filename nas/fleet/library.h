@@ -2,12 +2,21 @@
 // What only machines of a fleet need of other libraries: signatures, and asking other machines. It
 // lies in a library of its own, so that all others, who start in milliseconds, do not load it.
 
+#include <cstdint>
 #include <functional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 namespace nas {
+
+// The beginning of a reply whose body is passed on as it comes.
+struct FleetHead {
+  int status = 0;
+  std::int64_t length = -1;    // of the body; -1: it does not say
+  std::int64_t modified = -1;  // in seconds since 1970; -1: it does not say
+  std::string range = {};      // Content-Range
+};
 
 // One request to a machine.
 struct FleetRequest {
@@ -17,14 +26,18 @@ struct FleetRequest {
   std::string target;  // "/fleet/..."
   std::string token;
   std::string body = {};
-  int deadline_ms = 0;  // for the reply to be whole
+  int deadline_ms = 0;  // for the reply to be whole, or to begin where it is passed on
+  // Where set, replies of the statuses 200, 206 and 416 go to these instead of into memory: the
+  // head, and for the first two the body, in pieces. One that answers false ends the request.
+  std::function<bool(const FleetHead& head)> take_head = {};
+  std::function<bool(std::string_view piece)> take_piece = {};
 };
 
 struct FleetReply {
   enum class Outcome {
     kReply,  // status and body hold
     kDown,   // no connection, or one that broke off
-    kLate,   // nothing whole by the deadline
+    kLate,   // nothing whole by the deadline, or nothing further of what is passed on
     kTooLong,
   };
   Outcome outcome = Outcome::kDown;

@@ -40,8 +40,8 @@ std::string LocationText(const FleetLocation& location) {
 }  // namespace
 
 std::optional<Result<FleetLocation>> FindFleetLocation(const std::string& text) {
-  const auto& boxes = CurrentConfig().fleet.boxes;
-  if (boxes.empty() || !text.starts_with('/') || text.find('\0') != std::string::npos) {
+  if (CurrentConfig().fleet.boxes.empty() || !text.starts_with('/') ||
+      text.find('\0') != std::string::npos) {
     return std::nullopt;
   }
   std::vector<std::string> parts;
@@ -51,13 +51,12 @@ std::optional<Result<FleetLocation>> FindFleetLocation(const std::string& text) 
     at = end;
     if (!part.empty() && part != ".") parts.push_back(part);
   }
-  const auto box =
-      parts.empty() ? boxes.end() : std::ranges::find(boxes, parts.front(), &FleetBox::name);
-  if (box == boxes.end()) return std::nullopt;
+  const FleetBox* box = parts.empty() ? nullptr : FindFleetBox(parts.front());
+  if (box == nullptr) return std::nullopt;
   if (std::ranges::find(parts, "..") != parts.end()) return Error{kErrorIllegal, EINVAL, text};
   if (parts.size() == 1) return Error{kErrorNoSuchFolder, ENOENT, text};
   FleetLocation location;
-  location.box = &*box;
+  location.box = box;
   location.share = parts[1];
   for (size_t i = 2; i < parts.size(); ++i) {
     location.path += (location.path.empty() ? "" : "/") + parts[i];

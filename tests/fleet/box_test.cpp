@@ -34,22 +34,24 @@ class BoxTest : public FleetTest {
     }
   }
 
+  // Who is let in with this request, and who is not.
+  void CheckTokens(const Box& box, const std::string& method, const std::string& target,
+                   const std::string& body);
+
   int pages_ = 0;
   std::string task_;
 };
 
-TEST_F(BoxTest, BelievesATokenOnceForOneRequest) {
-  const Box box = StartBox("box1");
-  const std::string target = "/fleet/search";
-  const std::string body = Question(10);
-  const auto good = [&] { return TokenFor(box, User(), "POST", target, body); };
+void BoxTest::CheckTokens(const Box& box, const std::string& method, const std::string& target,
+                          const std::string& body) {
+  const auto good = [&] { return TokenFor(box, User(), method, target, body); };
   const auto with = [&](auto change) {
     nas::FleetToken token = good();
     change(token);
     return nas::SignedToken(token, secret_key_);
   };
   const std::string used = with([](auto&) {});
-  EXPECT_EQ(AskWith(box, used, "POST", target, body).status, 200);
+  EXPECT_EQ(AskWith(box, used, method, target, body).status, 200);
   std::string flipped = with([](auto&) {});
   flipped.back() = flipped.back() == '0' ? '1' : '0';
   std::string renamed = with([](auto&) {});
@@ -70,13 +72,16 @@ TEST_F(BoxTest, BelievesATokenOnceForOneRequest) {
       {"an unknown front", with([](auto& token) { token.front = "shop"; }), 401, "token"},
       {"another box's", with([](auto& token) { token.box = "box2"; }), 401, "token"},
       {"another body's",
-       with([&](auto& token) { token.hash = nas::RequestHash("POST", target, body + " "); }), 401,
+       with([&](auto& token) { token.hash = nas::RequestHash(method, target, body + " "); }), 401,
        "token"},
       {"another target's",
-       with([&](auto& token) { token.hash = nas::RequestHash("POST", "/fleet/rows", body); }), 401,
+       with([&](auto& token) { token.hash = nas::RequestHash(method, "/fleet/rows", body); }), 401,
        "token"},
       {"as old as may be", with([](auto& token) { token.issued -= nas::kTokenSeconds - 2; }), 200,
        ""},
+      {"another method's",
+       with([&](auto& token) { token.hash = nas::RequestHash("PUT", target, body); }), 401,
+       "token"},
       {"expired", with([](auto& token) { token.issued -= nas::kTokenSeconds + 2; }), 401, "clock"},
       {"a little ahead", with([](auto& token) { token.issued += nas::kTokenFutureSeconds - 2; }),
        200, ""},
@@ -92,7 +97,7 @@ TEST_F(BoxTest, BelievesATokenOnceForOneRequest) {
        403, ""},
   };
   for (const auto& row : rows) {
-    const Reply reply = AskWith(box, row.token, "POST", target, body);
+    const Reply reply = AskWith(box, row.token, method, target, body);
     EXPECT_EQ(reply.status, row.status) << row.what << ": " << reply.body;
     if (row.status == 200) continue;
     EXPECT_EQ(reply.json()["why"].asString(), row.why) << row.what;
@@ -100,6 +105,22 @@ TEST_F(BoxTest, BelievesATokenOnceForOneRequest) {
       EXPECT_NEAR(reply.json()["now"].asDouble(), static_cast<double>(time(nullptr)), 5);
     }
     EXPECT_EQ(reply.body.find("task"), std::string::npos) << row.what;
+  }
+}
+
+TEST_F(BoxTest, BelievesATokenOnceForOneRequest) {
+  const Box box = StartBox("box1");
+  MakeFile(box, "a.txt", "", "a task of words");
+  const struct {
+    const char* method;
+    std::string target;
+    std::string body;
+  } requests[] = {{"POST", "/fleet/search", Question(10)},
+                  {"GET", "/fleet/files/data/a.txt", ""},
+                  {"GET", "/fleet/lines/data/a.txt?pattern=words", ""}};
+  for (const auto& request : requests) {
+    SCOPED_TRACE(request.target);
+    CheckTokens(box, request.method, request.target, request.body);
   }
   EXPECT_NE(Log().find("\"front\":\"office\""), std::string::npos) << "who asked is not logged";
 }
@@ -109,12 +130,15 @@ TEST_F(BoxTest, NobodyIsAFrontWhereNoneIsNamed) {
   for (const char* target : {"/fleet/search", "/fleet/rows", "/fleet/end"}) {
     EXPECT_EQ(Ask(box, User(), "POST", target, "{}").status, 404) << target;
   }
-  EXPECT_EQ(Ask(box, User(), "GET", "/fleet/shares").status, 404);
+  for (const char* target : {"/fleet/shares", "/fleet/files/data/a", "/fleet/lines/data/a"}) {
+    EXPECT_EQ(Ask(box, User(), "GET", target).status, 404) << target;
+  }
 }
 
 TEST_F(BoxTest, ATokenOpensNothingElse) {
   const Box box = StartBox("box1");
-  for (const char* target : {"/shares", "/session", "/searches/x"}) {
+  for (const char* target :
+       {"/shares", "/session", "/searches/x", "/files/data/a", "/lines/data/a"}) {
     EXPECT_EQ(Ask(box, User(), "GET", target).status, 401) << target;
   }
   EXPECT_EQ(Ask(box, User(), "POST", "/api/NUVA.Arbory.Search/2/start", "{}").status, 401);

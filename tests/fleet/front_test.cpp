@@ -5,93 +5,16 @@
 #include <algorithm>
 #include <map>
 #include <random>
-#include <set>
 #include <utility>
 
 #include "nas/base/json_text.h"
-#include "tests/fleet/fleet_test.h"
+#include "tests/fleet/front.h"
 
 namespace fleet_test {
 namespace {
 
 using nas_test::AmRoot;
 using nas_test::Eventually;
-
-// A file as a listing shows it.
-struct Listed {
-  std::string path;
-  std::string name;
-  std::int64_t size = 0;
-  std::string owner;
-  auto operator<=>(const Listed&) const = default;
-};
-
-class FrontTest : public FleetTest {
- protected:
-  // A front that asks these; `more` goes into its file, before the boxes.
-  Server StartFront(const std::vector<Box>& boxes,
-                    const std::string& more = "deadline_ms = 5000\n") {
-    const std::string key = dir_ + "/office.key";
-    nas_test::WriteFile(key, nas::ToHex(secret_key_) + "\n");
-    chmod(key.c_str(), 0600);
-    std::string file =
-        "front = \"office\"\nrealm = \"OFFICE\"\nkey_file = \"" + key + "\"\n" + more + "[boxes]\n";
-    for (const Box& box : boxes) {
-      file += box.name + " = \"http://127.0.0.1:" + std::to_string(box.server.port) + "\"\n";
-    }
-    fleet_file_ = dir_ + "/fleet.toml";
-    nas_test::WriteFile(fleet_file_, file);
-    share_lines_ = "";
-    state_ = MakeFolder("front-state");
-    root_state_ = dir_ + "/front-root-state";
-    Server front = Start(PamLines(), "", AmRoot() ? As::kRootWithLogins : As::kOrdinaryUser);
-    fleet_file_ = "";
-    return front;
-  }
-
-  static Server LoggedIn(Server front, const std::string& user) {
-    if (AmRoot()) {
-      EXPECT_TRUE(front.LogIn(user, "right"));
-    } else {
-      front.Open();
-    }
-    return front;
-  }
-
-  // Runs a search to its end and leaves its id in task_.
-  void Search(const Server& server, Json::Value params) {
-    const Json::Value started = server.Call("start", Text(params)).json();
-    task_ = started["data"]["taskid"].asString();
-    ASSERT_TRUE(Eventually([&] {
-      status_ = server.Get("/searches/" + task_).json();
-      return status_["finished"].asBool();
-    })) << nas::JsonText(status_, nas::JsonBytes::kClean);
-  }
-
-  std::vector<Listed> List(const Server& server, Json::Value params) {
-    params["taskid"] = task_;
-    params["additional"] = "size,owner";
-    const Json::Value reply = server.Call("list", Text(params)).json();
-    EXPECT_EQ(reply["code"], 0);
-    std::vector<Listed> files;
-    for (const Json::Value& file : reply["data"]["files"]) {
-      files.push_back({file["path"].asString(), file["name"].asString(), file["size"].asInt64(),
-                       file["owner"]["user"].asString()});
-      owners_.insert(files.back().owner);
-    }
-    total_ = reply["data"]["total"].asUInt64();
-    return files;
-  }
-
-  static std::string Text(const Json::Value& params) {
-    return nas::JsonText(params, nas::JsonBytes::kRaw);
-  }
-
-  std::string task_;
-  Json::Value status_;
-  std::uint64_t total_ = 0;
-  std::set<std::string> owners_;
-};
 
 TEST_F(FrontTest, TellsTheSortedUnionOfWhatEachBoxTells) {
   std::mt19937 random(20261122);

@@ -15,6 +15,7 @@
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/paths.h"
 #include "nas/files/directory_reader.h"
+#include "nas/fleet/asker.h"
 #include "nas/match/query.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
@@ -81,6 +82,7 @@ class Archiver {
   void Add(const std::string& path) {
     if (IsInFolderAdded(path)) return;
     const size_t slash = path.find('/');
+    if (nas::FindFleetBox(path.substr(0, slash)) != nullptr) return LeaveOut(path, EREMOTE);
     const nas::UniqueFd& root = RootOf(path.substr(0, slash));
     if (!root) return LeaveOut(path, ENOENT);
     const std::string below = slash == std::string::npos ? "." : path.substr(slash + 1);
@@ -164,6 +166,7 @@ class Archiver {
     if (error == ENOENT) why = "it is no longer there";
     if (error == ELOOP) why = "it is a link, or lies too deep";
     if (error == EINVAL || error == ENXIO) why = "it is neither a file nor a folder";
+    if (error == EREMOTE) why = "it is on another machine; save it by itself";
     if (error == E2BIG) why = "there are too many files for one archive";
     told_ += path + ": " + why + "\r\n";
   }

@@ -10,6 +10,7 @@
 #include <charconv>
 #include <climits>
 
+#include "arbory/server/service/fleet_files.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
 #include "nas/base/json_text.h"
@@ -103,24 +104,6 @@ void SendOpenError(int pipe, int error) {
   }
 }
 
-nas::ReplyHead HeadOf(const FileRequest& request, const struct stat& info, const ByteRange& range) {
-  const std::string& name = request.path.back();
-  const auto type = request.preview ? PreviewType(name) : std::nullopt;
-  nas::ReplyHead head{range.partial ? kPartial : kOk, 0, {}};
-  head.fields = {{"Content-Type", type.value_or("application/octet-stream")},
-                 {"Content-Disposition", ContentDisposition(type.has_value(), name)},
-                 {"Content-Security-Policy", type == kPdf ? kPdfPolicy : kPreviewPolicy},
-                 {"Last-Modified", HttpDate(info.st_mtime)},
-                 {"Accept-Ranges", "bytes"},
-                 {"Cache-Control", "private, no-cache"}};
-  if (range.partial) {
-    head.fields.emplace_back("Content-Range", "bytes " + std::to_string(range.first) + "-" +
-                                                  std::to_string(range.first + range.count - 1) +
-                                                  "/" + std::to_string(info.st_size));
-  }
-  return head;
-}
-
 // Ends early when the file has become shorter: the server then ends the connection, which tells
 // the client that it has not got all.
 void SendBytes(int pipe, int file, const ByteRange& range) {
@@ -135,23 +118,31 @@ void SendBytes(int pipe, int file, const ByteRange& range) {
   }
 }
 
-void ServeFile(const FileRequest& request, int pipe) {
-  if (!BecomeForGood(request.user)) {
-    return SendError(pipe, kUnavailable, "The server cannot act as this user.");
+// Whether the child is the user for good now; otherwise it has answered.
+bool Enter(const FileRequest& request, int pipe) {
+  if (request.admit) {
+    if (const auto refusal = request.admit()) {
+      nas::SendReply(pipe, *refusal);
+      return false;
+    }
   }
+  if (BecomeForGood(request.user)) return true;
+  SendError(pipe, kUnavailable, "The server cannot act as this user.");
+  return false;
+}
+
+void ServeFile(const FileRequest& request, int pipe) {
+  if (!Enter(request, pipe)) return;
   const auto file = OpenFile(request);
   if (!file) return SendOpenError(pipe, file.error().error_number);
   const auto size = static_cast<std::uint64_t>(file->info.st_size);
   const ByteRange range = ParseRange(request.range, size);
   if (!range.satisfiable) {
-    const HttpReply reply = ErrorReply(kNotSatisfiable, "The file has none of these bytes.");
-    nas::ReplyHead head{kNotSatisfiable, kNotSatisfiable, reply.fields};
-    head.fields.emplace_back("Content-Range", "bytes */" + std::to_string(size));
-    nas::SendReply(pipe, {head, reply.body});
+    nas::SendReply(pipe, NoSuchBytes(size));
     return;
   }
-  if (!nas::SendHead(pipe, HeadOf(request, file->info, range), range.count) || request.head_only)
-    return;
+  const nas::ReplyHead head = FileHead(request, size, file->info.st_mtime, range);
+  if (!nas::SendHead(pipe, head, range.count) || request.head_only) return;
   SendBytes(pipe, file->fd.get(), range);
 }
 
@@ -187,9 +178,7 @@ void AddText(int file, std::uint64_t line, Json::Value* body) {
 void ServeFirstLine(const FileRequest& request, const std::string& pattern, bool with_text,
                     int pipe) {
   constexpr size_t kMostLineBytes = 400;  // more than a row of the page can show
-  if (!BecomeForGood(request.user)) {
-    return SendError(pipe, kUnavailable, "The server cannot act as this user.");
-  }
+  if (!Enter(request, pipe)) return;
   const auto parsed = nas::Query::Parse(pattern);
   if (!parsed) return SendError(pipe, kBadRequest, parsed.error().path.c_str());
   const auto file = OpenFile(request);
@@ -212,12 +201,45 @@ bool ParseNumber(std::string_view text, std::uint64_t* number) {
 }  // namespace
 
 nas::Child StartFile(const FileRequest& request) {
-  return nas::StartChild([&](int pipe) { ServeFile(request, pipe); });
+  const bool elsewhere = IsOnBox(request);
+  return nas::StartChild(
+      [&](int pipe) { elsewhere ? PassFileOn(request, pipe) : ServeFile(request, pipe); });
 }
 
 nas::Child StartFirstLine(const FileRequest& request, const std::string& pattern, bool with_text) {
-  return nas::StartChild([&](int pipe) { ServeFirstLine(request, pattern, with_text, pipe); },
-                         nas::CurrentConfig().call_memory_bytes());
+  const bool elsewhere = IsOnBox(request);
+  return nas::StartChild(
+      [&](int pipe) {
+        elsewhere ? PassFirstLineOn(request, pattern, with_text, pipe)
+                  : ServeFirstLine(request, pattern, with_text, pipe);
+      },
+      nas::CurrentConfig().call_memory_bytes());
+}
+
+nas::ReplyHead FileHead(const FileRequest& request, std::uint64_t size, std::time_t modified,
+                        const ByteRange& range) {
+  const std::string& name = request.path.back();
+  const auto type = request.preview ? PreviewType(name) : std::nullopt;
+  nas::ReplyHead head{range.partial ? kPartial : kOk, 0, {}};
+  head.fields = {{"Content-Type", type.value_or("application/octet-stream")},
+                 {"Content-Disposition", ContentDisposition(type.has_value(), name)},
+                 {"Content-Security-Policy", type == kPdf ? kPdfPolicy : kPreviewPolicy},
+                 {"Last-Modified", HttpDate(modified)},
+                 {"Accept-Ranges", "bytes"},
+                 {"Cache-Control", "private, no-cache"}};
+  if (range.partial) {
+    head.fields.emplace_back("Content-Range", "bytes " + std::to_string(range.first) + "-" +
+                                                  std::to_string(range.first + range.count - 1) +
+                                                  "/" + std::to_string(size));
+  }
+  return head;
+}
+
+nas::Reply NoSuchBytes(std::uint64_t size) {
+  const HttpReply reply = ErrorReply(kNotSatisfiable, "The file has none of these bytes.");
+  nas::ReplyHead head{kNotSatisfiable, kNotSatisfiable, reply.fields};
+  head.fields.emplace_back("Content-Range", "bytes */" + std::to_string(size));
+  return {head, reply.body};
 }
 
 ByteRange ParseRange(const std::optional<std::string>& field, std::uint64_t size) {

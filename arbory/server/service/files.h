@@ -1,7 +1,9 @@
 #pragma once
 // One file of a share, sent to a client by a child that is the user for good: the system's own
 // rules decide what it may open, and a disk that must first spin up keeps nobody else waiting.
+// Files of a fleet's boxes are sent through the front (fleet_files.h).
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -17,6 +19,8 @@ struct FileRequest {
   bool preview = false;              // shown by the browser instead of saved, where that is safe
   std::optional<std::string> range;  // the Range field
   bool head_only = false;
+  // Says in the child whether anybody may ask for this user (fronts.h); null: the user does.
+  std::function<std::optional<nas::Reply>()> admit = {};
 };
 
 // Forks the child, which replies 200, 206 or 416 with the file's fields and bytes, or an error's
@@ -41,6 +45,12 @@ struct ByteRange {
   bool satisfiable = true;
 };
 ByteRange ParseRange(const std::optional<std::string>& field, std::uint64_t size);
+
+// For the child: what stands before these bytes of a file, and what is answered where the file has
+// none of those that were asked for.
+nas::ReplyHead FileHead(const FileRequest& request, std::uint64_t size, std::time_t modified,
+                        const ByteRange& range);
+nas::Reply NoSuchBytes(std::uint64_t size);
 
 // What a browser may show of a file by its name's extension: types that carry no scripts. Nothing
 // for all others, which are only ever saved.

@@ -193,6 +193,12 @@ std::span<const Route> Service::Routes() {
       {kPost, "/fleet/end", Access::kFront,
        [](Self self, Request request, Path) { return self.EndForFront(*request); }, nullptr,
        nullptr},
+      {kGet, "/fleet/files/{share}/{path...}", Access::kFront,
+       [](Self self, Request request, Path path) { return self.GetFile(*request, path); }, nullptr,
+       nullptr},
+      {kGet, "/fleet/lines/{share}/{path...}", Access::kFront,
+       [](Self self, Request request, Path path) { return self.GetFirstLine(*request, path); },
+       nullptr, nullptr},
       {kGet, "/fleet/shares", Access::kFront,
        [](Self self, Request request, Path) {
          return self.AskForFront(*request, "fleet/shares", /*leased=*/false, StartListShares);
@@ -409,14 +415,17 @@ HttpReply Service::NoSuchRowReply(const RequestPath& path) const {
                     path[1] + " " + path[2] + " has no method " + path[3] + hint);
 }
 
-// Of an address /ROUTE/SHARE/PATH.
+// Of an address /ROUTE/SHARE/PATH, or /fleet/ROUTE/SHARE/PATH.
 std::optional<FileRequest> Service::FileOf(const HttpRequest& request, const RequestPath& path) {
-  constexpr size_t kBeforePath = 2;
-  if (path.size() <= kBeforePath) return std::nullopt;
+  const size_t share = request.front.empty() ? 1 : 2;
+  if (path.size() <= share + 1) return std::nullopt;
   FileRequest file;
   file.user = request.user;
-  file.share = path[1];
-  file.path.assign(path.begin() + kBeforePath, path.end());
+  file.share = path[share];
+  file.path.assign(path.begin() + static_cast<std::ptrdiff_t>(share) + 1, path.end());
+  if (!request.front.empty()) {
+    file.admit = [front = request.front, user = request.user] { return Admit(front, user); };
+  }
   return file;
 }
 
@@ -433,8 +442,11 @@ Answer Service::GetFirstLine(const HttpRequest& request, const RequestPath& path
   if (!file) return ErrorReply(kNotFound, "Name a file: /lines/SHARE/PATH.");
   const std::string pattern = QueryValue(request.query(), "pattern").value_or("");
   const bool with_text = QueryValue(request.query(), "text").value_or("") == "1";
-  return calls_.Run(Calls::Kind::kCall, request.user, "lines",
-                    [&] { return StartFirstLine(*file, pattern, with_text); });
+  const auto start = [&] { return StartFirstLine(*file, pattern, with_text); };
+  if (!request.front.empty()) {
+    return calls_.Run(Calls::Kind::kFront, request.front, "fleet/lines", start);
+  }
+  return calls_.Run(Calls::Kind::kCall, request.user, "lines", start);
 }
 
 Answer Service::GetArchive(const HttpRequest& request, const std::string& task_id) {
@@ -462,10 +474,17 @@ Answer Service::GetFile(const HttpRequest& request, const RequestPath& path) {
   if (!named) return ErrorReply(kNotFound, "Name a file: /files/SHARE/PATH.");
   FileRequest& file = *named;
   file.preview = QueryValue(request.query(), "preview").value_or("") == "1";
-  const std::string* range = request.Field("range");
-  if (range != nullptr) file.range = *range;
   file.head_only = request.method == "HEAD";
-  return calls_.Run(Calls::Kind::kDownload, request.user, "files", [&] { return StartFile(file); });
+  const bool of_front = !request.front.empty();
+  // A front says it in the address, which it has signed.
+  if (of_front) {
+    file.range = QueryValue(request.query(), "range");
+  } else if (const std::string* range = request.Field("range")) {
+    file.range = *range;
+  }
+  // One user's places, whichever way they come.
+  return calls_.Run(Calls::Kind::kDownload, request.user, of_front ? "fleet/files" : "files",
+                    [&] { return StartFile(file); });
 }
 
 }  // namespace arbory

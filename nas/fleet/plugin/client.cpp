@@ -4,6 +4,8 @@
 
 #include <curl/curl.h>
 
+#include <chrono>
+#include <iterator>
 #include <map>
 #include <memory>
 #include <utility>
@@ -13,6 +15,13 @@ namespace {
 
 // Bounds how long Run takes to see its stop flag.
 constexpr int kTickMilliseconds = 25;
+// What a machine may keep silent in the midst of a body that is passed on: a disk may spin up.
+constexpr std::chrono::seconds kMostSilence(30);
+constexpr int kOk = 200;
+constexpr int kPartial = 206;
+constexpr int kNotSatisfiable = 416;
+
+using Clock = std::chrono::steady_clock;
 
 struct EasyEnd {
   void operator()(CURL* easy) const { curl_easy_cleanup(easy); }
@@ -29,11 +38,54 @@ struct Exchange {
   FleetReply reply;
   size_t most_bytes = 0;
   FleetClient::Done done;
+  // Of a body that is passed on.
+  std::function<bool(const FleetHead&)> take_head;
+  std::function<bool(std::string_view)> take_piece;
+  bool head_taken = false;
+  Clock::time_point patience_ends;
+
+  int status() const {
+    long status = 0;
+    curl_easy_getinfo(easy.get(), CURLINFO_RESPONSE_CODE, &status);
+    return static_cast<int>(status);
+  }
+  bool passed_on() const {
+    if (!take_head) return false;
+    const int is = status();
+    return is == kOk || is == kPartial || is == kNotSatisfiable;
+  }
+  bool TakeHead();
 };
+
+bool Exchange::TakeHead() {
+  if (std::exchange(head_taken, true)) return true;
+  FleetHead head;
+  head.status = status();
+  curl_off_t length = -1;
+  curl_off_t modified = -1;
+  curl_easy_getinfo(easy.get(), CURLINFO_CONTENT_LENGTH_DOWNLOAD_T, &length);
+  curl_easy_getinfo(easy.get(), CURLINFO_FILETIME_T, &modified);
+  head.length = length;
+  head.modified = modified;
+  curl_header* range = nullptr;
+  if (curl_easy_header(easy.get(), "Content-Range", 0, CURLH_HEADER, -1, &range) == CURLHE_OK) {
+    head.range = range->value;
+  }
+  return take_head(head);
+}
+
+size_t PassOn(Exchange& exchange, std::string_view piece) {
+  const bool taken =
+      exchange.TakeHead() && (exchange.status() == kNotSatisfiable || exchange.take_piece(piece));
+  // Whoever takes the pieces may be slow, which is not the machine's silence.
+  exchange.patience_ends = Clock::now() + kMostSilence;
+  return taken ? piece.size() : 0;
+}
 
 size_t TakeBody(char* bytes, size_t size, size_t count, void* context) {
   auto& exchange = *static_cast<Exchange*>(context);
   const size_t length = size * count;
+  if (exchange.passed_on()) return PassOn(exchange, {bytes, length});
   if (exchange.reply.body.size() + length > exchange.most_bytes) {
     exchange.reply.outcome = FleetReply::Outcome::kTooLong;
     return 0;
@@ -58,6 +110,7 @@ class CurlClient : public FleetClient {
 
  private:
   void TakeEnded();
+  void EndSilent();
   void BreakOff();
 
   const std::string socket_;
@@ -93,7 +146,15 @@ void CurlClient::Ask(const FleetRequest& request, Done done) {
   curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "http,https");
   curl_easy_setopt(easy, CURLOPT_PROXY, "");  // whatever the environment says
   curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
-  curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, static_cast<long>(request.deadline_ms));
+  if (request.take_head) {
+    exchange->take_head = request.take_head;
+    exchange->take_piece = request.take_piece;
+    exchange->patience_ends = Clock::now() + std::chrono::milliseconds(request.deadline_ms);
+    curl_easy_setopt(easy, CURLOPT_FILETIME, 1L);
+  } else {
+    curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, static_cast<long>(request.deadline_ms));
+  }
+  if (request.method == "HEAD") curl_easy_setopt(easy, CURLOPT_NOBODY, 1L);
   curl_easy_setopt(easy, CURLOPT_HTTPHEADER, exchange->fields.get());
   curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, TakeBody);
   curl_easy_setopt(easy, CURLOPT_WRITEDATA, exchange.get());
@@ -106,6 +167,7 @@ void CurlClient::Run(const std::function<bool()>& stop) {
     int running = 0;
     curl_multi_perform(multi_, &running);
     TakeEnded();
+    EndSilent();
     if (!under_way_.empty()) curl_multi_poll(multi_, nullptr, 0, kTickMilliseconds, nullptr);
   }
   BreakOff();
@@ -120,16 +182,28 @@ void CurlClient::TakeEnded() {
     curl_multi_remove_handle(multi_, ended.key());
     Exchange& exchange = *ended.mapped();
     FleetReply& reply = exchange.reply;
-    if (result == CURLE_OK) {
-      long status = 0;
-      curl_easy_getinfo(ended.key(), CURLINFO_RESPONSE_CODE, &status);
+    if (result == CURLE_OK && (!exchange.passed_on() || exchange.TakeHead())) {
       reply.outcome = FleetReply::Outcome::kReply;
-      reply.status = static_cast<int>(status);
+      reply.status = exchange.status();
     } else if (reply.outcome != FleetReply::Outcome::kTooLong) {
       reply.outcome = result == CURLE_OPERATION_TIMEDOUT ? FleetReply::Outcome::kLate
                                                          : FleetReply::Outcome::kDown;
     }
     exchange.done(std::move(reply));
+  }
+}
+
+void CurlClient::EndSilent() {
+  const Clock::time_point now = Clock::now();
+  for (auto at = under_way_.begin(); at != under_way_.end();) {
+    const auto next = std::next(at);
+    if (at->second->take_head && now > at->second->patience_ends) {
+      const auto ended = under_way_.extract(at);
+      curl_multi_remove_handle(multi_, ended.key());
+      ended.mapped()->reply.outcome = FleetReply::Outcome::kLate;
+      ended.mapped()->done(std::move(ended.mapped()->reply));
+    }
+    at = next;
   }
 }
 

@@ -1,0 +1,41 @@
+#pragma once
+// A front that asks boxes, and a person before it.
+
+#include <json/value.h>
+
+#include <cstdint>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "tests/fleet/fleet_test.h"
+
+namespace fleet_test {
+
+// A file as a listing shows it.
+struct Listed {
+  std::string path;
+  std::string name;
+  std::int64_t size = 0;
+  std::string owner;
+  auto operator<=>(const Listed&) const = default;
+};
+
+class FrontTest : public FleetTest {
+ protected:
+  // A front that asks these; `more` goes into its file, before the boxes.
+  Server StartFront(const std::vector<Box>& boxes,
+                    const std::string& more = "deadline_ms = 5000\n");
+  static Server LoggedIn(Server server, const std::string& user);
+  // Runs a search to its end and leaves its id in task_.
+  void Search(const Server& server, Json::Value params);
+  std::vector<Listed> List(const Server& server, Json::Value params);
+  static std::string Text(const Json::Value& params);
+
+  std::string task_;
+  Json::Value status_;
+  std::uint64_t total_ = 0;
+  std::set<std::string> owners_;
+};
+
+}  // namespace fleet_test
