@@ -2,10 +2,13 @@
 
 #include <grp.h>
 #include <pwd.h>
+#include <strings.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
+#include <iterator>
 #include <vector>
 
 #include "nas/base/utf8.h"
@@ -58,6 +61,36 @@ Result<Group> GroupOf(Ask ask) {
   return Group{record.gr_name, record.gr_gid};
 }
 
+struct Known {
+  const char* name = nullptr;  // null behind the last
+  id_t id = 0;
+};
+
+// `next` gives one after the other.
+template <typename Next>
+std::vector<std::string> NamesLike(std::string_view beginning, size_t most, Next next) {
+  constexpr std::chrono::milliseconds kMostTime{100};
+  // As distributions have it.
+  constexpr id_t kFirstPerson = 1000;
+  constexpr id_t kNobody = 65534;
+  const auto end = std::chrono::steady_clock::now() + kMostTime;
+  std::vector<std::string> people;
+  std::vector<std::string> others;
+  for (Known one = next(); one.name != nullptr; one = next()) {
+    if (strncasecmp(one.name, beginning.data(), beginning.size()) == 0) {
+      const bool person = one.id >= kFirstPerson && one.id != kNobody;
+      (person ? people : others).emplace_back(one.name);
+    }
+    if (people.size() >= most || std::chrono::steady_clock::now() > end) break;
+  }
+  std::ranges::sort(people);
+  std::ranges::sort(others);
+  std::ranges::move(others, std::back_inserter(people));
+  people.erase(std::unique(people.begin(), people.end()), people.end());
+  if (people.size() > most) people.resize(most);
+  return people;
+}
+
 }  // namespace
 
 bool IsUserName(const std::string& name) {
@@ -77,6 +110,26 @@ Result<Account> FindAccount(uid_t uid) {
   return AccountOf([&](passwd* record, char* buffer, size_t room, passwd** found) {
     return getpwuid_r(uid, record, buffer, room, found);
   });
+}
+
+std::vector<std::string> UsersLike(std::string_view beginning, size_t most) {
+  setpwent();
+  auto names = NamesLike(beginning, most, [] {
+    const passwd* record = getpwent();
+    return record == nullptr ? Known{} : Known{record->pw_name, record->pw_uid};
+  });
+  endpwent();
+  return names;
+}
+
+std::vector<std::string> GroupsLike(std::string_view beginning, size_t most) {
+  setgrent();
+  auto names = NamesLike(beginning, most, [] {
+    const group* record = getgrent();
+    return record == nullptr ? Known{} : Known{record->gr_name, record->gr_gid};
+  });
+  endgrent();
+  return names;
 }
 
 Result<Group> FindGroup(const std::string& name) {

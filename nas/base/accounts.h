@@ -7,6 +7,8 @@
 
 #include <map>
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include "nas/base/error.h"
 
@@ -36,6 +38,12 @@ struct Group {
 // The same of groups, with kErrorUnknownGroup.
 Result<Group> FindGroup(const std::string& name);
 Result<Group> FindGroup(gid_t gid);
+
+// Names that begin with these letters, in any letter case, sorted: at most `most`, those of people
+// first. Looks only so long as a person who types can wait, so a large directory is known in part,
+// and not at all where it lists nobody. For one thread.
+std::vector<std::string> UsersLike(std::string_view beginning, size_t most);
+std::vector<std::string> GroupsLike(std::string_view beginning, size_t most);
 
 // For showing: the name, or the number where the machine knows none for it.
 std::string UserText(uid_t uid);

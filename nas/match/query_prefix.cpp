@@ -17,32 +17,51 @@ using Value = QueryPrefix::Value;
 constexpr std::string_view kTimeHelp =
     "write a time as in today, last-7-days, 2026, 2026-07-15, >2-weeks-ago or 2026-01..2026-06";
 
+constexpr std::string_view kTimeValues =
+    "today yesterday last-7-days last-30-days this-month last-month last-12-months this-year "
+    "last-year";
+
 constexpr QueryPrefix kPrefixes[] = {
-    {"ext:", Kind::kExtension, Value::kWords, "write extensions, as in ext:jpg,png"},
+    {"ext:", Kind::kExtension, Value::kWords, "write extensions, as in ext:jpg,png",
+     "how the name ends: jpg,png"},
     {"type:", Kind::kType, Value::kWords,
      "there are file, dir, link, executable, empty, pipe, socket, device, image, video, audio, "
-     "document and archive"},
-    {"size:", Kind::kSize, Value::kSize, "write a size as in size:>10MB, size:1GB..2GB or size:0"},
-    {"modified:", Kind::kModified, Value::kTime, kTimeHelp},
-    {"created:", Kind::kCreated, Value::kTime, kTimeHelp},
-    {"opened:", Kind::kOpened, Value::kTime, kTimeHelp},
-    {"owner:", Kind::kOwner, Value::kWords, "write a user's name, as in owner:ann"},
-    {"group:", Kind::kGroup, Value::kWords, "write a group's name, as in group:staff"},
-    {"depth:", Kind::kDepth, Value::kNumber,
-     "write a number of levels, as in depth:1, depth:<3 or depth:2..4"},
-    {"empty:", Kind::kEmpty, Value::kNothing, "it takes no value, or yes or no"},
-    {"content:", Kind::kContent, Value::kText, "write a text, as in content:invoice"},
-    {"case:", Kind::kText, Value::kExact, "write a name, as in case:README"},
-    {"regex:", Kind::kText, Value::kRegex, ""},
+     "document and archive",
+     "what it is: image, video, dir",
+     "file dir image video audio document archive link executable empty pipe socket device"},
+    {"size:", Kind::kSize, Value::kSize, "write a size as in size:>10MB, size:1GB..2GB or size:0",
+     "how large: >10MB, 1GB..2GB", ">1MB >100MB >1GB <10KB 1MB..10MB 0"},
+    {"modified:", Kind::kModified, Value::kTime, kTimeHelp, "when it was changed: last-7-days",
+     kTimeValues},
+    {"created:", Kind::kCreated, Value::kTime, kTimeHelp, "when it was made: 2026-07", kTimeValues},
+    {"opened:", Kind::kOpened, Value::kTime, kTimeHelp, "when it was read: <2025", kTimeValues},
+    {"owner:", Kind::kOwner, Value::kWords, "write a user's name, as in owner:ann", "whose it is"},
+    {"group:", Kind::kGroup, Value::kWords, "write a group's name, as in group:staff",
+     "of which group it is"},
+    {"content:", Kind::kContent, Value::kText, "write a text, as in content:invoice",
+     "a text inside files"},
     {"exclude:", Kind::kExclude, Value::kGlobs,
-     "write names, as in exclude:node_modules or exclude:*.tmp,cache/"},
+     "write names, as in exclude:node_modules or exclude:*.tmp,cache/",
+     "names to leave out, with all that is in them", "@eaDir .git node_modules *.tmp"},
+    {"depth:", Kind::kDepth, Value::kNumber,
+     "write a number of levels, as in depth:1, depth:<3 or depth:2..4",
+     "how many folders down: 1, <3", "1 <3 2..4"},
+    {"empty:", Kind::kEmpty, Value::kNothing, "it takes no value, or yes or no",
+     "nothing is in the file or folder", "yes no"},
     {"hidden:", Kind::kExclude, Value::kChoice,
-     "write hidden:no to leave out what begins with a dot"},
+     "write hidden:no to leave out what begins with a dot", "names that begin with a dot: no",
+     "no yes"},
     {"ignored:", Kind::kIgnored, Value::kChoice,
-     "write ignored:no to leave out what .gitignore and its like do"},
-    {"mounts:", Kind::kOneDisk, Value::kChoice, "write mounts:no to stay on one file system"},
+     "write ignored:no to leave out what .gitignore and its like do",
+     "what .gitignore and its like leave out: no", "no yes"},
+    {"mounts:", Kind::kOneDisk, Value::kChoice, "write mounts:no to stay on one file system",
+     "other file systems below the folder: no", "no yes"},
     {"letters:", Kind::kLetters, Value::kLetters,
-     "write letters:exact, letters:smart or letters:any"},
+     "write letters:exact, letters:smart or letters:any", "whether capitals count",
+     "exact smart any"},
+    {"case:", Kind::kText, Value::kExact, "write a name, as in case:README",
+     "a text whose capitals count"},
+    {"regex:", Kind::kText, Value::kRegex, "", "a regular expression"},
 };
 
 ValueReader ReaderOf(Value value, std::time_t now) {
@@ -178,22 +197,6 @@ Result<QueryNode> EmptyNode(const QueryPrefix& prefix, std::string_view value) {
   return other;
 }
 
-// The place of the comma, or the end, behind a name that begins at `at`.
-size_t EndOfGlob(std::string_view value, size_t at) {
-  size_t open = 0;
-  for (; at < value.size(); ++at) {
-    if (value[at] == '\\')
-      ++at;
-    else if (value[at] == '{')
-      ++open;
-    else if (value[at] == '}' && open > 0)
-      --open;
-    else if (value[at] == ',' && open == 0)
-      return at;
-  }
-  return value.size();
-}
-
 Result<QueryNode> ExcludeNode(std::string_view glob, Letters letters) {
   auto text = TextTerm::Make(glob, TextTerm::Form::kWhole, IsExact(letters, glob, false));
   if (!text) return text.error();
@@ -241,6 +244,23 @@ size_t BehindEscape(std::string_view text, size_t at) {
 }
 
 }  // namespace
+
+size_t EndOfGlob(std::string_view value, size_t at) {
+  size_t open = 0;
+  for (; at < value.size(); ++at) {
+    if (value[at] == '\\')
+      ++at;
+    else if (value[at] == '{')
+      ++open;
+    else if (value[at] == '}' && open > 0)
+      --open;
+    else if (value[at] == ',' && open == 0)
+      return at;
+  }
+  return value.size();
+}
+
+std::span<const QueryPrefix> QueryPrefixes() { return kPrefixes; }
 
 const QueryPrefix* FindPrefix(std::string_view text) {
   constexpr size_t kLongest = 9;  // "modified:"

@@ -3,6 +3,7 @@
 
 #include <ctime>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -29,14 +30,24 @@ struct QueryPrefix {
   std::string_view name;  // with its colon
   QueryNode::Kind kind;
   Value value;
-  std::string_view help;  // what would be right
+  std::string_view help;   // what would be right
+  std::string_view about;  // what it asks for, in a few words
+  // Values that can be offered, separated by spaces: all that there are, or good beginnings. Of
+  // users and groups there is no list.
+  std::string_view values = {};
 };
+
+// All of them, in the order in which they are offered.
+std::span<const QueryPrefix> QueryPrefixes();
 
 // What "hidden:no" leaves out.
 inline constexpr std::string_view kHiddenGlob = ".*";
 
 // The prefix that `text` begins with, or null.
 const QueryPrefix* FindPrefix(std::string_view text);
+// The place of the comma, or the end, behind a name of a list (QueryPrefix::Value::kGlobs) that
+// begins at `at`.
+size_t EndOfGlob(std::string_view list, size_t at);
 // Whether `value` can be read; for values in which spaces may stand.
 bool IsValueOf(const QueryPrefix& prefix, std::string_view value, std::time_t now);
 // How texts are compared of which no prefix says it.

@@ -104,16 +104,23 @@ std::string Wildcards::Unescaped(std::string_view text) {
   return plain;
 }
 
-std::optional<Wildcards> Wildcards::Make(std::string_view text, bool of_path) {
+std::vector<std::string> Wildcards::Alternatives(std::string_view text) {
   std::vector<std::string> all;
   size_t bytes = 0;
-  if (!Expand(text, all, bytes)) return std::nullopt;
+  if (!Expand(text, all, bytes)) return {};
+  for (std::string& one : all) one = Translated(one);
+  return all;
+}
+
+std::optional<Wildcards> Wildcards::Make(std::string_view text, bool of_path) {
+  const std::vector<std::string> all = Alternatives(text);
+  if (all.empty()) return std::nullopt;
   Wildcards wildcards;
   for (const std::string& one : all) {
     if (of_path) {
-      wildcards.path_globs_.push_back(MakePathGlob(Translated(one)));
+      wildcards.path_globs_.push_back(MakePathGlob(one));
     } else {
-      wildcards.globs_.emplace_back(Translated(one));
+      wildcards.globs_.emplace_back(one);
     }
   }
   return wildcards;

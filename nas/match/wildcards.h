@@ -33,6 +33,9 @@ class Wildcards {
   static constexpr size_t kMostAlternatives = 256;
   static std::optional<Wildcards> Make(std::string_view text, bool of_path);
 
+  // The globs that `text` stands for; none where there are too many.
+  static std::vector<std::string> Alternatives(std::string_view text);
+
   // A path begins with "/", and ends with it where it is a folder's.
   bool Matches(std::string_view text) const;
   // Of wildcards over paths: whether something that lies in the folder of this path may match.

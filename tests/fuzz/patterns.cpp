@@ -7,6 +7,7 @@
 #include "nas/match/meant_query.h"
 #include "nas/match/query.h"
 #include "nas/match/query_match.h"
+#include "nas/match/query_spans.h"
 #include "tests/fuzz/fuzz.h"
 
 namespace {
@@ -159,6 +160,17 @@ int fuzz::Target(std::string_view rest) {
   const std::string_view text = fuzz::Take(&rest, '\n');
   const std::string name(rest);
   if (name.size() > 255) return fuzz::kUseless;
+  size_t behind = 0;
+  bool wrong = false;
+  for (const nas::QuerySpan& span : nas::SpansOf(text, kNow)) {
+    DEMAND(behind <= span.begin && span.begin <= span.value && span.value <= span.end);
+    behind = span.end;
+    wrong = wrong || !span.wrong.empty();
+  }
+  DEMAND(behind <= text.size());
+  DEMAND(!wrong || !Query::Parse(text, kNow));
+  const nas::QueryCompletion next = nas::CompletionAt(text, text.size() / 2, kNow);
+  DEMAND(next.begin <= next.end && next.end <= text.size());
   const std::string meant = nas::MeantQuery(text);
   DEMAND(meant.empty() || bool{Query::Parse(meant)});
   const auto query = Query::Parse(text, kNow);

@@ -58,6 +58,49 @@ TEST_F(QueryTest, WhatWasTypedIsReadOrToldWhatIsWrong) {
   }
 }
 
+TEST_F(QueryTest, PlacesAreCountedAsBrowsersDo) {
+  Server server = Start();
+  server.Open();
+  const struct {
+    const char* typed;
+    const char* spans;  // begin, value and end of each
+    const char* completion;
+  } rows[] = {
+      {R"({"pattern":""})", "", ""},
+      {R"({"pattern":"ab size:>1k"})", "0-2 3:8-11", ""},
+      {R"({"pattern":"\u00e9\ud83d\ude00 size:","caret":9})", "0-3 4:9-9", "9-9 >1MB"},
+      {"{\"pattern\":\"\xff\xe2\x82 ty\",\"caret\":5}", "0-2 3-5", "3-5 type:"},
+      {R"({"pattern":"plan","caret":2})", "0-4", ""},
+      {R"({"pattern":"ty","caret":1000000})", "0-2", "0-2 type:"},
+  };
+  for (const auto& row : rows) {
+    const Json::Value reply = server.Post("/query", row.typed).json();
+    std::string spans;
+    for (const Json::Value& span : reply["spans"]) {
+      spans += (spans.empty() ? "" : " ") + span["begin"].asString();
+      if (span.isMember("value")) spans += ":" + span["value"].asString();
+      spans += "-" + span["end"].asString();
+    }
+    EXPECT_EQ(spans, row.spans) << row.typed;
+    std::string told;
+    if (const Json::Value& offered = reply["completion"]; !offered.isNull()) {
+      told = offered["begin"].asString() + "-" + offered["end"].asString() + " " +
+             offered["items"][0]["text"].asString();
+    }
+    EXPECT_EQ(told, row.completion) << row.typed;
+  }
+  EXPECT_EQ(server.Post("/query", R"({"caret":-1})").status, 400);
+  // What is refused tells where; what is begun tells of its words.
+  const Json::Value wrong = server.Post("/query", R"({"pattern":"a size:1xb"})").json();
+  EXPECT_EQ(wrong["spans"][1]["wrong"].asString().substr(0, 12), "write a size");
+  const Json::Value begun =
+      server.Post("/searches", R"({"folder_path":["/photo"],"pattern":"Plan|*.{a,b}"})").json();
+  EXPECT_EQ(begun["spans"][0]["words"], Parsed(R"([{"text":"Plan","as":"literal"}])"));
+  EXPECT_EQ(
+      begun["spans"][2]["words"],
+      Parsed(R"([{"text":"*.a","as":"glob","in":"name"},{"text":"*.b","as":"glob","in":"name"}])"));
+}
+
 TEST_F(QueryTest, ASearchThatFoundNothingIsToldWhatItCameCloseTo) {
   for (const char* name : {"plan.txt", "report.txt", "rapart.jpg"})
     WriteFile(share_ + "/" + name, "x");

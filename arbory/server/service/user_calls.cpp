@@ -13,6 +13,7 @@
 #include "arbory/options.h"
 #include "arbory/running_search.h"
 #include "arbory/search_request.h"
+#include "arbory/server/service/query_help.h"
 #include "arbory/server/service/row_addresses.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
@@ -30,6 +31,7 @@ namespace arbory {
 namespace {
 
 constexpr char kTaskId[] = "taskid";
+constexpr char kCaret[] = "caret";
 // A person reads the first few.
 constexpr size_t kInstantRows = 100;
 // Each is a question of its own.
@@ -107,9 +109,16 @@ SearchQuery TypedQuery(const NUVA::APIRequest& request) {
 void ReadQueryEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) try {
   if (!BecomeCaller(request, response)) return;
   Json::Value body;
+  const SearchQuery typed = TypedQuery(*request);
+  const std::time_t now = std::time(nullptr);
+  body["spans"] = SpansJson(typed.pattern, now);
+  if (request->HasParam(kCaret)) {
+    const Json::UInt64 caret = request->GetParam(kCaret, Json::Value()).asUInt64();
+    Json::Value completion = CompletionJson(typed.pattern, caret, now);
+    if (!completion.isNull()) body["completion"] = std::move(completion);
+  }
   try {
-    Json::Value& params = body["params"] =
-        SearchRequest(TypedQuery(*request), {}, std::time(nullptr));
+    Json::Value& params = body["params"] = SearchRequest(typed, {}, now);
     for (const char* as_given : {"folder_path", "search_type", "list"}) {
       if (request->HasParam(as_given))
         params[as_given] = request->GetParam(as_given, Json::Value());

@@ -32,8 +32,10 @@ nas::Child StartListShares(const nas::ApiCall& call);
 nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 
 // What was typed, as the parameters of a search's start: {"params"}, or {"wrong":{"criterion",
-// "sentence"}} where it cannot be understood. The call's parameters are those of a start, sizes and
-// times as texts: "size_from", "size_to", and bounds as "mtime", "crtime" and "atime".
+// "sentence"}} where it cannot be understood; and the "spans" of the pattern (query_help.h). The
+// call's parameters are those of a start, sizes and times as texts: "size_from", "size_to", and
+// bounds as "mtime", "crtime" and "atime". With a place in the pattern as "caret" there is
+// "completion" too, where something can be offered.
 nas::Child StartReadQuery(const nas::ApiCall& call);
 // The same reply, waited for in the process that calls it.
 nas::Reply ReadQuery(const nas::ApiCall& call);
