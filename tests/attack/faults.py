@@ -29,7 +29,7 @@ PROMISE = ("A call of the system that fails anywhere costs one clear error: noth
 ATTACK = "each call of the C library fails once, over every operation"
 
 # Of the thousands of allocations only some are failed, spread over all of them.
-MOST_OF_A_KIND = {"alloc": 60}
+MOST_OF_A_KIND = {"alloc": 150}
 SHORT_KINDS = 6  # of an operation's, in the short form
 
 
