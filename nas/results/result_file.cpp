@@ -10,6 +10,7 @@
 #include <ctime>
 #include <system_error>
 #include <utility>
+#include <vector>
 
 #include "nas/base/file_lock.h"
 #include "nas/base/keeping.h"
@@ -24,12 +25,19 @@ constexpr char kLogSuffix[] = "-wal";
 // The journal is what a file has until it gets its log.
 constexpr std::array<const char*, 4> kCompanions = {"", kLogSuffix, "-shm", "-journal"};
 
+// The file and what there may be beside it.
+std::vector<std::string> PartsOf(const std::string& path) {
+  std::vector<std::string> parts;
+  for (const char* companion : kCompanions) parts.push_back(path + companion);
+  return parts;
+}
+
 // When the result file or its log was last written; 0 when neither is there.
 time_t LastWritten(const std::string& path) {
   time_t newest = 0;
-  for (const char* companion : kCompanions) {
+  for (const std::string& part : PartsOf(path)) {
     struct stat status;
-    if (stat((path + companion).c_str(), &status) == 0) newest = std::max(newest, status.st_mtime);
+    if (stat(part.c_str(), &status) == 0) newest = std::max(newest, status.st_mtime);
   }
   return newest;
 }
@@ -86,10 +94,24 @@ std::uint64_t ResultFileBytes(const std::string& path) {
   return bytes;
 }
 
+bool IsResultFileThere(const std::string& path) {
+  const auto there = [](const std::string& part) { return access(part.c_str(), F_OK) == 0; };
+  return std::ranges::any_of(PartsOf(path), there);
+}
+
 bool RemoveResultFile(const std::string& path) {
-  const bool removed = unlink(path.c_str()) == 0;
-  for (const char* companion : kCompanions) unlink((path + companion).c_str());
-  return removed;
+  // Made first: who has no memory for the names removes none of them.
+  const std::vector<std::string> parts = PartsOf(path);
+  bool removed = false;
+  bool left = false;
+  for (const std::string& part : parts) {
+    if (unlink(part.c_str()) == 0) {
+      removed = true;
+    } else if (errno != ENOENT) {
+      left = true;
+    }
+  }
+  return removed && !left;
 }
 
 void SweepResultFolder(const std::string& folder) {

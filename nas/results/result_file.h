@@ -88,7 +88,11 @@ bool IsResultId(std::string_view id);
 std::string ResultPath(const std::string& folder, const std::string& id);
 // How long the file and its log are; 0 where there is none.
 std::uint64_t ResultFileBytes(const std::string& path);
-// Deletes the file and its companions; true if the file itself was there and is gone.
+// Whether there is any part of it: who is killed while it deletes one leaves the companions, and a
+// writer that closes a deleted file leaves them too.
+bool IsResultFileThere(const std::string& path);
+// Deletes the file and its companions; true if there was a part of it and none is left. Throws
+// std::bad_alloc, and has then deleted nothing.
 bool RemoveResultFile(const std::string& path);
 // Deletes result files in `folder` that nobody wrote for kKeepSeconds and no search works on. No
 // database in it may be open in this process.

@@ -255,7 +255,7 @@ WfmSearchDBTask* WfmSearchDBTaskMgr::getDBTask(const char* volume, const char* i
   // SQLite is not to read a user's file in a process that could be root again.
   nas::GiveUpRoot();
   const std::string path = nas::ResultPath(*folder, id);
-  if (access(path.c_str(), F_OK) != 0) return nullptr;
+  if (!nas::IsResultFileThere(path)) return nullptr;
   return new WfmSearchDBTask(std::make_unique<WfmSearchDBTask::Impl>(path, user_));
 } catch (const std::exception& error) {
   syslog(LOG_ERR, "search results: %s", error.what());

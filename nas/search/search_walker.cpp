@@ -138,6 +138,7 @@ class WfmSearchWalker::Impl {
   bool stopped() const { return __atomic_load_n(&stop_flag_, __ATOMIC_RELAXED) != 0; }
   void WaitForSorting(pid_t child) const;
   [[noreturn]] void EndWorker();
+  bool IsForsaken();
   void Vanish();
 
   const std::string user_;
@@ -291,7 +292,7 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
                               .threads = nas::CurrentConfig().search_threads});
   AllNames all(locations_.empty() ? nullptr : names_, fleet_ ? &*fleet_ : nullptr);
   bool completed = job.Run(all, contents);
-  if (forsaken_) {
+  if (IsForsaken()) {
     Vanish();
     return false;
   }
@@ -325,7 +326,7 @@ void WfmSearchWalker::Impl::WaitForSorting(pid_t child) const {
 // A thread cannot be ended, but a process can: this is how a stopped search's worker ends, only
 // without waiting for the walk to return.
 void WfmSearchWalker::Impl::EndWorker() {
-  if (forsaken_) Vanish();
+  if (IsForsaken()) Vanish();
   task_->finish(false);
   _exit(0);
 }
@@ -363,6 +364,10 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   forsaken_ = task_->isForsaken();
   if (forsaken_ || task_->isFinished()) raise(SIGTERM);
 }
+
+// A clean tells the worker to stop before it removes what the task names, and may fail between:
+// then nobody but the worker knows what it has found.
+bool WfmSearchWalker::Impl::IsForsaken() { return forsaken_ || (stopped() && task_->isForsaken()); }
 
 // What nobody asks after leaves nothing. The database goes first, as when it is cleaned.
 void WfmSearchWalker::Impl::Vanish() {

@@ -90,7 +90,7 @@ TEST_F(Walker, ResultsThatNobodyCanNameGoWithIt) {
     auto walker = NewWalker();
     EXPECT_TRUE(walker->init({"/share"}, {}));
     if (named) NameInTask(*walker);
-    EXPECT_TRUE(!walked || Walk(*walker));
+    EXPECT_TRUE(!walked || Walk(*walker) == (stop_ == 0));
     walker.reset();
     const size_t left = ResultFiles();
     fs::remove_all(ResultFolder());
@@ -101,6 +101,29 @@ TEST_F(Walker, ResultsThatNobodyCanNameGoWithIt) {
   EXPECT_GT(files_after(true, true), 0u);
   EXPECT_TRUE(task_->remove());
   EXPECT_EQ(files_after(false, false), 0u) << "without a task";
+  stop_ = 1;
+  EXPECT_EQ(files_after(false, true), 0u) << "cleaned, as far as its task, while it stops";
+}
+
+// Who is killed while he removes results, or has no memory for the next name, leaves parts of them.
+TEST_F(Walker, WhatIsLeftOfItsResultsCanBeCleaned) {
+  auto walker = NewWalker();
+  ASSERT_TRUE(walker->init({"/share"}, {}));
+  NameInTask(*walker);
+  const std::string id = walker->getDBTaskId();
+  const std::string volume = walker->getDBVol();
+  ASSERT_TRUE(fs::remove(nas::ResultPath(ResultFolder(), id)));
+  walker.reset();
+  EXPECT_GT(ResultFiles(), 0u) << "a log is not deleted with what it is no longer the log of";
+  const FileSearch::WfmSearchDBTaskMgr databases(me_.c_str());
+  const auto removed = [&] {
+    const std::unique_ptr<FileSearch::WfmSearchDBTask> results(
+        databases.getDBTask(volume.c_str(), id.c_str()));
+    return results && results->remove();
+  };
+  EXPECT_TRUE(removed());
+  EXPECT_EQ(ResultFiles(), 0u);
+  EXPECT_FALSE(removed());
 }
 
 TEST_F(Walker, AFailedWalkTellsHowFarItCame) {
