@@ -49,6 +49,9 @@ std::string Hex(const void* bytes, size_t length) {
   return text;
 }
 
+// Images are made without an id, and kernels hide it.
+bool TellsNothing(const std::string& id) { return id.find_first_not_of('0') == id.npos; }
+
 // The file system's own id, the same wherever and whenever it is mounted. Empty for none.
 std::string IdOf(int folder, const std::string& type) {
   OwnId own;
@@ -56,11 +59,11 @@ std::string IdOf(int folder, const std::string& type) {
   std::string id;
   if (ioctl(folder, kGetOwnId, &own) == 0 && own.length <= own.bytes.size()) {
     id = Hex(own.bytes.data(), own.length);
-  } else if (IsAmong(kOwnFsid, type) && fstatfs(folder, &status) == 0) {
+  }
+  if (TellsNothing(id) && IsAmong(kOwnFsid, type) && fstatfs(folder, &status) == 0) {
     id = Hex(&status.f_fsid, sizeof status.f_fsid);
   }
-  // Images are made without one.
-  return id.find_first_not_of('0') == std::string::npos ? std::string() : id;
+  return TellsNothing(id) ? std::string() : id;
 }
 
 std::vector<std::string> WantedFolders() {
