@@ -38,6 +38,16 @@ class Find : public ProgramTest {
     indexed_ = status.exit_code == 0;
   }
 
+  // Asked again where the daemon had no time to answer: the machine may do much else.
+  Output Ask(const std::vector<std::string>& arguments) {
+    Output output;
+    EXPECT_TRUE(Eventually([&] {
+      output = Run(arguments);
+      return output.err.find("busy") == std::string::npos;
+    }));
+    return output;
+  }
+
   pid_t daemon_ = -1;
   bool indexed_ = false;
 };
@@ -117,16 +127,16 @@ TEST_F(Find, PrintsTheBestOrSaysWhyNot) {
     SCOPED_TRACE(row.why);
     std::vector<std::string> arguments = {"find"};
     arguments.insert(arguments.end(), row.arguments.begin(), row.arguments.end());
-    const Output output = Run(arguments);
+    const Output output = Ask(arguments);
     EXPECT_EQ(output.exit_code, row.exit_code);
     EXPECT_EQ(output.out, row.out);
     EXPECT_THAT(output.err, HasSubstr(row.err));
     EXPECT_EQ(output.err.empty(), *row.err == '\0') << output.err;
   }
   // The same row as a search's, though the volume was asked and not the share.
-  EXPECT_EQ(Run({"find", "floorplan", "--json"}).out,
+  EXPECT_EQ(Ask({"find", "floorplan", "--json"}).out,
             Run({"search", "floorplan", share_, "--json"}).out);
-  const std::vector<std::string> choices = Pieces(Run({"find", "odd", "--choices"}).out, '\0');
+  const std::vector<std::string> choices = Pieces(Ask({"find", "odd", "--choices"}).out, '\0');
   ASSERT_EQ(choices.size(), 1u);
   EXPECT_EQ(arbory::PathOfChoice(choices[0]), odd);
   EXPECT_THAT(Remains(), IsEmpty()) << "nothing is stored";
@@ -140,7 +150,7 @@ TEST_F(Find, ShowsAUserWhatTheyMaySee) {
   WriteFile(MakeFolder("volume1/shut", 0700) + "/plan", "");
   StartDaemon();
   SKIP_UNLESS_INDEXED();
-  const Output output = Run({"find", "plan", "--user", nas_test::kOtherUser});
+  const Output output = Ask({"find", "plan", "--user", nas_test::kOtherUser});
   EXPECT_EQ(output.out, share_ + "/open-plan\n");
   EXPECT_EQ(output.err, "");
 }
