@@ -18,10 +18,13 @@ constexpr char kLocations[] = "locations";
 constexpr char kLimit[] = "limit";
 constexpr char kWait[] = "wait_ms";
 constexpr char kAfter[] = "after";
+constexpr char kSortBy[] = "sort_by";
+constexpr char kDescending[] = "descending";
+constexpr char kBehind[] = "behind";
 
 // As many as a search may have.
 constexpr unsigned kMostLocations = 65'535;
-constexpr size_t kRowParts = 10;
+constexpr Json::ArrayIndex kRowParts = 11;
 constexpr size_t kMostNameBytes = 255;  // of every file system
 constexpr size_t kMostPathBytes = 64 << 10;
 
@@ -132,7 +135,13 @@ class RowsReader {
     row->folder = (*folder)[1].asString();
     return IsEntryName(row->name) && IsEntryName(row->share) && IsFolderPath(row->folder) &&
            ReadOwner("users", json[3], &row->user) && ReadOwner("groups", json[4], &row->group) &&
-           ReadNumbers(json, &row->attributes);
+           ReadNumbers(json, &row->attributes) && ReadNumber(json[kRowParts - 1], &row->number);
+  }
+
+  static bool ReadNumber(const Json::Value& json, std::uint32_t* number) {
+    if (!json.isUInt()) return false;
+    *number = json.asUInt();
+    return true;
   }
 
   bool ReadOwner(const char* list, const Json::Value& place, std::string* name) {
@@ -169,6 +178,18 @@ class RowsReader {
   const Json::Value& page_;
 };
 
+// False for what is no order.
+bool ReadOrder(const Json::Value& json, FleetPageRequest* page) {
+  const Json::Value& word = json[kSortBy];
+  if (word.isNull()) return json[kBehind].isNull() && json[kDescending].isNull();
+  const auto column = word.isString() ? ParseSortColumn(word.asString()) : std::nullopt;
+  if (!column || !json[kDescending].isBool()) return false;
+  page->column = *column;
+  page->ascending = !json[kDescending].asBool();
+  if (json[kBehind].isUInt()) page->behind = json[kBehind].asUInt();
+  return json[kBehind].isUInt() || json[kBehind].isNull();
+}
+
 std::string TextOf(const Json::Value& value) { return value.isString() ? value.asString() : ""; }
 
 }  // namespace
@@ -178,13 +199,23 @@ Json::Value FleetPageRequestJson(const FleetPageRequest& page) {
   json[kLimit] = page.limit;
   json[kWait] = page.wait_ms;
   json[kAfter] = Json::UInt64{page.after};
+  for (const auto& known : kSortColumns) {
+    if (known.column != page.column) continue;
+    json[kSortBy] = std::string(known.word);
+    json[kDescending] = !page.ascending;
+  }
+  if (page.behind) json[kBehind] = *page.behind;
   return json;
 }
 
 Result<FleetPageRequest> ReadFleetPageRequest(const Json::Value& json) {
   if (!json[kLimit].isUInt() || !json[kWait].isInt() || !json[kAfter].isUInt64()) return kIllegal;
-  FleetPageRequest page{json[kLimit].asUInt(), json[kWait].asInt(), json[kAfter].asUInt64()};
-  if (page.limit > kMostFleetRows || page.wait_ms < 0 || page.wait_ms > kMostFleetWaitMs) {
+  FleetPageRequest page;
+  page.limit = json[kLimit].asUInt();
+  page.wait_ms = json[kWait].asInt();
+  page.after = json[kAfter].asUInt64();
+  if (page.limit > kMostFleetRows || page.wait_ms < 0 || page.wait_ms > kMostFleetWaitMs ||
+      !ReadOrder(json, &page)) {
     return kIllegal;
   }
   return page;
@@ -227,7 +258,7 @@ unsigned FleetPageWriter::Place(Json::Value& names, std::map<std::string, unsign
   return place->second;
 }
 
-void FleetPageWriter::Add(const ResultRow& row) {
+void FleetPageWriter::Add(const ResultRow& row, std::uint32_t number) {
   std::string folder(row.share_name);
   folder.append(1, '\0').append(row.folder);
   if (folders_.empty() || folder != last_folder_) {
@@ -249,6 +280,7 @@ void FleetPageWriter::Add(const ResultRow& row) {
   }
   told.append(file.crtime == FileAttributes::kNoTime ? Json::Value()
                                                      : Json::Value(Json::Int64{file.crtime}));
+  told.append(number);
 }
 
 void FleetPageWriter::Finish(Json::Value* page) {

@@ -15,15 +15,19 @@
 //   "next"       the row after the last one here: "after" of the next request
 //   "users", "groups"   names
 //   "folders"    [share, path below its root]
-//   "rows"       [folder, name, mode, user, group, size, modified, opened, changed, created]:
+//   "rows"       [folder, name, mode, user, group, size, modified, opened, changed, created,
+//   number]:
 //                folder, user and group by their places above; created is null where none is known
 //
 // Rows come in the order found, numbered from 0, so that a page neither repeats a row nor leaves
-// one out while the search goes on.
+// one out while the search goes on. A request that names a column is told the first rows in its
+// order instead, or the first behind the row `behind`, of those found by then: "next" is then the
+// request's "after", but for a finished search all of whose rows are on the page.
 
 #include <json/value.h>
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -33,6 +37,7 @@
 #include "nas/files/attributes.h"
 #include "nas/match/query.h"
 #include "nas/results/block_reader.h"
+#include "nas/results/row_sorter.h"
 
 namespace nas {
 
@@ -47,6 +52,9 @@ struct FleetPageRequest {
   unsigned limit = kMostFleetRows;
   int wait_ms = 0;          // for as many rows, or the search's end
   std::uint64_t after = 0;  // the first row wanted
+  SortColumn column = SortColumn::kFound;
+  bool ascending = true;
+  std::optional<std::uint32_t> behind = {};  // a row's number, in the order of a column
 };
 
 struct FleetQuestion {
@@ -67,7 +75,7 @@ Result<FleetPageRequest> ReadFleetPageRequest(const Json::Value& json);
 // Collects a page's rows.
 class FleetPageWriter {
  public:
-  void Add(const ResultRow& row);
+  void Add(const ResultRow& row, std::uint32_t number);
   // Moves "users", "groups", "folders" and "rows" there.
   void Finish(Json::Value* page);
 
@@ -93,6 +101,7 @@ struct FleetRow {
   std::string user;
   std::string group;
   FileAttributes attributes;  // without owners and folder
+  std::uint32_t number = 0;
 };
 
 struct FleetPage {

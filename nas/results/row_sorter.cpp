@@ -10,36 +10,16 @@
 
 #include "nas/match/file_kinds.h"
 #include "nas/results/foreign_accounts.h"
+#include "nas/results/sort_key.h"
 
 namespace nas {
 namespace {
 
 // Orderings of fewer rows are quicker made than kept.
 constexpr std::uint64_t kWorthKeeping = 10'000;
-// Of a mode; the others are the file's type.
-constexpr std::uint32_t kPermissionBits = 07777;
 
 std::int64_t OrderingId(SortColumn column, std::uint64_t piece) {
   return (std::int64_t{static_cast<int>(column)} << 32) + static_cast<std::int64_t>(piece);
-}
-
-std::uint64_t NumberKey(SortColumn column, const FileAttributes& file) {
-  switch (column) {
-    case SortColumn::kSize:
-      return file.size;
-    case SortColumn::kMode:
-      return file.mode & kPermissionBits;
-    case SortColumn::kAtime:
-      return UnsignedKey(file.atime);
-    case SortColumn::kMtime:
-      return UnsignedKey(file.mtime);
-    case SortColumn::kCtime:
-      return UnsignedKey(file.ctime);
-    case SortColumn::kCrtime:
-      return UnsignedKey(file.crtime);
-    default:
-      return 0;
-  }
 }
 
 }  // namespace
@@ -111,7 +91,7 @@ Ordering RowSorter::MakeOrdering(SortColumn column) {
     default: {
       std::vector<std::uint64_t> keys(blocks_.rows());
       blocks_.ForEachAttributes([&](std::uint32_t row, const FileAttributes& attributes) {
-        keys[row] = NumberKey(column, attributes);
+        keys[row] = NumberSortKey(column, attributes);
       });
       return OrderByNumber(keys);
     }

@@ -21,6 +21,9 @@ constexpr unsigned kFewestRows = 100;
 // A row of a name of 255 bytes, each of them escaped, in a folder of its own.
 constexpr size_t kMostRowBytes = 2048;
 constexpr size_t kMostPageBytes = size_t{4} << 20;
+// The part of the deadline that the first page's rows wait for each other; those of a box that is
+// slower join later.
+constexpr int kFirstPageShare = 4;
 // For boxes to be told that a search was stopped; those that do not hear it end it by its lease.
 constexpr int kEndMs = 50;
 
@@ -81,16 +84,20 @@ FleetSearch::FleetSearch(std::vector<FleetLocation> locations, Settings settings
   }
   page_.limit = PageLimit(boxes_.size());
   page_.wait_ms = kWaitMs;
+  first_.emplace(ExpectedFirstPage(), static_cast<unsigned>(boxes_.size()));
+  if (!first_->wanted()) first_.reset();
 }
 
 void FleetSearch::Run() {
-  const size_t most_bytes = std::min(kMostPageBytes, page_.limit * kMostRowBytes);
-  asker_.emplace(fleet_, most_bytes);
-  for (Box& box : boxes_) {
-    asker_->Ask(*box.box, {"POST", "/fleet/search", QuestionFor(box), kWaitMs},
-                [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
-  }
-  asker_->Run([this] { return search_.stopping(); });
+  const size_t most_rows = std::max(page_.limit, first_ ? first_->most_rows() : 0);
+  asker_.emplace(fleet_, std::min(kMostPageBytes, most_rows * kMostRowBytes));
+  for (Box& box : boxes_) AskFirst(box);
+  first_page_due_.emplace(fleet_.deadline_ms / kFirstPageShare);
+  asker_->Run([this] {
+    if (first_ && first_page_due_->passed()) ReleaseFirstPage();
+    return search_.stopping();
+  });
+  if (first_) ReleaseFirstPage();
   search_.sink.Append(block_);
   if (search_.stopping()) EndSearches();
 }
@@ -100,71 +107,147 @@ std::string FleetSearch::QuestionFor(const Box& box) const {
   question.query = search_.criteria.root;
   question.contents = settings_.contents;
   question.recursive = settings_.recursive;
-  question.page = page_;
+  question.page = first_ ? first_->FirstRequest(kWaitMs) : page_;
   for (const FleetLocation* location : box.locations) {
     question.locations.push_back(LocationText(*location));
   }
   return FleetQuestionText(question);
 }
 
+void FleetSearch::AskFirst(Box& box) {
+  box.in_order = first_.has_value();
+  asker_->Ask(*box.box, {"POST", "/fleet/search", QuestionFor(box), kWaitMs},
+              [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
+}
+
 void FleetSearch::Took(Box& box, BoxAnswer answer) {
   if (answer.state != BoxState::kAnswered) {
     const bool lost = answer.state == BoxState::kOld && !box.task.empty();
-    return lost ? Finish(box, BoxState::kDown, "has lost the search")
-                : Finish(box, answer.state, answer.why);
+    lost ? Finish(box, BoxState::kDown, "has lost the search")
+         : Finish(box, answer.state, answer.why);
+  } else {
+    const auto page = ReadFleetPage(answer.body);
+    if (page && TakePage(box, *page)) {
+      TookPage(box, *page);
+    } else {
+      Finish(box, BoxState::kDown, "says what is no answer");
+    }
   }
-  const auto page = ReadFleetPage(answer.body);
-  if (!page || !TakePage(box, *page)) {
-    return Finish(box, BoxState::kDown, "says what is no answer");
-  }
+  if (first_) LookAtFirstPage();
+}
+
+// Goes on with a box that has told a page.
+void FleetSearch::TookPage(Box& box, const FleetPage& page) {
   // At once: a page that somebody looks at waits for it.
   search_.sink.Append(block_);
-  if (page->finished && page->next == page->total) {
-    if (page->error == kErrorNone) return Finish(box, BoxState::kAnswered, "");
-    const bool folder = page->error == kErrorNoSuchFolder || page->error == kErrorPermission;
+  if (page.finished && page.next == page.total) {
+    if (page.error == kErrorNone) return Finish(box, BoxState::kAnswered, "");
+    const bool folder = page.error == kErrorNoSuchFolder || page.error == kErrorPermission;
     return Finish(box, BoxState::kRefused, folder ? "no such folder" : "the search failed there");
   }
-  if (page->next >= static_cast<std::uint64_t>(fleet_.rows_per_box)) {
+  if (page.next >= static_cast<std::uint64_t>(fleet_.rows_per_box)) {
     asker_->Ask(*box.box, {"POST", "/fleet/end", "{\"taskid\":\"" + box.task + "\"}"},
                 [](const BoxAnswer&) {});
     return Finish(box, BoxState::kRefused, "has more rows than are asked for");
   }
-  AskMore(box);
+  if (first_) {
+    box.waits = true;
+  } else {
+    AskMore(box);
+  }
 }
 
 bool FleetSearch::TakePage(Box& box, const FleetPage& page) {
+  const unsigned limit = std::max(page_.limit, first_ ? first_->most_rows() : 0);
   const bool agrees = page.next >= box.next && page.total >= page.next &&
-                      page.rows.size() <= page.next - box.next && page.rows.size() <= page_.limit;
+                      page.rows.size() <= limit &&
+                      page.rows.size() <= (box.in_order ? page.total : page.next - box.next);
   if (!agrees) return false;
+  std::uint64_t rows = 0;
   for (const FleetRow& row : page.rows) {
-    if (!TakeRow(box, row)) return false;
+    if (LocationOf(box, row) == nullptr) return false;
+    const bool known = box.told_once.contains(row.number);
+    if (!TakeNumber(box, page, row)) return false;
+    if (known) continue;
+    ++rows;
+    if (!first_) {
+      TakeRow(box, row);
+      continue;
+    }
+    first_->Add(BoxPlace(box), box.box->name + "/" + row.share, row);
+    held_.push_back({&box, row});
   }
-  search_.progress.AddMatches(page.rows.size());
+  if (first_) first_->Told(BoxPlace(box), !page.finished || page.next < page.total);
+  search_.progress.AddMatches(rows);
+  box.told_any = box.told_any || rows > 0;
   box.task = page.task;
   box.next = page.next;
   return true;
 }
 
-bool FleetSearch::TakeRow(const Box& box, const FleetRow& row) {
+// Whether the row's number can be that of this row: no row comes twice.
+bool FleetSearch::TakeNumber(Box& box, const FleetPage& page, const FleetRow& row) {
+  if (row.number >= page.total) return false;
+  if (box.in_order) return box.told_once.insert(row.number).second;
+  const bool follows = row.number >= box.lowest && row.number < page.next;
+  box.lowest = std::uint64_t{row.number} + 1;
+  return follows;
+}
+
+const FleetLocation* FleetSearch::LocationOf(const Box& box, const FleetRow& row) {
   const auto location = std::ranges::find_if(
       box.locations, [&row](const FleetLocation* asked) { return IsIn(row, *asked); });
-  if (location == box.locations.end()) return false;
+  return location == box.locations.end() ? nullptr : *location;
+}
+
+void FleetSearch::TakeRow(const Box& box, const FleetRow& row) {
   FileAttributes attributes = row.attributes;
   attributes.uid = IdOf(row.user, true);
   attributes.gid = IdOf(row.group, false);
   if (block_.full()) search_.sink.Append(block_);
-  block_.SetFolder((*location)->number, row.folder);
+  block_.SetFolder(LocationOf(box, row)->number, row.folder);
   block_.Add(row.name, attributes);
-  return true;
+}
+
+// Once every box has told what it was asked for, or will tell nothing.
+void FleetSearch::LookAtFirstPage() {
+  const bool all = std::ranges::all_of(
+      boxes_, [](const Box& box) { return box.waits || box.state != BoxState::kAsked; });
+  if (!all) return;
+  bool whole = true;
+  for (const size_t place : first_->AskFurther()) {
+    Box& box = boxes_[place];
+    if (!box.waits) continue;
+    whole = box.waits = false;
+    AskRows(box, first_->FurtherRequest(place, kWaitMs));
+  }
+  if (whole) ReleaseFirstPage();
+}
+
+// Its rows become visible, and all others are asked for.
+void FleetSearch::ReleaseFirstPage() {
+  first_.reset();
+  for (const HeldRow& held : held_) TakeRow(*held.box, held.row);
+  held_ = {};
+  search_.sink.Append(block_);
+  for (Box& box : boxes_) {
+    if (box.waits) AskMore(box);
+  }
+}
+
+void FleetSearch::AskRows(Box& box, const FleetPageRequest& page) {
+  FleetPageRequest asked = page;
+  asked.after = box.next;
+  Json::Value body = FleetPageRequestJson(asked);
+  body["task"] = box.task;
+  box.in_order = page.column != SortColumn::kFound;
+  asker_->Ask(*box.box, {"POST", "/fleet/rows", JsonText(body, JsonBytes::kRaw), kWaitMs},
+              [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
 }
 
 void FleetSearch::AskMore(Box& box) {
-  FleetPageRequest page = page_;
-  page.after = box.next;
-  Json::Value body = FleetPageRequestJson(page);
-  body["task"] = box.task;
-  asker_->Ask(*box.box, {"POST", "/fleet/rows", JsonText(body, JsonBytes::kRaw), kWaitMs},
-              [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
+  box.waits = false;
+  AskRows(box, page_);
 }
 
 void FleetSearch::EndSearches() {
@@ -200,7 +283,7 @@ std::uint32_t FleetSearch::IdOf(const std::string& name, bool user) {
 bool FleetSearch::failed() const {
   const std::lock_guard lock(mutex_);
   return std::ranges::none_of(
-      boxes_, [](const Box& box) { return box.state == BoxState::kAnswered || box.next > 0; });
+      boxes_, [](const Box& box) { return box.state == BoxState::kAnswered || box.told_any; });
 }
 
 void FleetSearch::Tell(Json::Value* walk) const {

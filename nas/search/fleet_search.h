@@ -6,6 +6,10 @@
 // Nothing that a box says is believed but that it found these rows: names and folders must be some
 // that were asked for, counts must agree with what came, and after rows_per_box of them it is asked
 // no further. So a box that lies costs its own rows alone.
+//
+// Where it is known in what order the first page will be listed (first_page.h), the rows of that
+// page come first, all together: boxes are asked for their first ones in that order, and those that
+// had more for the page for further ones. All other rows come in the order found.
 
 #include <json/value.h>
 
@@ -13,12 +17,15 @@
 #include <map>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
+#include "nas/base/deadline.h"
 #include "nas/fleet/asker.h"
 #include "nas/fleet/question.h"
 #include "nas/results/row_block.h"
+#include "nas/search/first_rows.h"
 #include "nas/search/judge.h"
 
 namespace nas {
@@ -61,14 +68,33 @@ class FleetSearch {
     std::vector<const FleetLocation*> locations;
     std::string task;
     std::uint64_t next = 0;
+    bool in_order = false;              // what it was asked for last
+    bool waits = false;                 // to be asked on, once the first page is whole
+    std::set<std::uint32_t> told_once;  // rows that came in order
+    std::uint64_t lowest = 0;           // that the next row may have, in the order found
+    bool told_any = false;
     BoxState state = BoxState::kAsked;
     std::string why;
   };
 
+  // A row that came, of the first page.
+  struct HeldRow {
+    const Box* box;
+    FleetRow row;
+  };
+
   std::string QuestionFor(const Box& box) const;
+  void AskFirst(Box& box);
   void Took(Box& box, BoxAnswer answer);
+  void TookPage(Box& box, const FleetPage& page);
   bool TakePage(Box& box, const FleetPage& page);
-  bool TakeRow(const Box& box, const FleetRow& row);
+  bool TakeNumber(Box& box, const FleetPage& page, const FleetRow& row);
+  void TakeRow(const Box& box, const FleetRow& row);
+  static const FleetLocation* LocationOf(const Box& box, const FleetRow& row);
+  size_t BoxPlace(const Box& box) const { return static_cast<size_t>(&box - boxes_.data()); }
+  void LookAtFirstPage();
+  void ReleaseFirstPage();
+  void AskRows(Box& box, const FleetPageRequest& page);
   void AskMore(Box& box);
   void EndSearches();
   void Finish(Box& box, BoxState state, const std::string& why);
@@ -79,6 +105,9 @@ class FleetSearch {
   SharedSearch& search_;
   const FleetSettings& fleet_;
   FleetPageRequest page_;
+  std::optional<FirstRowsMerge> first_;  // until the first page is whole
+  std::vector<HeldRow> held_;            // its rows, in the order they came
+  std::optional<Deadline> first_page_due_;
   std::optional<FleetAsker> asker_;
   RowBlock block_;
   std::map<std::pair<bool, std::string>, std::uint32_t> ids_;  // by kind and name

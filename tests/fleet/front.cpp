@@ -1,11 +1,63 @@
 #include "tests/fleet/front.h"
 
+#include <algorithm>
+#include <cctype>
+
 #include "nas/base/json_text.h"
 
 namespace fleet_test {
 
 using nas_test::AmRoot;
 using nas_test::Eventually;
+
+namespace {
+
+// Letters in lower case, numbers by their value.
+std::string Natural(const std::string& text) {
+  std::string key;
+  for (size_t at = 0; at < text.size();) {
+    const auto byte = static_cast<unsigned char>(text[at]);
+    if (!isdigit(byte)) {
+      key += static_cast<char>(tolower(byte));
+      ++at;
+      continue;
+    }
+    size_t end = at;
+    while (end < text.size() && isdigit(static_cast<unsigned char>(text[end]))) ++end;
+    while (at + 1 < end && text[at] == '0') ++at;
+    key.append("0").append(1, static_cast<char>(end - at)).append(text, at, end - at);
+    at = end;
+  }
+  return key;
+}
+
+std::string Padded(std::int64_t number) {
+  constexpr size_t kDigits = 20;
+  const std::string text = std::to_string(number);
+  return std::string(kDigits - text.size(), '0') + text;
+}
+
+}  // namespace
+
+std::string KeyOf(const Listed& file, const std::string& column) {
+  if (column == "name") return Natural(file.name);
+  if (column == "size") return Padded(file.size);
+  if (column == "user") return Natural(file.owner);
+  if (column == "type") {
+    const size_t dot = file.name.rfind('.');
+    return file.folder || dot == std::string::npos ? std::string(file.folder ? "" : "1")
+                                                   : "1" + Natural(file.name.substr(dot));
+  }
+  std::string folder = file.path.substr(0, file.path.size() - file.name.size() - 1);
+  std::ranges::replace(folder, '/', '\1');
+  return Natural(folder) + '\0' + Natural(file.name);
+}
+
+std::vector<std::string> KeysOf(const std::vector<Listed>& files, const std::string& column) {
+  std::vector<std::string> keys;
+  for (const Listed& file : files) keys.push_back(KeyOf(file, column));
+  return keys;
+}
 
 Server FrontTest::StartFront(const std::vector<Box>& boxes, const std::string& more) {
   const std::string key = dir_ + "/office.key";
@@ -49,14 +101,19 @@ std::vector<Listed> FrontTest::List(const Server& server, Json::Value params) {
   params["additional"] = "size,owner";
   const Json::Value reply = server.Call("list", Text(params)).json();
   EXPECT_EQ(reply["code"], 0);
-  std::vector<Listed> files;
-  for (const Json::Value& file : reply["data"]["files"]) {
-    files.push_back({file["path"].asString(), file["name"].asString(), file["size"].asInt64(),
-                     file["owner"]["user"].asString()});
-    owners_.insert(files.back().owner);
-  }
+  std::vector<Listed> files = FilesOf(reply["data"]["files"]);
+  for (const Listed& file : files) owners_.insert(file.owner);
   total_ = reply["data"]["total"].asUInt64();
   return files;
+}
+
+std::vector<Listed> FrontTest::FilesOf(const Json::Value& files) {
+  std::vector<Listed> listed;
+  for (const Json::Value& file : files) {
+    listed.push_back({file["path"].asString(), file["name"].asString(), file["size"].asInt64(),
+                      file["owner"]["user"].asString(), file["is_dir"].asBool()});
+  }
+  return listed;
 }
 
 std::string FrontTest::Text(const Json::Value& params) {

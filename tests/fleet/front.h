@@ -18,8 +18,14 @@ struct Listed {
   std::string name;
   std::int64_t size = 0;
   std::string owner;
+  bool folder = false;
   auto operator<=>(const Listed&) const = default;
 };
+
+// What a listing by that column is sorted by, as a text; for names of ASCII.
+std::string KeyOf(const Listed& file, const std::string& column);
+// Of all of them, in the listing's order.
+std::vector<std::string> KeysOf(const std::vector<Listed>& files, const std::string& column);
 
 class FrontTest : public FleetTest {
  protected:
@@ -30,6 +36,7 @@ class FrontTest : public FleetTest {
   // Runs a search to its end and leaves its id in task_.
   void Search(const Server& server, Json::Value params);
   std::vector<Listed> List(const Server& server, Json::Value params);
+  static std::vector<Listed> FilesOf(const Json::Value& files);
   static std::string Text(const Json::Value& params);
 
   std::string task_;

@@ -9,6 +9,7 @@
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/json_text.h"
 #include "nas/system/config.h"
+#include "nas/system/first_page.h"
 
 namespace arbory {
 namespace {
@@ -56,6 +57,18 @@ Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Js
   }
 }
 
+// What the listing will ask for, which the search may find first.
+void ExpectPage(const Json::Value& listing) {
+  if (!listing.isObject() || !listing["sort_by"].isString()) return;
+  nas::FirstPage page;
+  page.sort_by = listing["sort_by"].asString();
+  const Json::Value& direction = listing["sort_direction"];
+  page.descending = direction.isString() && LowerCase(direction.asString()) == "desc";
+  const Json::Value& limit = listing[kLimit];
+  page.rows = limit.isUInt() && limit.asUInt() > 0 ? limit.asUInt() : kMostRows;
+  nas::ExpectFirstPage(std::move(page));
+}
+
 nas::Reply Begin(const nas::ApiCall& call, const NUVA::APIMethod& start,
                  const NUVA::APIMethod& list) {
   nas::ApiCall plain = call;
@@ -67,6 +80,7 @@ nas::Reply Begin(const nas::ApiCall& call, const NUVA::APIMethod& start,
   }
   Json::Value listing = body["params"]["list"];
   body["params"].removeMember("list");
+  ExpectPage(listing);
   int code = 0;
   nas::ApiCall starting = CallOf(call, start, body["params"]);
   starting.asks_fleet = true;

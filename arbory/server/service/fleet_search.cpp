@@ -18,6 +18,7 @@
 #include "nas/fleet/question.h"
 #include "nas/results/result_file.h"
 #include "nas/results/result_reader.h"
+#include "nas/results/sort_key.h"
 #include "nas/search/criteria.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
@@ -146,9 +147,27 @@ Rows ReadRows(const RunningSearch& search, const nas::FleetPageRequest& page,
   const std::uint64_t end = std::min(rows.total, page.after + page.limit);
   for (; rows.next < end; ++rows.next) {
     const auto row = static_cast<std::uint32_t>(rows.next);
-    if (writer != nullptr && !reader.purged(row)) writer->Add(reader.Row(row));
+    if (writer != nullptr && !reader.purged(row)) writer->Add(reader.Row(row), row);
   }
   reader.End();
+  return rows;
+}
+
+// In the order of a column. "Next" stays where it was, unless this is all there will be.
+Rows ReadFirstRows(const RunningSearch& search, const nas::FleetPageRequest& page,
+                   nas::FleetPageWriter* writer) {
+  Rows rows{0, page.after};
+  if (search.results.empty() || access(search.results.c_str(), F_OK) != 0) return rows;
+  nas::ResultReader reader(search.results);
+  reader.Begin();
+  rows.total = reader.rows();
+  auto behind = page.behind;
+  if (behind && *behind >= rows.total) behind.reset();
+  for (const auto row : nas::FirstRows(reader, page.column, page.ascending, page.limit, behind)) {
+    writer->Add(reader.Row(row), row);
+  }
+  reader.End();
+  if (search.finished && !page.behind && rows.total <= page.limit) rows.next = rows.total;
   return rows;
 }
 
@@ -165,8 +184,10 @@ RunningSearch WaitForRows(const std::string& user, const std::string& id,
   for (;;) {
     RunningSearch search = ReadSearch(user, id);
     if (!search.exists || search.finished) return search;
-    const Rows rows = ReadRows(search, page, nullptr);
-    if (rows.next == page.after + page.limit || !pause.Wait()) return search;
+    // The first in an order are known when all are.
+    const bool enough = page.column == nas::SortColumn::kFound &&
+                        ReadRows(search, page, nullptr).next == page.after + page.limit;
+    if (enough || !pause.Wait()) return search;
   }
 }
 
@@ -175,7 +196,8 @@ void AnswerPage(const std::string& user, const std::string& id, const nas::Fleet
   const RunningSearch search = WaitForRows(user, id, page);
   if (!search.exists) return RefuseOwn(response, kNotFound, "There is no such search.");
   nas::FleetPageWriter writer;
-  const Rows rows = ReadRows(search, page, &writer);
+  const Rows rows = page.column == nas::SortColumn::kFound ? ReadRows(search, page, &writer)
+                                                           : ReadFirstRows(search, page, &writer);
   Json::Value body;
   body["protocol"] = nas::kFleetProtocol;
   body["version"] = ARBORY_VERSION;
@@ -205,9 +227,9 @@ Json::Value ParamsOf(const NUVA::APIRequest& request, std::initializer_list<cons
 }
 
 void SearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
-  const auto question =
-      nas::ReadFleetQuestion(ParamsOf(*request, {"protocol", "query", "contents", "recursive",
-                                                 "locations", "limit", "wait_ms", "after"}));
+  const auto question = nas::ReadFleetQuestion(
+      ParamsOf(*request, {"protocol", "query", "contents", "recursive", "locations", "limit",
+                          "wait_ms", "after", "sort_by", "descending", "behind"}));
   if (!question) return RefuseOwn(response, kBadRequest, kNotUnderstood);
   const std::string user = request->GetLoginUserName();
   if (const auto refusal = TakeSearchPlace(g_front)) {
@@ -223,7 +245,8 @@ void SearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
 
 void RowsEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   nas::GiveUpRoot();
-  const auto page = nas::ReadFleetPageRequest(ParamsOf(*request, {"limit", "wait_ms", "after"}));
+  const auto page = nas::ReadFleetPageRequest(
+      ParamsOf(*request, {"limit", "wait_ms", "after", "sort_by", "descending", "behind"}));
   const Json::Value id = request->GetParam(kTask, Json::Value());
   if (!page || !id.isString()) return RefuseOwn(response, kBadRequest, kNotUnderstood);
   AnswerPage(request->GetLoginUserName(), id.asString(), *page, response);
