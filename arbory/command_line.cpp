@@ -67,8 +67,13 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
   command->add_option("-e,--extension", query->extensions, "Extensions: jpg, or jpg,png")
       ->type_name("EXT")
       ->allow_extra_args(false);
+  // For who completes it; what else it may be, or several, the search tells.
+  const CLI::Validator types([](const std::string&) { return std::string(); },
+                             "{file,dir,link,executable,empty,pipe,socket,block,char,image,video,"
+                             "audio,document,archive}");
   command->add_option("-t,--type", query->types, "Types: f or file, or d,l; see below")
       ->type_name("TYPE")
+      ->check(types)
       ->allow_extra_args(false);
   command->add_option("--size-from", query->size_from, "At least this large")->type_name("SIZE");
   command->add_option("--size-to", query->size_to, "At most this large")->type_name("SIZE");
