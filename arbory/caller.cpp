@@ -77,7 +77,9 @@ void Caller::BecomeUser() const {
 nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
                         const Json::Value& params, const nas::ReplyEncoder& encode) const {
   // The session's name only shows in log lines.
-  return nas::RunCall(row, {method, params, user_, "terminal", leased_}, encode);
+  nas::ApiCall call{method, params, user_, "terminal", leased_};
+  call.asks_fleet = !config_.fleet.boxes.empty() && method == "start";
+  return nas::RunCall(row, call, encode);
 }
 
 }  // namespace arbory

@@ -195,6 +195,10 @@ void AddSearch(CLI::App* app, SearchOptions* options) {
   AddQueryOptions(search, &options->query);
   AddOutput(search, options, "Output");
   search->option_defaults()->group("Where and as whom");
+  search
+      ->add_option("--fleet", options->fleet,
+                   "Search the machines that this file names: /BOX/SHARE, or all")
+      ->type_name("FILE");
   AddCommonOptions(search, &options->common);
   search->footer(std::string(kQueryHelp) + kSearchHelp);
 }

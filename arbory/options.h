@@ -141,6 +141,7 @@ struct SearchOptions {
   std::uint64_t offset = 0;
   OutputOptions output;
   bool verbose = false;  // say how the search was answered
+  std::string fleet;     // the file that names the boxes to ask; empty: none are
 };
 
 struct FindOptions {

@@ -22,6 +22,8 @@ class JsonRows {
   // `context`: the line does not match itself.
   static void AppendLine(const nas::MatchingLine& line, bool context, bool first, std::string* out);
 
+  nas::AccountTexts& owners() { return owners_; }
+
  private:
   // A text, its JSON without the quotation marks, and whether that is all of it.
   struct Text {

@@ -14,6 +14,7 @@ class LongColumns {
   // Appends mode, owner, group, size and time, each with a space behind it. Columns have fixed
   // least widths, as rows are printed before the next ones are known.
   void Append(const nas::FileAttributes& file, std::string* out);
+  nas::AccountTexts& owners() { return owners_; }
 
  private:
   nas::AccountTexts owners_;

@@ -40,6 +40,10 @@ void RowReader::Sort() {
 RowReader::Rows RowReader::Next() {
   Rows rows;
   reader_.Begin();
+  if (!options_.fleet.empty()) {
+    const nas::ForeignAccounts accounts = reader_.Accounts();
+    for (const auto& [id, name] : accounts.names()) writer_.NameAccount(id, name);
+  }
   const bool sorted = !options_.sort_by.empty();
   const std::uint64_t there = std::min(end_, sorted ? sorted_.size() : reader_.rows());
   const std::uint64_t stop = at_ < there ? at_ + std::min(kMostRows, there - at_) : at_;

@@ -56,6 +56,11 @@ class RowWriter {
 
   // Appends the row with its end.
   void Append(const nas::ResultRow& row, std::string* out);
+  // Of another machine's account.
+  void NameAccount(std::uint32_t id, const std::string& name) {
+    columns_.owners().Know(id, name);
+    json_.owners().Know(id, name);
+  }
 
  private:
   void EnterFolder(const nas::ResultRow& row);

@@ -4,6 +4,7 @@
 
 #include "arbory/search_command.h"
 
+#include <fcntl.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -27,6 +28,7 @@
 #include "arbory/shown_paths.h"
 #include "arbory/terminal.h"
 #include "nas/base/unique_fd.h"
+#include "nas/results/foreign_accounts.h"
 #include "nas/results/result_file.h"
 #include "nas/system/identity.h"
 #include "nas/webapi/runner.h"
@@ -64,11 +66,44 @@ std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
 }
 
 // A path that a program is to be given begins with no "-".
-ShownPaths PathsFor(const SearchOptions& options) {
+ShownPaths PathsHere(const SearchOptions& options) {
   if (options.output.absolute) return {};
   if (!options.query.here) return ShownPaths(options.query.folders);
   return ShownPaths({options.output.null_separated || options.output.runs() ? "." : ""});
 }
+
+ShownPaths PathsFor(const SearchOptions& options) {
+  ShownPaths paths = PathsHere(options);
+  // What boxes have found begins with the box.
+  std::string root = nas::kFleetRoot;
+  root.pop_back();
+  paths.Show(root, "/");
+  return paths;
+}
+
+// The options with the boxes of the fleet known, all of them searched where no folder was named.
+SearchOptions WithFleet(const SearchOptions& options, Caller* caller) {
+  SearchOptions asked = options;
+  if (options.fleet.empty()) return asked;
+  if (options.output.runs()) {
+    throw UsageError("files of other machines cannot be given to a command");
+  }
+  if (options.output.lines) throw UsageError("--lines shows those of this machine's files alone");
+  nas::FleetSettings fleet = nas::LoadFleet(options.fleet);
+  if (faccessat(AT_FDCWD, fleet.key_file.c_str(), R_OK, AT_EACCESS) != 0) {
+    throw UsageError("the front's key " + fleet.key_file +
+                     " cannot be read: " + std::strerror(errno) + "; search as root, with --user");
+  }
+  if (asked.query.here) asked.query.folders.clear();
+  for (const nas::FleetBox& box : fleet.boxes) {
+    if (asked.query.here) asked.query.folders.push_back("/" + box.name);
+  }
+  asked.query.here = false;
+  caller->AskFleet(std::move(fleet));
+  return asked;
+}
+
+const Json::Value kNoBoxes;
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -252,6 +287,7 @@ class Search {
       Complain(std::string("cannot write the results: ") + std::strerror(failure_));
       return kExitError;
     }
+    TellOfBoxes(state);
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
     if (commands_ && !commands_->Finish() && Interrupted()) return kExitInterrupted;
     if (options_.output.count) WriteOut(STDOUT_FILENO, std::to_string(printed_) + "\n");
@@ -301,6 +337,14 @@ class Search {
     tell(state.not_text, "file is", "files are", " not text");
   }
 
+  static void TellOfBoxes(const RunningSearch& state) {
+    const Json::Value& fleet = state.walk.isObject() ? state.walk[task_record::kFleet] : kNoBoxes;
+    for (const Json::Value& box : fleet.isObject() ? fleet["boxes"] : kNoBoxes) {
+      Complain(box["name"].asString() + ": " + box["state"].asString() + " (" +
+               box["why"].asString() + ")");
+    }
+  }
+
   // The cleaning goes on by itself after the reply.
   void CleanUp() {
     Json::Value params(Json::objectValue);
@@ -333,10 +377,11 @@ class Search {
 
 }  // namespace
 
-int RunSearchCommand(const SearchOptions& options) {
+int RunSearchCommand(const SearchOptions& asked) {
   WatchForInterrupt();
-  Caller caller(options.common);
+  Caller caller(asked.common);
   nas::PrepareForCalls();
+  const SearchOptions options = WithFleet(asked, &caller);
   const Json::Value params = PrepareSearch(options.query, &caller);
   if (options.sort_by.empty()) caller.LeaveUnsorted();
   // From here on the program follows what the user's own processes write.

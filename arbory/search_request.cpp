@@ -6,6 +6,7 @@
 #include "arbory/search_terms.h"
 #include "nas/base/accounts.h"
 #include "nas/match/query.h"
+#include "nas/search/fleet_search.h"
 #include "nas/system/shares.h"
 #include "platform/filesearch.h"
 
@@ -125,9 +126,14 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
 }
 
 Json::Value PrepareSearch(const SearchQuery& query, Caller* caller) {
-  const Locations locations =
-      LocateFolders(query.folders, nas::ListShares(), query.recursive, query.ignore_files);
+  std::vector<std::string> here;
+  std::vector<std::string> elsewhere;
+  for (const std::string& folder : query.folders) {
+    (nas::FindFleetLocation(folder) ? elsewhere : here).push_back(folder);
+  }
+  Locations locations = LocateFolders(here, nas::ListShares(), query.recursive, query.ignore_files);
   caller->AddShares(locations.added);
+  locations.paths.insert(locations.paths.end(), elsewhere.begin(), elsewhere.end());
   return SearchRequest(query, locations.paths, std::time(nullptr));
 }
 

@@ -21,8 +21,8 @@ Json::Value SearchRequest(const SearchQuery& query, const std::vector<std::strin
                           std::time_t now);
 
 // The same for the folders as they were given: finds the share that each lies in, and offers a new
-// one through the caller where it lies in none. Throws UsageError for a folder that cannot be
-// searched too.
+// one through the caller where it lies in none. A folder that begins with a box of the caller's
+// fleet is the box's. Throws UsageError for a folder that cannot be searched too.
 Json::Value PrepareSearch(const SearchQuery& query, Caller* caller);
 
 }  // namespace arbory

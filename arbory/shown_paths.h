@@ -17,6 +17,11 @@ class ShownPaths {
   // shown as they are on disk.
   explicit ShownPaths(const std::vector<std::string>& folders);
 
+  // What lies below `real_path` is shown below `shown`, which ends with "/".
+  void Show(const std::string& real_path, const std::string& shown) {
+    roots_.push_back({real_path, shown});
+  }
+
   // Appends what stands before the names of what lies in the folder at `real_path` (empty: the root
   // directory).
   void AppendFolder(const std::string& real_path, std::string* out) const;

@@ -55,6 +55,8 @@ class AccountTexts {
  public:
   const std::string& User(uid_t uid);
   const std::string& Group(gid_t gid);
+  // Says what a number stands for, of a user and of a group, that is none of this machine's.
+  void Know(std::uint32_t id, const std::string& name) { users_[id] = groups_[id] = name; }
 
  private:
   std::map<uid_t, std::string> users_;

@@ -15,6 +15,7 @@
 #include "nas/base/unique_fd.h"
 #include "nas/fleet/token.h"
 #include "nas/system/child.h"
+#include "nas/system/identity.h"
 
 namespace nas {
 namespace {
@@ -27,6 +28,7 @@ UniqueFd g_signer;
 
 // Bytes; empty, with a line in the log, where the file cannot be used.
 std::string ReadKey(const std::string& path) {
+  const ScopedRoot root;  // the terminal's process is the user's already
   struct stat info;
   if (stat(path.c_str(), &info) == 0 && (info.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
     syslog(LOG_ERR, "fleet: %s can be read by others; the key is not used", path.c_str());

@@ -27,6 +27,7 @@ class ForeignAccounts {
   // The name, as nas/base/accounts.h tells it where the number is this machine's.
   std::string User(std::uint32_t id) const;
   std::string Group(std::uint32_t id) const;
+  const std::map<std::uint32_t, std::string>& names() const { return names_; }
   // Null for a number of this machine's.
   const std::string* Foreign(std::uint32_t id) const;
 

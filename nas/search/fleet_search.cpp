@@ -21,6 +21,9 @@ constexpr unsigned kFewestRows = 100;
 // A row of a name of 255 bytes, each of them escaped, in a folder of its own.
 constexpr size_t kMostRowBytes = 2048;
 constexpr size_t kMostPageBytes = size_t{4} << 20;
+// Of one box; rows name their share in 16 bits.
+constexpr size_t kMostShares = 1000;
+constexpr std::uint16_t kNoShare = 0xFFFF;
 // The part of the deadline that the first page's rows wait for each other; those of a box that is
 // slower join later.
 constexpr int kFirstPageShare = 4;
@@ -33,7 +36,8 @@ unsigned PageLimit(size_t boxes) {
 }
 
 bool IsIn(const FleetRow& row, const FleetLocation& location) {
-  return row.share == location.share && RowBlock::IsAtOrBelow(row.folder, location.path);
+  return location.share.empty() ||
+         (row.share == location.share && RowBlock::IsAtOrBelow(row.folder, location.path));
 }
 
 std::string LocationText(const FleetLocation& location) {
@@ -57,10 +61,9 @@ std::optional<Result<FleetLocation>> FindFleetLocation(const std::string& text) 
   const FleetBox* box = parts.empty() ? nullptr : FindFleetBox(parts.front());
   if (box == nullptr) return std::nullopt;
   if (std::ranges::find(parts, "..") != parts.end()) return Error{kErrorIllegal, EINVAL, text};
-  if (parts.size() == 1) return Error{kErrorNoSuchFolder, ENOENT, text};
   FleetLocation location;
   location.box = box;
-  location.share = parts[1];
+  if (parts.size() > 1) location.share = parts[1];
   for (size_t i = 2; i < parts.size(); ++i) {
     location.path += (location.path.empty() ? "" : "/") + parts[i];
   }
@@ -73,7 +76,8 @@ FleetSearch::FleetSearch(std::vector<FleetLocation> locations, Settings settings
       settings_(std::move(settings)),
       search_(search),
       fleet_(CurrentConfig().fleet),
-      next_id_(kFirstForeignId) {
+      next_id_(kFirstForeignId),
+      next_share_(settings_.first_number) {
   for (const FleetLocation& location : locations_) {
     auto box = std::ranges::find(boxes_, location.box, &Box::box);
     if (box == boxes_.end()) {
@@ -165,7 +169,7 @@ bool FleetSearch::TakePage(Box& box, const FleetPage& page) {
   if (!agrees) return false;
   std::uint64_t rows = 0;
   for (const FleetRow& row : page.rows) {
-    if (LocationOf(box, row) == nullptr) return false;
+    if (!CanTake(box, row)) return false;
     const bool known = box.told_once.contains(row.number);
     if (!TakeNumber(box, page, row)) return false;
     if (known) continue;
@@ -194,10 +198,15 @@ bool FleetSearch::TakeNumber(Box& box, const FleetPage& page, const FleetRow& ro
   return follows;
 }
 
-const FleetLocation* FleetSearch::LocationOf(const Box& box, const FleetRow& row) {
-  const auto location = std::ranges::find_if(
+// Whether it lies in what was asked for. Its share has a number then.
+bool FleetSearch::CanTake(Box& box, const FleetRow& row) {
+  const bool asked_for = std::ranges::any_of(
       box.locations, [&row](const FleetLocation* asked) { return IsIn(row, *asked); });
-  return location == box.locations.end() ? nullptr : *location;
+  if (!asked_for || box.shares.contains(row.share)) return asked_for;
+  if (box.shares.size() >= kMostShares || next_share_ == kNoShare) return false;
+  settings_.add_share(next_share_, box.box->name + "/" + row.share);
+  box.shares[row.share] = next_share_++;
+  return true;
 }
 
 void FleetSearch::TakeRow(const Box& box, const FleetRow& row) {
@@ -205,7 +214,7 @@ void FleetSearch::TakeRow(const Box& box, const FleetRow& row) {
   attributes.uid = IdOf(row.user, true);
   attributes.gid = IdOf(row.group, false);
   if (block_.full()) search_.sink.Append(block_);
-  block_.SetFolder(LocationOf(box, row)->number, row.folder);
+  block_.SetFolder(box.shares.at(row.share), row.folder);
   block_.Add(row.name, attributes);
 }
 

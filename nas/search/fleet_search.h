@@ -30,12 +30,11 @@
 
 namespace nas {
 
-// "/BOX/SHARE/below", taken apart.
+// "/BOX/SHARE/below", taken apart; or "/BOX", which is all shares there that the user can enter.
 struct FleetLocation {
   const FleetBox* box = nullptr;
-  std::string share;
-  std::string path;          // below the share's root
-  std::uint16_t number = 0;  // in the result file
+  std::string share;  // empty: all
+  std::string path;   // below the share's root
 };
 
 // Nothing for a text that names no box of the configuration; kErrorIllegal and kErrorNoSuchFolder
@@ -49,6 +48,10 @@ class FleetSearch {
     bool contents = false;
     // Gives the name of an account that this machine does not have its number in the result file.
     std::function<void(std::uint32_t id, const std::string& name)> add_account;
+    // Gives a share of a box its number in the result file, before its first row; from
+    // `first_number` on.
+    std::function<void(std::uint16_t number, const std::string& name)> add_share;
+    std::uint16_t first_number = 0;
   };
   // The search is borrowed.
   FleetSearch(std::vector<FleetLocation> locations, Settings settings, SharedSearch& search);
@@ -73,6 +76,7 @@ class FleetSearch {
     std::set<std::uint32_t> told_once;  // rows that came in order
     std::uint64_t lowest = 0;           // that the next row may have, in the order found
     bool told_any = false;
+    std::map<std::string, std::uint16_t> shares;  // their numbers in the result file
     BoxState state = BoxState::kAsked;
     std::string why;
   };
@@ -88,9 +92,9 @@ class FleetSearch {
   void Took(Box& box, BoxAnswer answer);
   void TookPage(Box& box, const FleetPage& page);
   bool TakePage(Box& box, const FleetPage& page);
+  bool CanTake(Box& box, const FleetRow& row);
   bool TakeNumber(Box& box, const FleetPage& page, const FleetRow& row);
   void TakeRow(const Box& box, const FleetRow& row);
-  static const FleetLocation* LocationOf(const Box& box, const FleetRow& row);
   size_t BoxPlace(const Box& box) const { return static_cast<size_t>(&box - boxes_.data()); }
   void LookAtFirstPage();
   void ReleaseFirstPage();
@@ -112,6 +116,7 @@ class FleetSearch {
   RowBlock block_;
   std::map<std::pair<bool, std::string>, std::uint32_t> ids_;  // by kind and name
   std::uint32_t next_id_;
+  std::uint16_t next_share_;
 
   mutable std::mutex mutex_;  // guards state and why of each
   std::vector<Box> boxes_;

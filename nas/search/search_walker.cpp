@@ -146,7 +146,7 @@ class WfmSearchWalker::Impl {
   const int& stop_flag_;
   std::vector<FindComp*> comps_;
   std::vector<nas::Location> locations_;             // on this machine
-  std::vector<nas::FleetLocation> fleet_locations_;  // on others, numbered behind those
+  std::vector<nas::FleetLocation> fleet_locations_;  // on others
   std::vector<nas::Error> unopened_;  // of each of the others, with the location's text
   std::string volume_;
   std::string folder_;
@@ -239,11 +239,6 @@ void WfmSearchWalker::Impl::AddLocations() {
   for (const nas::Location& location : locations_) {
     writer_->AddLocation(number++, location.share.name, location.share.root);
   }
-  for (nas::FleetLocation& location : fleet_locations_) {
-    const std::string name = location.box->name + "/" + location.share;
-    location.number = number;
-    writer_->AddLocation(number++, name, nas::kFleetRoot + name);
-  }
 }
 
 void WfmSearchWalker::Impl::AskFleet(const Json::Value& options, nas::SharedSearch& search) {
@@ -254,6 +249,10 @@ void WfmSearchWalker::Impl::AskFleet(const Json::Value& options, nas::SharedSear
   settings.add_account = [this](std::uint32_t id, const std::string& name) {
     writer_->AddAccount(id, name);
   };
+  settings.add_share = [this](std::uint16_t number, const std::string& name) {
+    writer_->AddLocation(number, name, nas::kFleetRoot + name);
+  };
+  settings.first_number = static_cast<std::uint16_t>(locations_.size());
   fleet_.emplace(fleet_locations_, std::move(settings), search);
 }
 

@@ -85,7 +85,9 @@ TEST_F(FrontTest, ASearchIsStoppedAndCleanedWithWhatBoxesKeep) {
   EXPECT_EQ(status_["progress"], -1) << "nothing can be known of that";
   params["folder_path"] = "/box1";
   Search(front, params);
-  EXPECT_EQ(status_["progress"], -1);
+  EXPECT_EQ(status_["progress"], 1);
+  EXPECT_EQ(List(front, page).size(), 5U);
+  EXPECT_EQ(total_, 3001U) << "of all shares of the box";
   params["folder_path"] = "/box1/../data";
   Search(front, params);
   EXPECT_EQ(status_["progress"], -1);

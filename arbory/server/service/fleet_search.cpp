@@ -22,6 +22,7 @@
 #include "nas/search/criteria.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
+#include "nas/system/shares.h"
 #include "platform/filesearch.h"
 #include "platform/system.h"
 #include "platform/task.h"
@@ -65,10 +66,28 @@ void LeaveUnsorted() {
   nas::Configure(std::move(config));
 }
 
+// "/" stands for all shares that the user can enter.
+std::vector<std::string> LocationsOf(const nas::FleetQuestion& question) {
+  std::vector<std::string> locations;
+  for (const std::string& location : question.locations) {
+    if (location != "/") {
+      locations.push_back(location);
+      continue;
+    }
+    for (const nas::Share& share : nas::ListShares()) {
+      if (CanList(share.root)) locations.push_back("/" + share.name);
+    }
+  }
+  return locations;
+}
+
 bool Search(const std::string& user, const nas::FleetQuestion& question, OKT::Task* task) {
   nas::NodeComp criteria(question.query);
   FileSearch::WfmSearchWalker walker(user.c_str(), "", task, &g_stop);
-  if (!walker.init(question.locations, {&criteria})) return false;
+  const std::vector<std::string> locations = LocationsOf(question);
+  // Nothing that could be entered holds nothing.
+  if (locations.empty()) return true;
+  if (!walker.init(locations, {&criteria})) return false;
   walker.setSearchCurrentDir(!question.recursive);
   task->reload();
   Json::Value data = task->getProperty(record::kData);

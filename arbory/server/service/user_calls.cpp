@@ -38,10 +38,6 @@ constexpr size_t kInstantRows = 100;
 constexpr size_t kMostInstantLocations = 64;
 constexpr char kNoSearch[] = "There is no such search; start a new one.";
 
-bool CanList(const std::string& folder) {
-  return faccessat(AT_FDCWD, folder.empty() ? "/" : folder.c_str(), R_OK | X_OK, AT_EACCESS) == 0;
-}
-
 Json::Value ListShares(const std::string& user) {
   Json::Value body;
   body["shares"] = Json::Value(Json::arrayValue);
@@ -274,6 +270,10 @@ nas::Child Start(NUVA::APIEntry entry, const std::string& user, const Json::Valu
 }
 
 }  // namespace
+
+bool CanList(const std::string& folder) {
+  return faccessat(AT_FDCWD, folder.empty() ? "/" : folder.c_str(), R_OK | X_OK, AT_EACCESS) == 0;
+}
 
 nas::Reply EncodeOwnReply(int code, const Json::Value& data) {
   if (!data.isNull() && code >= kOk)

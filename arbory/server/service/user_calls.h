@@ -22,6 +22,9 @@ nas::Reply EncodeOwnReply(int code, const Json::Value& data);
 // Answers with an error's status and sentence.
 void RefuseOwn(NUVA::APIResponse* response, int status, const char* sentence);
 
+// Whether the process's user can enter and list the folder that a share begins with.
+bool CanList(const std::string& folder);
+
 // {"shares":[{"name","indexed"}],"homes":BOOL}: the shares the user can enter and list. With
 // `asks_fleet` those of a fleet's boxes too, as "BOX/SHARE", and in "boxes" the "state" and "why"
 // of each that has not answered, by name.
