@@ -89,8 +89,8 @@ class Spans {
   void Add(size_t number) {
     const QueryPiece& piece = cut_.pieces[number];
     using Piece = QueryPiece::Kind;
-    if (piece.kind == Piece::kOpen) ++depth_;
-    if (piece.kind == Piece::kClose) --depth_;
+    if (piece.kind == Piece::kOpen) groups_.push_back(left_out() || piece.negated);
+    if (piece.kind == Piece::kClose) groups_.pop_back();
     const size_t begin = PlaceOf(piece.written, query_);
     const size_t end = begin + piece.written.size();
     if (piece.kind == Piece::kBar) {
@@ -109,13 +109,15 @@ class Spans {
     QuerySpan& span = spans_.emplace_back();
     span = {.kind = KindOf(piece), .begin = behind, .end = end};
     span.value = PlaceOf(piece.behind_prefixes, query_);
-    span.alone = depth_ == 0 && !piece.negated && !is_bar(number + 1) && !is_bar(number - 1);
+    span.alone = groups_.empty() && !piece.negated && !is_bar(number + 1) && !is_bar(number - 1);
     span.open = piece.open;
     span.prefix = PrefixOf(piece);
     if (piece.prefix != nullptr && piece.prefix->value != Value::kText)
       span.values = ValuesOf(piece);
     if (piece.kind == Piece::kTerm) Understand(piece, span);
   }
+
+  bool left_out() const { return !groups_.empty() && groups_.back(); }
 
   void Sign(Kind kind, size_t begin, size_t end, const char* says) {
     spans_.push_back({.kind = kind, .begin = begin, .value = begin, .end = end, .says = says});
@@ -129,7 +131,7 @@ class Spans {
       return;
     }
     span.says = (piece.negated ? "not: " : "") + SayLeaf(piece, *leaf);
-    if (!piece.negated) span.words = WordsOf(*leaf);
+    if (!piece.negated && !left_out()) span.words = WordsOf(*leaf);
     if (AnyLeaf(*leaf, IsOfWalk) && !span.alone) of_walk_.push_back(spans_.size() - 1);
   }
 
@@ -146,7 +148,7 @@ class Spans {
   const std::time_t now_;
   const QueryPieces cut_;
   const Letters letters_;
-  size_t depth_ = 0;
+  std::vector<bool> groups_;  // those that are open: whether what they find is left out
   bool some_wrong_ = false;
   std::vector<size_t> of_walk_;
   std::vector<QuerySpan> spans_;
