@@ -101,7 +101,7 @@ export class Tab {
     const found = await rows.evaluateAll((elements) =>
       elements.map((row) => ({
         index: Number(row.id.slice('row-'.length)),
-        name: row.querySelector('.name')?.textContent ?? '',
+        name: row.querySelector('.name bdi')?.textContent ?? '', // without the line that was found in it
       })),
     );
     return found.sort((a, b) => a.index - b.index).map((row) => row.name);

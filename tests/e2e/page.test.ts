@@ -168,21 +168,24 @@ test('a running search is stopped, and says so', async () => {
 test('reload and a shared link repeat the search; the way back leads to the one before', async () => {
   const tab = await openTab();
   const { page } = tab;
+  await page.fill('#pattern', 'plan');
+  await page.press('#pattern', 'Escape'); // what was searched for before lies over it
   await page.click('text=Criteria');
   await page.getByLabel('Size from').fill('1 KB');
   await page.getByRole('radio', { name: 'Files' }).check({ force: true });
-  await tab.search('plan');
+  await page.press('#pattern', 'Enter');
+  await page.locator('.figures strong', { hasText: '2 matches' }).waitFor();
   assert.deepEqual([...(await tab.names())].sort(), ['plan large.txt', 'plan middle.txt']);
   const link = page.url();
   await tab.search('notes');
   await page.goBack();
   await tab.over();
   assert.equal(page.url(), link);
-  assert.equal(await page.inputValue('#pattern'), 'plan');
+  assert.equal(await page.inputValue('#pattern'), 'plan size:1KB.. type:file');
   await page.reload();
   await tab.over();
   assert.equal(await tab.count(), '2 matches');
-  await page.getByRole('button', { name: 'Remove: at least 1 KB' }).click();
+  await page.getByRole('button', { name: 'Remove: 1 KB or more' }).click();
   await page.locator('.figures strong', { hasText: '3 matches' }).waitFor();
   await tab.close();
 });
@@ -244,26 +247,26 @@ test('past searches are offered, repeated and cleared', async () => {
   await page.press('#pattern', 'ArrowDown');
   come();
   await page.getByRole('option', { name: 'notes', exact: true }).waitFor();
-  const needle = page.getByRole('option', { name: /^needle \.txt · modified last 7 days · also inside files/ });
+  const needle = page.getByRole('option', { name: /^ext:txt modified:last-7-days needle also inside files/ });
   await needle.click();
   await tab.over();
   assert.deepEqual(await tab.names(), ['notes.txt']);
-  assert.match(page.url(), /modified=last-7-days/);
+  assert.match(decodeURIComponent(page.url()), /modified:last-7-days/);
   // One goes alone; a pinned one has a name, and stays first.
   await page.fill('#pattern', 'not');
   await page.press('#pattern', 'ArrowDown');
   await page.press('#pattern', 'Delete');
   await page.getByRole('option', { name: 'notes', exact: true }).waitFor({ state: 'detached' });
   await page.click('.home');
-  await page.getByRole('button', { name: 'Pin plan' }).first().click();
-  await page.getByRole('button', { name: 'Name plan' }).click();
+  await page.getByRole('button', { name: 'Pin plan type:file', exact: true }).click();
+  await page.getByRole('button', { name: 'Name plan type:file', exact: true }).click();
   await page.getByLabel('Name of the pinned search').fill('My plans');
   await page.keyboard.press('Enter');
   await page.getByRole('button', { name: 'My plans', exact: true }).waitFor();
   await page.reload();
   await page.getByRole('button', { name: 'My plans', exact: true }).click();
   await tab.over();
-  assert.equal(await page.inputValue('#pattern'), 'plan');
+  assert.equal(await page.inputValue('#pattern'), 'plan type:file');
   await page.fill('#pattern', '');
   await page.click('text=Clear history');
   await page.getByText('The history is cleared.').waitFor();
@@ -400,15 +403,16 @@ test('failures are sentences that say what to do', async () => {
   await tab.search('plan');
   await tab.page.getByLabel('Size from').fill('huge');
   await tab.page.press('#pattern', 'Enter');
-  await tab.page.getByText("'huge' is not a size").waitFor();
+  await tab.page.getByText("'size:huge..': write a size as in").waitFor();
   assert.equal(await tab.page.getByLabel('Size from').getAttribute('aria-invalid'), 'true');
   assert.equal(await tab.count(), '4 matches', 'what was found before is shown still');
   // Whatever the server reads may be written.
   await tab.page.getByLabel('Size from').fill('');
   await tab.page.getByRole('combobox', { name: 'Modified' }).selectOption('As written …');
   await tab.page.getByLabel('Modified, as written').fill('2026-01-02..2026-01');
-  await tab.search('plan');
-  assert.equal(await tab.count(), '2 matches');
+  await tab.page.press('#pattern', 'Enter');
+  await tab.page.locator('.figures strong', { hasText: '2 matches' }).waitFor();
+  assert.equal(await tab.page.inputValue('#pattern'), 'plan modified:2026-01-02..2026-01');
   await tab.close();
 });
 
@@ -476,12 +480,23 @@ test('screen readers find names, roles and contrast in order, light and dark', a
     ['criteria', '#q=plan&type=file', 'text=Criteria'],
     ['the folders', '#q=plan', '.folders'],
     ['nothing found', '#q=nowhere+to+be+found'],
+    ['the criteria of a query', '#q=plan+size:>1+!ext:x+exclude:.git', 'text=Criteria'],
+  ];
+  // What is typed, and what is to be seen then.
+  const typed: [string, string, string][] = [
+    ['what can be written next', 'plan si', '[role=option]'],
+    ['what is wrong', 'size:1xb plan "a b" !<c|regex:d>', '.mistaken'],
   ];
   const axe = fs.readFileSync(require.resolve('axe-core/axe.min.js'), 'utf8');
   for (const colorScheme of ['light', 'dark'] as const) {
-    for (const [state, hash, click] of states) {
-      const tab = await openTab(hash, { colorScheme });
-      if (click) await tab.page.click(click);
+    for (const [state, hash, action] of [...states, ...typed]) {
+      const tab = await openTab(hash.startsWith('#') ? hash : '', { colorScheme });
+      if (hash && !hash.startsWith('#')) {
+        await tab.page.locator('#pattern').pressSequentially(hash);
+        await tab.page.waitForSelector(action!);
+      } else if (action) {
+        await tab.page.click(action);
+      }
       await tab.page.evaluate(axe);
       const found = await tab.page.evaluate(async () => {
         // The table scrolls by the keys of the grid around it, which has the focus.

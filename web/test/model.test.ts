@@ -1,62 +1,45 @@
 // The parts of the page that only compute: each table row is a case that once could go wrong.
 import assert from 'node:assert/strict';
-import * as fs from 'node:fs';
-import { join } from 'node:path';
 import { test } from 'node:test';
 import { fromHash, toHash, type Address } from '../src/model/address.ts';
-import { begun, contentsOf, criterion, CriterionError, FIELDS, NO_CRITERIA, type Criteria, type StartParams } from '../src/model/criteria.ts';
+import { begun, contentsOf, CriterionError, NO_CRITERIA, type Criteria, type StartParams } from '../src/model/criteria.ts';
 import { csvRow, jsonLine } from '../src/model/csv.ts';
 import { Highlighter } from '../src/model/highlight.ts';
 import { smallPicture } from '../src/model/exif.ts';
-import { excludesOf, withExclude, withoutExclude } from '../src/model/excludes.ts';
 import { addressOf, offered, titleOf } from '../src/model/history.ts';
+import { movedTo, painted, withTerm, without, type Query, type Span, type Word } from '../src/model/query.ts';
 import { formatSize } from '../src/model/size.ts';
+import { onlyInText, shownTerm, shownValue, sizeBetween, sizeEnds, written } from '../src/model/terms.ts';
 import { pieces, visible } from '../src/model/text.ts';
 import type { FileRow } from '../src/api/types.ts';
 
-// The engine's cases; `marks` is the name with what is marked in «», or null where it does not match.
-test('highlighting speaks the language of the engine', () => {
-  const table = fs.readFileSync(join(process.cwd(), '../tests/patterns.json'), 'utf8');
-  const rows = JSON.parse(table) as { pattern: string; name: string; marks: string | null; why: string }[];
-  assert.ok(rows.length > 100);
-  const isOneTerm = (pattern: string) => /^[^ |!"]+$/.test(pattern);
-  for (const { pattern, name, marks, why } of rows) {
-    // The engine judges; only of a single term is nothing marked where it says no.
-    if (marks === null && !isOneTerm(pattern)) continue;
-    assert.equal(marked(pattern, name), marks ?? name, `${pattern} in ${name}: ${why}`);
-  }
-  for (const [pattern, why] of [
-    ['regex:(', 'a broken one'],
-    ['regex:(a+)+$', 'one that may run away is not tried'],
-    ['regex:[[:alpha:]]', 'what is another expression to a browser'],
-  ] as const) {
-    assert.equal(marked(pattern, 'aaa'), 'aaa', why);
-  }
-  const line = new Highlighter('regex:^b.*', 'contents').ranges('a\nbc\nd');
+test('expressions that a browser reads otherwise, or that may run away, mark nothing', () => {
+  const rows: [string, string][] = [
+    ['(', 'a broken one'],
+    ['(a+)+$', 'one that may run away is not tried'],
+    ['[[:alpha:]]', 'what is another expression to a browser'],
+  ];
+  for (const [text, why] of rows) assert.deepEqual(new Highlighter([{ text, as: 'regex' }]).ranges('aaa'), [], why);
+  const line = new Highlighter([{ text: '^b.*', as: 'regex' }], 'contents').ranges('a\nbc\nd');
   assert.deepEqual(line, [[2, 4]], 'contents have lines');
 });
-
-function marked(pattern: string, name: string): string {
-  let text = '';
-  let at = 0;
-  for (const [start, end] of new Highlighter(pattern).ranges(name)) {
-    text += `${name.slice(at, start)}«${name.slice(start, end)}»`;
-    at = end;
-  }
-  return text + name.slice(at);
-}
 
 // A second of work, where a pattern that runs away takes years.
 const MOST_MICROSECONDS = 1_000_000;
 
 test('highlighting ends soon whatever the pattern', () => {
   const name = 'a'.repeat(255);
-  for (const pattern of ['*a'.repeat(120) + 'b', 'a '.repeat(500), '*' + '?*'.repeat(400)]) {
+  const words: Word[][] = [
+    [{ text: '*a'.repeat(120) + 'b', as: 'glob' }],
+    Array.from({ length: 500 }, () => ({ text: 'a', as: 'literal' })),
+    [{ text: '*' + '?*'.repeat(400), as: 'glob' }],
+  ];
+  for (const all of words) {
     // Of the processor: what else the machine does is no fault of the page.
     const begun = process.cpuUsage();
-    new Highlighter(pattern).ranges(name);
+    new Highlighter(all).ranges(name);
     const { user } = process.cpuUsage(begun);
-    assert.ok(user < MOST_MICROSECONDS, pattern.slice(0, 20));
+    assert.ok(user < MOST_MICROSECONDS, all[0]!.text.slice(0, 20));
   }
 });
 
@@ -81,14 +64,8 @@ test('an address repeats its search, whatever it holds', () => {
   const address: Address = {
     criteria: {
       ...NO_CRITERIA,
-      pattern: 'a b&c=d#e "ü" 100%',
+      pattern: 'a b&c=d#e "ü" 100% created:last-7-days',
       folders: ['/photos/2024 & more', '/Straße'],
-      kind: 'image',
-      extension: 'jpg, png',
-      sizeFrom: '1.5 MB',
-      modified: '2026-01-01..',
-      created: 'last-7-days',
-      owner: 'DOM\\ann',
       contents: true,
       subfolders: false,
     },
@@ -97,8 +74,6 @@ test('an address repeats its search, whatever it holds', () => {
   assert.deepEqual(fromHash(toHash(address)), address);
   assert.equal(fromHash(''), null);
   assert.equal(fromHash('#sort=name'), null);
-  const hostile = fromHash('#q=x&in=javascript:1&in=//evil&type=exe&sort=-DROP');
-  assert.deepEqual(hostile, { criteria: { ...NO_CRITERIA, pattern: 'x' }, sort: null });
 });
 
 test('sizes', () => {
@@ -115,8 +90,8 @@ test('sizes', () => {
 });
 
 test('what a search is started with', async () => {
-  const full: Criteria = { ...NO_CRITERIA, pattern: ' x ', folders: ['/c'], kind: 'image', sizeTo: ' 1 KB ', modified: '2 weeks', contents: true };
-  const asked = { pattern: ' x ', filetype: 'image', size_to: '1 KB', mtime: '2 weeks', search_content: true, recursive: true };
+  const full: Criteria = { ...NO_CRITERIA, pattern: ' x ', folders: ['/c'], contents: true };
+  const asked = { pattern: ' x ', search_content: true, recursive: true };
   const same = async (query: StartParams) => ({ params: query });
   const startParams = async (c: Criteria, folders: string[], begin: Parameters<typeof begun>[2]) => ((await begun(c, folders, begin)) as { params?: object }).params;
   assert.deepEqual(await startParams(full, ['/a'], same), { ...asked, folder_path: ['/c'], search_type: 'advance' }, 'as typed');
@@ -128,32 +103,110 @@ test('what a search is started with', async () => {
     search_content: false,
     search_type: 'simple',
   });
-  for (const [criterion, field] of [['pattern', 'pattern'], ['size_to', 'sizeTo'], ['atime', 'accessed'], ['owner', 'owner'], ['news', 'pattern']] as const) {
-    const wrong = async () => ({ wrong: { criterion, sentence: "'x' is wrong" } }) as const;
-    const told = (error: unknown) => error instanceof CriterionError && error.field === field && error.message === "'x' is wrong.";
-    await assert.rejects(startParams(plain, ['/a'], wrong), told, criterion);
-  }
+  const wrong = async () => ({ wrong: { criterion: 'pattern', sentence: "'x' is wrong" } });
+  const told = (error: unknown) => error instanceof CriterionError && error.field === 'pattern' && error.message === "'x' is wrong.";
+  await assert.rejects(startParams(plain, ['/a'], wrong), told);
   await assert.rejects(startParams(plain, [], same), CriterionError);
   await assert.rejects(startParams({ ...full, pattern: ' ' }, ['/a'], same), CriterionError);
 });
 
-test('what is left out is a term of the query, put in and taken out', () => {
-  const rows: [string, string[], string, string][] = [
-    // pattern, what it leaves out, with .git, without a
-    ['', [], 'exclude:.git', ''],
-    ['plan', [], 'plan exclude:.git', 'plan'],
-    ['plan exclude:a', ['a'], 'plan exclude:a exclude:.git', 'plan'],
-    ['exclude:a plan', ['a'], 'exclude:a plan exclude:.git', 'plan'],
-    ['EXCLUDE:a,.git x', ['a', '.git'], 'EXCLUDE:a,.git x', 'exclude:.git x'],
-    ['exclude:"a b",a x', ['"a b"', 'a'], 'exclude:"a b",a x exclude:.git', 'exclude:"a b" x'],
-    ['"say exclude:a"', [], '"say exclude:a" exclude:.git', '"say exclude:a"'],
-    ['exclude:a\\,b', ['a\\,b'], 'exclude:a\\,b exclude:.git', 'exclude:a\\,b'],
+// "kind:text" of each span; a term is found by its prefix or a word of it.
+const parts = ({ text, spans }: Query) => spans.map(({ begin, end }) => text.slice(begin, end)).join(' / ');
+
+// As the server would cut it, in so far as these tests need it.
+function cut(text: string): Query {
+  const spans = [...text.matchAll(/regex:.*|(!)|(\|)|"[^"]*"?|(?:(\w+):)?[^\s|!"]*(?:"[^"]*"?)?/g)].flatMap((match) => {
+    const [all, , , named] = match;
+    const prefix = named ?? (all.startsWith('regex:') ? 'regex' : undefined);
+    if (!all.trim()) return [];
+    const begin = match.index;
+    const alone = text[begin - 1] !== '!';
+    const span: Span = { kind: prefix ? 'prefix' : /^[!|]$/.test(all) ? 'operator' : 'text', begin, end: begin + all.length, alone };
+    if (prefix) Object.assign(span, { prefix, value: begin + prefix.length + 1 });
+    if (prefix === 'regex' || (all.match(/"/g) ?? []).length % 2 === 1) span.open = true;
+    return [span];
+  });
+  return { text, spans };
+}
+
+test('colours are carried over while one types', () => {
+  const rows: [string, string, string, string][] = [
+    ['plan ext:jp', 'plan ext:jpg', 'plan / ext:jpg', 'at the end of a term'],
+    ['plan ext:jpg', 'plans ext:jpg', 'plans / ext:jpg', 'before others'],
+    ['plan ext:jpg', 'plan a ext:jpg', 'plan / ext:jpg', 'a word between'],
+    ['plan ext:jpg', 'ext:jpg', 'ext:jpg', 'without the first'],
+    ['plan ext:jpg', 'plan ', 'plan', 'without the last'],
+    ['plan ext:jpg', 'plan ext:g', 'plan / ext:g', 'within one'],
+    ['plan ext:jpg', 'x', '', 'all replaced'],
+    ['plan ext:jpg', '', '', 'nothing left'],
+    ['plan', 'plan b', 'plan', 'a word more'],
+    ['aa', 'aaa', 'aaa', 'one of several like it'],
+    ['a|b', 'ax|b', 'ax / | / b', ''],
   ];
-  for (const [pattern, names, more, less] of rows) {
-    assert.deepEqual(excludesOf(pattern), names, pattern);
-    assert.equal(withExclude(pattern, '.git'), more, pattern);
-    assert.equal(withoutExclude(pattern, 'a'), less, pattern);
+  for (const [from, to, moved, why] of rows) assert.equal(parts(movedTo(cut(from), to)), moved, `${from} to ${to}: ${why}`);
+  // Whatever becomes of a text, its pieces are the text.
+  const texts = rows.flatMap(([from, to]) => [from, to]);
+  for (const from of texts) {
+    for (const to of texts) {
+      const query = movedTo(cut(from), to);
+      assert.equal(painted(query).map(({ text }) => text).join(''), to, `${from} to ${to}`);
+      for (const { begin, value = begin, end } of query.spans) assert.ok(begin <= value && value <= end && end <= to.length);
+    }
   }
+});
+
+test('a criterion is a term of the query, put in, changed and taken out', () => {
+  const rows: [string, string, string][] = [
+    // query, with ext:png, without ext
+    ['', 'ext:png', ''],
+    ['plan', 'plan ext:png', 'plan'],
+    ['ext:jpg plan', 'ext:png plan', 'plan'],
+    ['a ext:jpg b', 'a ext:png b', 'a b'],
+    ['a ext:"x y"', 'a ext:png', 'a'],
+    ['a !ext:jpg', 'a !ext:jpg ext:png', 'a !ext:jpg'],
+    ['a regex:^b c', 'ext:png a regex:^b c', 'a regex:^b c'],
+    ['a "open end', 'ext:png a "open end', 'a "open end'],
+    ['a |', 'ext:png a |', 'a |'],
+    ['ext:a ext:b', 'ext:a ext:png', 'ext:a'],
+  ];
+  for (const [text, more, less] of rows) {
+    const query = cut(text);
+    const changed = withTerm(query, shownTerm(query, 'ext'), 'ext', 'png');
+    assert.equal(changed.text, more);
+    assert.deepEqual(parts(changed), parts(cut(more)), text);
+    assert.equal(shownValue(changed, 'ext'), 'png', text);
+    const term = shownTerm(query, 'ext');
+    const left = term ? without(query, term) : query;
+    assert.equal(left.text, less);
+    assert.deepEqual(parts(left), parts(cut(less)), text);
+  }
+  assert.deepEqual(onlyInText(cut('a ext:jpg !ext:b size:>1k size:..2k depth:1 type:link exclude:x')), ['!ext:b', 'size:>1k', 'depth:1', 'type:link']);
+  const sizes: [string, [string, string] | null][] = [
+    ['', ['', '']],
+    ['1KB..2.5GB', ['1KB', '2.5GB']],
+    ['1.5KB..', ['1.5KB', '']],
+    ['..2', ['', '2']],
+    ['>=1k', ['1k', '']],
+    ['<=2k', ['', '2k']],
+    ['>1k', null],
+    ['10MB', null],
+    ['..', ['', '']],
+  ];
+  for (const [value, ends] of sizes) assert.deepEqual(sizeEnds(value), ends, value);
+  assert.equal(sizeBetween(' 1.5 KB', ''), '1.5KB..');
+  assert.equal(written('ext', ' jpg,  .png'), 'jpg,.png');
+  assert.equal(written('owner', 'DOM\\ann b"'), '"DOM\\ann b"');
+  assert.equal(written('modified', '2 weeks'), '"2 weeks"');
+});
+
+test('an address of the time when criteria stood beside the pattern says the same', () => {
+  const rows: [string, string][] = [
+    ['#q=plan&type=image&ext=jpg,+png&min=1.5+MB&modified=2026-01-01..&owner=DOM%5Cann', 'type:image ext:jpg,png size:1.5MB.. modified:2026-01-01.. owner:DOM\\ann plan'],
+    ['#q=&min=1k&max=2k&accessed=2+weeks', 'size:1k..2k opened:"2 weeks"'],
+    ['#q=regex:^a b&group=staff', 'group:staff regex:^a b'],
+    ['#q=x&in=javascript:1&in=//evil&type=exe&sort=-DROP', 'x'],
+  ];
+  for (const [hash, pattern] of rows) assert.deepEqual(fromHash(hash)?.criteria, { ...NO_CRITERIA, pattern }, hash);
 });
 
 test('the small picture of a photo is found, and nothing beyond the bytes there are', () => {
@@ -189,30 +242,21 @@ test('the small picture of a photo is found, and nothing beyond the bytes there 
 });
 
 test('past searches are offered as they were asked for, the pinned first', () => {
-  const asked: Criteria = { ...NO_CRITERIA, pattern: 'x', folders: ['/a/b'], contents: true, modified: 'last-7-days', owner: 'ann', subfolders: false };
+  const asked: Criteria = { ...NO_CRITERIA, pattern: 'x modified:last-7-days', folders: ['/a/b'], contents: true, subfolders: false };
   const of = (change: Partial<Criteria>) => addressOf({ ...NO_CRITERIA, ...change });
   const past = [
     { at: 5, search: of({ pattern: 'news' }) },
     { at: 4, search: addressOf(asked) },
     { at: 3, search: of({ pattern: 'terminal', folders: ['/tmp'] }) },
     { at: 2, search: 'no address' },
-    { at: 1, search: of({ kind: 'image' }), name: 'Pictures' },
+    { at: 1, search: of({ pattern: 'type:image' }), name: 'Pictures' },
   ];
   const list = offered(past, ['/a', '/home']);
-  assert.deepEqual(list.map(titleOf), ['Pictures', 'news', 'x']);
+  assert.deepEqual(list.map(titleOf), ['Pictures', 'news', 'x modified:last-7-days']);
   assert.deepEqual(list[2]!.criteria, asked, 'relative days and contents are kept');
   for (const blank of [{}, { pattern: ' ' }, contentsOf('/a'), { folders: ['/a'] }]) {
     assert.equal(of(blank), '', JSON.stringify(blank));
   }
-});
-
-test('the page sends every parameter that the documents name', () => {
-  const api = fs.readFileSync(join(process.cwd(), '../docs/api.md'), 'utf8');
-  const start = /^### start\n([^]*?)^### /m.exec(api)![1]!;
-  const table = /\| parameter \|.*\n\|[-|]+\n((?:\|.*\n)+)/.exec(start)![1]!;
-  const documented = table.trim().split('\n').flatMap((row) => [...row.split('|')[1]!.matchAll(/`(\w+)`/g)].map((m) => m[1]!));
-  const known = ['folder_path', 'pattern', 'search_type', ...FIELDS.flatMap((field) => criterion(field).params)];
-  assert.deepEqual([...known].sort(), [...documented].sort());
 });
 
 test('exports are safe to open', () => {

@@ -20,7 +20,7 @@ const progress = (finished: boolean, how: number, matches: number, errno?: numbe
   body: { taskid: 't', finished, progress: how, errno, walk: { phase: 'names', matches } },
 });
 const HAPPY: Script = {
-  searches: () => ({ body: { taskid: 't', params: {} } }),
+  searches: () => ({ body: { taskid: 't', params: {}, spans: [] } }),
   list: () => listing(3, true),
   'searches/t': () => progress(true, 1, 3),
   stop: () => data({}),
@@ -90,7 +90,7 @@ test('the rows that come with the begin are shown, and asked for again only wher
   for (const [finished, lists] of [[true, 0], [false, 1]] as const) {
     const page = { files: rows(3), total: 3, offset: 0, finished };
     begin({
-      searches: () => ({ body: { taskid: 't', params: {}, page } }),
+      searches: () => ({ body: { taskid: 't', params: {}, spans: [], page } }),
       'searches/t': (n) => (n < 3 ? progress(false, 0, 3) : progress(true, 1, 3)),
     });
     const over = search.run();

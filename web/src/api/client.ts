@@ -10,6 +10,7 @@ import type {
   Page,
   PastSearch,
   Progress,
+  Read,
   Session,
   Shares,
   Started,
@@ -65,6 +66,9 @@ async function call<T>(api: string, method: string, params: object, init?: Reque
 }
 
 export const startSearch = (params: object) => call<Started>(SEARCH, 'start', params);
+// Of the pattern that was typed, alone or with the place of the caret in it.
+export const readQuery = (typed: { pattern: string; caret?: number }, signal: AbortSignal) =>
+  post('query', typed, { signal }) as Promise<Read>;
 export const instant = (typed: object, signal: AbortSignal) =>
   request(`instant?${new URLSearchParams({ params: JSON.stringify(typed) })}`, {
     signal,

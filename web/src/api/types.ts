@@ -1,4 +1,6 @@
 // What the server replies.
+import type { Span } from '../model/query.ts';
+
 export interface FileRow {
   name: string;
   path: string;
@@ -52,6 +54,21 @@ export interface Progress {
 // What about something that was typed cannot be understood.
 export interface Wrong {
   wrong: { criterion: string; sentence: string };
+  spans?: Span[];
+}
+
+// What a query is understood to be, and what can be written where the caret stands.
+export interface Read {
+  spans: Span[];
+  wrong?: { sentence: string };
+  completion?: Completion;
+}
+
+export interface Completion {
+  of: 'prefix' | 'value' | 'share'; // of shares the page knows which
+  begin: number;
+  end: number;
+  items: { text: string; about: string }[];
 }
 
 // A search that was begun: what was typed as the parameters of its start, and what it had found by
@@ -59,6 +76,7 @@ export interface Wrong {
 export interface Begun {
   taskid: string;
   params: Record<string, unknown>;
+  spans: Span[];
   page?: Partial<Page>;
 }
 

@@ -1,6 +1,7 @@
 // The search in the address bar. It stands behind the "#", which is never sent to the server, so
 // that what people look for does not end up in the logs of a proxy.
-import { CRITERIA, criterion, FIELDS, NO_CRITERIA, type Criteria } from './criteria.ts';
+import type { Criteria } from './criteria.ts';
+import { fromFields } from './terms.ts';
 
 export const SORT_COLUMNS = ['name', 'path', 'type', 'size', 'mtime', 'crtime', 'user'] as const;
 export type SortColumn = (typeof SORT_COLUMNS)[number];
@@ -20,10 +21,8 @@ export function toHash({ criteria, sort }: Address): string {
   const query = new URLSearchParams();
   query.set('q', criteria.pattern);
   for (const folder of criteria.folders) query.append('in', folder);
-  for (const field of FIELDS) {
-    const value = criteria[field];
-    if (value !== NO_CRITERIA[field]) query.set(CRITERIA[field].key, textOf(value));
-  }
+  if (criteria.contents) query.set('contents', '1');
+  if (!criteria.subfolders) query.set('subfolders', '0');
   if (sort) query.set('sort', sortText(sort));
   return '#' + query.toString();
 }
@@ -33,21 +32,13 @@ export function toHash({ criteria, sort }: Address): string {
 export function fromHash(hash: string): Address | null {
   const query = new URLSearchParams(hash.replace(/^#/, ''));
   if (!query.has('q')) return null;
-  const criteria: Criteria = { ...NO_CRITERIA, pattern: query.get('q') ?? '' };
-  criteria.folders = query.getAll('in').filter((folder) => /^\/[^/]/.test(folder));
-  for (const field of FIELDS) {
-    const { key, none, fits } = criterion(field);
-    const value = valueOf(query.get(key) ?? '', none);
-    if (fits?.(value as string) ?? true) Object.assign(criteria, { [field]: value });
-  }
+  const criteria: Criteria = {
+    pattern: fromFields(query.get('q') ?? '', (key) => query.get(key) ?? ''),
+    folders: query.getAll('in').filter((folder) => /^\/[^/]/.test(folder)),
+    contents: query.get('contents') === '1',
+    subfolders: query.get('subfolders') !== '0',
+  };
   return { criteria, sort: parseSort(query.get('sort')) };
-}
-
-const textOf = (value: string | boolean) => (typeof value === 'string' ? value : value ? '1' : '0');
-// A choice is told only by the value that it does not have by itself.
-function valueOf(text: string, none: string | boolean): string | boolean {
-  if (typeof none === 'string') return text;
-  return text === textOf(!none) ? !none : none;
 }
 
 export function sortText(sort: Sort | null): string {

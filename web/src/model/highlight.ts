@@ -1,9 +1,9 @@
-// Which part of a name a pattern matched. The server decides what matches; this only finds where, by
-// the words of the same language (words.ts). The cases of tests/patterns.json are asked of both. What
-// it cannot find is simply not highlighted. Takes at most name length x pattern length steps, save
-// for regular expressions, where only those are tried that cannot run away.
+// Which part of a name a pattern matched. The server decides what matches, and by which words; this
+// only finds where (the cases of tests/patterns.json are asked of both). What it cannot find is simply
+// not highlighted. Takes at most name length x pattern length steps, save for regular expressions,
+// where only those are tried that cannot run away.
+import type { Word } from './query.ts';
 import type { Range } from './text.ts';
-import { expand, isWild, type Word, wordsOf } from './words.ts';
 
 // A repeated group, or a back reference, is what makes a backtracking engine run away; a named class
 // is none to the browser.
@@ -14,12 +14,12 @@ export class Highlighter {
   private readonly regexes: RegExp[];
 
   // As the server does, a name is taken as one text, and contents line by line.
-  constructor(pattern: string, where: 'name' | 'contents' = 'name') {
-    const words = wordsOf(pattern).flatMap((word) => (where === 'name' ? inName(word) : inContents(word)));
-    this.regexes = words.flatMap((word) => (word.kind === 'regex' ? compile(word, where) : []));
+  constructor(all: Word[], where: 'name' | 'contents' = 'name') {
+    const words = all.filter((word) => (word.in ?? where) === where);
+    this.regexes = words.flatMap((word) => (word.as === 'regex' ? compile(word, where) : []));
     const changed = (word: Word) => (word.exact ? compose : fold)(word.text).text;
     this.words = words
-      .filter((word) => word.kind !== 'regex')
+      .filter((word) => word.as !== 'regex')
       .map((word) => ({ ...word, text: changed(word) }));
   }
 
@@ -46,26 +46,9 @@ export class Highlighter {
   }
 }
 
-// Of a path only the last name is seen.
-function inName(word: Word): Word[] {
-  if (word.kind === 'content') return [];
-  if (word.kind === 'regex') return [word];
-  const text = word.text.slice(word.text.lastIndexOf('/') + 1);
-  const globs = word.kind === 'glob' ? expand(text) : [text];
-  const path = text !== word.text;
-  return globs
-    .filter((one) => one !== '')
-    .map((one) => ({ ...word, text: one, kind: path && word.kind === 'literal' ? 'first' : word.kind }));
-}
-
-function inContents(word: Word): Word[] {
-  if (word.kind === 'glob' && isWild(word.text)) return [];
-  return [word.kind === 'regex' ? word : { ...word, kind: 'literal' }];
-}
-
 function placesOf(text: string, word: Word): Range[] {
-  if (word.kind === 'glob') return globPlaces(text, word.text);
-  if (word.kind === 'first') return text.startsWith(word.text) ? [[0, word.text.length]] : [];
+  if (word.as === 'glob') return globPlaces(text, word.text);
+  if (word.as === 'start') return text.startsWith(word.text) ? [[0, word.text.length]] : [];
   return literalPlaces(text, word.text);
 }
 

@@ -14,10 +14,12 @@ import {
   begun as begin,
   type Criteria,
 } from '../model/criteria.ts';
+import type { Query } from '../model/query.ts';
 import { parseColumns } from '../view/columns.ts';
 import { Instant } from './instant.ts';
 import { recall, remember } from './memory.ts';
 import { Past } from './past.ts';
+import { Reading } from './reading.ts';
 import { firstPage, Search } from './search.ts';
 import type { Shown } from './shown.ts';
 import { Thumbnails } from './thumbnails.ts';
@@ -47,6 +49,8 @@ export class App {
   search: Search | null = null;
   readonly instant: Instant;
   readonly past: Past;
+  readonly reading: Reading;
+  caret = -1; // in the query, while it is typed
   unfolded = false;
   columns = parseColumns(recall('columns'));
   pictures = recall('pictures') === 'shown';
@@ -67,6 +71,7 @@ export class App {
 
   constructor(private readonly draw: () => void) {
     this.instant = new Instant(this.changed, this.signedOut);
+    this.reading = new Reading(this.changed);
     this.thumbnails = new Thumbnails(this.changed);
     this.past = new Past(() => this.everywhere, this.changed, this.failed);
     addEventListener('popstate', () => this.followAddress());
@@ -177,13 +182,25 @@ export class App {
     return this.homes ? [...folders, '/home'] : folders;
   }
 
-  edit(change: Partial<Criteria>): void {
+  // `caret`: where in the pattern one types; `query`: what it is made of, where that is known.
+  edit(change: Partial<Criteria>, caret?: number, query?: Query): void {
     this.draftError = null;
     // Who types a name while a folder lies open looks for it below that.
     const below = change.pattern && browses(this.draft) ? { subfolders: true } : {};
     this.draft = { ...this.draft, ...below, ...change };
+    this.reading.follow(this.draft.pattern, caret, query);
     this.askAtOnce();
     this.changed();
+  }
+
+  // Has terms of the query that is typed taken out, or others put in their place; `and` does something
+  // with what has come of it.
+  rewrite(change: (query: Query) => Query, and?: () => void): void {
+    this.reading.whenSure(() => {
+      const query = change(this.reading.query);
+      this.edit({ pattern: query.text }, undefined, query);
+      and?.();
+    });
   }
 
   // What is typed and not yet searched for is shown as far as an index knows it.
@@ -209,6 +226,7 @@ export class App {
   // Searches for what is typed, and puts it into the address bar.
   submit(change: Partial<Criteria> = {}): void {
     this.edit(change);
+    this.reading.expect(this.draft.pattern);
     this.instant.cancel();
     const sort = this.nextSort();
     const hash = toHash({ criteria: this.draft, sort });
@@ -261,6 +279,7 @@ export class App {
     if (seen) {
       this.instant.drop();
       Object.assign(this, seen, { draft: seen.search.criteria, draftError: null });
+      this.reading.follow(this.draft.pattern);
       this.setTitle();
       this.followDetails(step);
     } else {
@@ -273,6 +292,7 @@ export class App {
     else this.trail.begin();
     history.replaceState({ entry: this.trail.entry } satisfies Step, '');
     this.draft = criteria;
+    this.reading.expect(criteria.pattern);
     void this.start(criteria, sort).then((started) => {
       if (!started || !this.search) return;
       this.search.scroll.restore(step?.above ?? 0);
@@ -333,6 +353,7 @@ export class App {
     this.instant.drop();
     Object.assign(this, { detailed: null, active: -1, draft: NO_CRITERIA });
     this.draftError = null;
+    this.reading.follow('');
     this.setTitle();
     this.changed();
   }
@@ -344,7 +365,11 @@ export class App {
     if (this.standing === undefined) this.standing = this.search;
     else this.search?.close();
     const list = firstPage(sort);
-    const begun = begin(criteria, this.everywhere, (asked) => client.beginSearch(asked, list));
+    const begun = begin(criteria, this.everywhere, async (asked) => {
+      const reply = await client.beginSearch(asked, list);
+      if (reply.spans) this.reading.learn(criteria.pattern, { ...reply, spans: reply.spans });
+      return reply;
+    });
     const search = new Search(criteria, begun, sort, this.changed, this.signedOut);
     this.search = search;
     const ended = search.run();
@@ -355,7 +380,7 @@ export class App {
     if (error instanceof CriterionError) {
       this.abandon();
       this.draftError = error;
-      if (error.field !== 'pattern' && error.field !== 'folders') this.unfolded = true;
+      if (error.field === 'contents') this.unfolded = true;
       this.changed();
       return false;
     }

@@ -48,7 +48,7 @@ export class Search {
   readonly choice = new Choice(() => this.pages.order);
   filter = ''; // what the rows that are shown fit beside what was asked for
   filterWrong = false;
-  readonly lines?: Lines;
+  lines?: Lines;
   private taskid = '';
   private closed = false;
   private stopAsked = false;
@@ -62,8 +62,6 @@ export class Search {
     private readonly changed: () => void,
     private readonly signedOut: () => void,
   ) {
-    const { contents, pattern } = criteria;
-    if (contents || /(^|[ |<!])content:/i.test(pattern)) this.lines = new Lines(pattern, changed);
     this.pages = new Pages(
       async (offset, limit, signal) => {
         const page = await this.list(offset, limit, signal);
@@ -96,7 +94,11 @@ export class Search {
     const { sort } = this;
     let page: Page | undefined;
     try {
-      ({ taskid: this.taskid, page } = await this.begun);
+      const begun = await this.begun;
+      ({ taskid: this.taskid, page } = begun);
+      const { contents, pattern } = this.criteria;
+      const inside = begun.spans.some(({ prefix }) => prefix === 'content');
+      if (contents || inside) this.lines = new Lines(pattern, this.changed);
     } catch (error) {
       this.fail(error);
       return;

@@ -2,6 +2,7 @@
 import { Fragment } from 'preact';
 import type { Misses as NearMisses } from '../api/types.ts';
 import { browses, hasCriteria, NO_CRITERIA, type Criteria } from '../model/criteria.ts';
+import { withoutCriteria } from '../model/terms.ts';
 import { plural, visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 import type { Search } from '../state/search.ts';
@@ -80,9 +81,11 @@ export function Nothing({ app, search }: { app: App; search: Search }) {
     );
   }
   const offers: [string, () => void][] = [];
-  if (hasCriteria(c)) {
-    const bare = { ...NO_CRITERIA, pattern: c.pattern, folders: c.folders };
-    offers.push(['Search without the criteria', () => app.submit(bare)]);
+  const query = app.reading.of(c.pattern);
+  const bare = query && withoutCriteria(query).text;
+  if (hasCriteria(c) || (bare !== null && bare !== c.pattern)) {
+    const pattern = bare ?? c.pattern;
+    offers.push(['Search without the criteria', () => app.submit({ ...NO_CRITERIA, pattern, folders: c.folders })]);
   }
   if (c.folders.length > 0) offers.push(['Search all folders', () => app.submit({ ...c, folders: [] })]);
   if (!c.contents && c.pattern.trim()) {

@@ -1,52 +1,66 @@
-// The criteria beside the name. Folded away they are shown as tags that can be taken off.
+// The criteria: another view of the terms of the query. What is chosen here is written there, and what
+// is written there is shown here where it can be; below are the tags that say what the terms mean.
 import { useState } from 'preact/hooks';
+import { browses, hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
+import { nameList, without, withTerm, type Query, type Span } from '../model/query.ts';
 import {
-  browses,
-  CRITERIA,
-  describe,
-  FIELDS,
-  hasCriteria,
+  excludesOf,
   KINDS,
-  NO_CRITERIA,
-  type Field,
-  type TextField,
-} from '../model/criteria.ts';
+  onlyInText,
+  shownTerm,
+  shownValue,
+  sizeBetween,
+  sizeEnds,
+  TEXTS,
+  TIMES,
+  USUAL_EXCLUDES,
+  withoutCriteria,
+  written,
+} from '../model/terms.ts';
 import { isDay, splitCustom, TIME_WORDS } from '../model/times.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
-import { ExcludeChoice } from './Excludes.tsx';
 import { Icon } from './icons.tsx';
 
 const LAST_DAY = '2038-01-18'; // the last whole day that a search can compare
 const BETWEEN = 'between';
 const WRITTEN = 'written';
 
-// The two sizes stand side by side; the rest as they come in the table.
-const AFTER_SIZE = FIELDS.slice(FIELDS.indexOf('sizeTo') + 1);
+// `value` as it has to stand in a query.
+function put(app: App, prefix: string, value: string): void {
+  app.rewrite((query) => withTerm(query, shownTerm(query, prefix), prefix, value));
+}
 
 export function CriteriaPanel({ app }: { app: App }) {
-  const error = app.draftError;
+  const { query } = app.reading;
+  const bare = withoutCriteria(query);
+  const others = onlyInText(query);
+  const error = app.draftError?.field === 'contents' ? app.draftError.message : '';
+  const removeAll = () => {
+    app.rewrite(withoutCriteria);
+    app.edit({ ...NO_CRITERIA, pattern: app.draft.pattern, folders: app.draft.folders });
+  };
   return (
     <section class="criteria" id="criteria" aria-label="Criteria">
-      <Input app={app} field="kind" />
-      <Input app={app} field="extension" />
-      <div class="pair" role="group" aria-label="Size">
-        <Input app={app} field="sizeFrom" />
-        <Input app={app} field="sizeTo" />
-      </div>
-      {AFTER_SIZE.map((field) => (
-        <Input key={field} app={app} field={field} />
+      <Kinds app={app} />
+      <Text app={app} prefix="ext" />
+      <Size app={app} />
+      {(Object.keys(TIMES) as (keyof typeof TIMES)[]).map((prefix) => (
+        <Time key={prefix} app={app} prefix={prefix} />
       ))}
+      <Text app={app} prefix="owner" />
+      <Text app={app} prefix="group" />
+      <Contents app={app} />
       <ExcludeChoice app={app} />
       <footer>
-        <p class="hint" role="alert">
-          {error && error.field in CRITERIA ? <span class="wrong">{error.message}</span> : 'Write a size as 1.5 GB, and a time of your own as 2 weeks, 2026-07 or <2025.'}
+        <p class="hint" role={error ? 'alert' : undefined}>
+          {error ? <span class="wrong">{error}</span> : others.length > 0 ? <OnlyInText terms={others} /> : 'Write a size as 1.5 GB, and a time of your own as 2 weeks, 2026-07 or <2025.'}
         </p>
         <button
           type="button"
           class="quiet"
-          disabled={!hasCriteria(app.draft)}
-          onClick={() => app.edit({ ...NO_CRITERIA, pattern: app.draft.pattern, folders: app.draft.folders })}
+          disabled={!hasCriteria(app.draft) && bare.text === query.text}
+          onClick={removeAll}
         >
           Remove all criteria
         </button>
@@ -55,33 +69,35 @@ export function CriteriaPanel({ app }: { app: App }) {
   );
 }
 
-function Input({ app, field }: { app: App; field: Field }) {
-  switch (CRITERIA[field].input) {
-    case 'kind':
-      return <Kinds app={app} />;
-    case 'text':
-      return <Text app={app} field={field as TextField} />;
-    case 'time':
-      return <Time app={app} field={field as TextField} />;
-    case 'choice':
-      return <Choice app={app} field={field} />;
-    case 'folders':
-      return null;
-  }
+function OnlyInText({ terms }: { terms: string[] }) {
+  return (
+    <>
+      Only in the text:{' '}
+      {terms.map((term, i) => (
+        <>
+          {i > 0 && ' '}
+          <code>{visible(term)}</code>
+        </>
+      ))}
+    </>
+  );
 }
 
 function Kinds({ app }: { app: App }) {
+  const { query } = app.reading;
+  const chosen = shownValue(query, 'type');
+  const other = chosen === '' && query.spans.some(({ prefix, alone }) => prefix === 'type' && alone);
   return (
     <fieldset class="kinds">
-      <legend>{CRITERIA.kind.label}</legend>
+      <legend>Type</legend>
       <div class="segments">
         {KINDS.map(([kind, name]) => (
           <label key={kind}>
             <input
               type="radio"
               name="kind"
-              checked={app.draft.kind === kind}
-              onChange={() => app.edit({ kind })}
+              checked={chosen === kind && !other}
+              onChange={() => put(app, 'type', kind)}
             />
             <span>{name}</span>
           </label>
@@ -91,65 +107,105 @@ function Kinds({ app }: { app: App }) {
   );
 }
 
-function Choice({ app, field }: { app: App; field: Field }) {
+function Contents({ app }: { app: App }) {
   return (
-    <label class={`choice ${field}`}>
+    <label class="choice contents">
       <input
         type="checkbox"
-        checked={app.draft[field] === true}
-        onChange={(event) => app.edit({ [field]: event.currentTarget.checked })}
+        checked={app.draft.contents}
+        onChange={(event) => app.edit({ contents: event.currentTarget.checked })}
       />
-      {CRITERIA[field].label}
+      Also look inside files
     </label>
   );
 }
 
-function searchOnEnter(app: App): (event: KeyboardEvent) => void {
-  return (event) => {
-    if (event.key === 'Enter' && !event.isComposing) app.submit();
-  };
+interface TypedProps {
+  app: App;
+  prefix: string;
+  value: string; // as the query has it
+  put: (value: string) => string; // writes it, and gives what the query has then
+  label?: string; // where no element around it has one
+  placeholder?: string;
 }
 
-// `label`: where no element around it has one.
-function Typed(props: { app: App; field: TextField; label?: string; placeholder?: string }) {
-  const { app, field, label, placeholder } = props;
+// What is typed stays as it is typed while the query has it in its own form, or has not got it yet.
+function Typed({ app, prefix, value, put: write, label, placeholder }: TypedProps) {
+  const [typed, setTyped] = useState({ text: value, before: value, value });
+  const own = value === typed.value || value === typed.before;
   return (
     <input
       type="text"
       aria-label={label}
-      value={app.draft[field]}
+      value={own ? typed.text : value}
       placeholder={placeholder}
       spellcheck={false}
       autocapitalize="none"
       autocomplete="off"
-      aria-invalid={app.draftError?.field === field}
-      onInput={(event) => app.edit({ [field]: event.currentTarget.value })}
-      onKeyDown={searchOnEnter(app)}
+      aria-invalid={shownTerm(app.reading.query, prefix)?.wrong !== undefined}
+      onInput={(event) => {
+        const text = event.currentTarget.value;
+        setTyped({ text, before: value, value: write(text) });
+      }}
+      onBlur={() => setTyped({ text: value, before: value, value })}
+      onKeyDown={(event) => event.key === 'Enter' && !event.isComposing && app.submit()}
     />
   );
 }
 
-function Text({ app, field }: { app: App; field: TextField }) {
-  const { label, placeholder } = CRITERIA[field];
+const unquoted = (value: string) => value.replaceAll('"', '');
+
+function Text({ app, prefix }: { app: App; prefix: keyof typeof TEXTS }) {
+  const [label, placeholder] = TEXTS[prefix];
+  const write = (text: string) => {
+    const value = written(prefix, text);
+    put(app, prefix, value);
+    return unquoted(value);
+  };
   return (
-    <label class={`labelled ${field}`}>
+    <label class={`labelled ${prefix}`}>
       <span>{label}</span>
-      <Typed app={app} field={field} placeholder={placeholder} />
+      <Typed app={app} prefix={prefix} value={shownValue(app.reading.query, prefix)} put={write} placeholder={placeholder} />
     </label>
   );
 }
 
-function Time({ app, field }: { app: App; field: TextField }) {
-  const { label } = CRITERIA[field];
-  const value = app.draft[field];
+function Size({ app }: { app: App }) {
+  const [from, to] = sizeEnds(shownValue(app.reading.query, 'size')) ?? ['', ''];
+  const write = (first: string, last: string) => {
+    const value = sizeBetween(first, last);
+    put(app, 'size', value);
+    return sizeEnds(unquoted(value)) ?? ['', ''];
+  };
+  return (
+    <div class="pair" role="group" aria-label="Size">
+      <label class="labelled">
+        <span>Size from</span>
+        <Typed app={app} prefix="size" value={from} put={(text) => write(text, to)[0]} placeholder="10 MB" />
+      </label>
+      <label class="labelled">
+        <span>to</span>
+        <Typed app={app} prefix="size" value={to} put={(text) => write(from, text)[1]} placeholder="2 GB" />
+      </label>
+    </div>
+  );
+}
+
+function Time({ app, prefix }: { app: App; prefix: keyof typeof TIMES }) {
+  const label = TIMES[prefix];
+  const value = shownValue(app.reading.query, prefix);
   const [from, to] = splitCustom(value);
   const isWord = TIME_WORDS.some(([word]) => word === value);
   const [choice, setChoice] = useState('');
   const days = from + to !== '' && [from, to].every((end) => end === '' || isDay(end));
   const told = isWord ? value : days ? BETWEEN : value !== '' ? WRITTEN : choice;
   const kind = choice === WRITTEN ? choice : told;
-  const setDays = (first: string, last: string) =>
-    app.edit({ [field]: first || last ? `${first}..${last}` : '' });
+  const write = (text: string) => {
+    const next = written(prefix, text);
+    put(app, prefix, next);
+    return unquoted(next);
+  };
+  const setDays = (first: string, last: string) => write(first || last ? `${first}..${last}` : '');
   return (
     <div class={`labelled time ${kind === BETWEEN ? 'custom' : ''}`} role="group" aria-label={label}>
       <label>
@@ -160,7 +216,7 @@ function Time({ app, field }: { app: App; field: TextField }) {
             const word = event.currentTarget.value;
             const own = word === BETWEEN || word === WRITTEN;
             setChoice(own ? word : '');
-            app.edit({ [field]: own ? '' : word });
+            write(own ? '' : word);
           }}
         >
           <option value="">Any time</option>
@@ -176,7 +232,9 @@ function Time({ app, field }: { app: App; field: TextField }) {
       {kind === WRITTEN && (
         <Typed
           app={app}
-          field={field}
+          prefix={prefix}
+          value={value}
+          put={write}
           label={`${label}, as written`}
           placeholder="2 weeks, 2026-07, <2025"
         />
@@ -204,29 +262,91 @@ function Time({ app, field }: { app: App; field: TextField }) {
   );
 }
 
-// One tag for each criterion; taking it off searches again when there is a search to repeat.
+function ExcludeChoice({ app }: { app: App }) {
+  const left = excludesOf(app.reading.query);
+  return (
+    <fieldset class="excludes">
+      <legend>Leave out</legend>
+      {USUAL_EXCLUDES.map((name) => (
+        <button
+          type="button"
+          class="tool"
+          key={name}
+          aria-pressed={left.includes(name)}
+          onClick={() =>
+            app.rewrite((query) =>
+              excludesOf(query).includes(name)
+                ? withoutExclude(query, name)
+                : withTerm(query, undefined, 'exclude', nameList([name])),
+            )
+          }
+        >
+          {name}
+        </button>
+      ))}
+    </fieldset>
+  );
+}
+
+function withoutExclude(query: Query, name: string): Query {
+  const holds = ({ prefix, alone, values }: Span) => prefix === 'exclude' && alone && values?.includes(name);
+  const term = query.spans.find(holds);
+  if (!term) return query;
+  const others = term.values!.filter((other) => other !== name);
+  const next = withTerm(query, term, 'exclude', nameList(others));
+  const spans = next.spans.map((span) => (span.begin === term.begin && holds(span) ? { ...span, values: others } : span));
+  return withoutExclude({ ...next, spans }, name);
+}
+
+// One tag for each criterion, which says what it means; taking it off searches again when there is a
+// search to repeat.
 export function CriteriaTags({ app }: { app: App }) {
-  // Of a folder that lies open the way down to it says so.
-  const told = browses(app.draft) ? FIELDS.filter((field) => field !== 'subfolders') : FIELDS;
-  const tags = told.flatMap((field) => {
-    const alone = { ...NO_CRITERIA, [field]: app.draft[field] };
-    return describe(alone).map((text) => ({ field, text }));
-  });
-  const drop = (field: Field) => {
-    const change = { [field]: NO_CRITERIA[field] };
-    if (app.search) app.submit(change);
-    else app.edit(change);
+  const { query } = app.reading;
+  const { contents, subfolders } = app.draft;
+  const change = (edit: (query: Query) => Query) => app.rewrite(edit, () => app.search && app.submit());
+  const drop = (back: { contents?: false; subfolders?: true }) => {
+    if (app.search) app.submit(back);
+    else app.edit(back);
   };
+  const TEXT_PREFIXES = ['content', 'case', 'regex'];
+  const terms = query.spans.filter(
+    ({ prefix, alone, says }) => prefix && alone && says && !TEXT_PREFIXES.includes(prefix),
+  );
   return (
     <>
-      {tags.map(({ field, text }) => (
-        <span class="tag" key={field}>
-          <span class="ellipsis">{visible(text)}</span>
-          <button type="button" class="quiet" aria-label={`Remove: ${visible(text)}`} onClick={() => drop(field)}>
-            <Icon name="close" size={10} />
-          </button>
-        </span>
-      ))}
+      {terms.flatMap((span) =>
+        span.prefix === 'exclude' && span.values
+          ? span.values.map((name) => (
+              <Tag key={`-${name}`} text={`without ${name}`} drop={() => change((now) => withoutExclude(now, name))} />
+            ))
+          : [
+              <Tag
+                key={span.prefix}
+                text={span.says!}
+                drop={() => change((now) => dropped(now, span))}
+              />,
+            ],
+      )}
+      {contents && <Tag text="also inside files" drop={() => drop({ contents: false })} />}
+      {/* Of a folder that lies open the way down to it says so. */}
+      {!subfolders && !browses(app.draft) && <Tag text="not in subfolders" drop={() => drop({ subfolders: true })} />}
     </>
+  );
+}
+
+// The same term of what the query is by now.
+function dropped(query: Query, { prefix, begin }: Span): Query {
+  const span = query.spans.find((one) => one.prefix === prefix && one.begin === begin);
+  return span ? without(query, span) : query;
+}
+
+function Tag({ text, drop }: { text: string; drop: () => void }) {
+  return (
+    <span class="tag">
+      <span class="ellipsis">{visible(text)}</span>
+      <button type="button" class="quiet" aria-label={`Remove: ${visible(text)}`} onClick={drop}>
+        <Icon name="close" size={10} />
+      </button>
+    </span>
   );
 }

@@ -5,6 +5,7 @@ import { fileAddress, foundLine } from '../api/client.ts';
 import type { FileRow, FoundLine } from '../api/types.ts';
 import { Highlighter } from '../model/highlight.ts';
 import { previewKind, textPieces } from '../model/preview.ts';
+import type { Word } from '../model/query.ts';
 import { formatSize } from '../model/size.ts';
 import { count, folderOf, visible } from '../model/text.ts';
 import { formatTime } from '../model/times.ts';
@@ -35,7 +36,7 @@ export function Details({ app, row, pattern, actions }: Props) {
           <Icon name="close" size={15} />
         </button>
       </header>
-      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} />}
+      {!row.is_dir && <Preview key={row.path} row={row} pattern={pattern} words={app.reading.wordsOf(pattern)} />}
       <div class="actions">
         {row.is_dir && (
           <button type="button" class="tool" onClick={() => app.browse(row.path)}>
@@ -104,7 +105,13 @@ function sizeFact(size: number): string {
   return size < 1000 ? `${size} bytes` : `${formatSize(size)} (${count(size)} bytes)`;
 }
 
-function Preview({ row, pattern }: { row: FileRow; pattern: string }) {
+interface PreviewProps {
+  row: FileRow;
+  pattern: string;
+  words: Word[];
+}
+
+function Preview({ row, pattern, words }: PreviewProps) {
   const [failed, setFailed] = useState(false);
   const kind = previewKind(row.name);
   if (kind === 'none' || row.size === 0) {
@@ -128,11 +135,11 @@ function Preview({ row, pattern }: { row: FileRow; pattern: string }) {
       </div>
     );
   }
-  return <TextPreview row={row} pattern={pattern} fail={() => setFailed(true)} />;
+  return <TextPreview row={row} pattern={pattern} words={words} fail={() => setFailed(true)} />;
 }
 
 // In whatever encoding it is written, with the first line in sight that holds what was asked for.
-function TextPreview({ row, pattern, fail }: { row: FileRow; pattern: string; fail: () => void }) {
+function TextPreview({ row, pattern, words, fail }: PreviewProps & { fail: () => void }) {
   const [found, setFound] = useState<FoundLine | null>(null);
   const box = useRef<HTMLDivElement>(null);
   useEffect(() => {
@@ -147,8 +154,8 @@ function TextPreview({ row, pattern, fail }: { row: FileRow; pattern: string; fa
   // Of a long file its lines are highlighted from where they are shown.
   const lines = useMemo(() => {
     if (!text) return [];
-    return textPieces(text.text, new Highlighter(pattern, 'contents'));
-  }, [text, pattern]);
+    return textPieces(text.text, new Highlighter(words, 'contents'));
+  }, [text, words]);
   useEffect(() => {
     if (!box.current || !found?.text) return;
     const { line, text } = found;

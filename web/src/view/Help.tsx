@@ -3,6 +3,7 @@ import { useEffect, useRef } from 'preact/hooks';
 const KEYS = [
   ['/', 'to the search field'],
   ['Enter', 'search; in the table, open'],
+  ['Ctrl Space', 'what can be written at this place; Tab takes it'],
   ['↓ ↑', 'past searches; in the table, move'],
   ['Page ↓ ↑, Home, End', 'move far'],
   ['Shift, Ctrl', 'with ↓ ↑ or a click: choose several rows'],

@@ -16,13 +16,13 @@ import { Failed, Nothing, Welcome } from './Blank.tsx';
 import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
 import { Crumbs } from './Crumbs.tsx';
 import { Details } from './Details.tsx';
-import { ExcludeTags } from './Excludes.tsx';
 import { FolderPicker } from './FolderPicker.tsx';
 import { Gate } from './Gate.tsx';
 import { Help } from './Help.tsx';
 import { Icon, Wordmark } from './icons.tsx';
 import { Popover } from './Popover.tsx';
 import { ResultTable, type RowActions } from './ResultTable.tsx';
+import { QueryLine } from './QueryLine.tsx';
 import { SearchBar } from './SearchBar.tsx';
 import { InstantLine, StatusLine } from './StatusLine.tsx';
 
@@ -52,6 +52,7 @@ export function Page({ app }: { app: App }) {
           </a>
         </h1>
         <SearchBar app={app} />
+        <QueryLine app={app} />
         <Menu app={app} help={() => setHelp(true)} />
       </header>
       <section class="toolbar" aria-label="Folders and criteria">
@@ -68,9 +69,8 @@ export function Page({ app }: { app: App }) {
           <Icon name={app.unfolded ? 'up' : 'down'} size={11} />
         </button>
         <CriteriaTags app={app} />
-        <ExcludeTags app={app} />
       </section>
-      {app.draftError && !inPanel(app.draftError) && (
+      {app.draftError && !inPlace(app.draftError) && (
         <p class="wrong band" role="alert">
           {app.draftError.message}
         </p>
@@ -88,7 +88,7 @@ export function Page({ app }: { app: App }) {
 }
 
 // Told beside the field that it is about.
-const inPanel = ({ field }: CriterionError) => field !== 'pattern' && field !== 'folders';
+const inPlace = ({ field }: CriterionError) => field !== 'folders';
 
 function Result({ app, actions }: { app: App; actions: RowActions }) {
   const { search } = app;
