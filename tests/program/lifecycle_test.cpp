@@ -182,6 +182,8 @@ TEST_F(Lifecycle, CleanRemovesTheSearchesItNamesAndNoOther) {
 TEST_F(Lifecycle, WhatCannotBeReadCanBeCleaned) {
   const std::string id = StartQuick("one");
   const std::string results = Databases(dir_ + "/volume1", nas_test::Me()).at(0);
+  // A listing that was there when the worker ended leaves the log, which has all rows too.
+  for (const char* part : {"-wal", "-shm", ""}) fs::remove(results + part);
   WriteFile(results, "no database");
   EXPECT_EQ(Call("list", Id(id)).code, 600);
   EXPECT_EQ(Call("clean", Id(id)).code, 0);
