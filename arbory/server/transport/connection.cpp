@@ -178,9 +178,26 @@ void Connection::OnHeader(Error error) {
 void Connection::ReadBody() {
   sent_ = 0;
   Arm(host_->settings().header_seconds);
-  http::async_read(socket_, in_, *parser_, [self = shared_from_this()](Error error, size_t) {
-    if (error) return self->OnReadError(error);
-    self->Dispatch();
+  parser_->eager(true);
+  if (parser_->is_done()) return Dispatch();
+  ReadPiece();
+}
+
+void Connection::ReadPiece() {
+  if (timed_out_) return OnReadError(asio::error::operation_aborted);
+  http::async_read_some(socket_, in_, *parser_,
+                        [self = shared_from_this()](Error error, size_t) { self->OnPiece(error); });
+}
+
+// A body that is not held is read so that its client comes to the reply, which is for its client
+// alone to wait for: many such bodies at once are no reason for the others to.
+void Connection::OnPiece(Error error) {
+  if (error) return OnReadError(error);
+  if (parser_->is_done()) return Dispatch();
+  if (parser_->get().body().room) return ReadPiece();
+  socket_.async_wait(asio::socket_base::wait_read, [self = shared_from_this()](Error waited) {
+    if (waited) return self->OnReadError(waited);
+    self->host_->turns().Await([self] { self->ReadPiece(); });
   });
 }
 

@@ -15,6 +15,7 @@
 #include "arbory/server/transport/child_pipe.h"
 #include "arbory/server/transport/held_body.h"
 #include "arbory/server/transport/http.h"
+#include "arbory/server/transport/turns.h"
 #include "nas/system/child.h"
 #include "nas/system/config.h"
 
@@ -32,6 +33,8 @@ class ConnectionHost {
   virtual const Proxies& proxies() const = 0;
   virtual HttpService& service() = 0;
   virtual bool stopping() const = 0;
+  // For what no reply waits for.
+  virtual Turns& turns() = 0;
   // Takes the child and its token over: it is reaped there, and killed when it stays silent.
   virtual std::shared_ptr<ChildPipe> Adopt(ChildAnswer* answer) = 0;
   // Called by the connection's destructor.
@@ -68,6 +71,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void SetClient();
   void OnHeader(Error error);
   void ReadBody();
+  void ReadPiece();
+  void OnPiece(Error error);
   void OnReadError(Error error);
   void Dispatch();
   Answer HandleSafely();

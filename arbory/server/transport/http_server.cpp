@@ -118,6 +118,7 @@ class HttpServer::Loop : public ConnectionHost {
   const Proxies& proxies() const override { return proxies_; }
   HttpService& service() override { return *service_; }
   bool stopping() const override { return stopping_; }
+  Turns& turns() override { return turns_; }
 
   std::shared_ptr<ChildPipe> Adopt(ChildAnswer* answer) override {
     auto pipe =
@@ -169,6 +170,7 @@ class HttpServer::Loop : public ConnectionHost {
     if (!awaiting_children_) AwaitChildren();
     Reap();  // also those whose signal came to nothing
     if (!accepting_ && !stopping_) Accept();
+    turns_.Continue();
   }
 
   template <typename Step>
@@ -377,6 +379,7 @@ class HttpServer::Loop : public ConnectionHost {
   std::string address_;
   std::set<Connection*> connections_;  // each keeps itself alive by what it waits for
   asio::io_context loop_;
+  Turns turns_{&loop_};
   tcp::acceptor acceptor_;
   asio::steady_timer accept_pause_;
   asio::steady_timer errand_timer_;
