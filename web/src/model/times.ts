@@ -27,19 +27,6 @@ export function splitCustom(value: string): [string, string] {
   return parts.length === 2 ? [parts[0]!, parts[1]!] : ['', ''];
 }
 
-export function describeTime(value: string): string {
-  const word = TIME_WORDS.find(([key]) => key === value);
-  if (word) return word[1].toLowerCase();
-  const [from, to] = splitCustom(value).map(shown) as [string, string];
-  if (from && to) return from === to ? `on ${from}` : `${from} to ${to}`;
-  if (from) return `since ${from}`;
-  return to ? `until ${to}` : value;
-}
-
-function shown(end: string): string {
-  return /^\d{5,}$/.test(end) ? formatTime(Number(end)) : end;
-}
-
 export function formatTime(second: number): string {
   const time = new Date(second * 1000);
   return `${dayOf(second)} ${two(time.getHours())}:${two(time.getMinutes())}`;

@@ -225,6 +225,7 @@ export class App {
 
   // Searches for what is typed, and puts it into the address bar.
   submit(change: Partial<Criteria> = {}): void {
+    if (this.reading.pending) return this.reading.whenSure(() => this.submit(change));
     this.edit(change);
     this.reading.expect(this.draft.pattern);
     this.instant.cancel();

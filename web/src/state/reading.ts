@@ -66,6 +66,10 @@ export class Reading {
     else this.waiting.push(act);
   }
 
+  get pending(): boolean {
+    return this.waiting.length > 0;
+  }
+
   learn(pattern: string, { spans, wrong }: Pick<Read, 'spans' | 'wrong'>): void {
     const told = spans.some((span) => span.wrong !== undefined);
     const known = { spans, words: wordsOf(spans), wrong: wrong && !told ? asSentence(wrong.sentence) : '' };

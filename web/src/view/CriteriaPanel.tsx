@@ -321,7 +321,7 @@ export function CriteriaTags({ app }: { app: App }) {
             ))
           : [
               <Tag
-                key={span.prefix}
+                key={span.begin}
                 text={span.says!}
                 drop={() => change((now) => dropped(now, span))}
               />,
