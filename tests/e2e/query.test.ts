@@ -142,6 +142,12 @@ test('a term says what it asks for, and what is wrong with it is told at its pla
   await says.getByText("There is no user 'nob0dy'.", { exact: true }).waitFor();
   await page.keyboard.press('Enter');
   await page.getByRole('alert').getByText("'size:1xb': write a size").waitFor();
+  // What was searched for is no longer being written.
+  await page.fill('#pattern', 'size:1x');
+  await says.getByText('Write a size as in').waitFor();
+  await looks(tab, 'prefix:size: value:1x');
+  await page.keyboard.press('Enter');
+  await looks(tab, 'prefix mistaken:size: value mistaken:1x');
   await page.fill('#pattern', 'plan');
   await looks(tab, '');
   await tab.close();

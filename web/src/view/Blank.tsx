@@ -83,7 +83,8 @@ export function Nothing({ app, search }: { app: App; search: Search }) {
   const offers: [string, () => void][] = [];
   const query = app.reading.of(c.pattern);
   const bare = query && withoutCriteria(query).text;
-  if (hasCriteria(c) || (bare !== null && bare !== c.pattern)) {
+  const ofMore = bare !== null && bare !== c.pattern; // than names
+  if (hasCriteria(c) || ofMore) {
     const pattern = bare ?? c.pattern;
     offers.push(['Search without the criteria', () => app.submit({ ...NO_CRITERIA, pattern, folders: c.folders })]);
   }
@@ -97,7 +98,7 @@ export function Nothing({ app, search }: { app: App; search: Search }) {
       <p>
         {c.pattern.trim() ? (
           <>
-            No {c.contents ? 'name and no file' : 'name'} fits <q>{visible(c.pattern.trim())}</q>
+            {ofMore ? 'Nothing' : c.contents ? 'No name and no file' : 'No name'} fits <q>{visible(c.pattern.trim())}</q>
           </>
         ) : (
           'Nothing fits'

@@ -2,15 +2,17 @@
 // spoken once one rests.
 import { useEffect, useState } from 'preact/hooks';
 import { asSentence } from '../api/errors.ts';
-import { spanAt, type Query, type Span } from '../model/query.ts';
+import { spanAt, type Span } from '../model/query.ts';
 import { visible } from '../model/text.ts';
 import type { App } from '../state/app.ts';
 
 const REST_MS = 900;
 
-// What is wrong with a term that is being written at its end is no fault yet.
-export function unfinished(query: Query, caret: number): Span | undefined {
-  return query.spans.find(({ wrong, end }) => wrong !== undefined && end === caret);
+// What is wrong with a term that is being written at its end is no fault yet, unless it was searched
+// for.
+export function unfinished({ draftError, caret, reading }: App): Span | undefined {
+  if (draftError?.field === 'pattern') return undefined;
+  return reading.query.spans.find(({ wrong, end }) => wrong !== undefined && end === caret);
 }
 
 interface Told {
@@ -25,7 +27,7 @@ function toldOf(app: App): Told {
   const { caret } = app;
   const here = caret < 0 ? undefined : spanAt(query, caret);
   if (here?.wrong !== undefined) {
-    return { text: asSentence(here.wrong), wrong: here !== unfinished(query, caret) };
+    return { text: asSentence(here.wrong), wrong: here !== unfinished(app) };
   }
   const other = query.spans.find((span) => span.wrong !== undefined);
   if (other) {

@@ -30,6 +30,8 @@ export function SearchBar({ app }: { app: App }) {
   const past = !next && open !== '' && shown.length > 0;
   const unfolded = past || next !== null;
   const { query } = app.reading;
+  const forgiven = unfinished(app);
+  const mistaken = query.spans.some((span) => span.wrong !== undefined && span !== forgiven);
 
   useEffect(() => input.current?.focus(), []);
   useEffect(() => {
@@ -130,7 +132,7 @@ export function SearchBar({ app }: { app: App }) {
         <Painted
           input={input}
           query={query.text === pattern ? query : { text: pattern, spans: [] }}
-          forgiven={unfinished(query, app.caret)}
+          forgiven={forgiven}
         />
         <input
           ref={input}
@@ -143,7 +145,7 @@ export function SearchBar({ app }: { app: App }) {
           placeholder="Name of a file or folder"
           aria-label="Search for"
           role="combobox"
-          aria-invalid={app.draftError?.field === 'pattern' || query.spans.some((span) => span.wrong !== undefined && span !== unfinished(query, app.caret))}
+          aria-invalid={mistaken || app.draftError?.field === 'pattern'}
           aria-describedby={pattern.trim() ? 'query-says' : undefined}
           aria-expanded={unfolded}
           aria-controls="suggestions"
