@@ -99,6 +99,11 @@ test('several rows are chosen by mouse and keys, copied and downloaded as one ar
   const holds = (name: string) => assert.equal(names.filter((line) => line.startsWith(`'${name}`)).length, 1, `${name} in\n${names.join('\n')}`);
   ['docs/notes.txt', 'docs/data.bin', 'hostile/hostile line\\nbreak.txt', 'hostile/hostile broken ', 'not included.txt'].forEach(holds);
   assert.ok(names.includes(`'hostile/hostile \\u05e9\\u05dc\\u05d5\\u05dd \\u05e2\\u05d5\\u05dc\\u05dd.txt' 4`), 'marked as UTF-8');
+  // So does one folder that nobody chose but that is at hand.
+  await tab.search('docs');
+  await page.focus('.table');
+  const alone = await zipped(async () => [await key('Home'), await key('d')]);
+  assert.ok(alone.includes(`'docs/notes.txt' 2219`), alone.join());
   await tab.close();
 });
 

@@ -43,11 +43,9 @@ export function Details({ app, row, pattern, actions }: Props) {
             <Icon name="folder" size={14} /> Open
           </button>
         )}
-        {!row.is_dir && (
-          <button type="button" class="tool" onClick={() => actions.download(row)}>
-            <Icon name="download" size={14} /> Download
-          </button>
-        )}
+        <button type="button" class="tool" onClick={() => actions.download(row)}>
+          <Icon name={row.is_dir ? 'archive' : 'download'} size={14} /> Download
+        </button>
         {!row.is_dir && previewKind(row.name) !== 'none' && (
           <a class="tool" href={fileAddress(row, true)} target="_blank" rel="noopener">
             <Icon name="open" size={14} /> Open

@@ -3,6 +3,7 @@ import { useEffect, useMemo, useState } from 'preact/hooks';
 import { checkFile, fileAddress } from '../api/client.ts';
 import { ApiError } from '../api/errors.ts';
 import type { FileRow } from '../api/types.ts';
+import type { Spans } from '../model/choice.ts';
 import { browses, type CriterionError } from '../model/criteria.ts';
 import { previewKind } from '../model/preview.ts';
 import { copied, plural, visible } from '../model/text.ts';
@@ -10,7 +11,6 @@ import type { App } from '../state/app.ts';
 import { chosenRows, downloadRows } from '../state/chosen.ts';
 import { copyText, follow } from '../state/save.ts';
 import { Search } from '../state/search.ts';
-import type { Shown } from '../state/shown.ts';
 import { nextTheme, themeName } from '../state/theme.ts';
 import { Failed, Nothing, Welcome } from './Blank.tsx';
 import { CriteriaPanel, CriteriaTags } from './CriteriaPanel.tsx';
@@ -207,18 +207,19 @@ function rowActions(app: App): RowActions {
       if (error instanceof ApiError && error.signedOut) app.signedOut();
       else app.tell(error instanceof Error ? error.message : String(error));
     });
-  const downloadChosen = async ({ choice }: Shown) => {
+  const downloadAll = async (spans: Spans) => {
     if (!(app.shown instanceof Search)) return app.tell('Press Enter first, to have them all found.');
-    const refused = await downloadRows(app.shown, choice.spans);
+    const refused = await downloadRows(app.shown, spans);
     if (refused) app.tell(refused);
   };
   const download = (row?: FileRow) => {
     const { shown } = app;
-    if (shown && shown.choice.count > 0) void downloadChosen(shown);
+    if (shown && shown.choice.count > 0) void downloadAll(shown.choice.spans);
     else if (row) downloadOne(row);
   };
   const downloadOne = (row: FileRow) => {
-    if (row.is_dir) app.tell('A folder cannot be downloaded. Search in it, and download its files.');
+    // A folder comes as an archive of the one row, which is the one that is acted on.
+    if (row.is_dir) void downloadAll([[app.active, app.active]]);
     else whenReadable(row, () => follow(fileAddress(row), row.name));
   };
   return {
