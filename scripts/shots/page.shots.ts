@@ -98,9 +98,9 @@ test('pictures', async () => {
     await shoot('page-light', '#q=holiday&sort=-mtime', DESK, (tab) => tab.page.press('#pattern', 'ArrowDown'));
     await shoot('page-preview', '#q=holiday+2025&sort=name', DESK, choose('lake 2025.png'));
     await shoot('page-dark', '#q=holiday+202&sort=-mtime', DARK, choose('packing list 2025'));
-    await shoot('page-criteria', '#q=img&in=/photos&type=image&min=3+MB&modified=2026-01-01..2026-06-30', DESK, (tab) => tab.page.click('text=Criteria'));
+    await shoot('page-criteria', '#q=img+type:image+size:3MB..+modified:2026-01-01..2026-06-30&in=/photos', DESK, (tab) => tab.page.click('text=Criteria'));
     await shoot('page-running', '#q=holiday&contents=1', DESK, (tab) => tab.page.waitForTimeout(2500));
-    await shoot('page-nothing', '#q=submarine&type=video', DESK);
+    await shoot('page-nothing', '#q=submarine+type:video', DESK);
     await shoot('page-error', '#q=regex:(2025', DESK);
     await shoot('page-history', '', DARK, async ({ page }) => {
       await page.press('#pattern', 'ArrowDown');
