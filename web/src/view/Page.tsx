@@ -52,7 +52,6 @@ export function Page({ app }: { app: App }) {
           </a>
         </h1>
         <SearchBar app={app} />
-        <QueryLine app={app} />
         <Menu app={app} help={() => setHelp(true)} />
       </header>
       <section class="toolbar" aria-label="Folders and criteria">
@@ -69,6 +68,7 @@ export function Page({ app }: { app: App }) {
           <Icon name={app.unfolded ? 'up' : 'down'} size={11} />
         </button>
         <CriteriaTags app={app} />
+        <QueryLine app={app} />
       </section>
       {app.draftError && !inPlace(app.draftError) && (
         <p class="wrong band" role="alert">

@@ -1,4 +1,4 @@
-// The line below the field: what is wrong with the query, or what the term at the caret asks for. It is
+// Below the field: what is wrong with the query, or what the term at the caret asks for. It is
 // spoken once one rests.
 import { useEffect, useState } from 'preact/hooks';
 import { asSentence } from '../api/errors.ts';
@@ -48,8 +48,8 @@ export function QueryLine({ app }: { app: App }) {
   if (app.draft.pattern.trim() === '') return null;
   const refused = app.draftError?.field === 'pattern';
   return (
-    <div class="queryline">
-      <p id="query-says" class={wrong ? 'wrong' : ''} role={refused ? 'alert' : undefined}>
+    <div class={`queryline ${wrong ? 'wrong' : ''}`}>
+      <p id="query-says" title={text} role={refused ? 'alert' : undefined}>
         {text}
       </p>
       <span class="visually-hidden" role="status">
