@@ -207,8 +207,8 @@ std::string WithoutAccents(std::string_view folded) {
 namespace {
 
 // How many bytes the character at the front of `text` has, where it is a common one that is
-// composed and neither composes with another such nor is taken apart; else 0. Those are Latin and
-// Cyrillic letters, kana, ideographs and Hangul syllables.
+// composed and neither composes with another such nor is taken apart; else 0. Those are Latin,
+// Greek, Cyrillic, Hebrew and Arabic letters, kana, ideographs and Hangul syllables.
 size_t PlainCharacter(std::string_view text) {
   const auto byte = [text](size_t at) {
     return at < text.size() ? static_cast<unsigned char>(text[at]) : 0U;
@@ -217,7 +217,12 @@ size_t PlainCharacter(std::string_view text) {
   const unsigned lead = byte(0);
   const unsigned next = byte(1);
   if (lead < 0x80) return 1;
-  if ((lead >= 0xc2 && lead <= 0xcb) || lead == 0xd0 || lead == 0xd1) return follows(1) ? 2 : 0;
+  const bool greek = (lead == 0xce && next != 0x87) || lead == 0xcf;
+  const bool hebrew = lead == 0xd7 && next >= 0x90 && next <= 0xaa;
+  const bool arabic = (lead == 0xd8 && next >= 0xa0) || (lead == 0xd9 && next <= 0x8a);
+  if ((lead >= 0xc2 && lead <= 0xcb) || lead == 0xd0 || lead == 0xd1 || greek || hebrew || arabic) {
+    return follows(1) ? 2 : 0;
+  }
   if (!follows(1) || !follows(2)) return 0;
   const bool kana = lead == 0xe3 && next >= 0x81 && next <= 0x83;
   const bool mark = next == 0x82 && (byte(2) == 0x99 || byte(2) == 0x9a);
@@ -229,18 +234,102 @@ size_t PlainCharacter(std::string_view text) {
 
 }  // namespace
 
-bool IsComposed(std::string_view text) {
-  if (IsAscii(text)) return true;
-  for (size_t bytes; !text.empty(); text.remove_prefix(bytes)) {
-    bytes = PlainCharacter(text);
-    if (bytes == 0) return false;
+namespace {
+
+// Behind the ASCII characters that begin at `at`.
+size_t BehindAscii(std::string_view text, size_t at) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::uint64_t word = 0;
+  for (; at + sizeof(word) <= text.size(); at += sizeof(word)) {
+    std::memcpy(&word, text.data() + at, sizeof(word));
+    if ((word & kHighBits) != 0) break;
   }
+  while (at < text.size() && static_cast<unsigned char>(text[at]) < 0x80) ++at;
+  return at;
+}
+
+// Behind the characters from `at` on that are sure to be composed.
+size_t BehindPlain(std::string_view text, size_t at) {
+  for (size_t bytes = 1; bytes != 0 && (at = BehindAscii(text, at)) < text.size(); at += bytes) {
+    bytes = PlainCharacter(text.substr(at));
+  }
+  return at;
+}
+
+// What a letter in ASCII and the mark behind it, U+0300 to U+036F, become together.
+class MarkedLetters {
+ public:
+  // Empty where the mark that begins at `at` is none of those, or makes no one character with what
+  // stands before it.
+  std::string_view Find(std::string_view text, size_t at) {
+    if (at == 0 || text.size() - at < 2) return {};
+    const auto letter = static_cast<unsigned char>(text[at - 1]);
+    const unsigned mark =
+        (static_cast<unsigned char>(text[at]) << 8U) | static_cast<unsigned char>(text[at + 1]);
+    constexpr unsigned kFirstMark = 0xcc80;
+    constexpr unsigned kLastMark = 0xcdaf;
+    if (letter >= kLetters || mark < kFirstMark || mark > kLastMark) return {};
+    Together& together = all_[letter * kMarks + (mark - kFirstMark)];
+    if (!together.known) Learn(text.substr(at - 1, 3), together);
+    return {together.bytes.data(), together.size};
+  }
+
+ private:
+  static constexpr size_t kLetters = 0x80;
+  static constexpr size_t kMarks = 0x130;
+  struct Together {
+    bool known = false;
+    unsigned char size = 0;
+    std::array<char, 3> bytes = {};
+  };
+
+  static void Learn(std::string_view text, Together& together) {
+    std::string composed;
+    together.known = true;
+    if (!Normalise(text, kCompose, composed) || composed.size() > together.bytes.size()) return;
+    if (utf8proc_ssize_t(composed.size()) != OneCharacter(composed)) return;
+    together.size = static_cast<unsigned char>(composed.copy(together.bytes.data(), 3));
+  }
+  // How many bytes the first character has.
+  static utf8proc_ssize_t OneCharacter(const std::string& text) {
+    utf8proc_int32_t point = 0;
+    return utf8proc_iterate(reinterpret_cast<const utf8proc_uint8_t*>(text.data()),
+                            static_cast<utf8proc_ssize_t>(text.size()), &point);
+  }
+
+  std::vector<Together> all_ = std::vector<Together>(kLetters * kMarks);
+};
+
+}  // namespace
+
+bool IsComposed(std::string_view text) { return BehindPlain(text, 0) == text.size(); }
+
+// Letters and marks come apart from what is sure to be composed as it is, so one pass over most
+// names makes them as the general way would.
+bool AppendComposed(std::string_view text, std::string* out) {
+  const size_t begin = out->size();
+  size_t copied = 0;
+  size_t at = 0;
+  while ((at = BehindPlain(text, at)) < text.size()) {
+    thread_local MarkedLetters letters;
+    const std::string_view together = letters.Find(text, at);
+    if (together.empty()) {
+      out->resize(begin);
+      std::string composed;
+      if (!Normalise(text, kCompose, composed)) return false;
+      out->append(composed);
+      return true;
+    }
+    out->append(text.substr(copied, at - 1 - copied)).append(together);
+    copied = at += 2;
+  }
+  out->append(text.substr(copied));
   return true;
 }
 
 std::string ComposeText(std::string_view text) {
   std::string composed;
-  if (IsComposed(text) || !Normalise(text, kCompose, composed)) composed = text;
+  if (!AppendComposed(text, &composed)) composed = text;
   return composed;
 }
 

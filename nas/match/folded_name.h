@@ -31,6 +31,8 @@ std::string WithoutAccents(std::string_view folded);
 // Whether the text is surely valid UTF-8 and in NFC, at a glance. No says nothing: it knows the
 // common characters only.
 bool IsComposed(std::string_view text);
+// Appends the text in NFC, case kept. False, with nothing appended, where it is not valid UTF-8.
+bool AppendComposed(std::string_view text, std::string* out);
 // The text in NFC, case kept; unchanged where it is not valid UTF-8.
 std::string ComposeText(std::string_view text);
 
