@@ -97,12 +97,23 @@ class NameTable {
   // Entries. `id` < entries(). Names are NUL-ended, into the mapping.
   FolderId folder_of(EntryId id) const;  // that it lies in; logarithmic
   std::string_view name(EntryId id) const {
-    const std::uint64_t word = columns_.named[id / kWordBits];
     const std::uint64_t bit = std::uint64_t{1} << (id % kWordBits);
-    if ((word & bit) == 0) return Piece(columns_.texts, columns_.text_begins, id);
-    const auto before = static_cast<std::uint32_t>(std::popcount(word & (bit - 1)));
-    return Piece(columns_.names, columns_.name_begins,
-                 columns_.named_before[id / kWordBits] + before);
+    if ((columns_.named[id / kWordBits] & bit) == 0) {
+      return Piece(columns_.texts, columns_.text_begins, id);
+    }
+    return Piece(columns_.names, columns_.name_begins, NamedBefore(id));
+  }
+  // Calls `take` with each of [begin, end) and its name, in order: quicker than asking each.
+  template <class Take>
+  void EachName(EntryId begin, EntryId end, const Take& take) const {
+    size_t named = NamedBefore(begin);
+    for (EntryId id = begin; id < end; ++id) {
+      if ((columns_.named[id / kWordBits] >> (id % kWordBits) & 1) == 0) {
+        take(id, Piece(columns_.texts, columns_.text_begins, id));
+      } else {
+        take(id, Piece(columns_.names, columns_.name_begins, named++));
+      }
+    }
   }
   unsigned char type(EntryId id) const;  // DT_*
   std::uint64_t inode(EntryId id) const {
@@ -179,6 +190,14 @@ class NameTable {
     const char* top_names = nullptr;
     const std::uint32_t* top_name_begins = nullptr;
   };
+
+  // How many entries before this one, which may be entries(), have a name that is not their text.
+  size_t NamedBefore(EntryId id) const {
+    if (id == entries_) return named_count_;
+    const std::uint64_t bit = std::uint64_t{1} << (id % kWordBits);
+    return columns_.named_before[id / kWordBits] +
+           static_cast<size_t>(std::popcount(columns_.named[id / kWordBits] & (bit - 1)));
+  }
 
   NameTable() = default;
   void Swap(NameTable& other);

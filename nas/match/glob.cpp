@@ -114,6 +114,86 @@ std::string Glob::LongestText() const {
   return longest;
 }
 
+namespace {
+
+// As an expression has a byte that stands for itself, in a set or outside.
+std::string Escaped(unsigned char byte) {
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  return {'\\', 'x', kDigits[byte >> 4], kDigits[byte & 0xf]};
+}
+
+constexpr std::string_view kInText = "[^\\x00]";
+constexpr std::string_view kOtherCharacter = "[\\x80-\\xff]{1,4}";
+
+}  // namespace
+
+bool Glob::Unit::accepts_others() const {
+  constexpr char32_t kFirstOther = 0x80;
+  return any || negated ||
+         std::ranges::any_of(ranges, [](const auto& range) { return range.second >= kFirstOther; });
+}
+
+std::string Glob::Unit::Expression() const {
+  std::string set;
+  for (size_t c = 1; c < ascii.size(); ++c) {
+    if (ascii[c]) set += Escaped(static_cast<unsigned char>(c));
+  }
+  if (!accepts_others()) return set.empty() ? "(?!)" : "[" + set + "]";
+  const std::string others(kOtherCharacter);
+  return set.empty() ? others : "(?:[" + set + "]|" + others + ")";
+}
+
+bool Glob::Segment::HasFixedLength() const {
+  return std::ranges::none_of(units, &Unit::accepts_others);
+}
+
+std::string Glob::Segment::Expression() const {
+  std::string expression;
+  for (const char c : literal) expression += Escaped(static_cast<unsigned char>(c));
+  for (const Unit& unit : units) expression += unit.Expression();
+  return expression;
+}
+
+// From wherever the segment before it ends. Of a fixed length, the first place leaves the most for
+// what is behind it, so that no other need be tried.
+std::string Glob::Segment::ExpressionFurtherOn() const {
+  const std::string text = Expression();
+  if (literal.size() == 1) return "[^\\x00" + text + "]*+" + text;
+  const std::string anywhere = std::string(kInText) + "*?" + text;
+  return HasFixedLength() ? "(?>" + anywhere + ")" : anywhere;
+}
+
+std::string Glob::Expression(bool alone) const {
+  // What lies at a text's begin or end; a name may hold a "\1" too.
+  constexpr std::string_view kBegin = "(?<![^\\x00\\x01])";
+  constexpr std::string_view kEnd = "(?![^\\x00\\x01])";
+  const Segment& first = segments_.front();
+  // Nothing tells where such a match may begin, so that every place would be tried.
+  if (!first.units.empty() && first.units.front().accepts_others()) return {};
+  std::string expression = first.Expression();
+  if (segments_.size() == 1) return expression.insert(0, kBegin).append(kEnd);
+  const bool anchored = !expression.empty();
+  if (anchored) expression.insert(0, kBegin);
+  std::string rest;
+  bool once = alone && !anchored;  // where it fails once it fails in all of the text
+  for (size_t i = 1; i < segments_.size(); ++i) {
+    const std::string text = segments_[i].Expression();
+    const bool last = i + 1 == segments_.size();
+    if (text.empty()) continue;
+    once = once && (last ? !expression.empty() : segments_[i].HasFixedLength());
+    if (expression.empty()) {
+      expression = text;  // which may begin anywhere
+    } else if (last) {
+      rest.append(kInText).append("*").append(text);
+    } else {
+      rest.append(segments_[i].ExpressionFurtherOn());
+    }
+    if (last) rest.append(kEnd);
+  }
+  if (!once || rest.empty()) return expression + rest;
+  return expression.append("(?:").append(rest).append("|[^\\x00]*+(*SKIP)(*FAIL))");
+}
+
 bool Glob::Unit::Accepts(char32_t c) const {
   if (any) return true;
   const bool in = std::any_of(ranges.begin(), ranges.end(),

@@ -29,6 +29,11 @@ class Glob {
   std::string_view LongestLiteral() const;
   // The same, where it may lie between wildcards for one character.
   std::string LongestText() const;
+  // For a scan over many texts (regex_scan.h): an expression over bytes that finds a place in every
+  // text that matches, each with a NUL or "\1" behind it. In others too, where characters are not
+  // ASCII. Empty where everything matches, and where it would take longer than asking each text.
+  // `alone`: it is not put beside others.
+  std::string Expression(bool alone) const;
 
  private:
   // One character: any, or one of (none of) the ranges.
@@ -38,6 +43,8 @@ class Glob {
     bool negated = false;
     std::bitset<128> ascii = {};  // what is accepted of it
     bool Accepts(char32_t c) const;
+    bool accepts_others() const;  // any that is not ASCII
+    std::string Expression() const;
   };
   // What stands between two stars: a plain text or, where it holds "?" or sets, units.
   struct Segment {
@@ -49,6 +56,9 @@ class Glob {
     size_t FindFrom(std::string_view text, size_t from) const;
     bool MatchesEnd(std::string_view text, size_t from) const;
     bool AcceptsAscii(const char* at) const;  // as many bytes as there are units
+    bool HasFixedLength() const;              // in bytes, of all that it matches
+    std::string Expression() const;
+    std::string ExpressionFurtherOn() const;
   };
 
   static Segment ParseSegment(std::string_view pattern);

@@ -121,18 +121,27 @@ std::optional<std::string> ForManyTexts(std::string_view expression) {
   return Rewriter(expression).Rewrite();
 }
 
-std::shared_ptr<const RegexScan> RegexScan::Make(std::string_view expression) {
+std::shared_ptr<const RegexScan> RegexScan::Make(std::string_view expression, Texts texts) {
   const auto rewritten = ForManyTexts(expression);
   if (!rewritten) return nullptr;
+  const std::uint32_t unicode = texts == Texts::kUtf8 ? PCRE2_UTF | PCRE2_UCP : 0;
+  return Compile(*rewritten, PCRE2_CASELESS | PCRE2_MULTILINE | unicode);
+}
+
+std::shared_ptr<const RegexScan> RegexScan::OfWildcards(std::string_view expression) {
+  return Compile(expression, 0);
+}
+
+std::shared_ptr<const RegexScan> RegexScan::Compile(std::string_view expression,
+                                                    std::uint32_t options) {
   pcre2_compile_context* context = pcre2_compile_context_create(nullptr);
   if (context == nullptr) return nullptr;
   // "." is anything but the NUL, and "^" and "$" stand beside it.
   pcre2_set_newline(context, PCRE2_NEWLINE_NUL);
   int number = 0;
   PCRE2_SIZE where = 0;
-  pcre2_code* code =
-      pcre2_compile(reinterpret_cast<PCRE2_SPTR>(rewritten->data()), rewritten->size(),
-                    PCRE2_CASELESS | PCRE2_MULTILINE, &number, &where, context);
+  pcre2_code* code = pcre2_compile(reinterpret_cast<PCRE2_SPTR>(expression.data()),
+                                   expression.size(), options, &number, &where, context);
   pcre2_compile_context_free(context);
   if (code == nullptr) return nullptr;
   std::shared_ptr<const RegexScan> scan(new RegexScan(code));

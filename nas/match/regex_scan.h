@@ -2,6 +2,7 @@
 // An expression that is run over very many texts at once instead of one after the other: a search
 // over all of them takes a fraction of the time of as many calls.
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -18,18 +19,26 @@ std::optional<std::string> ForManyTexts(std::string_view expression);
 // Does not change once made: any thread may ask.
 class RegexScan {
  public:
-  // Null where there is none of it.
-  static std::shared_ptr<const RegexScan> Make(std::string_view expression);
+  enum class Texts {
+    kBytes,  // what is not ASCII in them is taken as bytes
+    kUtf8,   // surely, and in NFC: an expression finds what it finds in each by itself (regex.h)
+  };
+  // Of an expression of names. Null where there is none of it.
+  static std::shared_ptr<const RegexScan> Make(std::string_view expression, Texts texts);
+  // Of wildcards (wildcards.h), over the texts of a name table.
+  static std::shared_ptr<const RegexScan> OfWildcards(std::string_view expression);
   ~RegexScan();
   RegexScan(const RegexScan&) = delete;
   RegexScan& operator=(const RegexScan&) = delete;
 
   // Where the first match in `texts` begins that begins at `from` or later; npos where there is
-  // none. What is not ASCII is taken as bytes. Nothing where the search was given up.
+  // none. Nothing where the search was given up.
   std::optional<size_t> Find(std::string_view texts, size_t from) const;
 
  private:
   explicit RegexScan(void* code) : code_(code) {}
+  static std::shared_ptr<const RegexScan> Compile(std::string_view expression,
+                                                  std::uint32_t options);
   void* code_;
 };
 

@@ -93,6 +93,17 @@ std::vector<std::string> TextTerm::RequiredTexts() const {
   return all;
 }
 
+std::string TextTerm::ScanExpression() const {
+  if (exact_ || of_path_ || literal_ || !has_wildcards()) return {};
+  std::string all;
+  for (const Comparand& form : forms_) {
+    const std::string one = form.wildcards->Expression(forms_.size() == 1);
+    if (one.empty()) return one;
+    all.append(all.empty() ? "" : "|").append(one);
+  }
+  return all;
+}
+
 // Whether one of the forms in which `text` is compared passes the test with the term's own.
 template <class Test>
 bool TextTerm::AnyForm(FoldedName& text, const Test& test) const {

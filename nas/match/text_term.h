@@ -43,6 +43,10 @@ class TextTerm {
   // in that form without accents. None where that cannot be told, as of terms about paths.
   std::vector<std::string> RequiredTexts() const;
 
+  // Of wildcards over names, letter case ignored: what finds all names that have the term in the
+  // texts of a name table (regex_scan.h). Empty of others, and where all names have it.
+  std::string ScanExpression() const;
+
   const std::string& text() const { return text_; }  // without quotes, prefix and escapes
   // What Make was given.
   const std::string& given() const { return given_; }

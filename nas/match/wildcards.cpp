@@ -234,4 +234,14 @@ std::vector<std::string> Wildcards::RequiredTexts() const {
   return texts;
 }
 
+std::string Wildcards::Expression(bool alone) const {
+  std::string all;
+  for (const Glob& glob : globs_) {
+    const std::string one = glob.Expression(alone && globs_.size() == 1);
+    if (one.empty()) return one;
+    all.append(all.empty() ? "" : "|").append(one);
+  }
+  return all;
+}
+
 }  // namespace nas

@@ -47,6 +47,8 @@ class Wildcards {
   // Of wildcards over names: texts, one of which everything matched holds; one that is empty says
   // that nothing is known.
   std::vector<std::string> RequiredTexts() const;
+  // Of wildcards over names: as of Glob, for all that they stand for.
+  std::string Expression(bool alone) const;
 
  private:
   // One alternative for paths: runs of names with any number of folders between them.

@@ -21,12 +21,13 @@ bool IsPlainText(const QueryNode& leaf) {
          !leaf.text->has_wildcards() && !leaf.text->of_path();
 }
 
-// An expression that names must match, and that can be run over all of them.
-std::shared_ptr<const RegexScan> ScanOf(const QueryNode& root) {
+// The criterion that names must meet and that can be run over all of them; null without one. The
+// texts say nothing of letter case.
+const TextTerm* ScannableTerm(const QueryNode& root) {
   for (const QueryNode& child : root.children) {
-    if (child.kind != QueryNode::Kind::kText || !child.text->is_regex()) continue;
-    if (child.text->exact()) continue;  // the texts do not have it
-    if (auto scan = RegexScan::Make(child.text->text())) return scan;
+    if (child.kind != QueryNode::Kind::kText || child.text->exact()) continue;
+    if (child.text->is_regex() && ForManyTexts(child.text->text())) return child.text.get();
+    if (!child.text->ScanExpression().empty()) return child.text.get();
   }
   return nullptr;
 }
@@ -67,8 +68,9 @@ IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& sear
   const std::vector<std::string> texts =
       by_names ? RequiredTexts(root) : std::vector<std::string>();
   for (const std::string& text : texts) needles_.emplace_back(text);
-  if (by_names && has_regex_) scan_ = ScanOf(root);
-  decides_ = !needles_.empty() && root.children.size() == 1 && IsPlainText(root.children[0]);
+  if (by_names) PrepareScan(root);
+  decides_ = root.children.size() == 1 &&
+             (scan_ != nullptr || (!needles_.empty() && IsPlainText(root.children[0])));
   asks_names_ = AnyLeaf(root, AsksName);
   if (!finds()) {
     for (const QueryNode& child : root.children) {
@@ -79,21 +81,80 @@ IndexFilter::IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& sear
   if (asks_attributes_) ranges_.Prepare();
 }
 
+void IndexFilter::PrepareScan(const QueryNode& root) {
+  const TextTerm* term = ScannableTerm(root);
+  if (term == nullptr) return;
+  if (!term->is_regex()) {
+    scan_ = RegexScan::OfWildcards(term->ScanExpression());
+    roughly_ = true;
+    return;
+  }
+  scan_ = RegexScan::Make(term->text(), RegexScan::Texts::kBytes);
+  others_scan_ = RegexScan::Make(term->text(), RegexScan::Texts::kUtf8);
+  if (!others_scan_) scan_ = nullptr;
+}
+
 namespace {
 
-// The entry whose text holds the byte at `offset`, which is that of `from` or of a later one, and
-// most often of one that is near.
-EntryId EntryFrom(const NameTable& table, EntryId from, std::uint64_t offset) {
+// The text, of `end` that lie end to end, that holds the byte at `offset`: that of `from` or of a
+// later one, and most often of one that is near.
+template <class BeginOf>
+EntryId TextFrom(const BeginOf& begin_of, EntryId from, EntryId end, std::uint64_t offset) {
   EntryId step = 1;
-  while (from + step < table.entries() && table.text_begin(from + step) <= offset) {
+  while (from + step < end && begin_of(from + step) <= offset) {
     from += step;
     step *= 2;
   }
   for (; step > 0; step /= 2) {
-    if (from + step < table.entries() && table.text_begin(from + step) <= offset) from += step;
+    if (from + step < end && begin_of(from + step) <= offset) from += step;
   }
   return from;
 }
+
+EntryId EntryFrom(const NameTable& table, EntryId from, std::uint64_t offset) {
+  const auto begin_of = [&table](EntryId entry) { return table.text_begin(entry); };
+  return TextFrom(begin_of, from, table.entries(), offset);
+}
+
+// Takes those of the texts [begin, end), which lie end to end, in which the expression finds
+// something. Where the search is given up, false, and all that follow are taken.
+template <class BeginOf, class Take>
+bool ScanTexts(const RegexScan& scan, std::string_view texts, EntryId begin, EntryId end,
+               const BeginOf& begin_of, const Take& take) {
+  const std::uint64_t base = begin_of(begin);
+  EntryId text = begin;
+  for (size_t at = 0; at < texts.size(); at = begin_of(text + 1) - base, ++text) {
+    const auto place = scan.Find(texts, at);
+    if (!place) {
+      for (text = TextFrom(begin_of, text, end, base + at); text < end; ++text) take(text);
+      return false;
+    }
+    if (*place >= texts.size()) break;
+    text = TextFrom(begin_of, text, end, base + *place);
+    take(text);
+  }
+  return true;
+}
+
+// Names that are not ASCII, one after the other, as those of a table are.
+struct OtherNames {
+  std::string texts = {};
+  std::vector<size_t> begins = {};
+  std::vector<EntryId> entries = {};
+  // False where it is not UTF-8, and is left out.
+  bool Add(EntryId entry, std::string_view name) {
+    const size_t begin = texts.size();
+    if (!AppendComposed(name, &texts)) return false;
+    texts.push_back('\0');
+    begins.push_back(begin);
+    entries.push_back(entry);
+    return true;
+  }
+  // Of all texts, and where the last ends.
+  size_t begin(size_t number) const {
+    return number < begins.size() ? begins[number] : texts.size();
+  }
+};
 
 // The entries of [begin, end) whose texts have the needle `lead` bytes before the place where it is
 // found; false once there are more than `most` of them in all.
@@ -124,11 +185,11 @@ bool IndexFilter::FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* 
   return true;
 }
 
-void IndexFilter::FindBeginnings(const std::vector<std::string>& words, EntryId begin, EntryId end,
+bool IndexFilter::FindBeginnings(const std::vector<std::string>& words, EntryId begin, EntryId end,
                                  std::vector<EntryId>* found) const {
-  if (begin == end) return;
-  const NameTable& table = snapshot_.table;
   found->clear();
+  if (begin == end) return true;
+  const NameTable& table = snapshot_.table;
   for (const std::string& word : words) {
     // Behind the end of the text before; the first one's is not among these.
     if (table.texts(begin, begin + 1).starts_with(word)) found->push_back(begin);
@@ -137,44 +198,47 @@ void IndexFilter::FindBeginnings(const std::vector<std::string>& words, EntryId 
   }
   std::ranges::sort(*found);
   found->erase(std::unique(found->begin(), found->end()), found->end());
+  return decides_ && !scan_;
 }
 
-// Where the search is given up every further name is to be asked by itself.
-void IndexFilter::Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+bool IndexFilter::Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
   const NameTable& table = snapshot_.table;
-  const std::string_view texts = table.texts(begin, end);
-  const std::uint64_t base = table.text_begin(begin);
-  EntryId entry = begin;
-  for (size_t at = 0; at < texts.size(); at = table.text_begin(entry++ + 1) - base) {
-    const auto place = scan_->Find(texts, at);
-    if (!place) {
-      for (entry = EntryFrom(table, entry, base + at); entry < end; ++entry) {
-        found->push_back(entry);
-      }
-      return;
-    }
-    if (*place >= texts.size()) return;
-    entry = EntryFrom(table, entry, base + *place);
-    found->push_back(entry);
-  }
+  return ScanTexts(
+      *scan_, table.texts(begin, end), begin, end,
+      [&table](EntryId entry) { return table.text_begin(entry); },
+      [found](EntryId entry) { found->push_back(entry); });
 }
 
-void IndexFilter::FindOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+bool IndexFilter::ScanOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
+  const NameTable& table = snapshot_.table;
+  std::erase_if(*found, [&table](EntryId entry) { return !IsAscii(table.name(entry)); });
   const auto middle = static_cast<std::ptrdiff_t>(found->size());
-  for (EntryId entry = begin; entry < end; ++entry) {
-    if (!IsAscii(snapshot_.table.name(entry))) found->push_back(entry);
-  }
-  std::ranges::inplace_merge(*found, found->begin() + middle);
-  found->erase(std::unique(found->begin(), found->end()), found->end());
+  OtherNames others;
+  table.EachName(begin, end, [&](EntryId entry, std::string_view name) {
+    if (!IsAscii(name) && !others.Add(entry, name)) found->push_back(entry);
+  });
+  const auto broken = static_cast<std::ptrdiff_t>(found->size());
+  const bool told = ScanTexts(
+      *others_scan_, others.texts, 0, static_cast<EntryId>(others.entries.size()),
+      [&others](EntryId number) { return others.begin(number); },
+      [&](EntryId number) { found->push_back(others.entries[number]); });
+  std::inplace_merge(found->begin() + middle, found->begin() + broken, found->end());
+  std::inplace_merge(found->begin(), found->begin() + middle, found->end());
+  return told;
 }
 
-void IndexFilter::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
-  if (begin == end) return;
+bool IndexFilter::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
   found->clear();
-  if (!needles_.empty() && FindNeedles(begin, end, found)) return;
-  found->clear();
-  Scan(begin, end, found);
-  FindOthers(begin, end, found);
+  if (begin == end) return true;
+  if (!needles_.empty() && !needles_fail_.load(std::memory_order_relaxed)) {
+    if (FindNeedles(begin, end, found)) return decides_ && !scan_;
+    // Other names are much like these.
+    needles_fail_.store(true, std::memory_order_relaxed);
+    found->clear();
+  }
+  const bool told = Scan(begin, end, found);
+  const bool others_told = !others_scan_ || ScanOthers(begin, end, found);
+  return decides_ && told && others_told;
 }
 
 EntryFilter::EntryFilter(const IndexFilter& filter, const Location& location)
@@ -199,11 +263,12 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
   const EntryId last = table_.entries_begin(end);
   const bool hits = beginnings_ != nullptr || filter_.finds();
   const bool paths = filter_.search_.criteria.ask_paths;
+  bool decided = false;
   hits_.clear();
   if (beginnings_ != nullptr) {
-    filter_.FindBeginnings(*beginnings_, table_.entries_begin(begin), last, &hits_);
+    decided = filter_.FindBeginnings(*beginnings_, table_.entries_begin(begin), last, &hits_);
   } else if (hits) {
-    filter_.Find(table_.entries_begin(begin), last, &hits_);
+    decided = filter_.Find(table_.entries_begin(begin), last, &hits_);
   }
   auto hit = hits_.begin();
   const auto next = [&](EntryId from) {
@@ -222,7 +287,7 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
     }
     if (may_match && !hits) FindAmong(entry, behind, found);
     for (; may_match && hits && entry < behind; entry = next(entry + 1)) {
-      if (MayMatch(entry)) found->push_back(entry);
+      if (Passes(entry, decided)) found->push_back(entry);
     }
     if (!may_match || !hits) entry = next(behind);
   }
@@ -258,13 +323,16 @@ bool EntryFilter::LearnAttributes(EntryId entry) {
 // these are the names' folded forms, which fold to themselves. Expressions can tell another name of
 // the same text from it.
 void EntryFilter::SetName(EntryId entry) {
-  const std::string_view name = table_.name(entry);
   std::string_view text = table_.texts(entry, entry + 1);
   text.remove_suffix(1);
+  const bool by_text = filter_.by_texts_ && !filter_.has_regex_;
+  const bool ascii = IsAscii(text);
   const size_t mark = text.find('\1');
+  if (by_text && ascii && mark == std::string_view::npos) return name_.SetFolded(text);
+  const std::string_view name = table_.name(entry);
+  const bool usable = by_text || (filter_.by_texts_ && IsAscii(name));
+  if (usable && ascii && mark == std::string_view::npos) return name_.SetFolded(text);
   const std::string_view folded = text.substr(0, mark);
-  const bool usable = filter_.by_texts_ && (!filter_.has_regex_ || IsAscii(name));
-  if (usable && mark == std::string_view::npos && IsAscii(text)) return name_.SetFolded(text);
   // What a broken name has is in no such form.
   if (!usable || IsAscii(folded) || !IsComposed(folded) || name.find('\1') != name.npos) {
     return name_.Set(name);
@@ -272,8 +340,12 @@ void EntryFilter::SetName(EntryId entry) {
   name_.SetFolded(folded, mark == std::string_view::npos ? folded : text.substr(mark + 1));
 }
 
+bool EntryFilter::Passes(EntryId entry, bool told) {
+  const bool sure = told && (!filter_.roughly_ || IsAscii(table_.texts(entry, entry + 1)));
+  return sure || MayMatch(entry);
+}
+
 bool EntryFilter::MayMatch(EntryId entry) {
-  if (filter_.decides_) return true;
   QuerySubject subject;
   const unsigned char type = table_.type(entry);
   subject.is_folder = type == DT_DIR;

@@ -3,6 +3,7 @@
 // system call. It leaves out only what cannot match as the table has it; the judge decides about
 // the rest.
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <string_view>
@@ -16,7 +17,7 @@
 
 namespace nas {
 
-// Does not change once made; what it is made of is borrowed.
+// Any thread may ask; what it is made of is borrowed.
 class IndexFilter {
  public:
   IndexFilter(const IndexSnapshot& snapshot, const SharedSearch& search);
@@ -24,27 +25,31 @@ class IndexFilter {
   // Whether there are texts, or an expression, without which nothing matches, so that Find tells
   // where to look.
   bool finds() const { return !needles_.empty() || scan_ != nullptr; }
-  // The entries of [begin, end) that may have one, in order.
-  void Find(NameTable::EntryId begin, NameTable::EntryId end,
+  // The entries of [begin, end) that may have one, in order. Whether they surely match, as far as
+  // can be told from the table (EntryFilter::Passes).
+  bool Find(NameTable::EntryId begin, NameTable::EntryId end,
             std::vector<NameTable::EntryId>* found) const;
-  // Those whose text (name_table.h) begins with one of the words.
-  void FindBeginnings(const std::vector<std::string>& words, NameTable::EntryId begin,
+  // Those whose text (name_table.h) begins with one of the words, likewise.
+  bool FindBeginnings(const std::vector<std::string>& words, NameTable::EntryId begin,
                       NameTable::EntryId end, std::vector<NameTable::EntryId>* found) const;
 
  private:
   friend class EntryFilter;
   using EntryId = NameTable::EntryId;
 
+  void PrepareScan(const QueryNode& root);
   // False, with less than all of it, where they tell so little that scan_ is the quicker way.
   bool FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
-  void Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
-  // Those whose name is not ASCII.
-  void FindOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
+  bool Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
+  // Puts those whose name is not ASCII right, of which an expression that is run over texts tells
+  // nothing.
+  bool ScanOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
 
   const IndexSnapshot& snapshot_;
   const SharedSearch& search_;
   std::vector<TextFinder> needles_;
-  std::shared_ptr<const RegexScan> scan_;
+  std::shared_ptr<const RegexScan> scan_;         // over texts
+  std::shared_ptr<const RegexScan> others_scan_;  // of expressions, over names
   // What asks for attributes and holds of every match; where nothing is found by names.
   IndexRanges ranges_;
   bool only_ranges_ = false;      // there is nothing else
@@ -52,7 +57,9 @@ class IndexFilter {
   bool asks_names_ = false;
   bool by_texts_ = false;  // texts say of names in ASCII what the names say
   bool has_regex_ = false;
-  bool decides_ = false;  // what Find finds needs no further question
+  bool decides_ = false;                            // there is nothing but what Find looks for
+  bool roughly_ = false;                            // where a text is not ASCII
+  mutable std::atomic<bool> needles_fail_ = false;  // as FindNeedles has said
 };
 
 // One thread's.
@@ -74,6 +81,8 @@ class EntryFilter {
   bool Enter(std::string_view path, bool by_attributes = true);
   // Of one of a folder that was entered: whether the entry can match, as the table has it.
   bool MayMatch(NameTable::EntryId entry);
+  // The same of one that Find of the index filter has found, and what that has said.
+  bool Passes(NameTable::EntryId entry, bool told);
   // All of [begin, end), in folders that were entered, that can match.
   void FindAmong(NameTable::EntryId begin, NameTable::EntryId end,
                  std::vector<NameTable::EntryId>* found);

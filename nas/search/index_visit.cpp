@@ -55,8 +55,10 @@ IndexVisit::IndexVisit(IndexNames& names, size_t thread, Judge& judge)
 void IndexVisit::Visit(FolderId begin, FolderId end) {
   hits_.clear();
   next_hit_ = 0;
+  hits_told_ = false;
   if (names_.filter_.finds()) {
-    names_.filter_.Find(table_.entries_begin(begin), table_.entries_begin(end), &hits_);
+    hits_told_ =
+        names_.filter_.Find(table_.entries_begin(begin), table_.entries_begin(end), &hits_);
   }
   CollectLooks(begin, end);
   for (FolderId at = begin; !search_.stopping(); ++at) {
@@ -141,7 +143,7 @@ void IndexVisit::CollectEntries(FolderId folder, const Special* special) {
   if (!names_.filter_.finds()) filter_.FindAmong(table_.entries_begin(folder), end, &entries_);
   while (next_hit_ < hits_.size() && hits_[next_hit_] < table_.entries_begin(folder)) ++next_hit_;
   for (; next_hit_ < hits_.size() && hits_[next_hit_] < end; ++next_hit_) {
-    if (filter_.MayMatch(hits_[next_hit_])) entries_.push_back(hits_[next_hit_]);
+    if (filter_.Passes(hits_[next_hit_], hits_told_)) entries_.push_back(hits_[next_hit_]);
   }
   if (special == nullptr) return;
   std::erase_if(entries_, [&](EntryId entry) { return special->Holds(table_.name(entry)); });

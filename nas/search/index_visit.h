@@ -93,6 +93,7 @@ class IndexVisit {
   EntryFilter filter_;
   FolderPaths paths_;
   std::vector<EntryId> hits_;  // of the piece, where the filter finds
+  bool hits_told_ = false;     // need no further question
   size_t next_hit_ = 0;
   std::vector<EntryId> looks_;  // folders among the entries of the piece, not of the table
   size_t next_look_ = 0;

@@ -102,7 +102,7 @@ TEST(Filters, ExpressionsOverManyTexts) {
   for (const std::string& text : texts) all.append(text).push_back('\0');
   for (const auto& row : rows) {
     SCOPED_TRACE(row.expression);
-    const auto scan = RegexScan::Make(row.expression);
+    const auto scan = RegexScan::Make(row.expression, RegexScan::Texts::kBytes);
     EXPECT_EQ(scan != nullptr, row.runs);
     if (!scan) continue;
     const auto alone = Regex::Compile(row.expression, Regex::Kind::kName);

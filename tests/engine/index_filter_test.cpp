@@ -1,0 +1,208 @@
+// What an index's names are told apart by, against asking each of them: it may let too much pass,
+// never too little.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <utf8proc.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "nas/index/tree_scan.h"
+#include "nas/match/folded_name.h"
+#include "nas/match/query.h"
+#include "nas/search/index_filter.h"
+#include "tests/nas/fixture.h"
+
+namespace nas {
+namespace {
+
+class Pieces {
+ public:
+  explicit Pieces(unsigned seed) : random_(seed) {}
+  size_t Below(size_t count) { return random_() % count; }
+  template <class All>
+  std::string Some(const All& all, size_t most) {
+    std::string text;
+    for (size_t left = 1 + Below(most); left > 0; --left) text += all[Below(std::size(all))];
+    return text;
+  }
+
+ private:
+  std::mt19937 random_;
+};
+
+// What folds to other letters, to more of them or to ASCII, what composes, and what is no UTF-8.
+constexpr const char* kInNames[] = {
+    "a",
+    "b",
+    "B",
+    "k",
+    "K",
+    "s",
+    "S",
+    "x",
+    "Z",
+    "1",
+    "7",
+    " ",
+    ".",
+    "-",
+    "_",
+    "i",
+    "I",
+    "ss",
+    "fi",
+    "\x01",
+    "\n",
+    "\u00e9",
+    "e\u0301",
+    "E\u0301",
+    "\u00df",
+    "\u1e9e",
+    "\u212a",
+    "\u017f",
+    "\u0130",
+    "\u0131",
+    "\u01f0",
+    "j\u030c",
+    "H\u0331",
+    "T\u0308",
+    "\u0301",
+    "\ufb01",
+    "\u0149",
+    "\u03b1",
+    "\u0386",
+    "\u0391\u0301",
+    "\u0437",
+    "\u0418\u0306",
+    "\u0627",
+    "\u0627\u0653",
+    "\u05d0",
+    "\u65e5",
+    "\ud55c",
+    "\u1112\u1161",
+    "\u304b\u3099",
+    "\xff",
+    "\xc3",
+    "\u0660",
+    "\u00a0",
+    "\U0001f600",
+    "q\u0323\u0307",
+};
+
+constexpr const char* kInGlobs[] = {"*",     "*",       "*",      "?",    "a",
+                                    "b",     "k",       "s",      "ss",   "i",
+                                    "1",     "x",       "[a-k]",  "[!a]", "[\u00e9\u03b1]",
+                                    "[0-9]", "\u00e9",  "\u00df", "e",    ".",
+                                    "{a,s}", "{1?,*k}", "\\*",    "\xff", "\x01",
+                                    "\u65e5"};
+constexpr const char* kInExpressions[] = {
+    "a",   "b",   "k",    "s",     "i",    "1",      "x",     ".",  ".*",   "\\w", "\\W", "\\d+",
+    "\\D", "\\s", "\\S+", "[a-k]", "[^a]", "[^a-z]", "(a|s)", "k?", "s{2}", "\\b", "\\B", "[\\w.]"};
+
+// Of the kinds that are run over all names at once, and of a few more.
+std::string PatternOf(Pieces& pieces) {
+  if (pieces.Below(2) == 0) return pieces.Some(kInGlobs, 5);
+  const std::string begin = pieces.Below(4) == 0 ? "^" : "";
+  const std::string end = pieces.Below(4) == 0 ? "$" : "";
+  const std::string prefix = pieces.Below(8) == 0 ? "case:regex:" : "regex:";
+  const std::string more = pieces.Below(6) == 0 ? " a" : "";
+  return prefix + begin + pieces.Some(kInExpressions, 4) + end + more;
+}
+
+using IndexFilters = nas_test::PlatformTest;
+
+TEST_F(IndexFilters, LeaveOutNoNameThatMatches) {
+  constexpr size_t kNames = 2'000;
+  constexpr size_t kPatterns = 600;
+  const char* const given = std::getenv("ARBORY_TEST_SEED");
+  Pieces pieces(given != nullptr ? static_cast<unsigned>(std::atoi(given)) : 1);
+  const std::string tree = dir_ + "/tree";
+  ASSERT_EQ(mkdir(tree.c_str(), S_IRWXU), 0);
+  for (size_t i = 0; i < kNames; ++i) {
+    const std::string path = tree + "/" + pieces.Some(kInNames, 7);
+    const UniqueFd file(open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, S_IRUSR | S_IWUSR));
+  }
+  const UniqueFd top(open(tree.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const TablePlace place{AT_FDCWD, dir_ + "/table", "a test's"};
+  ASSERT_TRUE(ScanTree({{top.get(), "tree"}}, place));
+  const auto table = NameTable::Open(place.dir_fd, place.name, place.file_system);
+  ASSERT_TRUE(table);
+  const Changes changes;
+  const IndexSnapshot snapshot{*table, changes, true};
+  size_t matches = 0;
+  size_t left_out = 0;
+  for (size_t i = 0; i < kPatterns; ++i) {
+    const std::string pattern = PatternOf(pieces);
+    const auto query = Query::Parse(pattern);
+    if (!query) continue;
+    NodeComp comp(query->root());
+    const int never = 0;
+    class : public RowSink {
+      void Append(RowBlock& block) override { block.Clear(); }
+    } nowhere;
+    const SharedSearch search({&comp}, nowhere, never);
+    const IndexFilter filter(snapshot, search);
+    const Location location;
+    EntryFilter entries(filter, location);
+    std::vector<NameTable::EntryId> found;
+    entries.Find(
+        0, table->folders(), [](NameTable::FolderId) { return ""; }, &found);
+    ASSERT_TRUE(std::ranges::is_sorted(found)) << pattern;
+    FoldedName name;
+    for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
+      name.Set(table->name(entry));
+      const bool match = search.Ask({.name = &name, .is_file = true}) == Answer::kYes;
+      const bool passes = std::ranges::binary_search(found, entry);
+      ASSERT_LE(match, passes) << pattern << ": " << table->name(entry);
+      matches += match ? 1 : 0;
+      left_out += passes ? 0 : 1;
+    }
+  }
+  EXPECT_GT(matches, kPatterns * kNames / 20);
+  EXPECT_GT(left_out, kPatterns * kNames / 4);
+}
+
+std::string Composed(const std::string& text) {
+  utf8proc_uint8_t* made = utf8proc_NFC(reinterpret_cast<const utf8proc_uint8_t*>(text.c_str()));
+  if (made == nullptr) return "broken";
+  const std::string composed(reinterpret_cast<char*>(made));
+  std::free(made);
+  return composed;
+}
+
+std::string Encoded(utf8proc_int32_t point) {
+  utf8proc_uint8_t bytes[4];
+  const auto length = static_cast<size_t>(utf8proc_encode_char(point, bytes));
+  return {reinterpret_cast<char*>(bytes), length};
+}
+
+void ExpectComposed(const std::string& text) {
+  std::string out = ">";
+  const bool valid = AppendComposed(text, &out);
+  const std::string expected = Composed(text);
+  ASSERT_EQ(valid, expected != "broken") << text;
+  ASSERT_EQ(out, valid ? ">" + expected : ">") << text;
+}
+
+TEST(FoldedName, ComposesAsUnicodeDoes) {
+  constexpr utf8proc_int32_t kEnd = 0x20000;
+  for (utf8proc_int32_t point = 1; point < kEnd; ++point) {
+    if (point >= 0xd800 && point < 0xe000) continue;
+    const std::string one = Encoded(point);
+    ASSERT_TRUE(!IsComposed(one) || Composed(one) == one) << point;
+    ExpectComposed("e" + one + "\u0301");
+  }
+  for (utf8proc_int32_t mark = 0x2f0; mark < 0x380; ++mark) {
+    for (char letter = 1; letter > 0; ++letter) ExpectComposed(letter + Encoded(mark) + "x");
+  }
+  Pieces pieces(2);
+  for (int i = 0; i < 100'000; ++i) ExpectComposed(pieces.Some(kInNames, 7));
+}
+
+}  // namespace
+}  // namespace nas
