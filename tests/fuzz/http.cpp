@@ -72,6 +72,7 @@ class Host : public arbory::ConnectionHost {
   const arbory::Proxies& proxies() const override { return proxies_; }
   arbory::HttpService& service() override { return echo; }
   bool stopping() const override { return false; }
+  arbory::Turns& turns() override { return turns_; }
   std::shared_ptr<arbory::ChildPipe> Adopt(arbory::ChildAnswer* /*answer*/) override {
     return nullptr;
   }
@@ -82,6 +83,7 @@ class Host : public arbory::ConnectionHost {
 
  private:
   asio::io_context& loop_;
+  arbory::Turns turns_{&loop_};
   nas::ServerSettings settings_;
   arbory::Proxies proxies_{{}};
 };
