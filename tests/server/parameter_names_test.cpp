@@ -277,7 +277,8 @@ TEST_F(ParameterNamesTest, TheTerminalOffersWhatIsDocumented) {
     if (option->get_group().empty()) continue;  // offered to nobody
     std::vector<std::string> words = {"a", option->get_name()};
     if (option->get_items_expected_max() > 0) {
-      words.insert(words.begin() + 1, samples.at(option->get_type_name()));
+      const std::string type = option->get_type_name();  // and, behind a colon, what it may be
+      words.insert(words.begin() + 1, samples.at(type.substr(0, type.find(':'))));
     }
     const Json::Value changed = request(words);
     Names names;
