@@ -106,6 +106,11 @@ test('pictures', async () => {
       await page.press('#pattern', 'ArrowDown');
       await page.press('#pattern', 'ArrowDown');
     });
+    await shoot('page-query', '', DESK, async ({ page }) => {
+      await page.locator('#pattern').pressSequentially('"at the lake"|plan !draft size:>1MB modified:last-');
+      await page.getByRole('option').first().waitFor();
+      await page.press('#pattern', 'ArrowDown');
+    });
     await shoot('page-folders', '#q=holiday&in=/photos/2025', DESK, async ({ page }) => {
       await page.click('.folders');
       await page.click('[aria-label="Folders in photos"]');
