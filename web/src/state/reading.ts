@@ -13,6 +13,16 @@ const KEPT = 50;
 
 const NO_WORDS: Word[] = [];
 
+// What was offered, as far as it fits what has been typed on; null where something else was done.
+function carriedOn(offered: Completion, old: string, oldCaret: number, text: string, caret: number): Completion | null {
+  const { begin, end, of, items } = offered;
+  const same = old.slice(0, begin) === text.slice(0, begin) && old.slice(oldCaret) === text.slice(caret);
+  const typed = text.slice(begin, caret).toLowerCase();
+  if (!same || caret < begin || /[\s|:,/]/.test(typed)) return null;
+  const left = items.filter((item) => item.text.length > typed.length && item.text.toLowerCase().startsWith(typed));
+  return { of, begin, end: end + text.length - old.length, items: left };
+}
+
 export class Reading {
   query: Query = NO_QUERY; // of what is typed
   sure = true; // whether it is what the server says, or follows from that
@@ -38,7 +48,7 @@ export class Reading {
   // What is typed has become `text`. With the place of the caret, what can be written there is asked
   // for; `query` where it is known what the text is made of.
   follow(text: string, caret = -1, query?: Query): void {
-    this.completion = null;
+    this.completion = this.completion && carriedOn(this.completion, this.query.text, this.caret, text, caret);
     this.caret = caret;
     const known = this.known.get(text);
     if (known) this.show(text, known);
