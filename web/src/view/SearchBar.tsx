@@ -1,6 +1,7 @@
 // The one field: the query in its colours, what can be written next, and past searches. Those unfold
 // on a click, on typing or with the arrow key, never by themselves; what can be written next unfolds
 // when the beginning of a prefix or of a value stands there, or is asked for.
+import type { RefObject } from 'preact';
 import { useEffect, useMemo, useRef, useState } from 'preact/hooks';
 import type { Completion } from '../api/types.ts';
 import { titleOf, type Remembered } from '../model/history.ts';
@@ -34,17 +35,7 @@ export function SearchBar({ app }: { app: App }) {
   const mistaken = query.spans.some((span) => span.wrong !== undefined && span !== forgiven);
 
   useEffect(() => input.current?.focus(), []);
-  useEffect(() => {
-    const look = () => {
-      const field = input.current;
-      const caret = field && document.activeElement === field ? (field.selectionEnd ?? -1) : -1;
-      if (caret !== app.caret) app.set({ caret });
-    };
-    const events = ['selectionchange', 'focusin', 'focusout', 'keyup'];
-    const later = () => setTimeout(look);
-    events.forEach((name) => document.addEventListener(name, later));
-    return () => events.forEach((name) => document.removeEventListener(name, later));
-  }, [app]);
+  useCaret(app, input);
 
   const fold = () => {
     setOpen('');
@@ -191,6 +182,22 @@ export function SearchBar({ app }: { app: App }) {
       )}
     </form>
   );
+}
+
+// Has the page know where the caret is, while the field has the focus.
+function useCaret(app: App, input: RefObject<HTMLInputElement | null>): void {
+  useEffect(() => {
+    const look = () => {
+      const field = input.current;
+      const caret = field && document.activeElement === field ? (field.selectionEnd ?? -1) : -1;
+      if (caret !== app.caret) app.set({ caret });
+    };
+    // Some of these come before it has moved.
+    const later = () => setTimeout(look);
+    const events = ['selectionchange', 'focusin', 'focusout', 'keyup'];
+    events.forEach((name) => document.addEventListener(name, later));
+    return () => events.forEach((name) => document.removeEventListener(name, later));
+  }, [app]);
 }
 
 // What can be written where the caret is, when that is to be shown.
