@@ -1,7 +1,6 @@
 #include "nas/match/ignore_lines.h"
 
 #include <algorithm>
-#include <ranges>
 
 namespace nas {
 namespace {
@@ -81,7 +80,8 @@ void IgnoreLines::Add(std::string_view text) {
 IgnoreLines::Verdict IgnoreLines::Of(std::string_view path, bool is_folder) const {
   const std::string_view name = path.substr(path.rfind('/') + 1);
   std::string rooted;
-  for (const Line& line : std::views::reverse(lines_)) {
+  for (auto each = lines_.rbegin(); each != lines_.rend(); ++each) {
+    const Line& line = *each;
     if (line.folders_only && !is_folder) continue;
     if (line.of_path && rooted.empty()) rooted.assign("/").append(path);
     const std::string_view text = line.of_path ? std::string_view(rooted) : name;

@@ -101,7 +101,7 @@ void IndexRanges::AddDoubtful(EntryId begin, EntryId end, std::vector<EntryId>* 
   if (middle == static_cast<std::ptrdiff_t>(found->size())) return;
   std::inplace_merge(found->begin() + middle, found->begin() + among_inodes, found->end());
   std::inplace_merge(found->begin(), found->begin() + middle, found->end());
-  found->erase(std::ranges::unique(*found).begin(), found->end());
+  found->erase(std::unique(found->begin(), found->end()), found->end());
 }
 
 bool IndexRanges::DoubtsInode(std::uint64_t inode) const {

@@ -22,7 +22,6 @@ constexpr milliseconds kMostWait{250};
 constexpr milliseconds kLookAgain{10};
 // Of a first page: more than a screen shows, and a reply that need not be spooled.
 constexpr int kMostRows = 1000;
-constexpr char kList[] = "list";
 constexpr char kLimit[] = "limit";
 
 nas::ApiCall CallOf(const nas::ApiCall& outer, const NUVA::APIMethod& row, Json::Value params) {
