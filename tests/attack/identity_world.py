@@ -63,7 +63,9 @@ def system_call(name, *arguments):
 
 class World:
     def __init__(self, bin_dir):
-        self.house = House(bin_dir, "logins_per_minute = 1000000\n", logins=True)
+        # A download that nobody reads is there for as long as its child is attacked.
+        lines = "logins_per_minute = 1000000\nstall_seconds = 3600\n"
+        self.house = House(bin_dir, lines, logins=True)
         self.top = self.house.dir + "/volume1"
         self.roads = self.top + "/@tmp/webfm/FBSearch"
         os.mkdir(self.top + "/open")
