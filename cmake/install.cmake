@@ -1,7 +1,7 @@
 # Where everything goes below the prefix. The program finds the library, the module, the page and the
 # sample share by its own place.
 install(TARGETS arbory RUNTIME DESTINATION bin)
-install(TARGETS arbory_nas arbory_fleet LIBRARY DESTINATION lib/arbory)
+install(TARGETS arbory_nas arbory_fleet arbory_server LIBRARY DESTINATION lib/arbory)
 if(TARGET arbory_module)
   install(TARGETS arbory_module LIBRARY DESTINATION lib/arbory)
 endif()

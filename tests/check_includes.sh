@@ -26,7 +26,8 @@ nas/records              : nas/base nas/system platform
 nas/webapi               : nas/base nas/fleet nas/system platform
 arbory                   : nas platform arbory/server <CLI>
 arbory/server/transport  : nas platform <boost>
-arbory/server/service    : nas platform arbory arbory/server/transport <security> <zlib.h> <archive.h> <archive_entry.h>
+arbory/server/service    : nas platform arbory arbory/server/transport <zlib.h>
+arbory/server/plugin     : nas arbory/server/service arbory/server/transport <security> <archive.h> <archive_entry.h>
 bench                    : nas platform <benchmark>
 tests                    : platform api history search module nas arbory <sqlite3.h> <CLI> <utf8proc.h> <boost> <zlib.h>
 '

@@ -8,10 +8,11 @@
 #include <charconv>
 #include <exception>
 #include <map>
+#include <memory>
 #include <unordered_set>
 
 #include "arbory/running_search.h"
-#include "arbory/server/service/zip_stream.h"
+#include "arbory/server/service/library.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/paths.h"
 #include "nas/files/directory_reader.h"
@@ -77,7 +78,8 @@ size_t CommonBytes(const Paths& paths) {
 
 class Archiver {
  public:
-  Archiver(int pipe, size_t common_bytes) : zip_(pipe), common_bytes_(common_bytes) {}
+  Archiver(int pipe, size_t common_bytes)
+      : zip_(LoadServerLibrary().new_zip(pipe)), common_bytes_(common_bytes) {}
 
   void Add(const std::string& path) {
     if (IsInFolderAdded(path)) return;
@@ -96,11 +98,11 @@ class Archiver {
       if (left_out_ > kMostTold) {
         text += "... and " + std::to_string(left_out_ - kMostTold) + " more\r\n";
       }
-      zip_.AddText(kLeftOut, text);
+      zip_->AddText(kLeftOut, text);
     }
-    zip_.Finish();
+    zip_->Finish();
   }
-  bool broken() const { return zip_.broken(); }
+  bool broken() const { return zip_->broken(); }
 
  private:
   const nas::UniqueFd& RootOf(const std::string& share_name) {
@@ -126,7 +128,7 @@ class Archiver {
 
   void AddAt(int dir, const std::string& name, const std::string& path, int depth,
              unsigned long long resolve) {
-    if (zip_.broken()) return;
+    if (zip_->broken()) return;
     if (++files_ > kMostFiles) return LeaveOut(path, E2BIG);
     // Without O_NONBLOCK a pipe would be waited for; a terminal must not become this process's.
     const nas::UniqueFd file =
@@ -134,11 +136,11 @@ class Archiver {
     struct stat info;
     if (!file || fstat(file.get(), &info) != 0) return LeaveOut(path, errno);
     if (S_ISREG(info.st_mode)) {
-      if (!zip_.AddFile(NameOf(path), file.get(), info)) LeaveOut(path, EIO);
+      if (!zip_->AddFile(NameOf(path), file.get(), info)) LeaveOut(path, EIO);
     } else if (S_ISDIR(info.st_mode)) {
       if (depth == 0) folders_.insert(path);
       if (depth > kDeepest) return LeaveOut(path, ELOOP);
-      if (path.size() > common_bytes_) zip_.AddFolder(NameOf(path), info);
+      if (path.size() > common_bytes_) zip_->AddFolder(NameOf(path), info);
       AddBelow(file.get(), path, depth);
     } else {
       LeaveOut(path, EINVAL);
@@ -171,7 +173,7 @@ class Archiver {
     told_ += path + ": " + why + "\r\n";
   }
 
-  ZipStream zip_;
+  const std::unique_ptr<ZipStream> zip_;
   const size_t common_bytes_;
   std::map<std::string, nas::UniqueFd> roots_;  // of shares; invalid where there is none
   std::unordered_set<std::string> folders_;     // chosen ones
@@ -185,6 +187,7 @@ void Refuse(int pipe, int status, const char* sentence) {
 }
 
 void Serve(const ArchiveRequest& request, int pipe) {
+  LoadServerLibrary();
   if (!nas::BecomeUser(request.user)) {
     return Refuse(pipe, kUnavailable, "The server cannot act as this user.");
   }

@@ -1,4 +1,4 @@
-#include "arbory/server/service/zip_stream.h"
+#include "arbory/server/plugin/zip_stream.h"
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -8,6 +8,7 @@
 #include <clocale>
 #include <cstdio>
 #include <ctime>
+#include <memory>
 #include <new>
 
 #include "arbory/server/transport/http_text.h"
@@ -38,42 +39,56 @@ bool IsPacked(std::string_view name) {
          std::end(kExtensions);
 }
 
-}  // namespace
+class Zip : public ZipStream {
+ public:
+  explicit Zip(int pipe);
+  ~Zip() override;
+  Zip(const Zip&) = delete;
+  Zip& operator=(const Zip&) = delete;
 
-struct ZipStream::Chunks {
-  explicit Chunks(int fd) : pipe(fd) {}
-  const int pipe;
-  std::string buffer;
+  void AddFolder(const std::string& name, const struct stat& info) override;
+  bool AddFile(const std::string& name, int fd, const struct stat& info) override;
+  void AddText(const std::string& name, std::string_view text) override;
+  void Finish() override;
+  bool broken() const override { return broken_; }
 
-  static la_ssize_t Write(archive* /*unused*/, void* self, const void* bytes, size_t count) {
-    auto& chunks = *static_cast<Chunks*>(self);
-    if (count == 0) return 0;  // would be the end
-    std::array<char, 20> length{};
-    std::snprintf(length.data(), length.size(), "%zx\r\n", count);
-    chunks.buffer = length.data();
-    chunks.buffer.append(static_cast<const char*>(bytes), count);
-    chunks.buffer += "\r\n";
-    return nas::WriteAll(chunks.pipe, chunks.buffer) ? static_cast<la_ssize_t>(count) : -1;
-  }
+ private:
+  bool Begin(const std::string& name, const struct stat& info, bool packs);
+  void Write(std::string_view bytes);
+  static la_ssize_t WriteChunk(archive* archive, void* self, const void* bytes, size_t count);
+
+  const int pipe_;
+  std::string chunk_;
+  archive* const archive_;
+  bool broken_ = false;
 };
 
-ZipStream::ZipStream(int pipe)
-    : chunks_(std::make_unique<Chunks>(pipe)), archive_(archive_write_new()) {
+la_ssize_t Zip::WriteChunk(archive* /*unused*/, void* self, const void* bytes, size_t count) {
+  auto& zip = *static_cast<Zip*>(self);
+  if (count == 0) return 0;  // would be the end
+  std::array<char, 20> length{};
+  std::snprintf(length.data(), length.size(), "%zx\r\n", count);
+  zip.chunk_ = length.data();
+  zip.chunk_.append(static_cast<const char*>(bytes), count);
+  zip.chunk_ += "\r\n";
+  return nas::WriteAll(zip.pipe_, zip.chunk_) ? static_cast<la_ssize_t>(count) : -1;
+}
+
+Zip::Zip(int pipe) : pipe_(pipe), archive_(archive_write_new()) {
   if (archive_ == nullptr) throw std::bad_alloc();
   archive_write_set_format_zip(archive_);
   archive_write_set_options(archive_, kPacking);
   archive_write_set_bytes_per_block(archive_, kChunkBytes);
   archive_write_set_bytes_in_last_block(archive_, 1);  // not filled up
-  broken_ =
-      archive_write_open(archive_, chunks_.get(), nullptr, Chunks::Write, nullptr) != ARCHIVE_OK;
+  broken_ = archive_write_open(archive_, this, nullptr, WriteChunk, nullptr) != ARCHIVE_OK;
 }
 
-ZipStream::~ZipStream() {
+Zip::~Zip() {
   archive_write_fail(archive_);  // writes nothing more, even where it was not finished
   archive_write_free(archive_);
 }
 
-bool ZipStream::Begin(const std::string& name, const struct stat& info, bool packs) {
+bool Zip::Begin(const std::string& name, const struct stat& info, bool packs) {
   if (broken_) return false;
   std::setlocale(LC_CTYPE, nas::IsUtf8(name) ? kUtf8Locale : "C");
   if (packs) {
@@ -93,15 +108,15 @@ bool ZipStream::Begin(const std::string& name, const struct stat& info, bool pac
   return result >= ARCHIVE_WARN;
 }
 
-void ZipStream::Write(std::string_view bytes) {
+void Zip::Write(std::string_view bytes) {
   if (!broken_ && archive_write_data(archive_, bytes.data(), bytes.size()) < 0) broken_ = true;
 }
 
-void ZipStream::AddFolder(const std::string& name, const struct stat& info) {
+void Zip::AddFolder(const std::string& name, const struct stat& info) {
   Begin(name + "/", info, false);
 }
 
-bool ZipStream::AddFile(const std::string& name, int fd, const struct stat& info) {
+bool Zip::AddFile(const std::string& name, int fd, const struct stat& info) {
   if (!Begin(name, info, info.st_size > 0 && !IsPacked(name))) return false;
   std::string buffer(kReadBytes, '\0');
   bool whole = true;
@@ -120,7 +135,7 @@ bool ZipStream::AddFile(const std::string& name, int fd, const struct stat& info
   return whole;
 }
 
-void ZipStream::AddText(const std::string& name, std::string_view text) {
+void Zip::AddText(const std::string& name, std::string_view text) {
   struct stat info = {};
   info.st_mode = S_IFREG | S_IRUSR | S_IWUSR | S_IRGRP | S_IROTH;
   info.st_size = static_cast<off_t>(text.size());
@@ -128,9 +143,13 @@ void ZipStream::AddText(const std::string& name, std::string_view text) {
   if (Begin(name, info, true)) Write(text);
 }
 
-void ZipStream::Finish() {
+void Zip::Finish() {
   if (broken_ || archive_write_close(archive_) != ARCHIVE_OK) return;
-  (void)nas::WriteAll(chunks_->pipe, "0\r\n\r\n");
+  (void)nas::WriteAll(pipe_, "0\r\n\r\n");
 }
+
+}  // namespace
+
+ZipStream* NewZip(int pipe) { return new Zip(pipe); }
 
 }  // namespace arbory
