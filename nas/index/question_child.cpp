@@ -151,7 +151,8 @@ Status BecomePeer(const Peer& peer) {
 
 pid_t StartQuestion(const Question& question, const NameTable& table, Changes& changes,
                     bool attributes_current, const AnswerFunction& answer) {
-  // What lies free in pieces is brought together here, once; the child would do so in a copy.
+  // What lies free in pieces is brought together here, once; each child would do so in a copy, page
+  // by page, which is a twentieth of what a hundred rows of many take.
   malloc_trim(0);
   const pid_t pid = fork();
   if (pid == 0) Answer(question, table, changes, attributes_current, answer);
