@@ -101,6 +101,7 @@ void AnswerFrom(int connection, const IndexQuestion& question,
   search.AskContents(question.texts_too);
   search.candidate_sink = &sink;
   if (question.unread) search.unread = &sink;
+  search.names_alone = question.names_alone;
   IndexNames names(snapshot, {locations, folder, question.mounts, question.rules}, search);
   NoNames contents;
   if (question.best > 0) {

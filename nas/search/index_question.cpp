@@ -20,6 +20,7 @@ constexpr char kMounts[] = "mounts";
 constexpr char kTemporary[] = "temporary";
 constexpr char kLocations[] = "locations";
 constexpr char kUnread[] = "unread";
+constexpr char kNamesAlone[] = "names";
 constexpr char kBest[] = "best";
 
 Json::Value IdsToJson(const FolderGate::FolderIds& ids) {
@@ -51,7 +52,7 @@ bool ReadTexts(const Json::Value& json, std::vector<std::string>& texts) {
 
 bool ReadAll(const Json::Value& json, IndexQuestion& question) {
   std::vector<std::string> share;
-  for (const char* flag : {kTextsToo, kRecursive, kUnread}) {
+  for (const char* flag : {kTextsToo, kRecursive, kUnread, kNamesAlone}) {
     if (!json[flag].isBool()) return false;
   }
   if (!ReadTexts(json[kShare], share) || share.size() != 3) return false;
@@ -59,6 +60,7 @@ bool ReadAll(const Json::Value& json, IndexQuestion& question) {
   if (!json[kBest].isUInt() || json[kBest].asUInt() > kMostBest) return false;
   question.texts_too = json[kTextsToo].asBool();
   question.unread = json[kUnread].asBool();
+  question.names_alone = json[kNamesAlone].asBool();
   question.share = {share[0], share[1], {}};
   question.path = share[2];
   question.rules.recursive = json[kRecursive].asBool();
@@ -79,6 +81,7 @@ std::string QuestionText(const IndexQuestion& question) {
   json[kQuery] = QueryToJson(question.query);
   json[kTextsToo] = question.texts_too;
   json[kUnread] = question.unread;
+  json[kNamesAlone] = question.names_alone;
   json[kRecursive] = question.rules.recursive;
   for (const std::string& text : {question.share.name, question.share.root, question.path}) {
     json[kShare].append(text);

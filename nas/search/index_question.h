@@ -13,6 +13,7 @@
 //                device and inode of folders that are not entered (folder_gate.h), one after the
 //                other
 //   "unread"     whether folders that cannot be read are to be named
+//   "names"      whether rows need tell no more than names and types
 //   "best"       of an instant question: so many rows, the best first
 //
 // The answer is frames: blocks of rows (kRows: 32-bit lengths of folders and names, then the three
@@ -34,6 +35,7 @@ struct IndexQuestion {
   QueryNode query;
   bool texts_too = false;
   bool unread = false;
+  bool names_alone = false;
   Share share;       // no volume
   std::string path;  // below the share's root
   std::vector<std::string> mounts;

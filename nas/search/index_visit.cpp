@@ -21,6 +21,11 @@ constexpr unsigned kEnter = 1;
 bool IsGone(int error_number) { return error_number == ENOENT || error_number == ENOTDIR; }
 bool IsForbidden(int error_number) { return error_number == EACCES || error_number == EPERM; }
 
+// To look up one name takes as long as to read so many.
+constexpr size_t kNamesForLook = 8;
+// And reading a folder at all as long as so many looks.
+constexpr size_t kLooksForReading = 4;
+
 }  // namespace
 
 OwnRights::OwnRights() : all_(geteuid() == 0), user_(geteuid()) {
@@ -153,6 +158,10 @@ void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
   seen_ = 0;
   const bool may_tell = rights_.all() || !may_enter_;
   EnterJudge(judge_);
+  if (ReadingIsBetter(folder)) {
+    JudgeByReading(folder);
+    entries_.clear();
+  }
   for (const EntryId entry : entries_) {
     if (search_.stopping()) break;
     const DirectoryReader::Entry known{table_.name(entry), table_.inode(entry), table_.type(entry)};
@@ -176,6 +185,26 @@ void IndexVisit::JudgeEntries(FolderId folder, const Special* special) {
   }
   judge_.Leave();
   if (seen_ > 0) search_.progress.AddFolder(seen_);
+}
+
+// Where rows tell names alone, the folder tells them, also to whom its files are closed.
+bool IndexVisit::ReadingIsBetter(FolderId folder) const {
+  if (!search_.names_alone || entries_.empty()) return false;
+  const size_t names = table_.entries_end(folder) - table_.entries_begin(folder);
+  const bool many = entries_.size() > kLooksForReading + names / kNamesForLook;
+  if (many && !search_.criteria.ask_attributes) return true;
+  return !rights_.all() && faccessat(fd(), ".", X_OK, AT_EACCESS) != 0;
+}
+
+void IndexVisit::JudgeByReading(FolderId folder) {
+  DirectoryReader::Entry entry;
+  reader_.Start(fd());
+  while (reader_.Next(entry) && !search_.stopping()) {
+    if (!std::ranges::binary_search(entries_, table_.FindEntry(folder, entry.name))) continue;
+    judge_.Entry(entry);
+    ++seen_;
+  }
+  if (reader_.failed() != 0) search_.CannotRead(reader_.failed(), 0, path_);
 }
 
 void IndexVisit::EnterJudge(Judge& judge) const {

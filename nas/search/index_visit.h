@@ -62,6 +62,8 @@ class IndexVisit {
   void VisitFolder(FolderId folder);
   void CollectEntries(FolderId folder, const Special* special);
   void JudgeEntries(FolderId folder, const Special* special);
+  bool ReadingIsBetter(FolderId folder) const;
+  void JudgeByReading(FolderId folder);
   void LookAt(FolderId folder, const std::string& name);
   void ReadWhole(FolderId folder);
 
