@@ -9,6 +9,7 @@ namespace program_test {
 namespace {
 
 using testing::HasSubstr;
+using testing::Not;
 using testing::StartsWith;
 
 TEST(PathTemplates, HavePlacesForPartsOfAPath) {
@@ -152,6 +153,18 @@ TEST_F(Commands, CountsAndAnswersWithoutPaths) {
   EXPECT_EQ(none.out + none.err, "");
   EXPECT_EQ(Pieces(Run({"search", "txt", "-1"}).out, '\n').size(), 1U);
   EXPECT_EQ(Run({"search", "a b", "--format", "<{/.}>"}).out, "<a b>\n");
+}
+
+// Each library is loaded at every start and copied with every fork: what few processes need lies in
+// libraries of its own.
+TEST_F(Commands, StartWithFewLibraries) {
+  setenv("LD_TRACE_LOADED_OBJECTS", "1", 1);
+  const std::string loaded = Run({"search", "txt"}).out;
+  unsetenv("LD_TRACE_LOADED_OBJECTS");
+  EXPECT_THAT(loaded, HasSubstr("libarbory_nas.so"));
+  for (const char* other : {"libarchive", "libpam", "libcurl", "libsodium", "libxml2", "libssl"}) {
+    EXPECT_THAT(loaded, Not(HasSubstr(other)));
+  }
 }
 
 }  // namespace
