@@ -57,7 +57,7 @@ BoxAnswer AnswerOf(FleetReply reply) {
     case kUnavailable:
       // A proxy says so at once of a box that is gone.
       if (Said(reply)["code"] == kUnavailable) return {BoxState::kRefused, "busy", status, {}};
-      [[fallthrough]];
+      return {BoxState::kDown, "cannot be reached", status, {}};
     default:
       return {BoxState::kDown, "answers with status " + std::to_string(status), status, {}};
   }

@@ -190,6 +190,17 @@ bool ReadOrder(const Json::Value& json, FleetPageRequest* page) {
   return json[kBehind].isUInt() || json[kBehind].isNull();
 }
 
+// What a name takes in JSON.
+size_t TextBytes(std::string_view name) {
+  constexpr size_t kEscapeBytes = 6;
+  size_t bytes = 0;
+  for (const char byte : name) {
+    const bool plain = (byte < 0 || byte >= ' ') && byte != '"' && byte != '\\';
+    bytes += plain ? 1 : kEscapeBytes;
+  }
+  return bytes;
+}
+
 std::string TextOf(const Json::Value& value) { return value.isString() ? value.asString() : ""; }
 
 }  // namespace
@@ -265,6 +276,7 @@ void FleetPageWriter::Add(const ResultRow& row, std::uint32_t number) {
     Json::Value& pair = folders_.append(Json::arrayValue);
     pair.append(std::string(row.share_name));
     pair.append(std::string(row.folder));
+    bytes_ += TextBytes(folder);
     last_folder_ = std::move(folder);
   }
   const FileAttributes& file = *row.attributes;
@@ -281,6 +293,8 @@ void FleetPageWriter::Add(const ResultRow& row, std::uint32_t number) {
   told.append(file.crtime == FileAttributes::kNoTime ? Json::Value()
                                                      : Json::Value(Json::Int64{file.crtime}));
   told.append(number);
+  constexpr size_t kNumbersBytes = 100;
+  bytes_ += TextBytes(row.name) + kNumbersBytes;
 }
 
 void FleetPageWriter::Finish(Json::Value* page) {

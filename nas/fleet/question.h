@@ -43,8 +43,10 @@ namespace nas {
 
 // Of what both ends say; a box that does not know a word of a question refuses it.
 inline constexpr int kFleetProtocol = 1;
-// Of one page, which fits a few hundred kilobytes.
+// Of one page.
 inline constexpr unsigned kMostFleetRows = 2000;
+// A page ends with the row that makes it longer than that, however few there are.
+inline constexpr size_t kMostFleetPageBytes = size_t{192} << 10;
 // That a box may be asked to wait for rows.
 inline constexpr int kMostFleetWaitMs = 1000;
 
@@ -76,6 +78,8 @@ Result<FleetPageRequest> ReadFleetPageRequest(const Json::Value& json);
 class FleetPageWriter {
  public:
   void Add(const ResultRow& row, std::uint32_t number);
+  // Whether the page is as long as it may be.
+  bool full() const { return bytes_ >= kMostFleetPageBytes; }
   // Moves "users", "groups", "folders" and "rows" there.
   void Finish(Json::Value* page);
 
@@ -91,6 +95,7 @@ class FleetPageWriter {
   std::map<std::string, unsigned> known_users_;
   std::map<std::string, unsigned> known_groups_;
   std::string last_folder_;  // share, NUL, path
+  size_t bytes_ = 0;         // of the page's text, about
 };
 
 // A row as it came, valid as long as the page. Nothing of it is believed but that it is in order.

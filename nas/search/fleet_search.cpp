@@ -18,9 +18,8 @@ constexpr int kWaitMs = 250;
 // All pages of all boxes that may be under way at once, as far as their rows are ordinary ones.
 constexpr unsigned kMostRowsUnderWay = 50'000;
 constexpr unsigned kFewestRows = 100;
-// A row of a name of 255 bytes, each of them escaped, in a folder of its own.
-constexpr size_t kMostRowBytes = 2048;
-constexpr size_t kMostPageBytes = size_t{4} << 20;
+// More than a box sends (kMostFleetPageBytes); taken apart, a page may take fifty times as much.
+constexpr size_t kMostPageBytes = size_t{512} << 10;
 // Of one box; rows name their share in 16 bits.
 constexpr size_t kMostShares = 1000;
 constexpr std::uint16_t kNoShare = 0xFFFF;
@@ -93,8 +92,7 @@ FleetSearch::FleetSearch(std::vector<FleetLocation> locations, Settings settings
 }
 
 void FleetSearch::Run() {
-  const size_t most_rows = std::max(page_.limit, first_ ? first_->most_rows() : 0);
-  asker_.emplace(fleet_, std::min(kMostPageBytes, most_rows * kMostRowBytes));
+  asker_.emplace(fleet_, kMostPageBytes);
   for (Box& box : boxes_) AskFirst(box);
   first_page_due_.emplace(fleet_.deadline_ms / kFirstPageShare);
   asker_->Run([this] {
@@ -167,23 +165,24 @@ bool FleetSearch::TakePage(Box& box, const FleetPage& page) {
                       page.rows.size() <= limit &&
                       page.rows.size() <= (box.in_order ? page.total : page.next - box.next);
   if (!agrees) return false;
-  std::uint64_t rows = 0;
+  // All of them before any is taken.
+  std::vector<const FleetRow*> fresh;
   for (const FleetRow& row : page.rows) {
-    if (!CanTake(box, row)) return false;
     const bool known = box.told_once.contains(row.number);
-    if (!TakeNumber(box, page, row)) return false;
-    if (known) continue;
-    ++rows;
+    if (!CanTake(box, row) || !TakeNumber(box, page, row)) return false;
+    if (!known) fresh.push_back(&row);
+  }
+  for (const FleetRow* row : fresh) {
     if (!first_) {
-      TakeRow(box, row);
+      TakeRow(box, *row);
       continue;
     }
-    first_->Add(BoxPlace(box), box.box->name + "/" + row.share, row);
-    held_.push_back({&box, row});
+    first_->Add(BoxPlace(box), box.box->name + "/" + row->share, *row);
+    held_.push_back({&box, *row});
   }
   if (first_) first_->Told(BoxPlace(box), !page.finished || page.next < page.total);
-  search_.progress.AddMatches(rows);
-  box.told_any = box.told_any || rows > 0;
+  search_.progress.AddMatches(fresh.size());
+  box.told_any = box.told_any || !fresh.empty();
   box.task = page.task;
   box.next = page.next;
   return true;

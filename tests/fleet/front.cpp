@@ -59,17 +59,24 @@ std::vector<std::string> KeysOf(const std::vector<Listed>& files, const std::str
   return keys;
 }
 
+void FrontTest::WriteFleetFile(const std::vector<Box>& boxes, const std::string& more) {
+  std::string file = "front = \"office\"\nrealm = \"OFFICE\"\nkey_file = \"" + dir_ +
+                     "/office.key\"\n" + more + "[boxes]\n";
+  for (size_t i = 0; i < boxes.size(); ++i) {
+    const std::string address = i < addresses_.size()
+                                    ? addresses_[i]
+                                    : "http://127.0.0.1:" + std::to_string(boxes[i].server.port);
+    file += boxes[i].name + " = \"" + address + "\"\n";
+  }
+  nas_test::WriteFile(dir_ + "/fleet.toml", file);
+}
+
 Server FrontTest::StartFront(const std::vector<Box>& boxes, const std::string& more) {
   const std::string key = dir_ + "/office.key";
   nas_test::WriteFile(key, nas::ToHex(secret_key_) + "\n");
   chmod(key.c_str(), 0600);
-  std::string file =
-      "front = \"office\"\nrealm = \"OFFICE\"\nkey_file = \"" + key + "\"\n" + more + "[boxes]\n";
-  for (const Box& box : boxes) {
-    file += box.name + " = \"http://127.0.0.1:" + std::to_string(box.server.port) + "\"\n";
-  }
+  WriteFleetFile(boxes, more);
   fleet_file_ = dir_ + "/fleet.toml";
-  nas_test::WriteFile(fleet_file_, file);
   share_lines_ = "";
   state_ = MakeFolder("front-state");
   root_state_ = dir_ + "/front-root-state";

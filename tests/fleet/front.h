@@ -32,6 +32,7 @@ class FrontTest : public FleetTest {
   // A front that asks these; `more` goes into its file, before the boxes.
   Server StartFront(const std::vector<Box>& boxes,
                     const std::string& more = "deadline_ms = 5000\n");
+  void WriteFleetFile(const std::vector<Box>& boxes, const std::string& more);
   static Server LoggedIn(Server server, const std::string& user);
   // Runs a search to its end and leaves its id in task_.
   void Search(const Server& server, Json::Value params);
@@ -39,6 +40,7 @@ class FrontTest : public FleetTest {
   static std::vector<Listed> FilesOf(const Json::Value& files);
   static std::string Text(const Json::Value& params);
 
+  std::vector<std::string> addresses_;  // of the boxes, where they are others than their own
   std::string task_;
   Json::Value status_;
   std::uint64_t total_ = 0;

@@ -164,7 +164,7 @@ Rows ReadRows(const RunningSearch& search, const nas::FleetPageRequest& page,
   reader.Begin();
   rows.total = reader.rows();
   const std::uint64_t end = std::min(rows.total, page.after + page.limit);
-  for (; rows.next < end; ++rows.next) {
+  for (; rows.next < end && (writer == nullptr || !writer->full()); ++rows.next) {
     const auto row = static_cast<std::uint32_t>(rows.next);
     if (writer != nullptr && !reader.purged(row)) writer->Add(reader.Row(row), row);
   }
@@ -182,11 +182,14 @@ Rows ReadFirstRows(const RunningSearch& search, const nas::FleetPageRequest& pag
   rows.total = reader.rows();
   auto behind = page.behind;
   if (behind && *behind >= rows.total) behind.reset();
+  size_t told = 0;
   for (const auto row : nas::FirstRows(reader, page.column, page.ascending, page.limit, behind)) {
+    if (writer->full()) break;
     writer->Add(reader.Row(row), row);
+    ++told;
   }
   reader.End();
-  if (search.finished && !page.behind && rows.total <= page.limit) rows.next = rows.total;
+  if (search.finished && !page.behind && rows.total <= told) rows.next = rows.total;
   return rows;
 }
 

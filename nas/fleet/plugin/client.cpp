@@ -17,6 +17,11 @@ namespace {
 constexpr int kTickMilliseconds = 25;
 // What a machine may keep silent in the midst of a body that is passed on: a disk may spin up.
 constexpr std::chrono::seconds kMostSilence(30);
+// Of all replies that are being read. What is over goes at the expense of those that have more of
+// it than their part, so that machines that send without end take little from one that does not.
+constexpr size_t kMostHeldBytes = size_t{16} << 20;
+// A thousand connections are read at a time; the usual buffers would be most of what that takes.
+constexpr long kBufferBytes = 4096;
 constexpr int kOk = 200;
 constexpr int kPartial = 206;
 constexpr int kNotSatisfiable = 416;
@@ -30,13 +35,26 @@ struct ListEnd {
   void operator()(curl_slist* list) const { curl_slist_free_all(list); }
 };
 
+// What all replies hold that are being read.
+struct Held {
+  size_t replies = 0;
+  size_t bytes = 0;
+};
+
 // One request under way.
 struct Exchange {
+  ~Exchange() {
+    if (held == nullptr) return;
+    --held->replies;
+    held->bytes -= holds;
+  }
   std::unique_ptr<CURL, EasyEnd> easy{curl_easy_init()};
   std::unique_ptr<curl_slist, ListEnd> fields;
   std::string body;  // sent
   FleetReply reply;
   size_t most_bytes = 0;
+  Held* held = nullptr;
+  size_t holds = 0;  // of that
   FleetClient::Done done;
   // Of a body that is passed on.
   std::function<bool(const FleetHead&)> take_head;
@@ -82,11 +100,18 @@ size_t PassOn(Exchange& exchange, std::string_view piece) {
   return taken ? piece.size() : 0;
 }
 
+bool MayHold(Exchange& exchange, size_t more) {
+  Held& held = *exchange.held;
+  held.bytes += more;
+  exchange.holds += more;
+  return held.bytes <= kMostHeldBytes || exchange.holds <= kMostHeldBytes / held.replies;
+}
+
 size_t TakeBody(char* bytes, size_t size, size_t count, void* context) {
   auto& exchange = *static_cast<Exchange*>(context);
   const size_t length = size * count;
   if (exchange.passed_on()) return PassOn(exchange, {bytes, length});
-  if (exchange.reply.body.size() + length > exchange.most_bytes) {
+  if (exchange.reply.body.size() + length > exchange.most_bytes || !MayHold(exchange, length)) {
     exchange.reply.outcome = FleetReply::Outcome::kTooLong;
     return 0;
   }
@@ -116,6 +141,7 @@ class CurlClient : public FleetClient {
   const std::string socket_;
   const size_t most_bytes_;
   CURLM* const multi_;
+  Held held_;  // before what counts in it
   std::map<CURL*, std::unique_ptr<Exchange>> under_way_;
 };
 
@@ -124,6 +150,8 @@ void CurlClient::Ask(const FleetRequest& request, Done done) {
   CURL* easy = exchange->easy.get();
   exchange->body = request.body;
   exchange->most_bytes = most_bytes_;
+  exchange->held = &held_;
+  ++held_.replies;
   exchange->done = std::move(done);
   const auto add = [&](const std::string& field) {
     curl_slist* longer = curl_slist_append(exchange->fields.get(), field.c_str());
@@ -153,6 +181,7 @@ void CurlClient::Ask(const FleetRequest& request, Done done) {
     curl_easy_setopt(easy, CURLOPT_FILETIME, 1L);
   } else {
     curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, static_cast<long>(request.deadline_ms));
+    curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, kBufferBytes);
   }
   if (request.method == "HEAD") curl_easy_setopt(easy, CURLOPT_NOBODY, 1L);
   curl_easy_setopt(easy, CURLOPT_HTTPHEADER, exchange->fields.get());
