@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <utility>
@@ -25,7 +26,10 @@
 namespace arbory {
 namespace {
 
+constexpr char kProxyUser[] = "haproxy";
 constexpr size_t kMostStatusBytes = size_t{64} << 10;
+constexpr size_t kMostConfigBytes = size_t{16} << 20;  // ten thousand boxes
+constexpr mode_t kReadableByAll = S_IRUSR | S_IWUSR | S_IRGRP | S_IROTH;
 
 // "box1.example.net:8750" and whether TLS is spoken there.
 std::pair<std::string, bool> ServerOf(const nas::FleetBox& box) {
@@ -44,12 +48,18 @@ std::pair<std::string, bool> ServerOf(const nas::FleetBox& box) {
 std::string ProxyConfig(const nas::FleetSettings& fleet) {
   std::string text =
       "# Printed by `arbory fleet config`. The socket is open to all: tokens are what boxes go "
-      "by.\n"
+      "by.\n";
+  // Root's reads keys and binds the socket as root, and does all else as this user.
+  if (geteuid() == 0 && nas::FindAccount(kProxyUser)) {
+    text += std::string("global\n    user ") + kProxyUser + "\n\n";
+  }
+  text +=
       "defaults\n"
       "    mode http\n"
       "    timeout connect 1s\n"
       "    timeout client 1m\n"
       "    timeout server 1m\n"
+      "    retries 0\n"
       "    http-reuse always\n"
       "    option httpchk\n"
       "    default-server check inter 2s fall 2 rise 1\n"
@@ -67,13 +77,20 @@ std::string ProxyConfig(const nas::FleetSettings& fleet) {
             "\n    http-request set-header Host " + server + "\n    server " + box.name + " " +
             server;
     if (tls) {
-      text +=
-          " ssl verify required ca-file /etc/arbory/fleet/ca.pem crt /etc/arbory/fleet/front.pem"
-          " verifyhost " +
-          host + " sni str(" + host + ")";
+      text += " ssl verify required ca-file " + fleet.tls_folder + "/ca.pem crt " +
+              fleet.tls_folder + "/front.pem verifyhost " + host + " sni str(" + host + ")";
     }
     text += "\n";
   }
+  return text;
+}
+
+// What a box says, as a terminal may show it.
+std::string Plain(const std::string& said) {
+  constexpr size_t kMostBytes = 40;
+  std::string text = said.substr(0, kMostBytes);
+  std::ranges::replace_if(
+      text, [](unsigned char byte) { return byte < ' ' || byte > '~'; }, '?');
   return text;
 }
 
@@ -83,6 +100,8 @@ struct BoxLine {
   bool answered = false;
   std::string state = nas::BoxStateName(nas::BoxState::kAsked);
   std::string version = "-";
+  std::string files = "-";
+  std::string index = "-";
   std::string clock = "-";  // seconds that the box is ahead
   std::string spent = "-";  // milliseconds
   std::string why;
@@ -94,13 +113,15 @@ struct BoxLine {
     answered = answer.state == nas::BoxState::kAnswered && nas::ParseJson(answer.body, &said) &&
                said.isObject() && said["version"].isString() && said["now"].isInt64();
     if (!answered) return;
-    version = said["version"].asString();
+    version = Plain(said["version"].asString());
+    if (said["files"].isUInt64()) files = std::to_string(said["files"].asUInt64());
+    if (said["index"].isString()) index = Plain(said["index"].asString());
     clock = std::to_string(said["now"].asInt64() - std::time(nullptr));
     spent = std::to_string(std::chrono::ceil<std::chrono::milliseconds>(time).count());
   }
 
   static std::string Row(const std::vector<std::string>& cells) {
-    constexpr size_t kWidths[] = {20, 10, 12, 8, 6};
+    constexpr size_t kWidths[] = {20, 10, 12, 12, 14, 8, 6};
     std::string text;
     for (size_t i = 0; i < cells.size(); ++i) {
       text += cells[i];
@@ -110,8 +131,10 @@ struct BoxLine {
     while (text.ends_with(' ')) text.pop_back();
     return text + "\n";
   }
-  static std::string Head() { return Row({"BOX", "STATE", "VERSION", "CLOCK", "MS", "WHY"}); }
-  std::string Text() const { return Row({name, state, version, clock, spent, why}); }
+  static std::string Head() {
+    return Row({"BOX", "STATE", "VERSION", "FILES", "INDEX", "CLOCK", "MS", "WHY"});
+  }
+  std::string Text() const { return Row({name, state, version, files, index, clock, spent, why}); }
 };
 
 }  // namespace
@@ -140,7 +163,19 @@ int RunFleetConfigCommand(const FleetOptions& options) {
     throw UsageError("name the proxy's socket in " + options.file +
                      ", such as proxy = \"/run/haproxy/arbory.sock\"");
   }
-  WriteOut(STDOUT_FILENO, ProxyConfig(fleet));
+  const std::string text = ProxyConfig(fleet);
+  if (options.write.empty()) {
+    WriteOut(STDOUT_FILENO, text);
+    return kExitSuccess;
+  }
+  const auto before = nas::ReadWholeFile(AT_FDCWD, options.write, kMostConfigBytes);
+  if (before && *before == text) return kExitSuccess;
+  const nas::Status written =
+      nas::ReplaceFile(AT_FDCWD, options.write, text, kReadableByAll, /*durable=*/true);
+  if (!written) throw UsageError("cannot write " + written.error().Text());
+  if (!options.reload.empty() && std::system(options.reload.c_str()) != 0) {
+    throw UsageError("written to " + options.write + ", but this failed: " + options.reload);
+  }
   return kExitSuccess;
 }
 

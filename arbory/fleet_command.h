@@ -9,8 +9,9 @@ namespace arbory {
 // Throws UsageError where the file is there already or cannot be written.
 int RunFleetKeyCommand(const FleetOptions& options);
 
-// `arbory fleet config`: prints what HAProxy needs to stand between the front and its boxes. Throws
-// nas::ConfigError.
+// `arbory fleet config`: prints what HAProxy needs to stand between the front and its boxes, or
+// replaces a file with it and has that read anew. Throws nas::ConfigError, and UsageError for what
+// cannot be written or read.
 int RunFleetConfigCommand(const FleetOptions& options);
 
 // `arbory fleet status`: asks every box and prints a line of each; exit code 1 where one does not

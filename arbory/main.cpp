@@ -155,6 +155,13 @@ FleetCommands AddFleet(CLI::App* app, FleetOptions* options) {
   commands.key->add_option("FILE", options->key_file, "Where the secret one goes; a new file")
       ->required();
   commands.config = fleet->add_subcommand("config", "Print the configuration of HAProxy");
+  CLI::Option* write =
+      commands.config->add_option("--write", options->write, "Write it there, where it has changed")
+          ->type_name("PATH");
+  commands.config
+      ->add_option("--reload", options->reload, "And run this then: 'systemctl reload haproxy'")
+      ->type_name("COMMAND")
+      ->needs(write);
   commands.status = fleet->add_subcommand("status", "Tell of every box how it is");
   for (CLI::App* command : {commands.config, commands.status}) {
     command->add_option("FILE", options->file, "The file that names the boxes")->required();

@@ -61,7 +61,9 @@ struct ServeOptions {
 
 struct FleetOptions {
   std::string key_file;
-  std::string file;  // that names the boxes
+  std::string file;    // that names the boxes
+  std::string write;   // where the configuration goes; empty: to standard output
+  std::string reload;  // a shell command for when it has changed; empty: none
 };
 
 struct IndexOptions {

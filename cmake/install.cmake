@@ -12,4 +12,5 @@ install(DIRECTORY ${CMAKE_BINARY_DIR}/manual/ DESTINATION share PATTERN made EXC
 install(FILES docs/api.md docs/deploy.md docs/fleet.md docs/http.md docs/index.md docs/query.md
         DESTINATION share/doc/arbory)
 install(FILES packaging/arbory.toml packaging/nginx.conf DESTINATION share/doc/arbory/examples)
+install(DIRECTORY packaging/fleet DESTINATION share/doc/arbory/examples USE_SOURCE_PERMISSIONS)
 install(FILES packaging/pam/arbory DESTINATION share/doc/arbory/examples/pam)

@@ -104,6 +104,8 @@ struct FleetSettings {
   std::string realm;
   std::string key_file;  // its secret key, for root or its user alone
   std::string proxy;     // socket of a proxy that knows every box by its name; empty: no such thing
+  // What the proxy shows boxes, front.pem, and by whom their certificates are signed, ca.pem.
+  std::string tls_folder = "/etc/arbory/fleet";
   int deadline_ms = 2000;        // for a box to say something
   int rows_per_box = 1'000'000;  // of one search; what is over stays where it is
   std::vector<FleetBox> boxes;

@@ -117,6 +117,7 @@ class Reader {
         {"realm", [&](const toml::node& node) { fleet->realm = Text(node); }},
         {"key_file", [&](const toml::node& node) { fleet->key_file = Path(node); }},
         {"proxy", [&](const toml::node& node) { fleet->proxy = PathOrNone(node); }},
+        {"tls_folder", [&](const toml::node& node) { fleet->tls_folder = Path(node); }},
         {"boxes", [&](const toml::node& node) { fleet->boxes = Boxes(node); }},
     };
     AddLimits({{"deadline_ms", &fleet->deadline_ms}, {"rows_per_box", &fleet->rows_per_box}},

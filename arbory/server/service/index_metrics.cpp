@@ -1,5 +1,8 @@
 #include "arbory/server/service/index_metrics.h"
 
+#include <algorithm>
+#include <cstdint>
+
 #include "nas/base/json_text.h"
 #include "nas/index/client.h"
 
@@ -28,12 +31,17 @@ constexpr Figure kFigures[] = {
     {"swept_at", "arbory_index_compared_seconds", "gauge", "When it was last compared."},
 };
 
+Json::Value AskForReport() {
+  const auto text = nas::AskDaemon(nas::HelloKind::kReport, kPatienceMilliseconds);
+  Json::Value report;
+  return text && nas::ParseJson(*text, &report) ? report : Json::Value();
+}
+
 }  // namespace
 
 std::string IndexMetrics() {
-  const auto text = nas::AskDaemon(nas::HelloKind::kReport, kPatienceMilliseconds);
-  Json::Value report;
-  if (!text || !nas::ParseJson(*text, &report)) return {};
+  const Json::Value report = AskForReport();
+  if (report.isNull()) return {};
   std::string out =
       "# HELP arbory_index_current Whether everything that is to be indexed is.\n"
       "# TYPE arbory_index_current gauge\narbory_index_current ";
@@ -48,6 +56,21 @@ std::string IndexMetrics() {
     }
   }
   return out;
+}
+
+void AddIndexState(Json::Value* body) {
+  const Json::Value report = AskForReport();
+  if (report.isNull()) return;
+  std::uint64_t files = 0;
+  std::string state = "current";
+  for (const Json::Value& item : report["file_systems"]) {
+    files += item["entries"].asUInt64() -
+             std::min(item["entries"].asUInt64(), item["folders"].asUInt64());
+    const std::string its = item["state"].asString();
+    if (!report["current"].asBool() && its != nas::kIndexCurrent) state = its;
+  }
+  (*body)["files"] = Json::UInt64{files};
+  (*body)["index"] = state;
 }
 
 }  // namespace arbory

@@ -33,6 +33,7 @@ constexpr int kNoSuchMethod = 103;
 constexpr int kNoSuchVersion = 104;
 constexpr char kRetrySeconds[] = "1";
 constexpr char kStartMethod[] = "start";
+constexpr char kRoot[] = "root";
 
 std::string ListRows(const nas::Module& module) {
   Json::Value rows(Json::arrayValue);
@@ -77,12 +78,14 @@ nas::ApiCall ForSharesOf(const std::string& user) {
   return call;
 }
 
-// Of the machine alone, so nobody need be looked up for it.
-HttpReply FrontStatusReply() {
+// Of the machine alone, so nobody need be looked up for it. How many files there are would tell a
+// user how much is hidden: that is for the front's root, for whom a box does nothing else.
+HttpReply FrontStatusReply(const std::string& user) {
   Json::Value body;
   body["version"] = ARBORY_VERSION;
   body["protocol"] = nas::kFleetProtocol;
   body["now"] = Json::Int64{std::time(nullptr)};
+  if (user == kRoot) AddIndexState(&body);
   return JsonReply(kOk, nas::JsonText(body, nas::JsonBytes::kClean));
 }
 
@@ -205,7 +208,8 @@ std::span<const Route> Service::Routes() {
        },
        nullptr, nullptr},
       {kGet, "/fleet/status", Access::kFront,
-       [](Self, Request, Path) -> Answer { return FrontStatusReply(); }, nullptr, nullptr},
+       [](Self, Request request, Path) -> Answer { return FrontStatusReply(request->user); },
+       nullptr, nullptr},
       {kGet, "/api", Access::kEverybody,
        [](Self self, Request, Path) -> Answer { return JsonReply(kOk, self.api_list_); },
        "The rows of the method table", kJson},
