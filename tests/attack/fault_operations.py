@@ -1,6 +1,7 @@
 """The operations that the fault campaign attacks, and what each promises when a call of the system
 fails in it."""
 
+import contextlib
 import json
 import os
 import signal
@@ -132,6 +133,20 @@ class Stop(Call):
         if not harmless:
             attack.call(SEARCH + "stop", {"taskid": self.running})
         demand(eventually(lambda: not children(attack.checker.process)), "a stopped worker lives on")
+
+
+class CleanBeforeTheStop(Stop):
+    """What is cleaned is still in use: the worker stands still until the clean has ended."""
+
+    def run(self, attack):
+        with open(f"{attack.house.tasks}/{self.running}.json") as file:
+            worker = json.load(file)["properties"]["data"]["pid"]
+        os.kill(worker, signal.SIGSTOP)
+        try:
+            return super().run(attack)
+        finally:
+            with contextlib.suppress(ProcessLookupError):
+                os.kill(worker, signal.SIGCONT)
 
 
 def ends_by_right(attack, status, err):
@@ -266,6 +281,7 @@ def operations():
         "list": Call(SEARCH + "list", listed),
         "stop": Stop(SEARCH + "stop", {"taskid": "RUNNING"}),
         "clean-running": Stop(SEARCH + "clean", {"taskid": "RUNNING"}),
+        "clean-standing": CleanBeforeTheStop(SEARCH + "clean", {"taskid": "RUNNING"}),
         "clean": Call(SEARCH + "clean", {"taskid": "FOUND"}, keeps_results=False),
         "clean-all": Call(SEARCH + "Clean", {"action": "cleanall"}, keeps_results=False),
         "get": Call(HISTORY + "get", {}),
