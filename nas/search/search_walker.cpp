@@ -296,8 +296,11 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
     return false;
   }
   writer_->Complete();
+  const bool nobody = completed && fleet_ && locations_.empty() && fleet_->failed();
+  // Who is told that everything was found does not wait for how it ends.
+  if (nobody) search.progress.SetPhase(nas::WalkProgress::Phase::kNames);
   Report(search.progress, true);
-  if (completed && fleet_ && locations_.empty() && fleet_->failed()) {
+  if (nobody) {
     nas::SetLastError(nas::kErrorOther);
     completed = false;
   }
