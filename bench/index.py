@@ -245,7 +245,9 @@ def gap(index):
     pathlib.Path(index.folder + "/made-in-the-gap").touch()
     begun = time.perf_counter()
     index.daemon = index.spawn("index")
-    index.wait(lambda: index.status()["current"])
+    # All is current once attributes are as well.
+    index.wait(lambda: any(one["state"] == "current"
+                           for one in index.status().get("file_systems", [])))
     names = time.perf_counter() - begun
     index.wait(lambda: index.figures()["attributes"] == "current")
     os.unlink(index.folder + "/made-in-the-gap")
