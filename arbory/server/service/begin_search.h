@@ -12,7 +12,7 @@ namespace arbory {
 //
 //   {"wrong"}                     as StartReadQuery has it, and no search was begun
 //   {"code":N}                    of a start that failed
-//   {"taskid","params","spans"[,"page"]}  "page" as `list` gives it, where it could be listed at once
+//   {"taskid","params","spans"[,"page"]}  "page" as `list` gives it, where it could be
 //
 // The parameter "list" holds those of the listing but for the task. The first rows are waited for
 // for a moment. The pid is -1, with errno set, when nothing can be forked. Of the loop's thread
