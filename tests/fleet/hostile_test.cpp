@@ -174,7 +174,10 @@ TEST_F(HostileTest, EndlessRowsEndAtTheBoundAndTakeLittleMemory) {
   EXPECT_TRUE(ended) << "the box goes on for nobody";
   constexpr size_t kMostKilobytes = 64 << 10;
   EXPECT_GT(memory, 0U);
-  EXPECT_LT(memory, kMostKilobytes);
+  // Sanitizers map more than they use.
+  if (nas_test::kMemoryIsBounded) {
+    EXPECT_LT(memory, kMostKilobytes);
+  }
 }
 
 TEST_F(HostileTest, AClockThatIsOffIsFollowedOnceAndNotFar) {
