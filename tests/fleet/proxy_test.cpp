@@ -1,5 +1,6 @@
 // A fleet behind HAProxy, as `arbory fleet config` sets it up. Left out where there is none.
 
+#include <fcntl.h>
 #include <netinet/in.h>
 #include <signal.h>
 #include <sys/prctl.h>
@@ -50,9 +51,11 @@ class ProxyTest : public FrontTest {
     ASSERT_TRUE(Eventually([&] { return access((dir_ + "/proxy.sock").c_str(), F_OK) == 0; }));
   }
 
-  pid_t StartHaproxy(const std::string& config) {
+  // `taken_over` are the descriptors that it gets as they are.
+  pid_t StartHaproxy(const std::string& config, const std::vector<int>& taken_over = {}) {
     const pid_t pid = fork();
     if (pid != 0) return pid;
+    for (const int fd : taken_over) fcntl(fd, F_SETFD, 0);
     prctl(PR_SET_PDEATHSIG, SIGTERM);
     const int log = open((dir_ + "/haproxy.log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
     dup2(log, STDOUT_FILENO);
@@ -61,16 +64,23 @@ class ProxyTest : public FrontTest {
     _exit(98);
   }
 
-  // Of 127.0.0.1, free a moment ago.
-  static std::string FreePort() {
-    const nas::UniqueFd socket_fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  // Listens at a port of 127.0.0.1 that nobody else can have meanwhile; a proxy takes it over.
+  struct Listener {
+    nas::UniqueFd socket_fd;
+    std::string port;
+  };
+  static Listener Listen() {
+    Listener listener{nas::UniqueFd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)), {}};
     sockaddr_in address = {};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t length = sizeof address;
-    EXPECT_EQ(bind(socket_fd.get(), reinterpret_cast<sockaddr*>(&address), length), 0);
-    EXPECT_EQ(getsockname(socket_fd.get(), reinterpret_cast<sockaddr*>(&address), &length), 0);
-    return std::to_string(ntohs(address.sin_port));
+    const int fd = listener.socket_fd.get();
+    EXPECT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), length), 0);
+    EXPECT_EQ(listen(fd, SOMAXCONN), 0);
+    EXPECT_EQ(getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length), 0);
+    listener.port = std::to_string(ntohs(address.sin_port));
+    return listener;
   }
 
   // The states of the boxes that do not answer a search for all of them.
@@ -135,19 +145,20 @@ TEST_F(ProxyTest, ABoxWithAnothersCertificateIsNotBelieved) {
   std::string text =
       "defaults\n mode http\n timeout connect 5s\n timeout client 1m\n"
       " timeout server 1m\n";
-  const std::string ports[] = {FreePort(), FreePort()};
+  const Listener listeners[] = {Listen(), Listen()};
   for (size_t i = 0; i < boxes.size(); ++i) {
     const std::string number = std::to_string(i);
-    text += "listen box" + number + "\n bind 127.0.0.1:" + ports[i] + " ssl crt " + dir_ +
-            "/tls/localhost.pem ca-file " + dir_ +
+    text += "listen box" + number + "\n bind fd@" + std::to_string(listeners[i].socket_fd.get()) +
+            " ssl crt " + dir_ + "/tls/localhost.pem ca-file " + dir_ +
             "/tls/ca.pem verify required\n http-request set-header Host 127.0.0.1:" +
             std::to_string(boxes[i].server.port) +
             "\n server s 127.0.0.1:" + std::to_string(boxes[i].server.port) + "\n";
   }
   nas_test::WriteFile(tls, text);
-  const pid_t before_boxes = StartHaproxy(tls);
+  const pid_t before_boxes =
+      StartHaproxy(tls, {listeners[0].socket_fd.get(), listeners[1].socket_fd.get()});
   const Server front = LoggedIn(StartFront(boxes, Settings()), User());
-  addresses_ = {"https://localhost:" + ports[0], "https://127.0.0.1:" + ports[1]};
+  addresses_ = {"https://localhost:" + listeners[0].port, "https://127.0.0.1:" + listeners[1].port};
   WriteFleetFile(boxes, Settings());
   StartProxy();
   std::map<std::string, std::string> states;
