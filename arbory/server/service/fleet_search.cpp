@@ -156,10 +156,14 @@ struct Rows {
   std::uint64_t next = 0;
 };
 
+bool HasResults(const RunningSearch& search) {
+  return !search.results.empty() && access(search.results.c_str(), F_OK) == 0;
+}
+
 Rows ReadRows(const RunningSearch& search, const nas::FleetPageRequest& page,
               nas::FleetPageWriter* writer) {
   Rows rows{0, page.after};
-  if (search.results.empty() || access(search.results.c_str(), F_OK) != 0) return rows;
+  if (!HasResults(search)) return rows;
   nas::ResultReader reader(search.results);
   reader.Begin();
   rows.total = reader.rows();
@@ -176,7 +180,7 @@ Rows ReadRows(const RunningSearch& search, const nas::FleetPageRequest& page,
 Rows ReadFirstRows(const RunningSearch& search, const nas::FleetPageRequest& page,
                    nas::FleetPageWriter* writer) {
   Rows rows{0, page.after};
-  if (search.results.empty() || access(search.results.c_str(), F_OK) != 0) return rows;
+  if (!HasResults(search)) return rows;
   nas::ResultReader reader(search.results);
   reader.Begin();
   rows.total = reader.rows();
