@@ -29,6 +29,18 @@ export async function openMortalBrowser(): Promise<{ browser: Browser; kill: () 
   return { browser, kill: () => server.process().kill('SIGKILL') };
 }
 
+export type Cookies = Awaited<ReturnType<ReturnType<Page['context']>['cookies']>>;
+
+// The session that the address which a server printed gives, once.
+export async function sessionOf(browser: Browser, address: string): Promise<Cookies> {
+  const tab = await Tab.open(browser);
+  await tab.page.goto(address);
+  await tab.page.waitForSelector('#pattern');
+  const cookies = await tab.page.context().cookies();
+  await tab.close();
+  return cookies;
+}
+
 export class Tab {
   readonly troubles: string[] = [];
   readonly tasks: string[] = []; // of the searches it started
@@ -40,6 +52,20 @@ export class Tab {
     context.setDefaultTimeout(SOON_MS);
     const tab = new Tab(await context.newPage());
     tab.watch();
+    return tab;
+  }
+
+  // With a session, at the page's address.
+  static async openAt(
+    browser: Browser,
+    cookies: Cookies,
+    address: string,
+    options: BrowserContextOptions = {},
+  ): Promise<Tab> {
+    const tab = await Tab.open(browser, options);
+    await tab.page.context().addCookies(cookies);
+    await tab.page.goto(address);
+    await tab.page.waitForSelector('#pattern');
     return tab;
   }
 

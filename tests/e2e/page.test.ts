@@ -4,14 +4,14 @@ import * as fs from 'node:fs';
 import { after, before, test } from 'node:test';
 import { join } from 'node:path';
 import type { Browser } from 'playwright-core';
-import { openBrowser, Tab } from './browser.ts';
+import { openBrowser, type Cookies, Tab } from './browser.ts';
 import { Index, Place, Server } from './server.ts';
 import { HOSTILE, itemName, makeFiles, makeMany, MANY } from './tree.ts';
 
 let place: Place;
 let server: Server;
 let browser: Browser;
-let cookies: Awaited<ReturnType<ReturnType<Tab['page']['context']>['cookies']>>;
+let cookies: Cookies;
 
 before(async () => {
   place = new Place();
@@ -28,10 +28,7 @@ after(async () => {
 
 // A tab with the session that the first test opened; `hash` is the search in its address.
 async function openTab(hash = '', options = {}): Promise<Tab> {
-  const tab = await Tab.open(browser, options);
-  await tab.page.context().addCookies(cookies);
-  await tab.page.goto(`${server.origin}/${hash}`);
-  await tab.page.waitForSelector('#pattern');
+  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`, options);
   if (hash) await tab.over();
   return tab;
 }

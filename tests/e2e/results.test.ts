@@ -4,14 +4,14 @@ import { execFileSync } from 'node:child_process';
 import { after, before, test } from 'node:test';
 import { join } from 'node:path';
 import type { Browser } from 'playwright-core';
-import { openBrowser, Tab } from './browser.ts';
+import { openBrowser, type Cookies, sessionOf, Tab } from './browser.ts';
 import { Place, Server } from './server.ts';
 import { makeFiles } from './tree.ts';
 
 let place: Place;
 let server: Server;
 let browser: Browser;
-let cookies: Awaited<ReturnType<ReturnType<Tab['page']['context']>['cookies']>>;
+let cookies: Cookies;
 
 before(async () => {
   place = new Place();
@@ -19,11 +19,7 @@ before(async () => {
   place.giveAway(files);
   server = await Server.start(place, { shares: { files } });
   browser = await openBrowser();
-  const tab = await Tab.open(browser);
-  await tab.page.goto(server.address);
-  await tab.page.waitForSelector('#pattern');
-  cookies = await tab.page.context().cookies();
-  await tab.close();
+  cookies = await sessionOf(browser, server.address);
 });
 after(async () => {
   await browser?.close();
@@ -32,9 +28,7 @@ after(async () => {
 });
 
 async function openTab(hash: string, options = {}): Promise<Tab> {
-  const tab = await Tab.open(browser, options);
-  await tab.page.context().addCookies(cookies);
-  await tab.page.goto(`${server.origin}/${hash}`);
+  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`, options);
   await tab.over();
   return tab;
 }
