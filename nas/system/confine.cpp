@@ -41,6 +41,7 @@ namespace {
 constexpr char kBubblewrap[] = "/usr/bin/bwrap";
 // For emptying a folder of result files; longer takes only what will never end.
 constexpr std::chrono::minutes kPatience{10};
+constexpr std::chrono::milliseconds kLook{50};
 constexpr char kCommandPath[] = "/usr/bin:/bin";
 constexpr const char* kSystemFolders[] = {"/usr",   "/bin",   "/sbin",   "/lib",
                                           "/lib32", "/lib64", "/libx32", "/etc"};
@@ -110,18 +111,23 @@ int Reported(const std::string& report, const char* name) {
   return -1;
 }
 
-// Waits until `child` has ended; false when it did not in time.
+bool HasEnded(pid_t child) {
+  siginfo_t info{};
+  return waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT | WNOHANG) == 0 &&
+         info.si_pid == child;
+}
+
+// Waits until `child` has ended; false when it did not in time. Where no descriptor can be had that
+// tells of its end, looking again and again does.
 bool WaitForEnd(pid_t child) {
   const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, child, 0)));
   const auto end = std::chrono::steady_clock::now() + kPatience;
-  for (;;) {
-    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-        end - std::chrono::steady_clock::now());
+  while (!HasEnded(child)) {
+    if (std::chrono::steady_clock::now() >= end) return false;
     pollfd ended{process.get(), POLLIN, 0};
-    const int polled = left.count() > 0 ? poll(&ended, 1, static_cast<int>(left.count())) : 0;
-    if (polled < 0 && errno == EINTR) continue;
-    return polled > 0;
+    poll(&ended, 1, static_cast<int>(kLook.count()));
   }
+  return true;
 }
 
 std::string ReadAll(int fd) {
