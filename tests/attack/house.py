@@ -42,7 +42,7 @@ def children(process=None):
     try:
         with open(f"/proc/{process}/task/{process}/children") as file:
             return {int(number) for number in file.read().split()}
-    except FileNotFoundError:
+    except (FileNotFoundError, ProcessLookupError):
         return set()
 
 
