@@ -58,6 +58,9 @@ struct IndexSnapshot {
   // Whether files that are not among the changes have the attributes that the table says. Not so
   // for a while after a time of which no events are known.
   bool attributes_current = false;
+  // Whether all files that a process may be writing to by its memory alone are among the changes.
+  // Where not, the time of change of a file that may be mapped is not believed.
+  bool mappings_known = true;
 };
 
 }  // namespace nas

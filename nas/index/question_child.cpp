@@ -7,7 +7,6 @@
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -15,15 +14,12 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <charconv>
-#include <cstdio>
 #include <cstdlib>
-#include <memory>
-#include <string>
 
 #include "nas/base/paths.h"
 #include "nas/index/client.h"
 #include "nas/index/frames.h"
+#include "nas/index/mapped_files.h"
 #include "nas/system/child.h"
 #include "nas/system/config.h"
 #include "nas/system/memory.h"
@@ -88,43 +84,21 @@ bool KeepReadingOnly() {
                          bool attributes_current, const AnswerFunction& answer) {
   ResetSignals();
   OfferToOutOfMemoryKiller();
-  if (attributes_current && question.asks_times) attributes_current = AddMappedInodes(changes);
+  const bool mappings_known =
+      !attributes_current || !question.asks_times || AddMappedInodes(changes);
   const bool ready = KeepOnly(question) && BecomePeer(question.peer).ok();
   if (ready) {
     Bound();
     try {
       if (SendFrame(kConnection, FrameType::kStatus, kIndexCurrent)) {
-        answer(kConnection, UniqueFd(kLocation), {table, changes, attributes_current});
+        answer(kConnection, UniqueFd(kLocation),
+               {table, changes, attributes_current, mappings_known});
       }
     } catch (...) {
       // The peer sees a connection that ends before its answer does, and walks.
     }
   }
   _exit(ready ? EXIT_SUCCESS : EXIT_FAILURE);
-}
-
-// A line of /proc/PID/maps: "BEGIN-END rw-s OFFSET MAJOR:MINOR INODE   PATH".
-void AddLine(std::string_view line, Changes& changes) {
-  constexpr size_t kFieldsBeforeInode = 4;
-  size_t at = line.find(' ');
-  if (at == std::string_view::npos || at + 4 >= line.size()) return;
-  if (line[at + 2] != 'w' || line[at + 4] != 's') return;
-  for (size_t field = 1; field < kFieldsBeforeInode && at != std::string_view::npos; ++field) {
-    at = line.find(' ', at + 1);
-  }
-  if (at == std::string_view::npos) return;
-  std::uint64_t inode = 0;
-  std::from_chars(line.data() + at + 1, line.data() + line.size(), inode);
-  if (inode != 0) changes.AddInode(inode);
-}
-
-// Whether /proc shows the processes of the whole machine: in a container it shows the container's,
-// while others may have its files mapped.
-bool SeesAllProcesses() {
-  // Of the first namespace, as the kernel has it (PROC_PID_INIT_INO); others get higher numbers.
-  constexpr ino_t kFirst = 0xEFFFFFFC;
-  struct stat status;
-  return stat("/proc/self/ns/pid", &status) == 0 && status.st_ino == kFirst;
 }
 
 }  // namespace
@@ -157,29 +131,6 @@ pid_t StartQuestion(const Question& question, const NameTable& table, Changes& c
   const pid_t pid = fork();
   if (pid == 0) Answer(question, table, changes, attributes_current, answer);
   return pid;
-}
-
-bool AddMappedInodes(Changes& changes) {
-  if (!SeesAllProcesses()) return false;
-  const auto names = NamesIn(AT_FDCWD, "/proc");
-  if (!names) return false;
-  char* line = nullptr;
-  size_t room = 0;
-  bool complete = true;
-  for (const std::string& name : *names) {
-    if (name.find_first_not_of("0123456789") != std::string::npos) continue;
-    const std::unique_ptr<FILE, int (*)(FILE*)> maps(
-        std::fopen(("/proc/" + name + "/maps").c_str(), "re"), std::fclose);
-    if (!maps) {
-      complete = complete && (errno == ENOENT || errno == ESRCH);
-      continue;
-    }
-    for (ssize_t length = 0; (length = getline(&line, &room, maps.get())) > 0;) {
-      AddLine({line, static_cast<size_t>(length)}, changes);
-    }
-  }
-  std::free(line);
-  return complete;
 }
 
 }  // namespace nas

@@ -45,8 +45,4 @@ Status BecomePeer(const Peer& peer);
 pid_t StartQuestion(const Question& question, const NameTable& table, Changes& changes,
                     bool attributes_current, const AnswerFunction& answer);
 
-// Inodes, of whatever file system, that processes have mapped shared and writable: their sizes and
-// times change without an event. False where that cannot be told of some process.
-bool AddMappedInodes(Changes& changes);
-
 }  // namespace nas

@@ -92,6 +92,7 @@ Answer AskAttributes(const QueryNode& node, const QuerySubject& subject) {
     case Kind::kSize:
       return Known(HoldsOne(node, file.size));
     case Kind::kModified:
+      if (!file.modified_known) return Answer::kMaybe;
       return Known(HoldsOne(node, file.modified));
     case Kind::kCreated:
       return Known(file.created != QueryAttributes::kNoTime && HoldsOne(node, file.created));

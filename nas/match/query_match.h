@@ -19,6 +19,7 @@ struct QueryAttributes {
   static constexpr std::int64_t kNoTime = INT64_MIN;
   std::int64_t size = 0;
   std::int64_t modified = 0;
+  bool modified_known = true;
   std::int64_t created = kNoTime;  // kNoTime: not recorded, and so never within bounds
   std::int64_t opened = 0;
   bool opened_known = true;

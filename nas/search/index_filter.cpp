@@ -311,6 +311,7 @@ bool EntryFilter::LearnAttributes(EntryId entry) {
   if (!known) return false;
   attributes_ = {.size = static_cast<std::int64_t>(known->size),
                  .modified = known->mtime,
+                 .modified_known = filter_.ranges_.KnowsTimeOfChange(entry),
                  .created = known->crtime,
                  .opened_known = false,
                  .mode = known->mode,

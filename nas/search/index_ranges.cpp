@@ -64,14 +64,17 @@ void IndexRanges::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) 
     (*found)[count] = entry;
     count += verdicts_[table.class_row(entry)] == Verdict::kNo ? 0 : 1;
   }
-  const auto keep = [&](const std::vector<Bounds>& bounds, const auto& value_of) {
+  const auto keep = [&](const std::vector<Bounds>& bounds, const auto& value_of,
+                        bool all_known = true) {
     size_t kept = 0;
     for (size_t i = 0; i < count; ++i) {
       const EntryId entry = (*found)[i];
       (*found)[kept] = entry;
       const std::int64_t value = value_of(entry);
       const bool holds = value != QueryAttributes::kNoTime && OneHolds(bounds, value);
-      kept += holds || verdicts_[table.class_row(entry)] == Verdict::kMaybe ? 1 : 0;
+      const bool unsure = verdicts_[table.class_row(entry)] == Verdict::kMaybe ||
+                          (!all_known && !KnowsTimeOfChange(entry));
+      kept += holds || unsure ? 1 : 0;
     }
     count = kept;
   };
@@ -79,7 +82,8 @@ void IndexRanges::Find(EntryId begin, EntryId end, std::vector<EntryId>* found) 
     if (leaf->kind == Kind::kSize) {
       keep(leaf->bounds, [&](EntryId id) { return static_cast<std::int64_t>(table.size(id)); });
     } else if (leaf->kind == Kind::kModified) {
-      keep(leaf->bounds, [&](EntryId id) { return table.mtime(id); });
+      keep(
+          leaf->bounds, [&](EntryId id) { return table.mtime(id); }, snapshot_.mappings_known);
     } else if (leaf->kind == Kind::kCreated) {
       keep(leaf->bounds, [&](EntryId id) { return table.crtime(id); });
     }
@@ -112,6 +116,14 @@ bool IndexRanges::DoubtsInode(std::uint64_t inode) const {
 bool IndexRanges::Doubts(EntryId entry, unsigned char type) const {
   if (DoubtsInode(snapshot_.table.inode(entry))) return true;
   return type == DT_DIR && std::ranges::binary_search(folders_, entry);
+}
+
+// A page of a file that has none cannot be written to: to get one takes an event.
+bool IndexRanges::KnowsTimeOfChange(EntryId entry) const {
+  if (snapshot_.mappings_known) return true;
+  const unsigned char type = snapshot_.table.type(entry);
+  if (type == DT_REG) return snapshot_.table.size(entry) == 0;
+  return type == DT_DIR || type == DT_LNK || type == DT_FIFO || type == DT_SOCK;
 }
 
 }  // namespace nas

@@ -27,6 +27,9 @@ class IndexRanges {
   void Find(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
   // Whether the table is not believed of the attributes of this entry, of type DT_*.
   bool Doubts(EntryId entry, unsigned char type) const;
+  // Where a process's mappings are not known: whether nobody can have this entry mapped and so
+  // change its time without an event.
+  bool KnowsTimeOfChange(EntryId entry) const;
 
  private:
   enum class Verdict : std::uint8_t { kNo, kByValue, kMaybe };
