@@ -136,6 +136,9 @@ class NameTable {
   }
   // The rows of mode, user and group that entries share (table_format.h).
   std::span<const TableClass> class_rows() const { return {columns_.class_rows, class_count_}; }
+  // All entries, the fewest folders below their tree's topmost first; of these the newest, by what
+  // the table has of them (unknown: of 1970), then by their number.
+  std::span<const EntryId> nearest_first() const { return {columns_.nearest_first, entries_}; }
   // The entry of that name in the folder; entries() where there is none.
   EntryId FindEntry(FolderId folder, std::string_view name) const;
   // The folder that an entry of type DT_DIR is; kNoFolder where it is not in the table, such as a
@@ -175,6 +178,7 @@ class NameTable {
     const std::int32_t* crtimes = nullptr;
     const std::uint16_t* classes = nullptr;
     const TableClass* class_rows = nullptr;
+    const std::uint32_t* nearest_first = nullptr;
     const std::uint32_t* folder_entries = nullptr;
     const std::uint32_t* parents = nullptr;
     const std::uint32_t* ends = nullptr;

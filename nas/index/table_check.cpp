@@ -103,6 +103,7 @@ bool TableCheck::TakeColumns() {
          Take(kNamed, words, columns_.named) && Take(kNamedBefore, words, columns_.named_before) &&
          Take(kSizes, entries, columns_.sizes) && Take(kMtimes, entries, columns_.mtimes) &&
          Take(kCrtimes, entries, columns_.crtimes) && Take(kClasses, entries, columns_.classes) &&
+         Take(kNearestFirst, entries, columns_.nearest_first) &&
          Take(kFolderEntries, folders, columns_.folder_entries) &&
          Take(kFolderParents, folders, columns_.parents) &&
          Take(kFolderEnds, folders, columns_.ends) &&
@@ -136,7 +137,10 @@ bool TableCheck::EntriesAreSound() const {
   if (table_.class_count_ < kTypeClasses || table_.class_count_ > kMostClasses) return false;
   std::uint16_t highest = 0;
   for (size_t i = 0; i < table_.entries_; ++i) highest = std::max(highest, columns_.classes[i]);
-  return highest < table_.class_count_;
+  const std::uint32_t* order = columns_.nearest_first;
+  return highest < table_.class_count_ &&
+         std::all_of(order, order + table_.entries_,
+                     [this](NameTable::EntryId id) { return id < table_.entries_; });
 }
 
 bool TableCheck::NamesAreSound() const {

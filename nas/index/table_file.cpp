@@ -124,6 +124,7 @@ Status TableWriter::Write(int dir_fd, const std::string& name, std::string_view 
   file.Set(kCrtimes, crtimes_);
   file.Set(kClasses, classes_);
   file.Set(kClassRows, rows);
+  file.Set(kNearestFirst, nearest_first_);
   file.Set(kFolderEntries, folder_entries_);
   file.Set(kFolderParents, parents_);
   file.Set(kFolderEnds, ends_);

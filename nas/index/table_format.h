@@ -14,7 +14,7 @@
 namespace nas {
 
 inline constexpr std::array<char, 8> kTableMagic = {'A', 'r', 'b', 'N', 'a', 'm', 'e', '\n'};
-inline constexpr std::uint32_t kTableVersion = 1;
+inline constexpr std::uint32_t kTableVersion = 2;
 inline constexpr size_t kColumnAlignment = 64;
 
 enum TableColumn : unsigned {
@@ -33,6 +33,7 @@ enum TableColumn : unsigned {
   kCrtimes,       // i32; kNoCrtime where the file system does not record it
   kClasses,       // u16: a row of kClassRows
   kClassRows,     // TableClass
+  kNearestFirst,  // u32: all entries, those of the shallowest folders first, of these the newest
   // Of folders.
   kFolderEntries,  // u32: the entry that a folder is; UINT32_MAX of a topmost one
   kFolderParents,  // u32
@@ -78,7 +79,7 @@ struct TableHeader {
   std::uint32_t folders = 0;
   std::uint32_t trees = 0;
   std::uint32_t inode_bytes = 0;
-  std::uint32_t filling = 0;
+  std::array<std::uint32_t, 11> filling = {};
   std::uint64_t file_bytes = 0;
   std::array<char, 48> fold = {};          // FoldVersion, filled with zeros
   std::array<char, 128> file_system = {};  // which one, filled with zeros

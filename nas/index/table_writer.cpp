@@ -168,6 +168,7 @@ void TableWriter::Finish(std::vector<TableClass>& rows) {
   FinishNames();
   FinishFolders();
   FinishClasses(rows);
+  FinishOrder();
   FinishKeys();
 }
 
@@ -215,6 +216,30 @@ void TableWriter::FinishClasses(std::vector<TableClass>& rows) {
   }
   rows.resize(count);
   for (std::uint16_t& row : classes_) row = numbers[row];
+}
+
+void TableWriter::FinishOrder() {
+  constexpr unsigned kHalf = 32;
+  std::vector<size_t> depths(folders());
+  for (size_t id = 0; id < folders(); ++id) {
+    if (parents_[id] != NameTable::kNoFolder) depths[id] = depths[parents_[id]] + 1;
+  }
+  // Of each depth: an age, the newest the least, and the entry's number in the lower half.
+  std::vector<std::vector<std::uint64_t>> levels(
+      depths.empty() ? 0 : *std::ranges::max_element(depths) + 1);
+  for (size_t id = 0; id < folders(); ++id) {
+    for (EntryId entry = entries_begins_[id]; entry < entries_begins_[id + 1]; ++entry) {
+      const std::int64_t mtime = classes_[entry] < kTypeClasses ? 0 : mtimes_[entry];
+      const auto age = static_cast<std::uint64_t>(INT32_MAX - mtime);
+      levels[depths[id]].push_back(age << kHalf | entry);
+    }
+  }
+  nearest_first_.reserve(entries());
+  for (std::vector<std::uint64_t>& level : levels) {
+    std::ranges::sort(level);
+    for (const std::uint64_t one : level) nearest_first_.push_back(static_cast<EntryId>(one));
+    level = {};
+  }
 }
 
 void TableWriter::FinishKeys() {

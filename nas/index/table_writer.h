@@ -91,6 +91,7 @@ class TableWriter {
   void FinishNames();
   void FinishFolders();
   void FinishClasses(std::vector<TableClass>& rows);
+  void FinishOrder();
   void FinishKeys();
 
   bool too_large_ = false;
@@ -104,6 +105,7 @@ class TableWriter {
   std::vector<std::uint64_t> large_sizes_;
   std::vector<std::int32_t> mtimes_, crtimes_;
   std::vector<std::uint16_t> classes_;
+  std::vector<std::uint32_t> nearest_first_;
   std::vector<std::uint32_t> folder_entries_, parents_, ends_, entries_begins_, stamp_nanos_;
   std::vector<std::uint64_t> folder_inodes_;
   std::vector<std::int64_t> stamp_seconds_;

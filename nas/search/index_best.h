@@ -24,6 +24,9 @@ struct BestBounds {
   // which are only counted.
   std::chrono::milliseconds best{200};
   std::chrono::milliseconds further{4};
+  // Names looked at in the table's order: beyond it, all are as quickly looked at in the order in
+  // which they lie.
+  size_t in_order = size_t{16} << 10;
 };
 
 // The best go to the sink of `search`, in any order. Throws what that throws.

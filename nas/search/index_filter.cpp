@@ -8,6 +8,7 @@
 #include <iterator>
 
 #include "nas/match/required_texts.h"
+#include "nas/match/word_finder.h"
 
 namespace nas {
 
@@ -201,6 +202,27 @@ bool IndexFilter::FindBeginnings(const std::vector<std::string>& words, EntryId 
   return decides_ && !scan_;
 }
 
+bool IndexFilter::FindWords(const std::vector<std::string>& words, EntryId begin, EntryId end,
+                            std::vector<EntryId>* found) const {
+  found->clear();
+  if (begin == end) return true;
+  const NameTable& table = snapshot_.table;
+  const std::string_view texts = table.texts(begin, end);
+  const std::uint64_t base = table.text_begin(begin);
+  for (const std::string& word : words) {
+    const WordFinder needle(word);
+    EntryId entry = begin;
+    for (size_t at = 0; (at = needle.Find(texts, at)) != std::string_view::npos;) {
+      entry = EntryFrom(table, entry, base + at);
+      found->push_back(entry);
+      at = table.text_begin(entry + 1) - base;
+    }
+  }
+  std::ranges::sort(*found);
+  found->erase(std::unique(found->begin(), found->end()), found->end());
+  return decides_ && !scan_;
+}
+
 bool IndexFilter::Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
   const NameTable& table = snapshot_.table;
   return ScanTexts(
@@ -261,14 +283,17 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
                        const std::function<std::string_view(NameTable::FolderId)>& path_of,
                        std::vector<EntryId>* found) {
   const EntryId last = table_.entries_begin(end);
-  const bool hits = beginnings_ != nullptr || filter_.finds();
+  const bool hits = only_ != Only::kAny || filter_.finds();
   const bool paths = filter_.search_.criteria.ask_paths;
   bool decided = false;
   hits_.clear();
-  if (beginnings_ != nullptr) {
-    decided = filter_.FindBeginnings(*beginnings_, table_.entries_begin(begin), last, &hits_);
+  const EntryId first = table_.entries_begin(begin);
+  if (only_ == Only::kBeginnings) {
+    decided = filter_.FindBeginnings(*words_, first, last, &hits_);
+  } else if (only_ == Only::kWords) {
+    decided = filter_.FindWords(*words_, first, last, &hits_);
   } else if (hits) {
-    decided = filter_.Find(table_.entries_begin(begin), last, &hits_);
+    decided = filter_.Find(first, last, &hits_);
   }
   auto hit = hits_.begin();
   const auto next = [&](EntryId from) {
@@ -277,7 +302,7 @@ void EntryFilter::Find(NameTable::FolderId begin, NameTable::FolderId end,
     return hit == hits_.end() ? last : *hit;
   };
   Enter({});
-  for (EntryId entry = next(table_.entries_begin(begin)); entry < last;) {
+  for (EntryId entry = next(first); entry < last;) {
     EntryId behind = last;  // the folder, where it counts
     bool may_match = true;
     if (paths) {

@@ -4,6 +4,7 @@
 // the rest.
 
 #include <atomic>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string_view>
@@ -29,9 +30,14 @@ class IndexFilter {
   // can be told from the table (EntryFilter::Passes).
   bool Find(NameTable::EntryId begin, NameTable::EntryId end,
             std::vector<NameTable::EntryId>* found) const;
-  // Those whose text (name_table.h) begins with one of the words, likewise.
+  // Those whose text (name_table.h) begins with one of the words, or has one that stands by itself
+  // (word_finder.h), likewise.
   bool FindBeginnings(const std::vector<std::string>& words, NameTable::EntryId begin,
                       NameTable::EntryId end, std::vector<NameTable::EntryId>* found) const;
+  bool FindWords(const std::vector<std::string>& words, NameTable::EntryId begin,
+                 NameTable::EntryId end, std::vector<NameTable::EntryId>* found) const;
+  // Whether paths decide what matches.
+  bool asks_paths() const { return search_.criteria.ask_paths; }
 
  private:
   friend class EntryFilter;
@@ -67,8 +73,13 @@ class EntryFilter {
  public:
   EntryFilter(const IndexFilter& filter, const Location& location);
 
-  // From now on Find leaves out what does not begin with one of these; borrowed. Null: nothing.
-  void set_beginnings(const std::vector<std::string>* words) { beginnings_ = words; }
+  // What Find leaves out from now on, beside what cannot match: names that do not begin with one of
+  // the words, or that have none that stands by itself. The words are borrowed.
+  enum class Only : std::uint8_t { kAny, kBeginnings, kWords };
+  void set_only(Only only, const std::vector<std::string>* words) {
+    only_ = only;
+    words_ = words;
+  }
   // The entries of the folders [begin, end) that can match; `path_of` tells the path of a folder,
   // good until it is called again, and is asked where criteria do.
   void Find(NameTable::FolderId begin, NameTable::FolderId end,
@@ -93,7 +104,8 @@ class EntryFilter {
 
   const IndexFilter& filter_;
   const NameTable& table_;
-  const std::vector<std::string>* beginnings_ = nullptr;
+  Only only_ = Only::kAny;
+  const std::vector<std::string>* words_ = nullptr;
   FoldedName name_;
   EntryPath path_;
   bool by_attributes_ = true;

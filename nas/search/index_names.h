@@ -73,6 +73,9 @@ class IndexNames : public NameSource {
   // All pieces come once more. While no thread takes any.
   void StartOver() { next_ = 0; }
   const IndexFilter& filter() const { return filter_; }
+  // What is gone through: the location's folder, and the one behind the last.
+  FolderId top() const { return top_; }
+  FolderId end() const { return end_; }
   // The names that are noted as changed in the location, likewise.
   struct NotedName {
     FolderId folder;

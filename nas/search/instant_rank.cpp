@@ -3,21 +3,16 @@
 #include <algorithm>
 
 #include "nas/match/folded_name.h"
+#include "nas/match/word_finder.h"
 
 namespace nas {
 namespace {
 
 using Kind = QueryNode::Kind;
 
-bool IsOfWord(char c) {
-  return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || static_cast<unsigned char>(c) >= 0x80;
-}
-
 bool HoldsWord(std::string_view text, std::string_view word) {
   for (size_t at = text.find(word); at != std::string_view::npos; at = text.find(word, at + 1)) {
-    const size_t end = at + word.size();
-    const bool begins = at == 0 || !IsOfWord(text[at - 1]);
-    if (begins && (end == text.size() || !IsOfWord(text[end]))) return true;
+    if (StandsByItself(text, at, word.size())) return true;
   }
   return false;
 }

@@ -14,64 +14,21 @@
 
 #include "arbory/comparators.h"
 #include "nas/base/json_text.h"
-#include "nas/index/tree_scan.h"
 #include "nas/search/content_reading.h"
 #include "nas/search/folder_walk.h"
 #include "nas/search/index_answer.h"
 #include "nas/search/index_names.h"
 #include "nas/search/indexed_walk.h"
-#include "nas/search/instant.h"
 #include "nas/search/search_job.h"
 #include "tests/program/cases.h"
 #include "tests/program/kept_rows.h"
 #include "tests/program/program_test.h"
+#include "tests/program/watched_tree.h"
 
 namespace program_test {
 namespace {
 
 namespace fs = std::filesystem;
-
-// The table of a tree, and what has been done to the tree since, noted as a watcher notes it.
-class WatchedTree {
- public:
-  WatchedTree(std::string root, const std::string& folder) : root_(std::move(root)) {
-    const nas::UniqueFd top(open(root_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-    const nas::TablePlace place{AT_FDCWD, folder + "/table", "a test's"};
-    const nas::Status made = nas::ScanTree({{top.get(), "tree"}}, place);
-    EXPECT_TRUE(made) << made.error().Text();
-    auto table = nas::NameTable::Open(place.dir_fd, place.name, place.file_system);
-    EXPECT_TRUE(table) << table.error().Text();
-    table_.emplace(std::move(*table));
-  }
-
-  nas::IndexSnapshot snapshot() const { return {*table_, changes_, true}; }
-  const nas::NameTable& table() const { return *table_; }
-
-  void NoteName(const std::string& path) {
-    const fs::path at(path);
-    const auto folder = FolderOf(at.parent_path());
-    if (folder != nas::NameTable::kNoFolder) changes_.AddName(folder, at.filename().native());
-  }
-  void NoteFolder(const std::string& path) {
-    const auto folder = FolderOf(path);
-    if (folder != nas::NameTable::kNoFolder) changes_.AddFolder(folder);
-  }
-  void NoteInode(const std::string& path) {
-    struct stat status;
-    if (lstat(path.c_str(), &status) == 0) changes_.AddInode(status.st_ino);
-  }
-
- private:
-  nas::NameTable::FolderId FolderOf(const std::string& path) const {
-    const nas::UniqueFd fd(open(path.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    const auto key = nas::KeyOf(fd.get());
-    return key ? table_->Find(*key) : nas::NameTable::kNoFolder;
-  }
-
-  const std::string root_;
-  std::optional<nas::NameTable> table_;
-  nas::Changes changes_;
-};
 
 struct Seen {
   std::multiset<std::string> paths;
@@ -352,114 +309,33 @@ TEST_F(Index, UsersFindWhatTheirOwnWalkFindsAndLearnOfNothingElse) {
   }));
 }
 
-// The worker's end and the child's, with a connection between them that may break.
-class Answers {
- public:
-  // Passes on so many frames of each answer; all where it is negative.
-  Answers(const WatchedTree& index, int frames) : index_(index), frames_(frames) {}
-
-  nas::IndexAnswer Ask(int location) {
-    int ends[2];
-    int inner[2];
-    EXPECT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
-    EXPECT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, inner), 0);
-    nas::UniqueFd folder(fcntl(location, F_DUPFD_CLOEXEC, 0));
-    threads_.emplace_back([this, end = ends[1], asker = inner[0]] { Pass(end, asker); });
-    threads_.emplace_back([this, end = inner[1], at = std::move(folder)]() mutable {
-      const nas::UniqueFd connection(end);
-      nas::AnswerQuestion(connection.get(), std::move(at), index_.snapshot());
-    });
-    return {nas::UniqueFd(ends[0]), std::string(nas::kIndexCurrent)};
-  }
-
- private:
-  void Pass(int to, int from) const {
-    const nas::UniqueFd worker(to);
-    const nas::UniqueFd child(from);
-    nas::Frame frame;
-    nas::FrameReader questions(to, nas::kMaxQuestionBytes);
-    if (questions.Read(-1, &frame) != nas::FrameReader::State::kFrame) return;
-    EXPECT_TRUE(nas::SendFrame(from, frame.type, frame.payload));
-    nas::FrameReader answers(from, nas::kMaxAnswerBytes);
-    for (int i = 0; i != frames_; ++i) {
-      if (answers.Read(-1, &frame) != nas::FrameReader::State::kFrame) return;
-      if (!nas::SendFrame(to, frame.type, frame.payload)) return;
-    }
-  }
-
-  const WatchedTree& index_;
-  const int frames_;
-  std::vector<std::jthread> threads_;
-};
-
-// What is shown while somebody types: some of what a walk finds, all of it where there is room, in
-// the order of what is most likely meant.
-TEST_F(Index, InstantAnswersAreTheBestOfWhatAWalkFinds) {
-  for (const char* name : {"/plan.txt", "/docs/floorplan.txt", "/docs/the plan.txt",
-                           "/docs/planet.txt", "/docs/deep/plan b.txt"}) {
-    WriteFile(tree_ + name, "");
-  }
-  WatchedTree index(share_, dir_);
-  WriteFile(tree_ + "/docs/plan of today.txt", "");
-  index.NoteName(tree_ + "/docs/plan of today.txt");
-  fs::remove(tree_ + "/docs/planet.txt");  // noticed by looking, not by a note
-  std::vector<nas::Location> locations;
-  locations.push_back(std::move(*nas::OpenLocation("/share/tree")));
-  const struct {
-    const char* why;
-    const char* query;
-    size_t most;
-    std::vector<std::string> names;
-    bool complete;
-  } rows[] = {
-      {"the word first in the name, by itself, shallow; then within others",
-       "plan",
-       100,
-       {"plan.txt", "plan of today.txt", "plan b.txt", "the plan.txt", "floorplan.txt"},
-       true},
-      {"fewer than there are", "plan", 2, {"plan.txt", "plan of today.txt"}, false},
-      {"nothing", "no such name", 100, {}, true},
-      {"by a regular expression", "regex:^floor.lan", 100, {"floorplan.txt"}, true},
-  };
-  for (const auto& row : rows) {
-    SCOPED_TRACE(row.why);
-    Answers answers(index, -1);
-    const auto reply =
-        nas::AskInstantly(locations, nas::Query::Parse(row.query)->root(), true, row.most, {},
-                          [&](int location, bool) { return answers.Ask(location); });
-    ASSERT_TRUE(reply);
-    EXPECT_EQ(reply->state, nas::kIndexCurrent);
-    std::vector<std::string> names;
-    for (const auto& found : reply->rows) names.push_back(found.name);
-    EXPECT_EQ(names, row.names);
-    EXPECT_GE(reply->found, names.size());
-    if (row.complete) {
-      EXPECT_EQ(reply->found, names.size());
-    }
-  }
-}
-
-// So many that those which begin with what is asked for leave no room for the others.
-TEST_F(Index, InstantAnswersAreTheBestOfVeryMany) {
-  constexpr int kMany = 5000;
-  for (int i = 0; i < kMany; ++i) WriteFile(tree_ + "/docs/deep/q" + std::to_string(i), "");
-  for (int i = 0; i < kMany; ++i) WriteFile(tree_ + "/docs/" + std::to_string(i) + "q", "");
-  WriteFile(tree_ + "/docs/q", "");
+// Where some process's mappings are hidden, any file that has a page may have changed.
+TEST_F(Index, DoesNotBelieveTimesOfFilesThatMayBeMapped) {
+  WriteFile(tree_ + "/docs/mapped", "x");
+  WriteFile(tree_ + "/docs/empty", "");
   const WatchedTree index(share_, dir_);
-  std::vector<nas::Location> locations;
-  locations.push_back(std::move(*nas::OpenLocation("/share/tree")));
-  Answers answers(index, -1);
-  nas::InstantReply reply;
-  // A machine that does much else may not come that far at once.
-  for (int tries = 0; tries < 50 && reply.rows.size() < 100; ++tries) {
-    reply = nas::AskInstantly(locations, nas::Query::Parse("q")->root(), true, 100, {},
-                              [&](int location, bool) { return answers.Ask(location); })
-                .value_or({});
-    EXPECT_TRUE(reply.more);
-    for (const auto& row : reply.rows) EXPECT_TRUE(row.name.starts_with("q")) << row.name;
+  const fs::file_time_type old = fs::file_time_type::clock::now() - std::chrono::hours(100'000);
+  fs::last_write_time(tree_ + "/docs/mapped", old);  // as silently
+  nas::IndexSnapshot snapshot = index.snapshot();
+  for (const bool known : {true, false}) {
+    snapshot.mappings_known = known;
+    Json::Value params;
+    params["pattern"] = "modified:<2020";
+    EngineSearch engine(params, share_, tree_, results_);
+    const auto top = nas::IndexNames::FolderOf(snapshot, engine.locations.front());
+    nas::IndexNames names(
+        snapshot, {engine.locations, top, {}, nas::FolderGate::RulesFor(engine.locations, true)},
+        engine.search);
+    nas::EntryFilter filter(names.filter(), engine.locations.front());
+    std::vector<nas::NameTable::EntryId> found;
+    while (names.NextCandidates(filter, &found) > 0) {
+    }
+    std::set<std::string_view> candidates;
+    for (const auto entry : found) candidates.insert(index.table().name(entry));
+    EXPECT_EQ(candidates.contains("mapped"), !known);
+    EXPECT_FALSE(candidates.contains("empty"));
+    EXPECT_FALSE(candidates.contains("docs"));
   }
-  ASSERT_EQ(reply.rows.size(), 100U);
-  EXPECT_EQ(reply.rows.front().name, "q");
 }
 
 TEST_F(Index, AnswersOverAConnectionThatMayBreak) {
