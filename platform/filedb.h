@@ -2,8 +2,10 @@
 // The small keyed record store behind the search histories: one file, a few JSON records, the
 // newest first. Each object is for one operation of one process: open it, use it, destroy it. Any
 // number of processes may have the same file open; each write is one transaction, which survives a
-// power cut once it has returned. What fails is false with errno and the last error (system.h) set,
-// and leaves the store as it was; a write waits up to five seconds for another process's.
+// power cut once it has returned. Only a Delete of some records is one with the operation that
+// follows it, or with the object's end. What fails is false with errno and the last error
+// (system.h) set, and leaves the store as it was; a write waits up to five seconds for another
+// process's.
 
 #include <json/value.h>
 

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <climits>
 #include <functional>
+#include <optional>
 
 #include "nas/base/error.h"
 #include "nas/base/json_text.h"
@@ -138,19 +139,35 @@ class FileDB::Store {
 
   bool IsGood() const { return Succeeded(opened_); }
 
-  bool Use(const std::function<void(nas::Database&)>& work) {
-    return Succeeded(db_ ? Guard([&] { work(*db_); }) : opened_);
+  ~Store() { Settle(); }
+
+  bool Read(const std::function<void(nas::Database&)>& work) {
+    return Settle() && Succeeded(db_ ? Guard([&] { work(*db_); }) : opened_);
   }
 
   bool Change(const std::function<void(nas::Database&)>& work) {
-    return Use([&](nas::Database& db) {
-      nas::Transaction transaction(db, nas::Transaction::Kind::kWrite);
-      work(db);
-      transaction.Commit();
+    return BeginChange(work) && Settle();
+  }
+
+  // The change takes effect with the next one, or at the end.
+  bool BeginChange(const std::function<void(nas::Database&)>& work) {
+    if (!db_) return Succeeded(opened_);
+    const nas::Status done = Guard([&] {
+      if (!change_) change_.emplace(*db_, nas::Transaction::Kind::kWrite);
+      work(*db_);
     });
+    if (!done) change_.reset();
+    return Succeeded(done);
   }
 
  private:
+  bool Settle() {
+    if (!change_) return true;
+    const nas::Status done = Guard([this] { change_->Commit(); });
+    change_.reset();
+    return Succeeded(done);
+  }
+
   // The end of an operation: a failure becomes the platform's last error.
   static bool Succeeded(const nas::Status& status) {
     if (!status) nas::Report(status.error());
@@ -194,6 +211,7 @@ class FileDB::Store {
 
   const std::string path_;
   std::unique_ptr<nas::Database> db_;  // none where `opened_` is a failure
+  std::optional<nas::Transaction> change_;
   const nas::Status opened_;
 };
 
@@ -237,11 +255,13 @@ bool FileDB::Insert(const Json::Value& record) {
 bool FileDB::UpdateLastByTime(const Json::Value& record, long /*slots*/) { return Insert(record); }
 
 bool FileDB::Delete(const Condition& condition) {
-  return store_->Change([&](nas::Database& db) { DeleteMatching(db, condition); });
+  const auto work = [&](nas::Database& db) { DeleteMatching(db, condition); };
+  // What removes some is about to write one in their place: both reach the disk at once.
+  return condition.equal.empty() ? store_->Change(work) : store_->BeginChange(work);
 }
 
 bool FileDB::Select(const Condition& condition, std::vector<Json::Value>& out) const {
-  return store_->Use([&](nas::Database& db) {
+  return store_->Read([&](nas::Database& db) {
     int skip = std::max(condition.offset, 0);
     int left = condition.limit > 0 ? condition.limit : INT_MAX;
     const nas::Transaction reading(db, nas::Transaction::Kind::kRead);

@@ -65,6 +65,32 @@ TEST_F(DurableTest, WhatIsAnsweredForHasReachedTheDisk) {
   }
 }
 
+// A search that is made again takes the place of its record: one change, brought to the disk once.
+TEST_F(DurableTest, ARecordIsReplacedAtOnce) {
+  const std::string history = dir_ + "/history.db";
+  const auto syncs_of = [&](const char* pattern, bool replaces) {
+    g_synced.clear();
+    FileDB db(history);
+    if (replaces) {
+      EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("pattern", pattern)));
+    }
+    EXPECT_TRUE(db.UpdateLastByTime(Record(pattern), 3));
+    return g_synced.size();
+  };
+  syncs_of("a", false);
+  const size_t once = syncs_of("b", false);
+  EXPECT_EQ(syncs_of("a", true), once);
+  {
+    FileDB db(history);
+    EXPECT_TRUE(db.Delete(FileDB::Condition().SetCondition("pattern", "b")));
+    g_synced.clear();
+  }
+  EXPECT_FALSE(g_synced.empty()) << "what follows no write is a change of its own";
+  std::vector<Json::Value> left;
+  EXPECT_TRUE(FileDB(history).Select({}, left));
+  EXPECT_EQ(left, std::vector<Json::Value>{Record("a")});
+}
+
 TEST_F(DurableTest, SoHaveTheFoldersItStandsIn) {
   ASSERT_TRUE(nas::EnterUserState(Me()));
   const std::string preference = nas::PreferenceFolder(Me());
