@@ -74,12 +74,21 @@ void Caller::BecomeUser() const {
   throw std::runtime_error("cannot act for the user '" + user_ + "': " + std::strerror(errno));
 }
 
-nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
-                        const Json::Value& params, const nas::ReplyEncoder& encode) const {
+nas::ApiCall Caller::CallOf(const std::string& method, const Json::Value& params) const {
   // The session's name only shows in log lines.
   nas::ApiCall call{method, params, user_, "terminal", leased_};
   call.asks_fleet = !config_.fleet.boxes.empty() && method == "start";
-  return nas::RunCall(row, call, encode);
+  return call;
+}
+
+nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
+                        const Json::Value& params, const nas::ReplyEncoder& encode) const {
+  return nas::RunCall(row, CallOf(method, params), encode);
+}
+
+void Caller::Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
+                   const nas::ReplyEncoder& encode) const {
+  const nas::Child child = nas::StartCall(row, CallOf(method, params), encode);
 }
 
 }  // namespace arbory

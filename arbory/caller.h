@@ -52,8 +52,13 @@ class Caller {
   // Makes one call as this user; see nas::RunCall.
   nas::Reply Call(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
                   const nas::ReplyEncoder& encode) const;
+  // The same without its reply: the call goes on by itself, also when this program has ended.
+  void Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
+             const nas::ReplyEncoder& encode) const;
 
  private:
+  nas::ApiCall CallOf(const std::string& method, const Json::Value& params) const;
+
   nas::Config config_;
   std::string user_;
   bool leased_ = false;

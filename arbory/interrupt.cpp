@@ -4,6 +4,7 @@
 #include <signal.h>
 
 #include <initializer_list>
+#include <iterator>
 
 namespace arbory {
 namespace {
@@ -31,9 +32,9 @@ bool Interrupted() { return __atomic_load_n(&interrupted, __ATOMIC_RELAXED) != 0
 
 const int& InterruptFlag() { return interrupted; }
 
-bool Pause(int milliseconds, int pidfd) {
-  pollfd ended = {pidfd, POLLIN, 0};
-  return !Interrupted() && poll(&ended, 1, milliseconds) == 0;
+bool Pause(int milliseconds, int pidfd, int events) {
+  pollfd awaited[] = {{pidfd, POLLIN, 0}, {events, POLLIN, 0}};
+  return !Interrupted() && poll(awaited, std::size(awaited), milliseconds) == 0;
 }
 
 }  // namespace arbory

@@ -12,7 +12,8 @@ bool Interrupted();
 const int& InterruptFlag();
 
 // Waits; an interrupt ends the wait early, and so does the end of the process that `pidfd` stands
-// for (-1: none). Returns whether the wait lasted to its end.
-bool Pause(int milliseconds, int pidfd);
+// for, or something to be read from `events` (-1: none). Returns whether the wait lasted to its
+// end.
+bool Pause(int milliseconds, int pidfd, int events = -1);
 
 }  // namespace arbory

@@ -31,6 +31,7 @@
 #include "nas/results/foreign_accounts.h"
 #include "nas/results/result_file.h"
 #include "nas/system/identity.h"
+#include "nas/tasks/task_files.h"
 #include "nas/webapi/runner.h"
 #include "platform/task_record.h"
 
@@ -163,6 +164,7 @@ class Search {
       // What is read of the search from here on, a database among it, is its user's to write.
       nas::GiveUpRoot();
       asking_ = AskAfter(caller_.user(), task_id_);
+      records_.emplace(caller_.user());
       // Only ever waited for, so it does no harm where the id has come to mean another process.
       worker_.Reset(
           static_cast<int>(syscall(SYS_pidfd_open, ReadSearch(caller_.user(), task_id_).pid, 0)));
@@ -223,7 +225,7 @@ class Search {
   Ending ListSorted() {
     for (RunningSearch state; !state.finished; Wait()) {
       if (Interrupted()) return Ending::kInterrupted;
-      state = ReadSearch(caller_.user(), task_id_);
+      state = Look();
       if (!state.exists) return Ending::kFailed;
       if (state.finished) break;
     }
@@ -254,7 +256,8 @@ class Search {
     const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(now - started_);
     const auto most = now - busy_ < kLately ? kLeastPause : kMostPause;
     const auto pause = std::clamp(ran / kPauseShare, kLeastPause, most);
-    while (Pause(static_cast<int>(pause.count()), worker_.get())) {
+    const int records = records_ ? records_->fd() : -1;
+    while (Pause(static_cast<int>(pause.count()), worker_.get(), records)) {
       // Without the worker's descriptor only asking tells its end.
       if (!worker_ || !watch_ || watch_->Changed() || Clock::now() - now >= kMostUnasked) break;
       ShowProgress();
@@ -263,6 +266,7 @@ class Search {
 
   // Rows that come after this are noticed, however early the search is.
   RunningSearch Look() {
+    if (records_) records_->Take();
     RunningSearch state = ReadSearch(caller_.user(), task_id_);
     if (!watch_ && !state.results.empty()) watch_.emplace(state.results);
     return state;
@@ -279,7 +283,8 @@ class Search {
     progress_.Clear();
     if (ending == Ending::kInterrupted) return kExitInterrupted;
     const RunningSearch state = ReadSearch(caller_.user(), task_id_);
-    running_ = state.exists && !state.finished;
+    // One that has found everything ends by itself.
+    running_ = state.exists && !state.finished && !state.all_found;
     if (ending == Ending::kUnwritable) {
       // A reader that has seen enough, such as head, is no failure.
       if (failure_ == EPIPE) return kExitSuccess;
@@ -345,13 +350,13 @@ class Search {
     }
   }
 
-  // The cleaning goes on by itself after the reply.
+  // The cleaning goes on by itself: nobody waits for its reply.
   void CleanUp() {
     Json::Value params(Json::objectValue);
     params["taskid"] = task_id_;
     const auto ignore = [](int, const Json::Value&) { return nas::Reply(); };
     if (running_) Call("stop", params, ignore);
-    Call("clean", params, ignore);
+    caller_.Begin(caller_.Method("clean"), "clean", params, ignore);
   }
 
   Caller& caller_;
@@ -363,6 +368,7 @@ class Search {
   std::string task_id_;
   nas::UniqueFd asking_;  // by it the search knows that this program lives
   nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
+  std::optional<nas::RecordWatch> records_;
   std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows
   std::uint64_t printed_ = 0;

@@ -71,6 +71,10 @@ void ResultWriter::Append(RowBlock& block) {
 void ResultWriter::Complete() {
   const std::lock_guard lock(mutex_);
   Statement(db_, "INSERT INTO complete VALUES(?)").Bind(1, static_cast<std::int64_t>(rows_)).Run();
+}
+
+void ResultWriter::EmptyLog() {
+  const std::lock_guard lock(mutex_);
   db_.EmptyLog();
 }
 

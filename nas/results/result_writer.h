@@ -23,6 +23,9 @@ class ResultWriter : public RowSink {
   void Append(RowBlock& block) override;
   // Says that no rows will follow, so that orderings are worth keeping. Throws SqliteError.
   void Complete();
+  // Of the file, which closing would do while nobody else can open it (sqlite.h). It waits for no
+  // one.
+  void EmptyLog();
   std::uint64_t rows();
 
  private:

@@ -300,6 +300,7 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
   // Who is told that everything was found does not wait for how it ends.
   if (nobody) search.progress.SetPhase(nas::WalkProgress::Phase::kNames);
   Report(search.progress, true);
+  writer_->EmptyLog();
   if (nobody) {
     nas::SetLastError(nas::kErrorOther);
     completed = false;

@@ -1,9 +1,11 @@
 #include "nas/tasks/task_files.h"
 
 #include <fcntl.h>
+#include <sys/inotify.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <climits>
 #include <string_view>
@@ -214,6 +216,21 @@ bool LeaseWatch::IsOver(int lock_fd) {
   if (stamp != seen_ || lock.l_type != F_UNLCK) asked_ = now;
   seen_ = stamp;
   return now - asked_ > std::chrono::seconds(seconds_);
+}
+
+RecordWatch::RecordWatch(const std::string& owner)
+    : events_(inotify_init1(IN_CLOEXEC | IN_NONBLOCK)) {
+  const std::string folder = TaskFolder(owner);
+  if (events_ && inotify_add_watch(events_.get(), folder.c_str(), IN_MOVED_TO | IN_ONLYDIR) < 0) {
+    events_.Reset();
+  }
+}
+
+void RecordWatch::Take() const {
+  constexpr size_t kBufferBytes = 4096;
+  std::array<char, kBufferBytes> events;
+  while (events_ && read(events_.get(), events.data(), events.size()) > 0) {
+  }
 }
 
 bool TaskFiles::FreeReserve(const std::string& id) const {

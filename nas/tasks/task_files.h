@@ -118,6 +118,19 @@ class LeaseWatch {
   std::chrono::steady_clock::time_point asked_ = std::chrono::steady_clock::now();
 };
 
+// Wakes whoever waits for an owner's tasks: without it, they look now and then.
+class RecordWatch {
+ public:
+  explicit RecordWatch(const std::string& owner);
+  // Readable once a record has been replaced, and until Take. Invalid where that cannot be had.
+  int fd() const { return events_.get(); }
+  // To be called before the record is read, so that what follows is noticed.
+  void Take() const;
+
+ private:
+  UniqueFd events_;
+};
+
 // A lock is held for the time of one small write; a holder that is stopped must not stop others.
 inline constexpr int kLockTenths = 50;
 
