@@ -40,9 +40,7 @@ int RunCallCommand(const CallOptions& options) {
                      options.method + "; there are " + Methods(caller.module()));
   }
   const nas::Reply reply = caller.Call(*row, options.method, params, nas::EncodeJsonReply);
-  if (!WriteOut(STDOUT_FILENO, reply.body + "\n")) {
-    throw std::runtime_error("the reply could not be written");
-  }
+  Print(reply.body + "\n");
   return reply.head.code == 0 ? kExitSuccess : kExitNothing;
 }
 

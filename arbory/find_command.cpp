@@ -128,18 +128,19 @@ void TellOfMore(const nas::InstantReply& reply) {
   Complain("more than " + Counted(shown, "file matches", "match") + "; arbory search lists all");
 }
 
-int Print(const std::string& text) {
-  if (WriteOut(STDOUT_FILENO, text)) return text.empty() ? kExitNothing : kExitSuccess;
+int PrintRows(const std::string& text) {
+  Print(text);
   if (Interrupted()) return kExitInterrupted;
-  // A reader that has seen enough, such as head, is no failure.
-  if (errno == EPIPE) return kExitSuccess;
-  throw std::runtime_error(std::string("cannot write the results: ") + std::strerror(errno));
+  return text.empty() ? kExitNothing : kExitSuccess;
 }
 
 int RunFor(const OutputOptions& options, const std::string& paths) {
   CommandRunner commands(options);
   const bool ran = commands.Take(paths) && commands.Finish();
   if (Interrupted()) return kExitInterrupted;
+  if (!ran && commands.failure() != 0 && commands.failure() != EPIPE) {
+    throw std::runtime_error(CannotPrint(commands.failure()));
+  }
   return ran && commands.all_succeeded() && !paths.empty() ? kExitSuccess : kExitNothing;
 }
 
@@ -173,7 +174,7 @@ int Find(const FindOptions& options) {
   if (picks || options.choices) format = {.kind = RowFormat::Kind::kChoice, .end = '\0'};
   std::string text = RowsText(*answer, shares, format);
   if (picks) return Pick(options, std::move(text));
-  const int code = options.output.runs() ? RunFor(options.output, text) : Print(text);
+  const int code = options.output.runs() ? RunFor(options.output, text) : PrintRows(text);
   TellOfMore(answer->reply);
   return code;
 }

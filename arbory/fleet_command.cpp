@@ -153,7 +153,7 @@ int RunFleetKeyCommand(const FleetOptions& options) {
     throw UsageError("the key cannot be written to " + options.key_file + ": " +
                      std::strerror(written.error().error_number));
   }
-  WriteOut(STDOUT_FILENO, nas::ToHex(open_part) + "\n");
+  Print(nas::ToHex(open_part) + "\n");
   return kExitSuccess;
 }
 
@@ -165,7 +165,7 @@ int RunFleetConfigCommand(const FleetOptions& options) {
   }
   const std::string text = ProxyConfig(fleet);
   if (options.write.empty()) {
-    WriteOut(STDOUT_FILENO, text);
+    Print(text);
     return kExitSuccess;
   }
   const auto before = nas::ReadWholeFile(AT_FDCWD, options.write, kMostConfigBytes);
@@ -199,7 +199,7 @@ int RunFleetStatusCommand(const FleetOptions& options) {
   asker.Run([] { return false; });
   std::string text = BoxLine::Head();
   for (const BoxLine& line : lines) text += line.Text();
-  WriteOut(STDOUT_FILENO, text);
+  Print(text);
   return std::ranges::all_of(lines, &BoxLine::answered) ? kExitSuccess : kExitNothing;
 }
 

@@ -19,7 +19,7 @@
 namespace arbory {
 namespace {
 
-void Say(const std::string& line) { WriteOut(STDOUT_FILENO, line + "\n"); }
+void Say(const std::string& line) { Print(line + "\n"); }
 
 Json::Value Report() {
   const auto text = nas::AskDaemon(nas::HelloKind::kReport);
@@ -31,8 +31,8 @@ Json::Value Report() {
 
 int ShowStatus(bool json) {
   const Json::Value report = Report();
-  WriteOut(STDOUT_FILENO, json ? nas::JsonText(report, nas::JsonBytes::kClean) + "\n"
-                               : IndexTable(report, std::time(nullptr)));
+  Print(json ? nas::JsonText(report, nas::JsonBytes::kClean) + "\n"
+             : IndexTable(report, std::time(nullptr)));
   return report["current"].asBool() ? kExitSuccess : kExitNothing;
 }
 
@@ -83,8 +83,8 @@ int Check() {
 }
 
 int RunDaemon() {
-  const nas::Status ended =
-      nas::RunIndexDaemon(nas::AnswerQuestion, [] { Say("The index daemon answers."); });
+  const nas::Status ended = nas::RunIndexDaemon(
+      nas::AnswerQuestion, [] { WriteOut(STDOUT_FILENO, "The index daemon answers.\n"); });
   if (!ended) throw std::runtime_error("the index daemon cannot start: " + ended.error().Text());
   return kExitSuccess;
 }

@@ -8,6 +8,7 @@
 #include <exception>
 #include <map>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -326,7 +327,10 @@ int Run(int argc, char** argv) {
   try {
     app.parse(MarkedArguments(argc, argv));
   } catch (const CLI::Success& asked) {
-    return app.exit(asked);
+    std::ostringstream text;
+    app.exit(asked, text);
+    Print(text.str());
+    return kExitSuccess;
   } catch (const CLI::ParseError& error) {
     throw UsageError(Explain(app, error, argc > 1 ? argv[1] : nullptr));
   }
@@ -361,6 +365,7 @@ int Run(int argc, char** argv) {
 
 int main(int argc, char** argv) {
   std::set_terminate(arbory::EndWithWords);
+  arbory::FillStandardDescriptors();
   try {
     try {
       return arbory::Run(argc, argv);

@@ -140,7 +140,7 @@ int RunPicker(const PickerSettings& settings) {
     if (!path.empty()) paths += path + settings.end;
     at = end + 1;
   }
-  if (!WriteOut(STDOUT_FILENO, paths)) throw std::runtime_error("the path cannot be written");
+  Print(paths);
   return paths.empty() ? kExitNothing : kExitSuccess;
 }
 

@@ -163,7 +163,7 @@ bool CommandRunner::Start(std::vector<std::string> words, bool has_terminal) {
   if (!has_terminal) {
     job.output = MakeOutput();
     job.errors = MakeOutput();
-    if (!job.output || !job.errors) return false;
+    if (!job.output || !job.errors) return Failed(errno);
     spawning.Redirect(job.output.get(), job.errors.get());
   }
   if (const int failed = spawning.Run(words, &job.pid); failed != 0) {
@@ -200,7 +200,14 @@ bool CommandRunner::End(Job job) {
   }
   all_succeeded_ &= WIFEXITED(status) && WEXITSTATUS(status) == 0;
   if (!job.output) return true;
-  return CopyTo(STDOUT_FILENO, job.output.get()) && CopyTo(STDERR_FILENO, job.errors.get());
+  const bool passed_on = CopyTo(STDOUT_FILENO, job.output.get()) || Failed(errno);
+  CopyTo(STDERR_FILENO, job.errors.get());
+  return passed_on;
+}
+
+bool CommandRunner::Failed(int error_number) {
+  if (failure_ == 0) failure_ = error_number;
+  return false;
 }
 
 void CommandRunner::StopAll() {

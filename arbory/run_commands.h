@@ -27,11 +27,12 @@ class CommandRunner {
   CommandRunner& operator=(const CommandRunner&) = delete;
 
   // Takes paths that each end with a NUL byte; waits while as many commands run as may. False where
-  // no more are wanted: interrupted, the command cannot be run, or nobody takes what it writes,
-  // with errno set then.
+  // no more are wanted: interrupted, the command cannot be run, or nobody takes what it writes.
   bool Take(std::string_view paths);
   // Runs what is left and waits for all. False where that did not come to its end, as above.
   bool Finish();
+  // Why what a command wrote did not get on, as errno's value; 0 where all did.
+  int failure() const { return failure_; }
   // Of all that have ended.
   bool all_succeeded() const { return all_succeeded_; }
 
@@ -51,6 +52,7 @@ class CommandRunner {
   // Waits until fewer than `most` run.
   bool WaitFor(size_t most);
   bool End(Job job);
+  bool Failed(int error_number);
   void StopAll();
 
   const bool batch_;
@@ -63,6 +65,7 @@ class CommandRunner {
   std::vector<Job> running_;
   bool all_succeeded_ = true;
   bool broken_ = false;
+  int failure_ = 0;
 };
 
 }  // namespace arbory

@@ -89,7 +89,8 @@ SearchOptions WithFleet(const SearchOptions& options, Caller* caller) {
   if (options.output.runs()) {
     throw UsageError("files of other machines cannot be given to a command");
   }
-  if (options.output.lines) throw UsageError("--lines shows those of this machine's files alone");
+  if (options.output.lines)
+    throw UsageError("--line-number shows lines of this machine's files alone");
   nas::FleetSettings fleet = nas::LoadFleet(options.fleet);
   if (faccessat(AT_FDCWD, fleet.key_file.c_str(), R_OK, AT_EACCESS) != 0) {
     throw UsageError("the front's key " + fleet.key_file +
@@ -239,7 +240,7 @@ class Search {
     progress_.Clear();
     errno = 0;
     const bool taken = commands_ ? commands_->Take(rows.text) : WriteOut(STDOUT_FILENO, rows.text);
-    failure_ = taken ? 0 : errno;
+    if (!taken) failure_ = commands_ ? commands_->failure() : errno;
     return taken;
   }
 
@@ -285,17 +286,13 @@ class Search {
     const RunningSearch state = ReadSearch(caller_.user(), task_id_);
     // One that has found everything ends by itself.
     running_ = state.exists && !state.finished && !state.all_found;
-    if (ending == Ending::kUnwritable) {
-      // A reader that has seen enough, such as head, is no failure.
-      if (failure_ == EPIPE) return kExitSuccess;
-      if (commands_ && !commands_->all_succeeded()) return kExitNothing;
-      Complain(std::string("cannot write the results: ") + std::strerror(failure_));
-      return kExitError;
-    }
+    if (ending == Ending::kUnwritable) return EndUnwritten(failure_);
     TellOfBoxes(state);
     if (ending != Ending::kEnough && !CameToEnd(ending, state)) return kExitError;
-    if (commands_ && !commands_->Finish() && Interrupted()) return kExitInterrupted;
-    if (options_.output.count) WriteOut(STDOUT_FILENO, std::to_string(printed_) + "\n");
+    if (commands_ && !commands_->Finish()) {
+      return Interrupted() ? kExitInterrupted : EndUnwritten(commands_->failure());
+    }
+    if (options_.output.count) arbory::Print(std::to_string(printed_) + "\n");
     if (!options_.output.quiet || printed_ == 0) TellOfSkipped(state);
     if (options_.verbose) Complain("answered " + SourceText(state));
     found_nothing_ = ending == Ending::kComplete && state.exists && state.matches == 0;
@@ -303,6 +300,15 @@ class Search {
     ran_ = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - started_);
     const bool failed = commands_ && !commands_->all_succeeded();
     return printed_ > 0 && !failed ? kExitSuccess : kExitNothing;
+  }
+
+  // Without an errno's value it was a command that cannot be run, of which has been told.
+  static int EndUnwritten(int failure) {
+    // A reader that has seen enough, such as head, is no failure.
+    if (failure == EPIPE) return kExitSuccess;
+    if (failure == 0) return kExitNothing;
+    Complain(CannotPrint(failure));
+    return kExitError;
   }
 
   // What answers at once shall not walk for a script, which reads no advice.
@@ -372,7 +378,7 @@ class Search {
   std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows
   std::uint64_t printed_ = 0;
-  int failure_ = 0;           // errno of kUnwritable
+  int failure_ = 0;           // of kUnwritable, errno's value
   std::string failure_text_;  // of kFailed
   bool running_ = true;
   bool found_nothing_ = false;

@@ -1,9 +1,12 @@
 #include "arbory/terminal.h"
 
+#include <fcntl.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstring>
+#include <stdexcept>
 
 #include "arbory/interrupt.h"
 #include "nas/base/hex.h"
@@ -64,6 +67,23 @@ bool WriteOut(int fd, std::string_view bytes) {
     bytes.remove_prefix(static_cast<size_t>(written));
   }
   return true;
+}
+
+void Print(std::string_view text) {
+  if (WriteOut(STDOUT_FILENO, text) || Interrupted() || errno == EPIPE) return;
+  throw std::runtime_error(CannotPrint(errno));
+}
+
+std::string CannotPrint(int error_number) {
+  return std::string("cannot write to standard output: ") + std::strerror(error_number);
+}
+
+void FillStandardDescriptors() {
+  for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+    if (fcntl(fd, F_GETFD) >= 0) continue;
+    // The lowest that is free is this one.
+    open("/dev/null", (fd == STDIN_FILENO ? O_WRONLY : O_RDONLY) | O_CLOEXEC);
+  }
 }
 
 void Complain(std::string_view sentence) {

@@ -15,6 +15,17 @@ std::string Escaped(std::string_view text);
 // Writes all of it. False with errno set, or when interrupted half-way.
 bool WriteOut(int fd, std::string_view bytes);
 
+// Writes to standard output what a command has to tell. Throws where that takes it not; a reader
+// that has seen enough, such as head, is no failure, and who was interrupted looks for that.
+void Print(std::string_view text);
+
+// What Print() throws, for an errno's value.
+std::string CannotPrint(int error_number);
+
+// Opens standard descriptors that the program was started without, so that no file of its own gets
+// their numbers and with them what is printed: what is read from them or written to them fails.
+void FillStandardDescriptors();
+
 // "arbory: SENTENCE" on standard error, escaped: sentences quote names.
 void Complain(std::string_view sentence);
 

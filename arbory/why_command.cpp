@@ -141,10 +141,7 @@ std::string Reason(const nas::Explanation& found) {
 }
 
 int Tell(const std::string& line, int exit_code) {
-  const std::string text = isatty(STDOUT_FILENO) != 0 ? Escaped(line) : line;
-  if (!WriteOut(STDOUT_FILENO, text + "\n")) {
-    throw std::runtime_error("the answer could not be written");
-  }
+  Print((isatty(STDOUT_FILENO) != 0 ? Escaped(line) : line) + "\n");
   return exit_code;
 }
 

@@ -177,6 +177,36 @@ TEST_F(BadInput, CommandLine) {
   EXPECT_TRUE(Remains().empty());
 }
 
+// Whoever reads the output has to hear that it is not whole, and no file of the program's own gets
+// it by having the number of a closed descriptor.
+TEST_F(BadInput, OutputThatNobodyTakesIsAnError) {
+  WriteFile(share_ + "/file.txt", "x");
+  const char* const rows[] = {
+      "search file >/dev/full",
+      "search file -c >/dev/full",
+      "search file >&-",
+      "search file -x echo >/dev/full",
+      "--help >/dev/full",
+      "search -V >/dev/full",
+      "search file <&- >&-",
+      "search file <&- >&- 2>&-",
+      "why file.txt file . >/dev/full",
+  };
+  for (const char* const words : rows) {
+    SCOPED_TRACE(words);
+    const std::string command = "cd " + share_ + " && exec 2>" + dir_ +
+                                "/errors && ARBORY_CONFIG=" + dir_ + "/as-" + nas_test::Me() +
+                                "/arbory.toml exec " + program_ + " " + words;
+    const int status = system(command.c_str());
+    EXPECT_EQ(WIFEXITED(status) ? WEXITSTATUS(status) : -1, 2);
+    const std::string errors = nas_test::ReadFile(dir_ + "/errors");
+    if (std::string_view(words).find("2>") != std::string_view::npos) continue;
+    EXPECT_THAT(errors, testing::StartsWith("arbory: cannot write to standard output: "));
+    EXPECT_EQ(Pieces(errors, '\n').size(), 1U);
+  }
+  EXPECT_TRUE(Remains().empty());
+}
+
 TEST_F(BadInput, NinthSearchIsRefused) {
   MakeEndlessFile(share_ + "/endless.log");
   Json::Value clean;
