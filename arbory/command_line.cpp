@@ -2,6 +2,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <charconv>
 #include <cstdint>
 
 #include "arbory/output_options.h"
@@ -32,6 +33,18 @@ void AddLetters(CLI::App* command, SearchQuery* query) {
   add("-i,--ignore-case", "any", "They do not; as usual");
 }
 
+// What is off as usual, and what turns it off again, as other programs have it on.
+void AddSwitch(CLI::App* command, bool* value, const char* on, const char* what, const char* off) {
+  const auto add = [&](const char* names, bool given, const char* description) {
+    command
+        ->add_flag_function(
+            names, [value, given](std::int64_t) { *value = given; }, description)
+        ->trigger_on_parse();
+  };
+  add(on, true, what);
+  add(off, false, "Do not; as usual");
+}
+
 // Where the search goes.
 void AddScope(CLI::App* command, SearchQuery* query) {
   const CLI::Validator levels = NumberOf("levels");
@@ -42,13 +55,13 @@ void AddScope(CLI::App* command, SearchQuery* query) {
       ->type_name("N")
       ->check(levels);
   command
-      ->add_option("-E,--exclude", query->excludes,
-                   "Leave out such names and all in such folders; as in .gitignore")
+      ->add_option("-E,--exclude", query->excludes, "Leave out such names, and all in such folders")
       ->type_name("GLOB")
       ->allow_extra_args(false);
-  command->add_flag("--no-hidden", query->no_hidden, "Leave out what begins with a dot");
-  command->add_flag("--ignore-files", query->ignore_files,
-                    "Leave out what .gitignore, .ignore and .fdignore say");
+  AddSwitch(command, &query->no_hidden, "--no-hidden", "Leave out what begins with a dot",
+            "-H,--hidden");
+  AddSwitch(command, &query->ignore_files, "--ignore-files",
+            "Leave out what .gitignore, .ignore and .fdignore say", "-I,--no-ignore");
   command->add_flag("--one-file-system", query->one_file_system,
                     "Do not enter what is mounted from another file system");
   AddLetters(command, query);
@@ -71,7 +84,7 @@ void AddCriteria(CLI::App* command, SearchQuery* query) {
   const CLI::Validator types([](const std::string&) { return std::string(); },
                              "{file,dir,link,executable,empty,pipe,socket,block,char,image,video,"
                              "audio,document,archive}");
-  command->add_option("-t,--type", query->types, "Types: f or file, or d,l; see below")
+  command->add_option("-t,--type", query->types, "Types: f or file, or several: d,l")
       ->type_name("TYPE")
       ->check(types)
       ->allow_extra_args(false);
@@ -122,11 +135,32 @@ void Unmark(std::string* text) {
 
 CLI::Validator NumberOf(const char* what) {
   return {[what](const std::string& text) {
-            const bool digits =
-                !text.empty() && text.find_first_not_of("0123456789") == std::string::npos;
-            return digits ? std::string() : "'" + text + "' is not a number of " + what;
+            std::int64_t number = 0;
+            const char* const end = text.data() + text.size();
+            const auto read = std::from_chars(text.data(), end, number);
+            const bool whole = read.ec == std::errc() && read.ptr == end && number >= 0;
+            return whole ? std::string() : "'" + text + "' is not a number of " + what;
           },
           ""};
+}
+
+CLI::Validator OneOf(std::vector<std::string> words) {
+  std::string list;
+  for (const std::string& word : words) list += (list.empty() ? "" : ",") + word;
+  const auto check = [words = std::move(words)](std::string& text) {
+    const std::string lower = CLI::detail::to_lower(text);
+    if (std::ranges::find(words, lower) != words.end()) {
+      text = lower;
+      return std::string();
+    }
+    std::string sentence = "'" + text + "' is none of ";
+    for (const std::string& word : words) {
+      if (&word != &words.front()) sentence += &word == &words.back() ? " and " : ", ";
+      sentence += word;
+    }
+    return sentence;
+  };
+  return {check, "{" + list + "}"};
 }
 
 void AddCommonOptions(CLI::App* command, CommonOptions* common) {

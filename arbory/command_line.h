@@ -19,8 +19,11 @@ namespace arbory {
 std::vector<std::string> MarkedArguments(int argc, char** argv);
 void Unmark(std::string* text);
 
-// Refuses what is not digits alone, as no number of `what`, which has to live on.
+// Refuses what is not digits alone, or too large, as no number of `what`, which has to live on.
 CLI::Validator NumberOf(const char* what);
+
+// Refuses what is none of `words`, and takes their letter case as here.
+CLI::Validator OneOf(std::vector<std::string> words);
 
 // --user, --share and --config, in the current group of `command`.
 void AddCommonOptions(CLI::App* command, CommonOptions* common);

@@ -1,7 +1,9 @@
 #include "arbory/command_tree.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
 #include <string_view>
+#include <utility>
 
 namespace arbory {
 namespace {
@@ -50,6 +52,69 @@ CommandText DescribeCommand(CLI::App* command) {
   return text;
 }
 
+// Adds what the commands of a command take to that: one word more, and what stands behind it. What
+// not all of them take, or take as another thing, is told of with their names.
+class Below {
+ public:
+  explicit Below(const std::vector<CommandText>& commands) : commands_(commands) {}
+
+  void AddTo(CommandText* command) const {
+    OptionText which;
+    which.names = {"COMMAND"};
+    which.required = true;
+    for (const CommandText& below : commands_) {
+      which.choices.push_back(below.name);
+      which.description +=
+          (which.description.empty() ? "" : "; ") + below.name + ": " + below.summary;
+    }
+    command->operands.push_back(which);
+    for (const CommandText& below : commands_) {
+      for (const OptionText& operand : below.operands) {
+        Merge(operand, &CommandText::operands, &command->operands);
+      }
+      for (const OptionText& option : below.options) {
+        Merge(option, &CommandText::options, &command->options);
+      }
+    }
+  }
+
+ private:
+  using Options = std::vector<OptionText>;
+
+  void Merge(OptionText option, Options CommandText::*list, Options* into) const {
+    const auto is_same = [&](const OptionText& other) { return other.names == option.names; };
+    if (std::ranges::any_of(*into, is_same)) return;
+    std::vector<std::pair<std::string, std::string>> told;  // the names of those, and what
+    for (const CommandText& command : commands_) {
+      const auto found = std::ranges::find_if(command.*list, is_same);
+      if (found == (command.*list).end()) continue;
+      if (told.empty() || told.back().second != found->description) {
+        told.emplace_back(command.name, found->description);
+      } else {
+        told.back().first += ", " + command.name;
+      }
+    }
+    option.description.clear();
+    for (const auto& [names, description] : told) {
+      option.description += (option.description.empty() ? "" : "; ") + names + ": " + description;
+    }
+    into->push_back(std::move(option));
+  }
+
+  const std::vector<CommandText>& commands_;
+};
+
+std::vector<CommandText> CommandsOf(CLI::App* command) {
+  std::vector<CommandText> commands;
+  for (CLI::App* below :
+       command->get_subcommands([](CLI::App* each) { return !each->get_group().empty(); })) {
+    commands.push_back(DescribeCommand(below));
+    const std::vector<CommandText> further = CommandsOf(below);
+    if (!further.empty()) Below(further).AddTo(&commands.back());
+  }
+  return commands;
+}
+
 }  // namespace
 
 std::string ValueName(const CLI::Option* option) {
@@ -60,10 +125,7 @@ std::string ValueName(const CLI::Option* option) {
 ProgramText Describe(CLI::App* program) {
   ProgramText text;
   text.program = DescribeCommand(program);
-  for (CLI::App* command :
-       program->get_subcommands([](CLI::App* each) { return !each->get_group().empty(); })) {
-    text.commands.push_back(DescribeCommand(command));
-  }
+  text.commands = CommandsOf(program);
   return text;
 }
 

@@ -38,7 +38,8 @@ struct ProgramText {
 // What the value of an option is called: "COLUMN", without the list of what it may be.
 std::string ValueName(const CLI::Option* option);
 
-// Without what the help leaves out.
+// Without what the help leaves out. A command that has commands of its own takes the name of one,
+// and what they take.
 ProgramText Describe(CLI::App* program);
 
 }  // namespace arbory

@@ -314,9 +314,9 @@ std::string FishCompletion(const ProgramText& program) {
     const std::string condition = "__fish_seen_subcommand_from " + command.name;
     text += FishOptions(command, condition);
     for (const OptionText& operand : command.operands) {
-      if (KindOf(operand.names.front()) == Kind::kText) continue;
-      text += "complete -c arbory -n " + Quoted(condition) +
-              FishKind(operand, KindOf(operand.names.front())) + "\n";
+      const Kind kind = KindOf(operand.names.front());
+      if (kind == Kind::kText && operand.choices.empty()) continue;
+      text += "complete -c arbory -n " + Quoted(condition) + FishKind(operand, kind) + "\n";
     }
   }
   return text;

@@ -33,20 +33,22 @@ namespace {
 
 // Lines of these texts fit a terminal of 80 columns.
 constexpr char kProgramHelp[] =
-    "Searches read the folders themselves, or ask the index where its daemon runs, with\n"
-    "the same results. The server shows a page to search on.\n"
+    "Searches read the folders themselves, or ask the index where its daemon runs,\n"
+    "with the same results. The server shows a page to search on.\n"
     "\n"
     "Configuration: the file given with --config, else $ARBORY_CONFIG, else\n"
     "/etc/arbory/arbory.toml, else $XDG_CONFIG_HOME/arbory/arbory.toml. None is\n"
     "needed.\n";
 
 constexpr char kSearchHelp[] =
+    "\n"
     "COLUMN is name, path, size, type, user, group, mode, mtime, atime, ctime or\n"
     "crtime.\n"
     "\n"
     "In COMMAND and TEXT {} is the path, {/} the name, {//} the folder, {.} and {/.}\n"
-    "path and name without the last extension; {{ and }} are braces. A COMMAND without\n"
-    "any gets the path at its end. No shell reads it, and it ends at a ; of its own.\n"
+    "path and name without the last extension; {{ and }} are braces. A COMMAND\n"
+    "without any gets the path at its end. No shell reads it, and it ends at a ; of\n"
+    "its own.\n"
     "\n"
     "Exit status: 0 found, 1 nothing found or a command failed, 2 error, 130\n"
     "interrupted.\n"
@@ -68,9 +70,9 @@ constexpr char kCallHelp[] =
     "    '{\"folder_path\": \"/photo\", \"pattern\": \"*.jpg\"}'\n";
 
 constexpr char kServeHelp[] =
-    "As an ordinary user it serves that user and prints an address to open; it works once, and\n"
-    "SIGHUP prints another. As root people log in with their own accounts, unless --user names\n"
-    "the one user to serve. SIGTERM and SIGINT stop it.\n"
+    "As an ordinary user it serves that user and prints an address to open; it works\n"
+    "once, and SIGHUP prints another. As root people log in with their own accounts,\n"
+    "unless --user names the one user to serve. SIGTERM and SIGINT stop it.\n"
     "\n"
     "Examples:\n"
     "  arbory serve --share photos=$HOME/Pictures\n"
@@ -101,13 +103,20 @@ constexpr char kFindHelp[] =
     "  vi \"$(arbory find)\"\n";
 
 constexpr char kIndexHelp[] =
-    "Keeps the names of all shares and volumes in mind, so that searches need not read the\n"
-    "folders, and answers until SIGTERM or SIGINT. As root for everybody, each with what\n"
-    "they may see; as an ordinary user over what that user may read. The other forms ask\n"
-    "the daemon that runs.\n"
+    "Keeps the names of all shares and volumes in mind, so that searches need not\n"
+    "read the folders, and answers until SIGTERM or SIGINT. As root for everybody,\n"
+    "each with what they may see; as an ordinary user over what that user may read.\n"
+    "The other forms ask the daemon that runs.\n"
     "\n"
     "Exit status: --status 0 all is current, 1 not yet, 2 no daemon; --check 0 no\n"
     "difference, 1 some, 2 it could not be done.\n";
+
+constexpr char kFleetHelp[] =
+    "A front searches boxes. key makes what they know it by; config and status read\n"
+    "the file that names them, as in /etc/arbory/fleet.toml. How a fleet is set up\n"
+    "stands in docs/fleet.md.\n"
+    "\n"
+    "Exit status: 0 done, 1 for status where a box does not answer, 2 error.\n";
 
 // Help without the parser's own notes on which options need or exclude each other.
 class Formatter : public CLI::Formatter {
@@ -122,7 +131,16 @@ class Formatter : public CLI::Formatter {
 CLI::App* AddCall(CLI::App* app, CallOptions* options) {
   CLI::App* call = app->add_subcommand("call", "Make one API call and print its reply");
   call->add_option("API", options->api, "Name of the API")->required();
-  call->add_option("VERSION", options->version, "Version of the API")->required();
+  const CLI::Validator number(
+      [](const std::string& text) {
+        int version = 0;
+        const char* const end = text.data() + text.size();
+        const auto read = std::from_chars(text.data(), end, version);
+        if (read.ec == std::errc() && read.ptr == end) return std::string();
+        return "'" + text + "' is not a number";
+      },
+      "");
+  call->add_option("VERSION", options->version, "Version of the API")->required()->check(number);
   call->add_option("METHOD", options->method, "Method of the API")->required();
   call->add_option("JSON", options->params, "Parameters");
   AddCommonOptions(call, &options->common);
@@ -151,10 +169,10 @@ struct FleetCommands {
 FleetCommands AddFleet(CLI::App* app, FleetOptions* options) {
   CLI::App* fleet = app->add_subcommand("fleet", "Look after a fleet of machines");
   fleet->require_subcommand(1);
+  fleet->footer(kFleetHelp);
   FleetCommands commands;
   commands.key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
-  commands.key->add_option("FILE", options->key_file, "Where the secret one goes; a new file")
-      ->required();
+  commands.key->add_option("FILE", options->key_file, "A new file for the secret one")->required();
   commands.config = fleet->add_subcommand("config", "Print the configuration of HAProxy");
   CLI::Option* write =
       commands.config->add_option("--write", options->write, "Write it there, where it has changed")
@@ -178,15 +196,21 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
   CLI::Option* sort =
       search->add_option("--sort", options->sort_by, "Print sorted, when the search has finished")
           ->type_name("COLUMN")
-          ->check(CLI::IsMember({"name", "path", "size", "type", "user", "group", "mode", "mtime",
-                                 "atime", "ctime", "crtime"}));
+          ->check(OneOf({"name", "path", "size", "type", "user", "group", "mode", "mtime", "atime",
+                         "ctime", "crtime"}));
   search->add_flag("--desc", options->descending, "Largest, latest or last first")->needs(sort);
   AddSearchOutput(search, options);
   search->add_flag("--show-errors", options->common.show_errors,
                    "Name the folders that could not be read, and say why");
   search->add_option("--threads", options->common.threads, "Walk with N threads")
       ->type_name("N")
-      ->check(CLI::Range(1, kMostThreads).description(""));
+      ->check(CLI::Validator(
+          [](const std::string& text) {
+            return CLI::Range(1, kMostThreads)(text).empty()
+                       ? std::string()
+                       : "'" + text + "' is not a number from 1 to " + std::to_string(kMostThreads);
+          },
+          ""));
   search->add_flag("-v,--verbose", options->verbose, "Say how the search was answered");
   const std::map<std::string, nas::IndexUse> uses = {{"auto", nas::IndexUse::kAuto},
                                                      {"always", nas::IndexUse::kAlways},
@@ -195,7 +219,8 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
       ->add_option("--index", options->common.index_use,
                    "auto: where it is current; always: or fail; never: walk")
       ->type_name("WHEN")
-      ->transform(CLI::Transformer(uses, CLI::ignore_case));
+      ->transform(CLI::Transformer(uses).description(""))
+      ->transform(OneOf({"auto", "always", "never"}));
 }
 
 void AddSearch(CLI::App* app, SearchOptions* options) {
@@ -205,7 +230,7 @@ void AddSearch(CLI::App* app, SearchOptions* options) {
   search->option_defaults()->group("Where and as whom");
   search
       ->add_option("--fleet", options->fleet,
-                   "Search the machines that this file names: /BOX/SHARE, or all")
+                   "Search the machines it names; a FOLDER is /BOX/SHARE")
       ->type_name("FILE");
   AddCommonOptions(search, &options->common);
   search->footer(std::string(kQueryHelp) + kSearchHelp);
@@ -290,12 +315,14 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error, const cha
     return "'" + std::string(first_word) + "' is no command; see arbory --help";
   }
   const auto left = chosen.front()->remaining();
+  const std::string command = chosen.front()->get_name();
   std::string text = error.what();
+  if (chosen.front()->get_require_subcommand_min() > 0) text = "say what " + command + " is to do";
   if (!left.empty()) {
     text = "not understood: " + left.front();
     if (left.front().starts_with('-')) text += " (put -- before a pattern that begins with -)";
   }
-  return text + "; see arbory " + chosen.front()->get_name() + " --help";
+  return text + "; see arbory " + command + " --help";
 }
 
 int Run(int argc, char** argv) {

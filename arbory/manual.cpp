@@ -310,6 +310,14 @@ SampleLine ReadSampleLine(const std::string& line) {
   return read;
 }
 
+// "[server]", commented out or not; empty where the line is another.
+std::string TableOf(const std::string& line) {
+  const size_t begin = line.find_first_not_of("# ");
+  const size_t end = line.find("]");
+  if (begin == std::string::npos || line[begin] != '[' || end == std::string::npos) return {};
+  return line.substr(begin, end + 1 - begin);
+}
+
 }  // namespace
 
 std::vector<ManualPage> ManualPages(const ProgramText& program, const std::string& version,
@@ -329,8 +337,8 @@ ManualPage ConfigurationPage(const std::string& sample, const std::string& versi
   bool paragraph = true;  // a heading begins one
   for (const std::string& line : LinesOf(sample)) {
     if (line.empty()) continue;
-    if (line.starts_with('[')) {
-      roff += ".SH " + Literal(line) + "\n";
+    if (const std::string table = TableOf(line); !table.empty()) {
+      roff += ".SH " + Literal(table) + "\n";
       paragraph = true;
       continue;
     }

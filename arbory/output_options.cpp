@@ -67,7 +67,8 @@ void AddFormat(CLI::App* command, OutputOptions* output) {
       {"auto", ColorUse::kAuto}, {"always", ColorUse::kAlways}, {"never", ColorUse::kNever}};
   command->add_option("--color", output->color, "auto: on a terminal; always; never")
       ->type_name("WHEN")
-      ->transform(CLI::Transformer(uses, CLI::ignore_case));
+      ->transform(CLI::Transformer(uses).description(""))
+      ->transform(OneOf({"auto", "always", "never"}));
   AddCommand(command, "-x", "--exec", &output->exec,
              "Run for each path, several at a time; ends at ;");
   AddCommand(command, "-X", "--exec-batch", &output->exec_batch,

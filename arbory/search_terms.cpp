@@ -52,7 +52,10 @@ void AddTypes(const std::vector<std::string>& types, std::string* terms) {
   if (std::ranges::any_of(words, is("x", "executable"))) std::erase_if(words, is("f", "file"));
   std::string list;
   for (const std::string& word : words) list += (list.empty() ? "" : ",") + word;
-  if (!list.empty()) AddTerm("type:\"" + list + "\"", terms);
+  if (list.empty()) return;
+  // As people would write it, where it is what it should be: sentences quote it.
+  const bool plain = list.find_first_not_of("abcdefghijklmnopqrstuvwxyz,") == std::string::npos;
+  AddTerm(plain ? "type:" + list : "type:\"" + list + "\"", terms);
 }
 
 }  // namespace

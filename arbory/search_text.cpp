@@ -5,6 +5,9 @@
 #include <iterator>
 
 #include "arbory/terminal.h"
+#include "nas/system/config.h"
+#include "nas/system/identity.h"
+#include "nas/system/user_state.h"
 #include "platform/errors.h"
 #include "platform/task.h"
 #include "platform/task_record.h"
@@ -92,12 +95,17 @@ std::string FailureSentence(int code, const std::vector<std::string>& folders) {
 std::string WhyNoSearch(const Caller& caller) {
   const NUVA::APIMethod row = {"", 1, "", TryTask};
   const auto encode = [](int code, const Json::Value& data) {
-    // Without a text the call did not come as far as making a task.
-    std::string why = "the state directory " + nas::CurrentConfig().state_dir +
-                      " cannot be used (code " + std::to_string(code) + ")";
-    return nas::Reply{{.code = code}, data.isString() ? data.asString() : why};
+    return nas::Reply{{.code = code}, data.isString() ? data.asString() : ""};
   };
-  return caller.Call(row, "", Json::Value(), encode).body;
+  const nas::Reply tried = caller.Call(row, "", Json::Value(), encode);
+  if (tried.head.code == 0 || !tried.body.empty()) return tried.body;
+  // The call did not come as far as making a task: what was in its way is in this process's too.
+  const bool system_wide = nas::CanBeRoot();
+  const nas::Status entered = nas::EnterUserState(caller.user());
+  if (entered) return "code " + std::to_string(tried.head.code);
+  return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (" +
+         entered.error().Text() + "); state_dir in a configuration file" +
+         (system_wide ? "" : ", or $XDG_STATE_HOME,") + " names another";
 }
 
 }  // namespace arbory

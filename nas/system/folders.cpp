@@ -59,8 +59,9 @@ Status MakeFolders(const std::string& path, mode_t mode) {
       (void)SyncFolder(AT_FDCWD, part + "/..");
     } else if (errno != EEXIST) {
       // A folder on the way may refuse with another error though it exists.
+      const int refusal = errno;
       struct stat info;
-      if (stat(part.c_str(), &info) != 0) return ErrnoError(part);
+      if (stat(part.c_str(), &info) != 0) return ErrnoError(refusal, part);
     }
     if (end == std::string::npos) return {};
   }

@@ -150,6 +150,8 @@ TEST_F(BadInput, CommandLine) {
       {{"search", "x", "--sort", "spoon"}, "spoon"},
       {{"search", "x", "--desc"}, "--sort"},
       {{"search", "x", "--limit", "-1"}, "'-1'"},
+      {{"search", "x", "--limit", "9223372036854775808"}, "is not a number of files"},
+      {{"search", "x", "--color", "spoon"}, "'spoon' is none of auto, always and never"},
       {{"search", "x", "--json", "-l"}, "--json"},
       {{"search", "x", "--share", "spoon"}, "NAME=DIR"},
       {{"search", "x", "--share", "home=/etc"}, "home"},
@@ -217,6 +219,15 @@ TEST_F(BadInput, NinthSearchIsRefused) {
   EXPECT_EQ(Call("start", Json_(R"({"folder_path": "/share", "pattern": "x"})")).code, 401);
   EXPECT_EQ(Call("clean", clean).code, 0);
   EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
+}
+
+TEST_F(BadInput, NoPlaceForWhatASearchKeeps) {
+  WriteFile(dir_ + "/none.toml", "state_dir = \"/nowhere/state\"\n");
+  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
+    const Output output = Run({"search", "x", "--config", dir_ + "/none.toml"});
+    EXPECT_EQ(output.exit_code, 2);
+    EXPECT_THAT(output.err, testing::HasSubstr("/nowhere/state cannot be used (/nowhere: Perm"));
+  }));
 }
 
 TEST_F(BadInput, OnlyRootActsForOthers) {

@@ -116,8 +116,8 @@ TEST_F(Fd, FindsTheSame) {
     std::vector<std::string> arbory;
     const char* folder = "/tree";
   } rows[] = {
-      {"-HI ''", {""}},
-      {"-I ''", {"--no-hidden", ""}},
+      {"-HI ''", {"--no-hidden", "--ignore-files", "-HI", ""}},
+      {"-I ''", {"-H", "--no-hidden", ""}},
       {"-HI -d 1 ''", {"-d", "1", ""}},
       {"-HI -d 3 --min-depth 2 ''", {"-d", "3", "--min-depth", "2", ""}},
       {"-HI -t f ''", {"-t", "f", ""}},

@@ -285,7 +285,9 @@ TEST_F(ParameterNamesTest, TheTerminalOffersWhatIsDocumented) {
     for (const std::string& name : changed.getMemberNames()) {
       if (changed[name] != plain[name]) names.insert(name);
     }
-    EXPECT_EQ(names.size(), 1U) << option->get_name();
+    // What is so anyway changes nothing.
+    const bool usual = option->get_description().ends_with("as usual");
+    EXPECT_TRUE(names.size() == 1 || (usual && names.empty())) << option->get_name();
     offered.insert(names.begin(), names.end());
   }
   Names expected = NamesOf(documented_[std::string(kSearch) + " start"]);
