@@ -255,6 +255,9 @@ test('the panel and the text are two views of one query', async () => {
   assert.deepEqual(await page.locator('.criteria code').allTextContents(), ['!ext:a', 'size:>1k']);
   assert.equal(await page.getByLabel('Last opened, as written').inputValue(), '2026');
   assert.equal(await page.getByLabel('Extension').inputValue(), '');
+  // The accounts of the machine are offered, as behind the prefix.
+  await page.getByLabel('Owner').focus();
+  await page.waitForSelector('#accounts-owner option[value=root]', { state: 'attached' });
   await page.getByLabel('Owner').pressSequentially('no one');
   await holds('owner:"no one" !ext:a size:>1k opened:2026 "x y');
   await page.waitForFunction(() => document.querySelector('.owner input')?.getAttribute('aria-invalid') === 'true');

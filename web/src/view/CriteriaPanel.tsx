@@ -1,6 +1,7 @@
 // The criteria: another view of the terms of the query. What is chosen here is written there, and what
 // is written there is shown here where it can be; below are the tags that say what the terms mean.
-import { useState } from 'preact/hooks';
+import { useRef, useState } from 'preact/hooks';
+import { readQuery } from '../api/client.ts';
 import { browses, hasCriteria, NO_CRITERIA } from '../model/criteria.ts';
 import { nameList, without, withTerm, type Query, type Span } from '../model/query.ts';
 import {
@@ -127,10 +128,12 @@ interface TypedProps {
   put: (value: string) => string; // writes it, and gives what the query has then
   label?: string; // where no element around it has one
   placeholder?: string;
+  list?: string; // of the element that holds what may be written
+  offer?: (typed: string) => void; // is told of what is typed, and of the focus
 }
 
 // What is typed stays as it is typed while the query has it in its own form, or has not got it yet.
-function Typed({ app, prefix, value, put: write, label, placeholder }: TypedProps) {
+function Typed({ app, prefix, value, put: write, label, placeholder, list, offer }: TypedProps) {
   const [typed, setTyped] = useState({ text: value, before: value, value });
   const own = value === typed.value || value === typed.before;
   return (
@@ -139,6 +142,7 @@ function Typed({ app, prefix, value, put: write, label, placeholder }: TypedProp
       aria-label={label}
       value={own ? typed.text : value}
       placeholder={placeholder}
+      list={list}
       spellcheck={false}
       autocapitalize="none"
       autocomplete="off"
@@ -146,7 +150,9 @@ function Typed({ app, prefix, value, put: write, label, placeholder }: TypedProp
       onInput={(event) => {
         const text = event.currentTarget.value;
         setTyped({ text, before: value, value: write(text) });
+        offer?.(text);
       }}
+      onFocus={(event) => offer?.(event.currentTarget.value)}
       onBlur={() => setTyped({ text: value, before: value, value })}
       onKeyDown={(event) => event.key === 'Enter' && !event.isComposing && app.submit()}
     />
@@ -157,6 +163,7 @@ const unquoted = (value: string) => value.replaceAll('"', '');
 
 function Text({ app, prefix }: { app: App; prefix: keyof typeof TEXTS }) {
   const [label, placeholder] = TEXTS[prefix];
+  const [accounts, offer] = useAccounts(prefix);
   const write = (text: string) => {
     const value = written(prefix, text);
     put(app, prefix, value);
@@ -165,9 +172,42 @@ function Text({ app, prefix }: { app: App; prefix: keyof typeof TEXTS }) {
   return (
     <label class={`labelled ${prefix}`}>
       <span>{label}</span>
-      <Typed app={app} prefix={prefix} value={shownValue(app.reading.query, prefix)} put={write} placeholder={placeholder} />
+      <Typed
+        app={app}
+        prefix={prefix}
+        value={shownValue(app.reading.query, prefix)}
+        put={write}
+        placeholder={placeholder}
+        list={prefix === 'ext' ? undefined : `accounts-${prefix}`}
+        offer={prefix === 'ext' ? undefined : offer}
+      />
+      {prefix !== 'ext' && (
+        <datalist id={`accounts-${prefix}`}>
+          {accounts.map((name) => (
+            <option key={name} value={name} />
+          ))}
+        </datalist>
+      )}
     </label>
   );
+}
+
+// The accounts that begin with what is typed, as the query line offers them behind the prefix. The
+// newest question wins; without an answer nothing is offered.
+function useAccounts(prefix: string): [string[], (typed: string) => void] {
+  const [accounts, setAccounts] = useState<string[]>([]);
+  const asked = useRef(new AbortController());
+  const offer = (typed: string) => {
+    asked.current.abort();
+    asked.current = new AbortController();
+    const { signal } = asked.current;
+    const pattern = `${prefix}:"${unquoted(typed).toWellFormed()}`;
+    readQuery({ pattern, caret: pattern.length }, signal)
+      .then(({ completion }) => completion?.items.map(({ text }) => unquoted(text)) ?? [])
+      .then((names) => signal.aborted || setAccounts(names))
+      .catch(() => {});
+  };
+  return [accounts, offer];
 }
 
 function Size({ app }: { app: App }) {
