@@ -3,13 +3,14 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/stat.h>
 
-#include <chrono>
+#include <cstdio>
 #include <filesystem>
-#include <thread>
 
 #include "nas/system/config.h"
+#include "platform/task_record.h"
 #include "tests/program/program_test.h"
 
 namespace program_test {
@@ -17,32 +18,69 @@ namespace {
 
 namespace fs = std::filesystem;
 
-class Scope : public ProgramTest {};
+class Scope : public ProgramTest {
+ protected:
+  // Searches that hold all places of the user and do nothing.
+  std::vector<std::string> TakeAllPlaces() {
+    fs::create_directories(share_ + "/endless");
+    MakeEndlessFile(share_ + "/endless/file");
+    std::vector<std::string> running;
+    for (int i = 0; i < nas::CurrentConfig().searches_per_user; ++i) {
+      running.push_back(Start(Json_(R"({"folder_path": "/share/endless", "pattern": "zzz",
+                                        "search_content": true})")));
+      // Not while it has a lock that others wait for.
+      EXPECT_TRUE(Eventually([&] {
+        return TaskProperty(running.back(), task_record::kData).isMember(task_record::kDatabaseId);
+      }));
+      EXPECT_EQ(kill(Worker(running.back()), SIGSTOP), 0);
+    }
+    return running;
+  }
+  pid_t Worker(const std::string& id) {
+    return TaskProperty(id, task_record::kData)[task_record::kPid].asInt();
+  }
+  void End(const std::string& id) {
+    kill(Worker(id), SIGCONT);
+    Json::Value task;
+    task["taskid"] = id;
+    EXPECT_EQ(Call("stop", task).code, 0);
+    EXPECT_EQ(Call("clean", task).code, 0);
+  }
+};
 
+// On a terminal it says that it waits; where nobody watches nothing is said.
 TEST_F(Scope, OneSearchTooManyWaitsForAPlace) {
   fs::create_directories(share_ + "/plain");
-  fs::create_directories(share_ + "/endless");
   WriteFile(share_ + "/plain/a.txt", "");
-  MakeEndlessFile(share_ + "/endless/file");
-  std::vector<std::string> running;
-  for (int i = 0; i < nas::CurrentConfig().searches_per_user; ++i) {
-    running.push_back(Start(Json_(R"({"folder_path": "/share/endless", "pattern": "zzz",
-                                      "search_content": true})")));
+  const std::vector<std::string> running = TakeAllPlaces();
+  const pid_t unwatched = Launch({"search", "-0", "a.txt", share_ + "/plain"});
+  const std::string line = "cd " + share_ + " && ARBORY_CONFIG=" + dir_ + "/as-" + nas_test::Me() +
+                           "/arbory.toml script -qec '" + program_ +
+                           " search --color never a.txt plain' /dev/null </dev/null";
+  FILE* const watched = popen(line.c_str(), "r");
+  ASSERT_NE(watched, nullptr);
+  std::string said;
+  const auto hear = [&] {
+    const int c = std::getc(watched);
+    if (c != EOF) said.push_back(static_cast<char>(c));
+    return c != EOF;
+  };
+  while (said.find('\n') == std::string::npos && hear()) {
   }
-  const pid_t program = Launch({"search", "-0", "a.txt", share_ + "/plain"});
-  std::this_thread::sleep_for(std::chrono::milliseconds(300));
-  EXPECT_EQ(kill(program, 0), 0) << "it waits";
-  Json::Value one(Json::objectValue);
-  one["taskid"] = running[3];
-  Call("stop", one);
-  const Output output = Finish(program);
+  EXPECT_EQ(said,
+            "arbory: waiting for one of 8 searches that run for " + nas_test::Me() + " to end\r\n");
+  End(running[3]);
+  said.clear();
+  while (hear()) {
+  }
+  EXPECT_EQ(pclose(watched), 0);
+  EXPECT_NE(said.find("plain/a.txt\r\n"), std::string::npos) << said;
+  const Output output = Finish(unwatched);
   EXPECT_EQ(output.exit_code, 0) << output.err;
   EXPECT_EQ(Pieces(output.out, '\0').size(), 1U);
-  EXPECT_EQ(output.err, "") << "nothing is said where nobody watches";
+  EXPECT_EQ(output.err, "");
   for (const std::string& id : running) {
-    one["taskid"] = id;
-    Call("stop", one);
-    Call("clean", one);
+    if (id != running[3]) End(id);
   }
 }
 
