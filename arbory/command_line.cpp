@@ -11,7 +11,7 @@ namespace arbory {
 namespace {
 
 // Not to be typed by accident, and no beginning of an option.
-constexpr char kMark = '\x1f';
+constexpr char kMarked[] = "\x1f[";
 
 void AddTimes(CLI::App* command, const std::string& name, const std::string& verb,
               TimeRange* range) {
@@ -123,14 +123,33 @@ std::vector<std::string> MarkedArguments(int argc, char** argv) {
   std::vector<std::string> arguments(argv + std::min(argc, 1), argv + argc);
   JoinCommands(&arguments);
   for (std::string& argument : arguments) {
-    if (argument.starts_with('[')) argument.insert(0, 1, kMark);
+    // "--option=[" and "-o[" as well.
+    const size_t begin = argument.find('[');
+    const bool begins_value = begin == 0 || argument.starts_with('-');
+    if (begin != std::string::npos && begins_value) argument.replace(begin, 1, kMarked);
   }
   std::ranges::reverse(arguments);  // as the parser wants them
   return arguments;
 }
 
-void Unmark(std::string* text) {
-  if (text->starts_with(kMark)) text->erase(0, 1);
+std::string Unmarked(std::string text) {
+  const size_t mark = text.find(kMarked);
+  if (mark != std::string::npos) text.erase(mark, 1);
+  return text;
+}
+
+void UnmarkValues(CLI::App* app) {
+  const CLI::Validator unmark(
+      [](std::string& value) {
+        value = Unmarked(std::move(value));
+        return std::string();
+      },
+      "");
+  for (CLI::Option* option :
+       app->get_options([](CLI::Option* each) { return each->get_items_expected_max() > 0; })) {
+    option->transform(unmark);  // before all checks
+  }
+  for (CLI::App* command : app->get_subcommands({})) UnmarkValues(command);
 }
 
 CLI::Validator NumberOf(const char* what) {
@@ -176,8 +195,6 @@ void AddQueryOptions(CLI::App* command, SearchQuery* query) {
   command->add_option("FOLDER", query->folders, "Folders to search; the current one by default");
   AddCriteria(command, query);
   command->final_callback([query] {
-    Unmark(&query->pattern);
-    for (std::string& folder : query->folders) Unmark(&folder);
     query->here = query->folders.empty();
     if (query->here) query->folders = {"."};
   });
@@ -188,11 +205,9 @@ void AddFindQuery(CLI::App* command, FindOptions* find) {
   AddCriteria(command, &find->query);
   command->get_option("--content")->group("");  // refused with a sentence
   command->final_callback([find] {
-    for (std::string& word : find->words) {
-      Unmark(&word);
+    for (const std::string& word : find->words) {
       find->query.pattern += (&word == &find->words.front() ? "" : " ") + word;
     }
-    for (std::string& folder : find->query.folders) Unmark(&folder);
   });
 }
 

@@ -13,11 +13,14 @@ class Validator;
 
 namespace arbory {
 
-// A word that begins with "[" is a folder's name here and a list of values to the option parser.
-// The first function takes the words of main, the program's own left out, marks those and returns
-// all in reverse, as the parser wants them; the second takes a mark off again.
+// A value that begins with "[" is a folder's name, a pattern or an address here, and a list of
+// values to the option parser. The first function takes the words of main, the program's own left
+// out, marks those and returns all in reverse, as the parser wants them; the second takes a mark
+// off again, and the third has it done to all values of `app` and its commands, once all are
+// defined.
 std::vector<std::string> MarkedArguments(int argc, char** argv);
-void Unmark(std::string* text);
+std::string Unmarked(std::string text);
+void UnmarkValues(CLI::App* app);
 
 // Refuses what is not digits alone, or too large, as no number of `what`, which has to live on.
 CLI::Validator NumberOf(const char* what);
@@ -29,8 +32,8 @@ CLI::Validator OneOf(std::vector<std::string> words);
 void AddCommonOptions(CLI::App* command, CommonOptions* common);
 
 // PATTERN, FOLDER and the criteria in a group of their own. When the command has been parsed,
-// `query` holds words without marks and the current folder where none was given; before, it must
-// not be read. `query` must live as long as `command`.
+// `query` holds the current folder where none was given; before, it must not be read. `query` must
+// live as long as `command`.
 void AddQueryOptions(CLI::App* command, SearchQuery* query);
 
 // WORDS, --in and the criteria, in the same way: the query's pattern is the words then, and it has

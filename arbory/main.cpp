@@ -319,7 +319,7 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error, const cha
   std::string text = error.what();
   if (chosen.front()->get_require_subcommand_min() > 0) text = "say what " + command + " is to do";
   if (!left.empty()) {
-    text = "not understood: " + left.front();
+    text = "not understood: " + Unmarked(left.front());
     if (left.front().starts_with('-')) text += " (put -- before a pattern that begins with -)";
   }
   return text + "; see arbory " + command + " --help";
@@ -351,6 +351,7 @@ int Run(int argc, char** argv) {
   GenerateOptions generate_options;
   CLI::App* generate = AddGenerate(&app, &generate_options);
   AddVersion(&app);
+  UnmarkValues(&app);
   try {
     app.parse(MarkedArguments(argc, argv));
   } catch (const CLI::Success& asked) {
@@ -361,10 +362,7 @@ int Run(int argc, char** argv) {
   } catch (const CLI::ParseError& error) {
     throw UsageError(Explain(app, error, argc > 1 ? argv[1] : nullptr));
   }
-  if (call->parsed()) {
-    Unmark(&call_options.params);
-    return RunCallCommand(call_options);
-  }
+  if (call->parsed()) return RunCallCommand(call_options);
   if (fleet.key->parsed()) return RunFleetKeyCommand(fleet_options);
   if (fleet.config->parsed()) return RunFleetConfigCommand(fleet_options);
   if (fleet.status->parsed()) return RunFleetStatusCommand(fleet_options);
@@ -372,10 +370,7 @@ int Run(int argc, char** argv) {
   if (find->parsed()) return RunFindCommand(find_options);
   if (generate->parsed()) return RunGenerateCommand(generate_options, Describe(&app));
   if (serve->parsed()) return RunServeCommand(serve_options);
-  if (why->parsed()) {
-    Unmark(&why_options.file);
-    return RunWhyCommand(why_options);
-  }
+  if (why->parsed()) return RunWhyCommand(why_options);
   search_options.query.content |= search_options.output.lines;
   if (search_options.output.quiet) search_options.limit = 1;
   return RunSearchCommand(search_options);

@@ -43,8 +43,7 @@ std::string_view Environment(const char* name) {
 
 bool WantsColours(const OutputOptions& options, bool terminal) {
   if (options.color != ColorUse::kAuto) return options.color == ColorUse::kAlways;
-  return terminal && !options.null_separated && Environment("NO_COLOR").empty() &&
-         Environment("TERM") != "dumb";
+  return terminal && !options.null_separated && Environment("NO_COLOR").empty() && KnowsControls();
 }
 
 void CheckOnlyOne(const OutputOptions& options) {

@@ -5,9 +5,11 @@
 #include <iterator>
 
 #include "arbory/terminal.h"
+#include "nas/system/child.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
 #include "nas/system/user_state.h"
+#include "nas/webapi/runner.h"
 #include "platform/errors.h"
 #include "platform/task.h"
 #include "platform/task_record.h"
@@ -99,13 +101,18 @@ std::string WhyNoSearch(const Caller& caller) {
   };
   const nas::Reply tried = caller.Call(row, "", Json::Value(), encode);
   if (tried.head.code == 0 || !tried.body.empty()) return tried.body;
-  // The call did not come as far as making a task: what was in its way is in this process's too.
-  const bool system_wide = nas::CanBeRoot();
-  const nas::Status entered = nas::EnterUserState(caller.user());
-  if (entered) return "code " + std::to_string(tried.head.code);
-  return "the state directory " + nas::CurrentConfig().state_dir + " cannot be used (" +
-         entered.error().Text() + "); state_dir in a configuration file" +
-         (system_wide ? "" : ", or $XDG_STATE_HOME,") + " names another";
+  // The call did not come as far as making a task: what was in its way is in another child's too.
+  const auto tell = [&](int pipe) {
+    const nas::Status entered = nas::EnterUserState(caller.user());
+    nas::SendReply(pipe, {{.code = 0}, entered ? "" : entered.error().Text()});
+  };
+  const nas::Config& config = nas::CurrentConfig();
+  const std::string trouble =
+      nas::FinishCall(nas::StartChild(tell, config.call_memory_bytes()), encode).body;
+  if (trouble.empty()) return "code " + std::to_string(tried.head.code);
+  return "the state directory " + config.state_dir + " cannot be used (" + trouble +
+         "); state_dir in a configuration file" +
+         (nas::CanBeRoot() ? "" : ", or $XDG_STATE_HOME,") + " names another";
 }
 
 }  // namespace arbory

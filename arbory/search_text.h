@@ -21,8 +21,7 @@ std::string SourceText(const RunningSearch& search);
 
 // Why a search of `folders` failed with the web API code `code`.
 std::string FailureSentence(int code, const std::vector<std::string>& folders);
-// Why no search can be started for the caller's user just now; empty when one can. For a process
-// that has nothing to do but to tell of it: it may be the user's then.
+// Why no search can be started for the caller's user just now; empty when one can.
 std::string WhyNoSearch(const Caller& caller);
 
 }  // namespace arbory

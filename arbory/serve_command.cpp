@@ -2,9 +2,12 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
 #include <string>
 
 #include "arbory/caller.h"
+#include "arbory/search_text.h"
 #include "arbory/server/service/pages.h"
 #include "arbory/server/service/sample_share.h"
 #include "arbory/server/service/service.h"
@@ -78,6 +81,16 @@ void WarnOfMissingHelpers() {
       "results where they are");
 }
 
+// Only what would leave nothing of the page.
+void WarnOfMissingParts(const Service::Setup& setup, const Caller& caller) {
+  if (access((setup.web_dir + "/index.html").c_str(), R_OK) != 0) {
+    Complain("the page is not there: " + setup.web_dir + "/index.html: " + std::strerror(errno));
+  }
+  if (setup.single_user.empty()) return;
+  const std::string why = WhyNoSearch(caller);
+  if (!why.empty()) Complain("nothing can be searched: " + why);
+}
+
 void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& settings,
                      const HttpServer& server) {
   if (!server.on_loopback() && !settings.behind_tls) {
@@ -85,12 +98,11 @@ void WarnOfOpenDoors(const ServeOptions& options, const nas::ServerSettings& set
         "listening beyond this machine without TLS: passwords and files can be read on the way; "
         "put a proxy with TLS in front and set behind_tls");
   }
-  const std::string service = settings.pam_dir + "/" + settings.pam_service;
-  const bool found = settings.pam_dir.empty() ? access(("/etc/pam.d" + service).c_str(), R_OK) == 0
-                                              : access(service.c_str(), R_OK) == 0;
-  if (HasLogins(options) && !found) {
-    Complain("there is no PAM service file " + settings.pam_service +
-             ", so every login will be refused; see packaging/pam/arbory");
+  const std::string folder = settings.pam_dir.empty() ? "/etc/pam.d" : settings.pam_dir;
+  const std::string service = folder + "/" + settings.pam_service;
+  if (HasLogins(options) && access(service.c_str(), R_OK) != 0) {
+    Complain("there is no PAM service file " + service +
+             ", so every login will be refused; packaging/pam/arbory is one");
   }
 }
 
@@ -109,9 +121,11 @@ int RunServeCommand(const ServeOptions& options) {
   WarnOfMissingHelpers();
   const nas::ServerSettings settings = SettingsOf(options);
   HttpServer server(settings);
-  Service service(SetupOf(options, settings, caller, server), caller.module());
+  const Service::Setup setup = SetupOf(options, settings, caller, server);
+  Service service(setup, caller.module());
   WarnOfOpenDoors(options, settings, server);
   nas::PrepareForCalls();
+  WarnOfMissingParts(setup, caller);
   const std::string base = "http://" + server.address() + "/";
   if (HasLogins(options)) {
     Say("Open " + base);

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <stdexcept>
 
@@ -31,6 +32,17 @@ bool IsTrick(std::string_view sequence) {
     return byte(2) == 0x8E || byte(2) == 0x8F || (byte(2) >= 0xA8 && byte(2) <= 0xAE);
   }
   return byte(1) == 0x81 && byte(2) >= 0xA6 && byte(2) <= 0xA9;
+}
+
+// As many whole characters as fit into that many bytes.
+std::string_view Cut(std::string_view line, size_t bytes) {
+  size_t end = 0;
+  while (end < line.size()) {
+    const size_t next = end + nas::NextUtf8(line.substr(end)).length;
+    if (next > bytes) break;
+    end = next;
+  }
+  return line.substr(0, end);
 }
 
 }  // namespace
@@ -90,7 +102,13 @@ void Complain(std::string_view sentence) {
   WriteOut(STDERR_FILENO, "arbory: " + Escaped(sentence) + "\n");
 }
 
-ProgressLine::ProgressLine() : enabled_(isatty(STDERR_FILENO)), due_(Clock::now() + kFirstLine) {}
+bool KnowsControls() {
+  const char* const kind = getenv("TERM");
+  return kind == nullptr || std::string_view(kind) != "dumb";
+}
+
+ProgressLine::ProgressLine()
+    : enabled_(isatty(STDERR_FILENO) != 0 && KnowsControls()), due_(Clock::now() + kFirstLine) {}
 
 bool ProgressLine::Due() const { return enabled_ && Clock::now() >= due_; }
 
@@ -100,7 +118,7 @@ void ProgressLine::Show(const std::string& line) {
   const bool known = ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
   // A line that reaches the last column would wrap on some terminals and then not be cleared.
   const size_t room = (known ? size.ws_col : kUsualColumns) - 1;
-  WriteOut(STDERR_FILENO, kClearLine + line.substr(0, room));
+  WriteOut(STDERR_FILENO, kClearLine + std::string(Cut(line, room)));
   shown_ = true;
   due_ = Clock::now() + kNextLine;
 }

@@ -29,7 +29,11 @@ void FillStandardDescriptors();
 // "arbory: SENTENCE" on standard error, escaped: sentences quote names.
 void Complain(std::string_view sentence);
 
-// One line on standard error that is drawn over and over. Does nothing where that is no terminal.
+// Whether a terminal does what control sequences say, such as to colour; a "dumb" one prints them.
+bool KnowsControls();
+
+// One line on standard error that is drawn over and over. Does nothing where that is no terminal,
+// or one that only prints.
 class ProgressLine {
  public:
   ProgressLine();

@@ -100,7 +100,9 @@ std::string Meant(std::string word) {
   const bool wild = word.find_first_of("*?") != std::string::npos;
   if (!wild && word.find('[') == std::string::npos) std::ranges::replace(word, '\\', '/');
   const bool is_set = word.find('[') != std::string::npos && word.find(']') != std::string::npos;
-  return is_set && !wild ? "\"" + word + "\"" : word;
+  if (!is_set || wild) return word;
+  const std::string sign = word.starts_with('!') ? "!" : "";
+  return sign + "\"" + word.substr(sign.size()) + "\"";
 }
 
 // "size", ">", "1gb" and the like as one word; `at` is the first and becomes the last.

@@ -176,7 +176,7 @@ class Reader {
         {"listen", [&](const toml::node& value) { server->listen = Text(value); }},
         {"web_dir", [&](const toml::node& value) { server->web_dir = PathOrNone(value); }},
         {"behind_tls", [&](const toml::node& value) { server->behind_tls = Truth(value); }},
-        {"origins", [&](const toml::node& value) { server->origins = Texts(value); }},
+        {"origins", [&](const toml::node& value) { server->origins = Origins(value); }},
         {"proxies", [&](const toml::node& value) { server->proxies = Texts(value); }},
         {"pam_service", [&](const toml::node& value) { server->pam_service = Text(value); }},
         {"pam_dir", [&](const toml::node& value) { server->pam_dir = PathOrNone(value); }},
@@ -327,6 +327,22 @@ class Reader {
 
   std::vector<std::string> Texts(const toml::node& node) {
     return ListOf(node, [this](const toml::node& item) { return Text(item); });
+  }
+
+  // As browsers write them: another way would match no request.
+  std::vector<std::string> Origins(const toml::node& node) {
+    return ListOf(node, [this](const toml::node& item) {
+      const std::string origin = Text(item);
+      const size_t mark = origin.find("://");
+      const std::string scheme = origin.substr(0, mark);
+      const bool known = mark != std::string::npos && (scheme == "https" || scheme == "http");
+      const std::string host = known ? origin.substr(mark + 3) : std::string();
+      if (host.empty() || host.find_first_of("/?#@ ") != std::string::npos) {
+        Fail(item.source(),
+             "an address without a path, such as https://search.example.net, is expected here");
+      }
+      return origin;
+    });
   }
 
   std::vector<ShareSetting> Shares(const toml::node& node) {

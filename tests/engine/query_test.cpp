@@ -407,6 +407,7 @@ TEST_F(Queries, AsTheyWereMeant) {
       {"./a file:///b/c", "/a /b/c"},
       {"'exact words' x", "\"exact words\" x"},
       {"[draft]", "\"[draft]\""},
+      {"a -draft[1]", "a !\"draft[1]\""},
       // What says nothing else, or what nobody can tell.
       {"plan  ext:pdf", ""},
       {"note:x", ""},

@@ -154,6 +154,7 @@ TEST_F(BadInput, CommandLine) {
       {{"search", "x", "--color", "spoon"}, "'spoon' is none of auto, always and never"},
       {{"search", "x", "--json", "-l"}, "--json"},
       {{"search", "x", "--share", "spoon"}, "NAME=DIR"},
+      {{"search", "x", "--share", "[spoon]"}, "'[spoon]'"},
       {{"search", "x", "--share", "home=/etc"}, "home"},
       {{"search", "x", "--config", "/nonexistent/x.toml"}, "/nonexistent/x.toml"},
       {{"search", "x", "--user", "nob0dy"}, "no user 'nob0dy'"},

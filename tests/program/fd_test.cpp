@@ -128,6 +128,7 @@ TEST_F(Fd, FindsTheSame) {
       {"-HI -t e ''", {"-t", "e", ""}},
       {"-HI -t e -t d ''", {"-t", "e,d", ""}},
       {"-HI -E '*.c' ''", {"-s", "-E", "*.c", ""}},
+      {"-HI -E '[!s]*' ''", {"-s", "-E", "[!s]*", ""}},
       {"-HI -E node_modules -E build ''", {"-E", "node_modules", "-E", "build", ""}},
       {"-HI -E /build -E src/lib ''", {"-E", "/build", "-E", "src/lib", ""}},
       {"-HI -E 'src/**/*.{c,C}' -E 'build/' ''", {"-E", "src/**/*.{c,C}", "-E", "build/", ""}},
