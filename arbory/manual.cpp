@@ -313,9 +313,8 @@ SampleLine ReadSampleLine(const std::string& line) {
 // "[server]", commented out or not; empty where the line is another.
 std::string TableOf(const std::string& line) {
   const size_t begin = line.find_first_not_of("# ");
-  const size_t end = line.find("]");
-  if (begin == std::string::npos || line[begin] != '[' || end == std::string::npos) return {};
-  return line.substr(begin, end + 1 - begin);
+  if (begin == std::string::npos || line[begin] != '[' || !line.ends_with(']')) return {};
+  return line.substr(begin);
 }
 
 }  // namespace

@@ -82,8 +82,10 @@ class Manual(Written):
         known = set(re.findall(r'\{"(\w+)",\s', text)) - {"fronts"}
         self.assertGreater(len(known), 20)
         page = run("man", "-l", self.path("man/man5/arbory.toml.5")).stdout
-        told = set(re.findall(r"^ +(\w+) = ", page, re.M)) | set(re.findall(r"^\[(\w+)\]", page, re.M))
+        tables = re.findall(r"^\[([\w.]+)\]$", page, re.M)
+        told = set(re.findall(r"^ +(\w+) = ", page, re.M)) | set(tables)
         self.assertEqual(known - told, set())
+        self.assertEqual(len(tables), len(set(tables)), tables)
 
 
 class Completion(Written):
