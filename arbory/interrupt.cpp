@@ -9,16 +9,21 @@
 namespace arbory {
 namespace {
 
-int interrupted = 0;
+constexpr int kImpatient = 3;
 
-void Note(int) { __atomic_store_n(&interrupted, 1, __ATOMIC_RELAXED); }
+int interrupted = 0;  // how often
+
+void Note(int signal_number) {
+  if (__atomic_add_fetch(&interrupted, 1, __ATOMIC_RELAXED) < kImpatient) return;
+  signal(signal_number, SIG_DFL);
+  raise(signal_number);  // held back until this returns
+}
 
 }  // namespace
 
 void WatchForInterrupt() {
   struct sigaction note = {};
   note.sa_handler = Note;
-  note.sa_flags = static_cast<int>(SA_RESETHAND);
   for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
     // What nohup or a shell's background job chose to ignore stays ignored.
     struct sigaction before = {};

@@ -4,8 +4,9 @@
 
 namespace arbory {
 
-// From now on SIGINT, SIGTERM and SIGHUP are noted; a second one of the same kind ends the program
-// at once. A reader that went away is a failed write instead of a signal.
+// From now on SIGINT, SIGTERM and SIGHUP are noted, and the third ends the program at once. Not the
+// second: timeout(1) and shells send one to the program and the same to its process group. A reader
+// that went away is a failed write instead of a signal.
 void WatchForInterrupt();
 bool Interrupted();
 // The same for what looks at a flag, atomically: not 0 once interrupted.

@@ -363,6 +363,8 @@ TEST_F(Lifecycle, AnInterruptedProgramCleansUp) {
     const pid_t worker = Worker(OneThatWalks(nas_test::Me()));
     ASSERT_TRUE(Lives(worker));
     kill(program, signal_number);
+    usleep(1000);  // two that wait at once would be one
+    kill(program, signal_number);
     const Output output = Finish(program);
     EXPECT_EQ(output.exit_code, 130);
     EXPECT_TRUE(Eventually([&] { return !Lives(worker) && Remains().empty(); }));
