@@ -25,12 +25,15 @@ test('lines that were found are shown, numbered and marked, however late and in 
       ['late.txt', '40001', 'here is the Gärtner'],
       ['latin.txt', '1', 'Der Gärtner und die Äpfel'],
     ];
-    for (const [name, number, text] of rows) {
-      const row = page.locator('.row', { hasText: name });
-      await row.locator('.found', { hasText: text }).waitFor();
-      assert.equal(await row.locator('.found .number').textContent(), number);
-      assert.equal(await row.locator('.found mark').textContent(), 'Gärtner');
-      await row.click();
+    const row = (name: string) => page.locator('.row', { hasText: name });
+    for (const [name, , text] of rows) await row(name).locator('.found', { hasText: text }).waitFor();
+    const places = await page.locator('.row').evaluateAll((all) => all.map((one) => one.getBoundingClientRect().toJSON()));
+    const [upper, lower] = places.sort((a, b) => a.top - b.top);
+    assert.ok(lower.top >= upper.bottom - 1, 'one row is below the other');
+    for (const [name, number] of rows) {
+      assert.equal(await row(name).locator('.found .number').textContent(), number);
+      assert.equal(await row(name).locator('.found mark').textContent(), 'Gärtner');
+      await row(name).click();
       await page.locator('.details pre mark', { hasText: 'Gärtner' }).waitFor();
       const seen = await page.locator('.preview.text').evaluate((box) => {
         const mark = [...box.querySelectorAll('mark')][0]!.getBoundingClientRect();

@@ -32,7 +32,8 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   const { choice } = search;
   const { spans } = choice;
   const rows = search.found;
-  const { rowHeight, viewport, width } = useMeasures(scroller, app.pictures);
+  const looks = `${app.pictures ? 'with-pictures' : ''} ${search.lines ? 'with-lines' : ''}`;
+  const { rowHeight, viewport, width } = useMeasures(scroller, looks);
   const columns = useMemo(() => fittingColumns(app.columns, width), [app.columns, width]);
   const returns = useRef(0);
   if (model.resize({ rows, rowHeight, viewport })) ++returns.current;
@@ -136,7 +137,7 @@ export function ResultTable({ app, search, actions }: { app: App; search: Shown;
   return (
     <div
       ref={root}
-      class={`table ${app.pictures ? 'with-pictures' : ''} ${search.lines ? 'with-lines' : ''}`}
+      class={`table ${looks}`}
       role="grid"
       tabIndex={0}
       aria-label="Results"
@@ -221,8 +222,8 @@ function Head({ app, search, columns }: { app: App; search: Shown; columns: read
   );
 }
 
-// The height of a row is the style sheet's to say; it differs on a phone.
-function useMeasures(scroller: { current: HTMLElement | null }, pictures: boolean) {
+// The height of a row is the style sheet's to say; it differs on a phone, and with how the table looks.
+function useMeasures(scroller: { current: HTMLElement | null }, looks: string) {
   const [measures, setMeasures] = useState({ rowHeight: 30, viewport: 600, width: 1000 });
   useLayoutEffect(() => {
     const element = scroller.current!;
@@ -239,7 +240,7 @@ function useMeasures(scroller: { current: HTMLElement | null }, pictures: boolea
     const observer = new ResizeObserver(measure);
     observer.observe(element);
     return () => observer.disconnect();
-  }, [pictures]);
+  }, [looks]);
   return measures;
 }
 
