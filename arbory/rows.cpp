@@ -113,7 +113,9 @@ std::string PathOfChoice(std::string_view line) {
 }
 
 RowWriter::RowWriter(const RowFormat& format) : format_(format) {
-  if (format.lines) scanner_.emplace(*format.lines, InterruptFlag());
+  if (!format.lines) return;
+  for (const nas::ContentQuery& query : *format.lines)
+    scanners_.emplace_back(query, InterruptFlag());
 }
 
 void RowWriter::AppendText(std::string_view text, std::string* out) const {
@@ -180,8 +182,15 @@ bool RowWriter::Spill(std::string* out) const {
 }
 
 void RowWriter::EachLine(const nas::ResultRow& row, const nas::ContentScanner::TellLine& tell) {
-  if (!scanner_ || !S_ISREG(row.attributes->mode)) return;
-  scanner_->EachLine(AT_FDCWD, path_.c_str(), format_.lines_wanted, tell);
+  if (!S_ISREG(row.attributes->mode)) return;
+  bool told = false;
+  const auto hear = [&](const nas::MatchingLine& line, bool matches) {
+    told = true;
+    return tell(line, matches);
+  };
+  for (nas::ContentScanner& scanner : scanners_) {
+    if (!told) scanner.EachLine(AT_FDCWD, path_.c_str(), format_.lines_wanted, hear);
+  }
 }
 
 // "12:TEXT", or "11-TEXT" of a line that only stands near one that matches.

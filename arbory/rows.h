@@ -2,10 +2,11 @@
 // The rows of a search as they are printed.
 
 #include <functional>
+#include <list>
 #include <memory>
-#include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "arbory/ls_colors.h"
 #include "arbory/options.h"
@@ -24,13 +25,14 @@ struct RowFormat {
   // and cannot be trusted with a path's bytes: the path in hexadecimal digits, a tab, and the path
   // as a terminal may show it.
   enum class Kind { kNone, kPath, kLong, kJson, kTemplate, kChoice };
+  using Lines = std::vector<nas::ContentQuery>;
   Kind kind = Kind::kPath;
   ShownPaths paths = {};
   char end = '\n';
-  bool escape = false;                                  // for a terminal
-  std::shared_ptr<const LsColors> colors = {};          // null: none
-  std::shared_ptr<const PathTemplate> shape = {};       // of kTemplate
-  std::shared_ptr<const nas::ContentQuery> lines = {};  // null: no lines are told
+  bool escape = false;                             // for a terminal
+  std::shared_ptr<const LsColors> colors = {};     // null: none
+  std::shared_ptr<const PathTemplate> shape = {};  // of kTemplate
+  std::shared_ptr<const Lines> lines = {};         // null: no lines are told
   nas::LinesWanted lines_wanted = {};
   // Takes what has come together within a row that tells of very many lines; false: no more is
   // wanted.
@@ -79,8 +81,8 @@ class RowWriter {
   const RowFormat& format_;
   LongColumns columns_;
   JsonRows json_;
-  std::optional<nas::ContentScanner> scanner_;
-  bool told_lines_ = false;  // of any row
+  std::list<nas::ContentScanner> scanners_;  // for the lines, the first that tells any
+  bool told_lines_ = false;                  // of any row
   // Of the row before, whose folder most rows share.
   std::string share_root_;
   std::string folder_;

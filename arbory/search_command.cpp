@@ -59,11 +59,11 @@ constexpr std::chrono::milliseconds kLeastHint{100};
 constexpr std::chrono::milliseconds kMostHint{1000};
 
 // Null for a pattern that asks for no contents.
-std::shared_ptr<const nas::ContentQuery> LinesOf(const std::string& text) {
+std::shared_ptr<const RowFormat::Lines> LinesOf(const std::string& text) {
   const auto pattern = nas::Query::Parse(text);
   if (!pattern) return nullptr;
-  auto query = nas::ContentQuery::From(pattern->root(), true);
-  return query ? std::make_shared<const nas::ContentQuery>(std::move(*query)) : nullptr;
+  auto queries = nas::ContentQuery::ForLines(pattern->root());
+  return queries.empty() ? nullptr : std::make_shared<const RowFormat::Lines>(std::move(queries));
 }
 
 // A path that a program is to be given begins with no "-".

@@ -89,6 +89,8 @@ std::string FailureSentence(int code, const std::vector<std::string>& folders) {
       return "unknown user or group";
     case web_code::kIllegal:
       return "illegal pattern, file type or folder: " + where;
+    case web_code::kFailed:
+      return "the search failed: there may be no space for its results; the system log tells more";
     default:
       return "the search failed (code " + std::to_string(code) + "); the system log may tell";
   }

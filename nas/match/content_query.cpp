@@ -101,6 +101,15 @@ std::optional<ContentQuery> ContentQuery::From(const QueryNode& query, bool text
   return std::nullopt;
 }
 
+std::vector<ContentQuery> ContentQuery::ForLines(const QueryNode& query) {
+  std::vector<ContentQuery> made;
+  for (const bool texts_too : {true, false}) {
+    if (!made.empty() && !made.back().texts_too()) break;
+    if (auto one = From(query, texts_too)) made.push_back(std::move(*one));
+  }
+  return made;
+}
+
 std::optional<TextPlace> ContentQuery::Needle::Find(std::string_view text, size_t from) const {
   if (literal) {
     auto place = literal->Find(text.substr(from));

@@ -23,6 +23,11 @@ class ContentQuery {
   // the query only says what must not be there. Nothing where no contents are asked for.
   static std::optional<ContentQuery> From(const QueryNode& query, bool texts_too);
 
+  // By whose lines a file that was found is explained: the first that tells any. Behind the one
+  // with the texts is the one without, as a file may have them in its name. Empty where no contents
+  // are asked for.
+  static std::vector<ContentQuery> ForLines(const QueryNode& query);
+
   // The query, in which leaves know their needles.
   const QueryNode& root() const { return root_; }
   bool texts_too() const { return texts_too_; }

@@ -237,6 +237,8 @@ TEST_F(PrintedRows, LinesOfContents) {
   const Json::Value row = Json_(Run({"search", "-A1", "one", "--json"}).out);
   EXPECT_EQ(row["lines"], Json_(R"([{"number": 1, "text": "one"},
                       {"number": 2, "text": "two caf\uFFFD\uFFFD", "context": true}])"));
+  // What is asked of names alone is no part of the lines.
+  EXPECT_EQ(Run({"search", "-n", "content:one old"}).out, "old.txt:1:one\n");
   const std::string coloured =
       Run({"search", "-n", "one", "--color", "always", "--index", "never"}).out;
   EXPECT_EQ(coloured,

@@ -99,6 +99,9 @@ TEST_F(FilesTest, FirstLineOfWhatContentsHold) {
       {"three", 200, R"({"line":null,"parts":[]})"},
       {"regex:%5EA", 200, R"({"line":2,"parts":["","A"," \ufffd<b>Two</b> two"]})"},
       {"*.txt", 200, R"({"line":null,"parts":[]})"},
+      {"content:two%20notes", 200, R"({"line":2,"parts":["A \ufffd<b>","Two","</b> ","two",""]})"},
+      {"content:one%20two", 200, R"({"line":1,"parts":["","one",""]})"},
+      {"two%20notes", 200, R"({"line":null,"parts":[]})"},
       {"regex:(", 400, nullptr},
   };
   for (const auto& row : rows) {

@@ -183,10 +183,12 @@ void ServeFirstLine(const FileRequest& request, const std::string& pattern, bool
   if (!parsed) return SendError(pipe, kBadRequest, parsed.error().path.c_str());
   const auto file = OpenFile(request);
   if (!file) return SendOpenError(pipe, file.error().error_number);
-  const auto query = nas::ContentQuery::From(parsed->root(), true);
   const int never = 0;
   std::optional<nas::MatchingLine> line;
-  if (query) line = nas::ContentScanner(*query, never).FirstLine(file->fd.get(), kMostLineBytes);
+  for (const nas::ContentQuery& query : nas::ContentQuery::ForLines(parsed->root())) {
+    if (line || lseek(file->fd.get(), 0, SEEK_SET) != 0) break;
+    line = nas::ContentScanner(query, never).FirstLine(file->fd.get(), kMostLineBytes);
+  }
   Json::Value body = LineJson(line);
   if (with_text) AddText(file->fd.get(), line ? line->number : 1, &body);
   const std::string text = nas::JsonText(body, nas::JsonBytes::kClean);
