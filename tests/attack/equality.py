@@ -23,7 +23,7 @@ import time
 from collections import Counter
 
 from attack import Outcome
-from house import House, become_subreaper, children, eventually
+from house import House, become_subreaper, children, eventually, reap_others
 
 PROMISE = "An answer of the index is that of a walk, for every user, and tells of no file out of reach"
 ATTACK = ("random changes, kills, damage, storms and gaps on each kind of file system, and without root, "
@@ -437,6 +437,8 @@ class Equality:
         words = [*self.before, self.house.program, "search", "--config", self.house.config,
                  *([] if self.before else ["--user", user]), "--index", source, "--json", *question[1:], "--", question[0], folder]
         done = subprocess.run(words, capture_output=True)
+        # A search is cleaned up after its program has ended.
+        reap_others({self.daemon})
         rows = []
         for line in done.stdout.splitlines():
             row = json.loads(line)
@@ -487,7 +489,7 @@ class Equality:
                           for one, other in ((got, walked), (walked, got))]
             self.outcome.breaks(
                 f"{self.kind}, question {self.asked}, {user} {question} {folder}: {len(more)} rows "
-                f"too many, {len(less)} missing, such as {more[:2]} {less[:2]}; mounted are "
+                f"too many, {len(less)} missing, such as {more[:2]} {less[:9]}; mounted are "
                 f"{self.place.mounted}", self.repeat())
 
     def ask_during_swaps(self):

@@ -46,6 +46,12 @@ def children(process=None):
         return set()
 
 
+def reap_others(kept):
+    """Of those who lost their parent, which would otherwise be there for ever once they ended."""
+    for process in children() - set(kept):
+        os.waitid(os.P_PID, process, os.WEXITED | os.WNOHANG)
+
+
 def eventually(holds, seconds=DEADLINE):
     pause, end = 0.0005, time.monotonic() + seconds
     while not (value := holds()):
