@@ -42,7 +42,8 @@ void SetTimes(const TimeRange& range, const std::string& name, std::time_t now,
   if (!range.from.empty()) bounds.from = ParseTime(range.from, Bound::kFrom, now);
   if (!range.to.empty()) bounds.to = ParseTime(range.to, Bound::kTo, now);
   if (bounds.from > bounds.to) {
-    throw UsageError("'" + range.to + "' is before '" + range.from + "'");
+    throw UsageError("the latest time '" + range.to + "' is before the earliest, '" + range.from +
+                     "'");
   }
   SetBounds(bounds, name, params);
 }
@@ -71,7 +72,8 @@ void SetSizes(const SearchQuery& query, Json::Value* params) {
   Of("size_to", [&] {
     if (!query.size_to.empty()) bounds.to = ParseSize(query.size_to);
     if (bounds.from <= bounds.to) return;
-    throw UsageError("'" + query.size_to + "' is less than '" + query.size_from + "'");
+    throw UsageError("the largest size '" + query.size_to + "' is less than the smallest, '" +
+                     query.size_from + "'");
   });
   SetBounds(bounds, "size", params);
 }
