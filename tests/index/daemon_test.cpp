@@ -254,6 +254,39 @@ TEST_F(Life, FindsItsWayAfterLostEvents) {
   ExpectEqual();
 }
 
+// The kernel keeps so many events of single folders for a watcher that does not take them, and then
+// only says that there were more.
+TEST_F(Life, FindsItsWayAfterTheKernelsQueueWasFull) {
+  int limit = 0;
+  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
+  constexpr int kMany = 100'000;
+  if (limit <= 0 || limit > kMany) GTEST_SKIP() << "the queue holds too many events: " << limit;
+  MakeFolder("own", 0777);
+  EXPECT_TRUE(nas_test::InOrdinaryChild([&](const std::string&) {
+    prctl(PR_SET_DUMPABLE, 1);  // as a process has it that was never root's
+    state_ = dir_ + "/own/state";
+    tree_ = dir_ + "/own/tree";
+    MakeTree(tree_);
+    ConfigureIndex();
+    StartDaemon();
+    ASSERT_TRUE(Current());
+    const pid_t watcher = Watcher();
+    kill(watcher, SIGSTOP);
+    for (int at = 0; at < limit; ++at) {
+      const std::string path = tree_ + "/a/" + std::to_string(at % 8);
+      nas_test::WriteFile(path, "");
+      fs::remove(path);
+    }
+    nas_test::WriteFile(tree_ + "/c/after the last event", "text");
+    kill(watcher, SIGCONT);
+    // A look at it comes behind what was queued.
+    EXPECT_TRUE(Eventually([&] {
+      return See(tree_)["state"].asString() == nas::kIndexCurrent && Differences(tree_).empty();
+    }));
+    EXPECT_TRUE(StopDaemon());
+  }));
+}
+
 // A file that a process writes to by its memory alone changes without an event.
 TEST_F(Life, DoesNotBelieveMappedFiles) {
   if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
