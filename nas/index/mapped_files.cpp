@@ -3,7 +3,10 @@
 #include <fcntl.h>
 #include <sys/ioctl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <charconv>
 #include <cstdint>
@@ -89,23 +92,59 @@ bool SeesAllProcesses() {
   return stat("/proc/self/ns/pid", &status) == 0 && status.st_ino == kFirst;
 }
 
+bool HasEnded() { return errno == ENOENT || errno == ESRCH; }
+
+bool AddMappings(int process, Changes& changes) {
+  UniqueFd maps(openat(process, "maps", O_RDONLY | O_CLOEXEC));
+  if (!maps) return HasEnded();
+  if (!AskForMappings(maps.get(), changes)) ReadMappings(std::move(maps), changes);
+  return true;
+}
+
+// The file itself is not touched: it may lie on a file server that does not answer.
+bool AddOpenForWriting(int process, Changes& changes) {
+  constexpr size_t kMostBytes = 256;  // the inode is in the fourth line
+  constexpr std::string_view kInode = "\nino:\t";
+  const auto names = NamesIn(process, "fd");
+  if (!names) return HasEnded();
+  for (const std::string& name : *names) {
+    // The mode of a descriptor's link says how it was opened.
+    struct stat status;
+    const bool writes =
+        fstatat(process, ("fd/" + name).c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+        (status.st_mode & S_IWUSR) != 0;
+    if (!writes) continue;
+    const UniqueFd file(openat(process, ("fdinfo/" + name).c_str(), O_RDONLY | O_CLOEXEC));
+    std::array<char, kMostBytes> text;
+    const ssize_t got = file ? read(file.get(), text.data(), text.size()) : -1;
+    if (got < 0 && HasEnded()) continue;
+    const std::string_view lines(text.data(), static_cast<size_t>(std::max<ssize_t>(got, 0)));
+    const size_t at = lines.find(kInode);
+    if (at == std::string_view::npos) return false;
+    std::uint64_t inode = 0;
+    std::from_chars(lines.data() + at + kInode.size(), lines.data() + lines.size(), inode);
+    if (inode != 0) changes.AddInode(inode);
+  }
+  return true;
+}
+
 }  // namespace
 
+bool AddInodesMappedBy(const std::string& pid, Changes& changes) {
+  const UniqueFd process(open(("/proc/" + pid).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!process) return HasEnded();
+  return AddMappings(process.get(), changes) && AddOpenForWriting(process.get(), changes);
+}
+
+// What one hides is to be expected of any file; the others make no difference then.
 bool AddMappedInodes(Changes& changes) {
   if (!SeesAllProcesses()) return false;
   const auto names = NamesIn(AT_FDCWD, "/proc");
   if (!names) return false;
-  bool complete = true;
-  for (const std::string& name : *names) {
-    if (name.find_first_not_of("0123456789") != std::string::npos) continue;
-    UniqueFd maps(open(("/proc/" + name + "/maps").c_str(), O_RDONLY | O_CLOEXEC));
-    if (!maps) {
-      complete = complete && (errno == ENOENT || errno == ESRCH);
-    } else if (!AskForMappings(maps.get(), changes)) {
-      ReadMappings(std::move(maps), changes);
-    }
-  }
-  return complete;
+  return std::ranges::all_of(*names, [&](const std::string& name) {
+    const bool process = name.find_first_not_of("0123456789") == std::string::npos;
+    return !process || AddInodesMappedBy(name, changes);
+  });
 }
 
 }  // namespace nas

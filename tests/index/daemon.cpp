@@ -32,6 +32,7 @@ Json::Value Describe(const nas::IndexSnapshot& snapshot) {
   told["new_rights"] = prctl(PR_GET_NO_NEW_PRIVS, 0, 0, 0, 0) == 0;
   told["descriptors"] = static_cast<int>(nas_test::OpenDescriptors().size());
   told["attributes"] = snapshot.attributes_current;
+  told["mappings"] = snapshot.mappings_known;
   told["root_again"] = setuid(0) == 0 || setresuid(-1, 0, -1) == 0 || setgid(0) == 0;
   told["changes"] = Json::arrayValue;
   for (const auto& [id, changed] : snapshot.changes.folders()) {
