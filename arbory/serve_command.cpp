@@ -115,7 +115,7 @@ int RunServeCommand(const ServeOptions& options) {
   } else {
     caller.AskFleet(nas::LoadFleet(options.fleet));
     // Inherited by every child that asks.
-    nas::LoadFleetLibrary();
+    nas::LoadFleetLibrary().prepare_client();
   }
   WarnOfMissingShares();
   WarnOfMissingHelpers();

@@ -19,7 +19,7 @@ nas/match                : nas/base <pcre2.h> <utf8proc.h>
 nas/results              : nas/base nas/files nas/match
 nas/index                : nas/base nas/system nas/files nas/match platform <xxhash.h>
 nas/fleet                : nas/base nas/files nas/match nas/results nas/system
-nas/fleet/plugin         : nas/fleet <sodium.h> <curl>
+nas/fleet/plugin         : nas/base nas/fleet <sodium.h> <curl>
 nas/search               : nas/base nas/files nas/match nas/results nas/index nas/fleet nas/system platform
 nas/tasks                : nas/base nas/system platform
 nas/records              : nas/base nas/system platform

@@ -53,8 +53,11 @@ class FleetClient {
   using Done = std::function<void(FleetReply reply)>;
   // Begins one; `done` is called from Run, once, and may begin others.
   virtual void Ask(const FleetRequest& request, Done done) = 0;
-  // Until all requests have ended or `stop` says so, which is asked a few dozen times a second.
-  // What has not ended then is broken off without a word.
+  // Goes on with what can go on without waiting; may call what Run calls.
+  virtual void Step() = 0;
+  // Until `stop` says so, which is asked first and then at least a few dozen times a second and may
+  // begin requests, or all requests have ended. What has not ended then is broken off without a
+  // word.
   virtual void Run(const std::function<bool()>& stop) = 0;
 };
 
@@ -67,6 +70,8 @@ struct FleetLibrary {
                     const std::string& public_key);
   // Both keys of a new pair.
   void (*make_key)(std::string* secret_key, std::string* public_key);
+  // For a process that forks others which ask: what the client sets up once, they inherit.
+  void (*prepare_client)();
   // Replies longer than `most_bytes` are not read to their end. `socket`: of a proxy that all
   // connections go to; empty for none. The caller deletes it.
   FleetClient* (*new_client)(const std::string& socket, size_t most_bytes);

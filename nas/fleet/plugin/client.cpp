@@ -1,20 +1,30 @@
-// Asking over HTTP/1.1 by libcurl's multi interface.
+// Asking over HTTP/1.1 by libcurl's multi interface, which is told of the sockets that epoll names:
+// a look at each of a thousand connections whenever one has something to say would be most of the
+// work.
 
 #include "nas/fleet/plugin/client.h"
 
 #include <curl/curl.h>
+#include <sys/epoll.h>
 
+#include <algorithm>
+#include <array>
 #include <chrono>
 #include <iterator>
 #include <map>
 #include <memory>
+#include <optional>
 #include <utility>
+
+#include "nas/base/unique_fd.h"
 
 namespace nas {
 namespace {
 
 // Bounds how long Run takes to see its stop flag.
-constexpr int kTickMilliseconds = 25;
+constexpr std::chrono::milliseconds kTick(25);
+// Sockets that are looked at in one turn.
+constexpr int kEvents = 64;
 // What a machine may keep silent in the midst of a body that is passed on: a disk may spin up.
 constexpr std::chrono::seconds kMostSilence(30);
 // Of all replies that are being read. What is over goes at the expense of those that have more of
@@ -121,8 +131,7 @@ size_t TakeBody(char* bytes, size_t size, size_t count, void* context) {
 
 class CurlClient : public FleetClient {
  public:
-  CurlClient(std::string socket, size_t most_bytes)
-      : socket_(std::move(socket)), most_bytes_(most_bytes), multi_(curl_multi_init()) {}
+  CurlClient(std::string socket, size_t most_bytes);
   ~CurlClient() override {
     BreakOff();
     curl_multi_cleanup(multi_);
@@ -131,19 +140,60 @@ class CurlClient : public FleetClient {
   CurlClient& operator=(const CurlClient&) = delete;
 
   void Ask(const FleetRequest& request, Done done) override;
+  void Step() override { Turn(std::chrono::milliseconds(0)); }
   void Run(const std::function<bool()>& stop) override;
 
  private:
+  static int OnSocket(CURL* easy, curl_socket_t socket, int wanted, void* context, void* known);
+  static int OnTimer(CURLM* multi, long milliseconds, void* context);
+  void Turn(std::chrono::milliseconds most_wait);
   void TakeEnded();
   void EndSilent();
   void BreakOff();
 
   const std::string socket_;
   const size_t most_bytes_;
+  const UniqueFd epoll_;
   CURLM* const multi_;
-  Held held_;  // before what counts in it
+  std::optional<Clock::time_point> due_;  // for the library to look at its own times
+  Held held_;                             // before what counts in it
   std::map<CURL*, std::unique_ptr<Exchange>> under_way_;
+  size_t passed_on_ = 0;  // of those, whose bodies are passed on
 };
+
+CurlClient::CurlClient(std::string socket, size_t most_bytes)
+    : socket_(std::move(socket)),
+      most_bytes_(most_bytes),
+      epoll_(epoll_create1(EPOLL_CLOEXEC)),
+      multi_(curl_multi_init()) {
+  curl_multi_setopt(multi_, CURLMOPT_SOCKETFUNCTION, OnSocket);
+  curl_multi_setopt(multi_, CURLMOPT_SOCKETDATA, this);
+  curl_multi_setopt(multi_, CURLMOPT_TIMERFUNCTION, OnTimer);
+  curl_multi_setopt(multi_, CURLMOPT_TIMERDATA, this);
+}
+
+int CurlClient::OnSocket(CURL* /*easy*/, curl_socket_t socket, int wanted, void* context,
+                         void* known) {
+  const auto& self = *static_cast<CurlClient*>(context);
+  if (wanted == CURL_POLL_REMOVE) {
+    epoll_ctl(self.epoll_.get(), EPOLL_CTL_DEL, socket, nullptr);
+    return 0;
+  }
+  epoll_event event = {};
+  event.data.fd = socket;
+  if ((wanted & CURL_POLL_IN) != 0) event.events |= EPOLLIN;
+  if ((wanted & CURL_POLL_OUT) != 0) event.events |= EPOLLOUT;
+  epoll_ctl(self.epoll_.get(), known == nullptr ? EPOLL_CTL_ADD : EPOLL_CTL_MOD, socket, &event);
+  if (known == nullptr) curl_multi_assign(self.multi_, socket, context);
+  return 0;
+}
+
+int CurlClient::OnTimer(CURLM* /*multi*/, long milliseconds, void* context) {
+  auto& self = *static_cast<CurlClient*>(context);
+  self.due_.reset();
+  if (milliseconds >= 0) self.due_ = Clock::now() + std::chrono::milliseconds(milliseconds);
+  return 0;
+}
 
 void CurlClient::Ask(const FleetRequest& request, Done done) {
   auto exchange = std::make_unique<Exchange>();
@@ -179,6 +229,7 @@ void CurlClient::Ask(const FleetRequest& request, Done done) {
     exchange->take_piece = request.take_piece;
     exchange->patience_ends = Clock::now() + std::chrono::milliseconds(request.deadline_ms);
     curl_easy_setopt(easy, CURLOPT_FILETIME, 1L);
+    ++passed_on_;
   } else {
     curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, static_cast<long>(request.deadline_ms));
     curl_easy_setopt(easy, CURLOPT_BUFFERSIZE, kBufferBytes);
@@ -192,14 +243,34 @@ void CurlClient::Ask(const FleetRequest& request, Done done) {
 }
 
 void CurlClient::Run(const std::function<bool()>& stop) {
-  while (!under_way_.empty() && !stop()) {
-    int running = 0;
-    curl_multi_perform(multi_, &running);
-    TakeEnded();
-    EndSilent();
-    if (!under_way_.empty()) curl_multi_poll(multi_, nullptr, 0, kTickMilliseconds, nullptr);
-  }
+  while (!stop() && !under_way_.empty()) Turn(kTick);
   BreakOff();
+}
+
+void CurlClient::Turn(std::chrono::milliseconds most_wait) {
+  auto wait = most_wait;
+  if (due_) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due_ - Clock::now());
+    wait = std::clamp(left, std::chrono::milliseconds(0), most_wait);
+  }
+  std::array<epoll_event, kEvents> events;
+  const int count =
+      epoll_wait(epoll_.get(), events.data(), kEvents, static_cast<int>(wait.count()));
+  int running = 0;
+  for (int i = 0; i < count; ++i) {
+    const std::uint32_t is = events[static_cast<size_t>(i)].events;
+    int ready = 0;
+    if ((is & EPOLLIN) != 0) ready |= CURL_CSELECT_IN;
+    if ((is & EPOLLOUT) != 0) ready |= CURL_CSELECT_OUT;
+    if ((is & (EPOLLERR | EPOLLHUP)) != 0) ready |= CURL_CSELECT_ERR;
+    curl_multi_socket_action(multi_, events[static_cast<size_t>(i)].data.fd, ready, &running);
+  }
+  if (due_ && *due_ <= Clock::now()) {
+    due_.reset();
+    curl_multi_socket_action(multi_, CURL_SOCKET_TIMEOUT, 0, &running);
+  }
+  TakeEnded();
+  if (passed_on_ > 0) EndSilent();
 }
 
 void CurlClient::TakeEnded() {
@@ -210,6 +281,7 @@ void CurlClient::TakeEnded() {
     const auto ended = under_way_.extract(message->easy_handle);
     curl_multi_remove_handle(multi_, ended.key());
     Exchange& exchange = *ended.mapped();
+    if (exchange.take_head) --passed_on_;
     FleetReply& reply = exchange.reply;
     if (result == CURLE_OK && (!exchange.passed_on() || exchange.TakeHead())) {
       reply.outcome = FleetReply::Outcome::kReply;
@@ -229,6 +301,7 @@ void CurlClient::EndSilent() {
     if (at->second->take_head && now > at->second->patience_ends) {
       const auto ended = under_way_.extract(at);
       curl_multi_remove_handle(multi_, ended.key());
+      --passed_on_;
       ended.mapped()->reply.outcome = FleetReply::Outcome::kLate;
       ended.mapped()->done(std::move(ended.mapped()->reply));
     }
@@ -239,12 +312,16 @@ void CurlClient::EndSilent() {
 void CurlClient::BreakOff() {
   for (const auto& [easy, exchange] : under_way_) curl_multi_remove_handle(multi_, easy);
   under_way_.clear();
+  passed_on_ = 0;
 }
 
 }  // namespace
 
+// Again and again does no more than count.
+void PrepareFleetClient() { curl_global_init(CURL_GLOBAL_DEFAULT); }
+
 FleetClient* NewFleetClient(const std::string& socket, size_t most_bytes) {
-  curl_global_init(CURL_GLOBAL_DEFAULT);
+  PrepareFleetClient();
   return new CurlClient(socket, most_bytes);
 }
 

@@ -7,6 +7,7 @@
 
 namespace nas {
 
+void PrepareFleetClient();
 FleetClient* NewFleetClient(const std::string& socket, size_t most_bytes);
 
 }  // namespace nas

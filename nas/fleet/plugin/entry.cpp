@@ -5,7 +5,8 @@
 #include "nas/fleet/plugin/signatures.h"
 
 extern "C" __attribute__((visibility("default"))) const nas::FleetLibrary* ArboryFleetLibrary() {
-  static const nas::FleetLibrary library = {nas::Sha256, nas::Sign, nas::IsSigned, nas::MakeKey,
-                                            nas::NewFleetClient};
+  static const nas::FleetLibrary library = {
+      nas::Sha256,        nas::Sign, nas::IsSigned, nas::MakeKey, nas::PrepareFleetClient,
+      nas::NewFleetClient};
   return nas::PrepareSignatures() ? &library : nullptr;
 }
