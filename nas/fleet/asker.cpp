@@ -7,7 +7,6 @@
 #include <utility>
 
 #include "nas/base/json_text.h"
-#include "nas/fleet/signer.h"
 #include "nas/fleet/token.h"
 
 namespace nas {
@@ -22,6 +21,9 @@ constexpr int kNotFound = 404;
 constexpr int kNotAllowed = 405;
 constexpr int kNotSatisfiable = 416;
 constexpr int kUnavailable = 503;
+
+// Requests that are begun between two looks at those under way.
+constexpr unsigned kSentAtOnce = 16;
 
 // Of a list of shares.
 constexpr size_t kMostShareBytes = size_t{1} << 20;
@@ -76,47 +78,71 @@ FleetAsker::FleetAsker(const FleetSettings& fleet, size_t most_bytes)
 
 void FleetAsker::Ask(const FleetBox& box, Request request, Done done) {
   const auto known = offsets_.find(box.name);
-  Send(box, request, known == offsets_.end() ? 0 : known->second, done);
+  Prepare(box, std::move(request), known == offsets_.end() ? 0 : known->second, std::move(done));
 }
 
-void FleetAsker::Send(const FleetBox& box, const Request& request, int clock_offset,
-                      const Done& done) {
-  const std::string hash = RequestHash(request.method, request.target, request.body);
+void FleetAsker::Run(const std::function<bool()>& stop) {
+  client_->Run([this, &stop] {
+    SendSigned();
+    return stop();
+  });
+  waiting_.clear();
+  tokens_.Drop();
+}
+
+void FleetAsker::Prepare(const FleetBox& box, Request request, int clock_offset, Done done) {
+  tokens_.Ask(box, RequestHash(request.method, request.target, request.body), clock_offset);
+  waiting_.push_back({&box, std::move(request), clock_offset, std::move(done)});
+}
+
+// Boxes are asked while further tokens are signed.
+void FleetAsker::SendSigned() {
+  for (unsigned sent = 1; !waiting_.empty(); ++sent) {
+    const std::string token = tokens_.Take();
+    Waiting first = std::move(waiting_.front());
+    waiting_.pop_front();
+    Send(std::move(first), token);
+    if (sent % kSentAtOnce == 0) client_->Step();
+  }
+}
+
+void FleetAsker::Send(Waiting waiting, const std::string& token) {
+  const Request& request = waiting.request;
   FleetRequest sent;
   // A proxy finds the box by the name that it is asked for.
-  sent.address = fleet_.proxy.empty() ? box.address : "http://" + box.name;
+  sent.address = fleet_.proxy.empty() ? waiting.box->address : "http://" + waiting.box->name;
   sent.method = request.method;
   sent.target = request.target;
   sent.body = request.body;
-  sent.token = FleetTokenFor(box, hash, clock_offset);
+  sent.token = token;
   sent.deadline_ms = fleet_.deadline_ms + request.wait_ms;
   sent.take_head = request.take_head;
   sent.take_piece = request.take_piece;
-  client_->Ask(sent, [this, &box, request, done](FleetReply reply) {
+  client_->Ask(sent, [this, asked = std::move(waiting)](FleetReply reply) {
     if (reply.outcome == FleetReply::Outcome::kReply && reply.status == kUnauthorized &&
-        SendAgain(box, request, reply, done)) {
+        SendAgain(asked, reply)) {
       return;
     }
-    done(AnswerOf(std::move(reply)));
+    asked.done(AnswerOf(std::move(reply)));
   });
 }
 
 // Once for each box: one whose clock jumps is not followed.
-bool FleetAsker::SendAgain(const FleetBox& box, const Request& request, const FleetReply& reply,
-                           const Done& done) {
+bool FleetAsker::SendAgain(const Waiting& asked, const FleetReply& reply) {
+  const FleetBox& box = *asked.box;
   const Json::Value said = Said(reply);
   if (said["why"] != "clock" || !said["now"].isInt64() || offsets_.contains(box.name)) return false;
   const std::int64_t offset = said["now"].asInt64() - std::time(nullptr);
   if (offset < -kMostClockOff || offset > kMostClockOff) return false;
   offsets_[box.name] = static_cast<int>(offset);
-  Send(box, request, offsets_[box.name], done);
+  Prepare(box, asked.request, offsets_[box.name], asked.done);
   return true;
 }
 
 const FleetBox* FindFleetBox(const std::string& name) {
   const auto& boxes = CurrentConfig().fleet.boxes;
-  const auto box = std::ranges::find(boxes, name, &FleetBox::name);
-  return box == boxes.end() ? nullptr : &*box;
+  const auto box = std::ranges::lower_bound(boxes, name, {}, &FleetBox::name);
+  return box == boxes.end() || box->name != name ? nullptr : &*box;
 }
 
 void AppendFleetShares(Json::Value* shares, Json::Value* troubles) {

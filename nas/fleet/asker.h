@@ -3,12 +3,14 @@
 
 #include <json/value.h>
 
+#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
 #include <string>
 
 #include "nas/fleet/library.h"
+#include "nas/fleet/signer.h"
 #include "nas/system/config.h"
 
 namespace nas {
@@ -49,18 +51,29 @@ class FleetAsker {
     std::function<bool(std::string_view piece)> take_piece = {};
   };
   using Done = std::function<void(BoxAnswer answer)>;
-  // `done` is called from Run, once, and may ask again. A box whose clock is off by no more than
-  // kMostClockOff is asked once more, by its own time.
+  // `done` is called from Run, once, and may ask again. The box must live as long. A box whose
+  // clock is off by no more than kMostClockOff is asked once more, by its own time.
   void Ask(const FleetBox& box, Request request, Done done);
-  void Run(const std::function<bool()>& stop) { client_->Run(stop); }
+  // Until all boxes have answered or `stop` says so, which is asked a few dozen times a second.
+  void Run(const std::function<bool()>& stop);
 
  private:
-  void Send(const FleetBox& box, const Request& request, int clock_offset, const Done& done);
-  bool SendAgain(const FleetBox& box, const Request& request, const FleetReply& reply,
-                 const Done& done);
+  // What waits for its token.
+  struct Waiting {
+    const FleetBox* box;
+    Request request;
+    int clock_offset;
+    Done done;
+  };
+  void Prepare(const FleetBox& box, Request request, int clock_offset, Done done);
+  void SendSigned();
+  void Send(Waiting waiting, const std::string& token);
+  bool SendAgain(const Waiting& asked, const FleetReply& reply);
 
   const FleetSettings& fleet_;
   std::unique_ptr<FleetClient> client_;
+  std::deque<Waiting> waiting_;
+  FleetTokens tokens_;
   std::map<std::string, int> offsets_;  // of boxes' clocks, in seconds
 };
 

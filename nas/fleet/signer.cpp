@@ -7,7 +7,10 @@
 
 #include <algorithm>
 #include <charconv>
+#include <iterator>
 #include <sstream>
+#include <utility>
+#include <vector>
 
 #include "nas/base/file_io.h"
 #include "nas/base/random_name.h"
@@ -20,8 +23,16 @@
 namespace nas {
 namespace {
 
-constexpr size_t kMostMessageBytes = 1024;
+// Few, so that the first tokens are there soon.
+constexpr size_t kMostQuestions = 8;  // of a message
+// That are under way; together far less than a connection holds, so that neither end waits for the
+// other to read.
+constexpr size_t kMostMessages = 4;
+constexpr size_t kMostMessageBytes = kMostQuestions * 2048;
 constexpr size_t kMostKeyBytes = 256;
+
+// A line, of a token that there is not.
+constexpr char kNone[] = "-";
 
 // Of this process and its forks. Guard: set once, by a process of one thread.
 UniqueFd g_signer;
@@ -48,14 +59,20 @@ std::string Answer(const std::string& question, const std::string& user, const s
   FleetToken token;
   int offset = 0;
   words >> token.box >> token.hash >> offset;
-  const bool known =
-      std::ranges::find(fleet.boxes, token.box, &FleetBox::name) != fleet.boxes.end();
+  const bool known = std::ranges::binary_search(fleet.boxes, token.box, {}, &FleetBox::name);
   if (!words || !known || !FromHex(token.hash) || std::abs(offset) > kMostClockOff) return {};
   token.front = fleet.front;
   token.user = fleet.realm.empty() ? user : user + "@" + fleet.realm;
   token.issued = std::time(nullptr) + offset;
   token.nonce = RandomName();
   return SignedToken(token, key);
+}
+
+std::vector<std::string> LinesOf(const std::string& message) {
+  std::vector<std::string> lines;
+  std::istringstream stream(message);
+  for (std::string line; std::getline(stream, line);) lines.push_back(line);
+  return lines;
 }
 
 std::string Receive(int connection) {
@@ -76,11 +93,14 @@ void AnswerAll(int connection, const std::string& user) {
   const std::string key = ReadKey(CurrentConfig().fleet.key_file);
   if (key.empty()) return;
   for (;;) {
-    const std::string question = Receive(connection);
-    if (question.empty()) return;
-    const std::string token = Answer(question, user, key);
-    // An empty message would be taken for the end.
-    if (!Send(connection, token.empty() ? "-" : token)) return;
+    const std::string questions = Receive(connection);
+    if (questions.empty()) return;
+    std::string tokens;
+    for (const std::string& question : LinesOf(questions)) {
+      const std::string token = Answer(question, user, key);
+      tokens += (token.empty() ? kNone : token) + "\n";
+    }
+    if (!Send(connection, tokens)) return;
   }
 }
 
@@ -91,13 +111,49 @@ void StartFleetSigner(const std::string& user) {
   g_signer = StartAnsweringChild([&](int connection) { AnswerAll(connection, user); }).fd;
 }
 
-std::string FleetTokenFor(const FleetBox& box, const std::string& hash, int clock_offset) {
-  if (!g_signer ||
-      !Send(g_signer.get(), box.name + " " + hash + " " + std::to_string(clock_offset))) {
+void FleetTokens::Ask(const FleetBox& box, const std::string& hash, int clock_offset) {
+  questions_.push_back(box.name + " " + hash + " " + std::to_string(clock_offset) + "\n");
+}
+
+std::string FleetTokens::Take() {
+  Send();
+  if (tokens_.empty() && !Receive()) {
+    // Nobody signs any more.
+    if (!questions_.empty()) questions_.pop_front();
     return {};
   }
-  const std::string token = Receive(g_signer.get());
-  return token == "-" ? std::string() : token;
+  std::string token = std::move(tokens_.front());
+  tokens_.pop_front();
+  return token == kNone ? std::string() : token;
+}
+
+void FleetTokens::Drop() {
+  questions_.clear();
+  while (!under_way_.empty()) Receive();
+  tokens_.clear();
+}
+
+void FleetTokens::Send() {
+  while (g_signer && !questions_.empty() && under_way_.size() < kMostMessages) {
+    std::string message;
+    size_t lines = 0;
+    for (; lines < std::min(kMostQuestions, questions_.size()); ++lines) {
+      message += questions_[lines];
+    }
+    if (!nas::Send(g_signer.get(), message)) return;
+    questions_.erase(questions_.begin(), questions_.begin() + static_cast<std::ptrdiff_t>(lines));
+    under_way_.push_back(lines);
+  }
+}
+
+// False where nothing is under way. What the signer has not answered counts as a refusal.
+bool FleetTokens::Receive() {
+  if (under_way_.empty()) return false;
+  std::vector<std::string> answers = LinesOf(nas::Receive(g_signer.get()));
+  answers.resize(under_way_.front(), kNone);
+  under_way_.pop_front();
+  std::ranges::move(answers, std::back_inserter(tokens_));
+  return true;
 }
 
 }  // namespace nas

@@ -104,16 +104,18 @@ void FleetSearch::Run() {
   if (search_.stopping()) EndSearches();
 }
 
-std::string FleetSearch::QuestionFor(const Box& box) const {
+// Most boxes are asked the same.
+const std::string& FleetSearch::QuestionFor(const Box& box) {
+  std::vector<std::string> locations;
+  for (const FleetLocation* location : box.locations) locations.push_back(LocationText(*location));
+  if (!question_.empty() && locations == question_locations_) return question_;
   FleetQuestion question;
   question.query = search_.criteria.root;
   question.contents = settings_.contents;
   question.recursive = settings_.recursive;
   question.page = first_ ? first_->FirstRequest(kWaitMs) : page_;
-  for (const FleetLocation* location : box.locations) {
-    question.locations.push_back(LocationText(*location));
-  }
-  return FleetQuestionText(question);
+  question.locations = question_locations_ = std::move(locations);
+  return question_ = FleetQuestionText(question);
 }
 
 void FleetSearch::AskFirst(Box& box) {

@@ -87,7 +87,7 @@ class FleetSearch {
     FleetRow row;
   };
 
-  std::string QuestionFor(const Box& box) const;
+  const std::string& QuestionFor(const Box& box);
   void AskFirst(Box& box);
   void Took(Box& box, BoxAnswer answer);
   void TookPage(Box& box, const FleetPage& page);
@@ -109,6 +109,8 @@ class FleetSearch {
   SharedSearch& search_;
   const FleetSettings& fleet_;
   FleetPageRequest page_;
+  std::string question_;  // the last one, and of which folders
+  std::vector<std::string> question_locations_;
   std::optional<FirstRowsMerge> first_;  // until the first page is whole
   std::vector<HeldRow> held_;            // its rows, in the order they came
   std::optional<Deadline> first_page_due_;

@@ -108,7 +108,7 @@ struct FleetSettings {
   std::string tls_folder = "/etc/arbory/fleet";
   int deadline_ms = 2000;        // for a box to say something
   int rows_per_box = 1'000'000;  // of one search; what is over stays where it is
-  std::vector<FleetBox> boxes;
+  std::vector<FleetBox> boxes;   // in the order of their names
 
   bool operator==(const FleetSettings&) const = default;
 };

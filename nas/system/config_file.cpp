@@ -28,6 +28,7 @@
 #include <unistd.h>
 
 #include <toml++/toml.h>
+#include <algorithm>
 #include <cstdlib>
 #include <functional>
 #include <map>
@@ -254,6 +255,7 @@ class Reader {
       }
       boxes.push_back({FleetName(name.source(), std::string(name.str())), text});
     }
+    std::ranges::sort(boxes, {}, &FleetBox::name);
     return boxes;
   }
 
