@@ -34,17 +34,24 @@ Database MakeResultFile(const std::string& path) {
 
 ResultWriter::ResultWriter(const std::string& path)
     : db_(MakeResultFile(path)),
+      insert_location_(db_, "INSERT INTO location VALUES(?,?,?)"),
       insert_names_(db_, "INSERT INTO names VALUES(?,?,?,?)"),
       insert_attributes_(db_, "INSERT INTO attributes VALUES(?,?)") {}
 
 void ResultWriter::AddLocation(std::uint16_t id, const std::string& share_name,
                                const std::string& share_root) {
   const std::lock_guard lock(mutex_);
-  Statement(db_, "INSERT INTO location VALUES(?,?,?)")
-      .Bind(1, id)
-      .BindBlob(2, share_name)
-      .BindBlob(3, share_root)
-      .Run();
+  locations_.push_back({id, share_name, share_root});
+}
+
+// In a transaction. A thousand of them one by one would take as many.
+void ResultWriter::WriteLocations() {
+  for (const Location& location : locations_) {
+    insert_location_.Bind(1, location.id)
+        .BindBlob(2, location.share_name)
+        .BindBlob(3, location.share_root)
+        .Run();
+  }
 }
 
 void ResultWriter::AddAccount(std::uint32_t id, const std::string& name) {
@@ -57,6 +64,7 @@ void ResultWriter::Append(RowBlock& block) {
   const std::lock_guard lock(mutex_);
   const auto first = static_cast<std::int64_t>(rows_);
   Transaction transaction(db_, Transaction::Kind::kWrite);
+  WriteLocations();
   insert_names_.Bind(1, first)
       .Bind(2, static_cast<std::int64_t>(block.size()))
       .BindBlob(3, block.folders())
@@ -64,6 +72,7 @@ void ResultWriter::Append(RowBlock& block) {
       .Run();
   insert_attributes_.Bind(1, first).BindBlob(2, block.attributes()).Run();
   transaction.Commit();
+  locations_.clear();
   rows_ += block.size();
   block.Clear();
 }

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "nas/base/sqlite.h"
 #include "nas/results/row_sink.h"
@@ -15,7 +16,8 @@ class ResultWriter : public RowSink {
   // Makes the file, which must not exist or be empty. Throws SqliteError.
   explicit ResultWriter(const std::string& path);
 
-  // Registers where rows lie; to be called before any block that names it. Throws SqliteError.
+  // Registers where rows lie; to be called before any block that names it, with the next of which
+  // it is written.
   void AddLocation(std::uint16_t id, const std::string& share_name, const std::string& share_root);
   // Names an account of another machine (foreign_accounts.h). Throws SqliteError.
   void AddAccount(std::uint32_t id, const std::string& name);
@@ -31,6 +33,15 @@ class ResultWriter : public RowSink {
  private:
   std::mutex mutex_;  // guards everything below
   Database db_;
+  void WriteLocations();
+
+  struct Location {
+    std::uint16_t id;
+    std::string share_name;
+    std::string share_root;
+  };
+  std::vector<Location> locations_;  // not yet written
+  Statement insert_location_;
   Statement insert_names_;
   Statement insert_attributes_;
   std::uint64_t rows_ = 0;
