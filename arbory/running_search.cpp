@@ -2,8 +2,11 @@
 
 #include <exception>
 #include <memory>
+#include <optional>
 
+#include "nas/base/pause.h"
 #include "nas/results/result_file.h"
+#include "nas/results/result_reader.h"
 #include "nas/system/volumes.h"
 #include "nas/tasks/task_files.h"
 #include "platform/task.h"
@@ -77,6 +80,31 @@ RunningSearch ReadSearch(const std::string& user, const std::string& task_id) {
     // Somebody cleaned it.
   }
   return search;
+}
+
+void WaitForFirstRows(const std::string& user, const std::string& task_id, int tenths) try {
+  const auto tasks = nas::TaskFiles::Open(user.c_str());
+  if (!tasks) return;
+  nas::GrowingPause pause(tenths);
+  std::optional<nas::ResultReader> results;
+  do {
+    // In this order, so that the last rows are seen.
+    const bool ended = !tasks->IsAlive(task_id);
+    if (!results) {
+      // The file's name is known when it is whole.
+      const std::string path = ReadSearch(user, task_id).results;
+      if (!path.empty()) results.emplace(path);
+    }
+    if (results) {
+      results->Begin();
+      const bool any = results->rows() > 0;
+      results->End();
+      if (any) return;
+    }
+    if (ended) return;
+  } while (pause.Wait());
+} catch (const std::exception&) {
+  // Whoever lists them says what is wrong.
 }
 
 nas::UniqueFd AskAfter(const std::string& user, const std::string& task_id) {

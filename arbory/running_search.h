@@ -52,6 +52,10 @@ struct RunningSearch {
 // Throws nothing: a record that cannot be read is that of a search that does not exist.
 RunningSearch ReadSearch(const std::string& user, const std::string& task_id);
 
+// Waits until the search has rows to show or nobody works on it any more, for so many tenths of a
+// second at most. Reads the results: the process must be the user for good.
+void WaitForFirstRows(const std::string& user, const std::string& task_id, int tenths);
+
 // Tells the search that its results are wanted, for as long as the descriptor is open. Invalid
 // where that cannot be had: then only looking at it does.
 nas::UniqueFd AskAfter(const std::string& user, const std::string& task_id);

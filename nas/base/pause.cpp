@@ -11,6 +11,9 @@ constexpr long long kNanosecondsPerTenth = kNanosecondsPerSecond / 10;
 // The first is about what a write takes; the last is below what a person notices.
 constexpr long long kFirstPause = 500'000;
 constexpr long long kLongestPause = 20'000'000;
+// Each pause is longer than the one before by a fourth of that: what has taken a while is seen
+// after a fifth more at most.
+constexpr long long kGrowth = 4;
 
 long long Now() {
   timespec now;
@@ -31,7 +34,7 @@ bool GrowingPause::Wait() {
                            static_cast<long>(pause % kNanosecondsPerSecond)};
   // A signal may end it early: the caller then looks once more than needed.
   nanosleep(&length, nullptr);
-  pause_ = std::min(pause_ * 2, kLongestPause);
+  pause_ = std::min(pause_ + pause_ / kGrowth, kLongestPause);
   return true;
 }
 

@@ -1,8 +1,9 @@
 #include "arbory/server/service/begin_search.h"
 
-#include <chrono>
-#include <thread>
+#include <optional>
+#include <utility>
 
+#include "arbory/running_search.h"
 #include "arbory/server/service/row_addresses.h"
 #include "arbory/server/service/user_calls.h"
 #include "arbory/server/transport/http.h"
@@ -10,16 +11,14 @@
 #include "nas/base/json_text.h"
 #include "nas/system/config.h"
 #include "nas/system/first_page.h"
+#include "nas/system/identity.h"
+#include "platform/webfm.h"
 
 namespace arbory {
 namespace {
 
-using std::chrono::milliseconds;
-using std::chrono::steady_clock;
-
 // Most searches have found something by then, and a person feels no more.
-constexpr milliseconds kMostWait{250};
-constexpr milliseconds kLookAgain{10};
+constexpr int kMostWaitTenths = 3;
 // Of a first page: more than a screen shows, and a reply that need not be spooled.
 constexpr int kMostRows = 1000;
 constexpr char kLimit[] = "limit";
@@ -41,19 +40,22 @@ Json::Value DataOf(const nas::Reply& reply, int* code) {
   return body["data"];
 }
 
-// What the search has found once that is something, or it has ended.
+// What the search has found once that is something, or it has ended. The child that lists waits for
+// it, as one that lists again and again would take from the search what it needs to find anything.
 Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Json::Value params) {
   const Json::Value& limit = params[kLimit];
   if (!limit.isInt() || limit.asInt() <= 0 || limit.asInt() > kMostRows) params[kLimit] = kMostRows;
-  const auto end = steady_clock::now() + kMostWait;
-  for (;;) {
-    int code = 0;
-    Json::Value page =
-        DataOf(nas::RunCall(list, CallOf(outer, list, params), EncodeWithAddresses), &code);
-    const bool waits = page.isObject() && page["files"].empty() && !page["finished"].asBool();
-    if (!waits || steady_clock::now() > end) return page;
-    std::this_thread::sleep_for(kLookAgain);
-  }
+  nas::ApiCall listing = CallOf(outer, list, {});
+  listing.read_params = [&](Json::Value* asked) -> std::optional<nas::Reply> {
+    if (WfmLibUGIDSet(nullptr, outer.user.c_str()) >= 0) {
+      nas::GiveUpRoot();
+      WaitForFirstRows(outer.user, params["taskid"].asString(), kMostWaitTenths);
+    }
+    asked->swap(params);
+    return std::nullopt;
+  };
+  int code = 0;
+  return DataOf(nas::RunCall(list, listing, EncodeWithAddresses), &code);
 }
 
 // What the listing will ask for, which the search may find first.
