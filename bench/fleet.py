@@ -1,11 +1,14 @@
 #!/usr/bin/env python3
-"""What a search over many machines costs: fleet.py BIN_DIR [--boxes N] [--files N] [--stand-ins N ...]
+"""What a search over many machines costs: fleet.py BIN_DIR TOP [--boxes N] [--files N]
+[--stand-ins N ...] [--quick] [--write]
 
-Real boxes, each an `arbory serve` with a tree of its own; and stand-ins, which give the same short page
-at once, so that what is left is the front. HAProxy stands between them and the front, as it does
-outside, and plays the stand-ins. Prints rows of a table, milliseconds in medians."""
+Real boxes, each an `arbory serve`, walking and with an index; and stand-ins, which give the same short
+page at once, so that what is left is the front. HAProxy stands between them and the front, as it does
+outside, and plays the stand-ins. Prints rows of a table, in medians of all rounds."""
 
 import argparse
+import asyncio
+import concurrent.futures
 import contextlib
 import getpass
 import http.client
@@ -22,6 +25,8 @@ import tempfile
 import threading
 import time
 
+import run
+
 ROUNDS = 15
 FIRST_PORT = 21000
 DEADLINE_MS = 500
@@ -32,12 +37,17 @@ USER = "nobody" if os.geteuid() == 0 else getpass.getuser()
 AS_USER = ["--user", USER] if os.geteuid() == 0 else []
 
 
-def page_of_four():
-    rows = [[0, f"invoice {number}.txt", 33188, 0, 0, 5, 1, 1, 1, None, number]
-            for number in range(4)]
+HEAD = ["a fleet", "measured", "must"]
+MOST_MEMORY = 64  # MiB
+MOST_OVER_SLOWEST = 1.3
+
+
+def page_of(count, name="invoice"):
+    rows = [[0, f"{name} {number}.txt", 33188, 0, 0, 5, 1, 1, 1, None, number]
+            for number in range(count)]
     return json.dumps({"protocol": 1, "version": "0", "task": "0" * 32, "error": 0, "source": "walk",
                        "index": "none", "users": ["u"], "groups": ["g"], "folders": [["data", "f"]],
-                       "finished": True, "total": 4, "next": 4, "rows": rows})
+                       "finished": True, "total": count, "next": count, "rows": rows})
 
 
 class Fleet:
@@ -165,83 +175,224 @@ def measure(front, folders):
             statistics.median(ended for _, ended, _ in took), took[-1][2])
 
 
-def stand_ins(bin_dir, count, frozen=0):
-    folder = pathlib.Path(tempfile.mkdtemp(prefix="arbory-bench-fleet-"))
-    folder.chmod(0o755)
+def row(name, measured, must="", reached=True):
+    line = [name, measured, must + ("" if reached else ": not reached")]
+    print("| " + " | ".join(line) + " |", flush=True)
+    return line
+
+
+@contextlib.contextmanager
+def folder():
+    path = pathlib.Path(tempfile.mkdtemp(prefix="arbory-bench-fleet-"))
+    path.chmod(0o755)
     try:
-        config = folder / "stand-ins.cfg"
-        config.write_text(
-            "defaults\n mode http\n timeout connect 5s\n timeout client 1m\n timeout server 1m\n"
-            f"frontend all\n bind 127.0.0.1:{FIRST_PORT}-{FIRST_PORT + count - frozen - 1}\n"
-            " http-request return status 200 content-type application/json file "
-            f"{folder}/page.json\n")
-        (folder / "page.json").write_text(page_of_four())
-        boxes = {f"box{number}": f"http://127.0.0.1:{FIRST_PORT + number}"
-                 for number in range(count - frozen)}
-        silent = [socket.create_server(("127.0.0.1", 0), backlog=4096) for _ in range(frozen)]
-        for number, listener in enumerate(silent):
-            boxes[f"silent{number}"] = f"http://127.0.0.1:{listener.getsockname()[1]}"
-        fleet = Fleet(bin_dir, folder, boxes)
-        if frozen:  # as it is before a check has noticed
-            text = (folder / "proxy.cfg").read_text()
-            (folder / "proxy.cfg").write_text(text.replace("default-server check", "default-server"))
+        yield path
+    finally:
+        shutil.rmtree(path, ignore_errors=True)
+
+
+class Liars:
+    """Stand-ins that answer with as many bytes as are read of a box, none of them to be believed."""
+
+    def __init__(self, count):
+        # More rows than it counts itself.
+        page = page_of(1700, "n" * 240).replace('"total": 1700', '"total": 1').encode()
+        self.reply = (b"HTTP/1.1 200 OK\r\nContent-Type: application/json\r\nContent-Length: "
+                      + str(len(page)).encode() + b"\r\n\r\n" + page)
+        self.loop = asyncio.new_event_loop()
+        servers = [self.loop.run_until_complete(
+            asyncio.start_server(self.answer, "127.0.0.1", 0)) for _ in range(count)]
+        self.addresses = [f"http://127.0.0.1:{one.sockets[0].getsockname()[1]}" for one in servers]
+        self.thread = threading.Thread(target=self.loop.run_forever, daemon=True)
+        self.thread.start()
+
+    async def answer(self, reader, writer):
+        with contextlib.suppress(OSError, asyncio.IncompleteReadError):
+            while True:
+                head = await reader.readuntil(b"\r\n\r\n")
+                length = re.search(rb"(?i)content-length: (\d+)", head)
+                await reader.readexactly(int(length[1]) if length else 0)
+                writer.write(self.reply if head.startswith(b"POST") else
+                             b"HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n")
+                await writer.drain()
+        writer.close()
+
+    def close(self):
+        self.loop.call_soon_threadsafe(self.loop.stop)
+        self.thread.join()
+
+
+def honest(place, count):
+    """HAProxy's configuration for so many stand-ins, and their addresses."""
+    (place / "page.json").write_text(page_of(4))
+    config = place / "stand-ins.cfg"
+    config.write_text(
+        "defaults\n mode http\n timeout connect 5s\n timeout client 1m\n timeout server 1m\n"
+        f"frontend all\n bind 127.0.0.1:{FIRST_PORT}-{FIRST_PORT + count - 1}\n"
+        " http-request return status 200 content-type application/json file "
+        f"{place}/page.json\n")
+    return config, [f"http://127.0.0.1:{FIRST_PORT + number}" for number in range(count)]
+
+
+def stand_ins(bin_dir, count, others=(), checked=True):
+    """Times, what was said and the memory, of a search over so many stand-ins and other boxes.
+    Fails where there is not each row of the stand-ins, or one of the others."""
+    with folder() as place:
+        config, addresses = honest(place, count)
+        boxes = {f"box{number:04}": address
+                 for number, address in enumerate([*addresses, *others])}
+        fleet = Fleet(bin_dir, place, boxes)
+        if not checked:  # as it is before a check has noticed
+            text = (place / "proxy.cfg").read_text()
+            (place / "proxy.cfg").write_text(re.sub("default-server check .*", "", text))
         with process([HAPROXY, "-db", "-f", str(config)]), fleet.running() as front:
             with Memory(front.pid) as memory:
                 shown, ended, state = measure(front, [f"/{name}/data" for name in boxes])
-        told = state["walk"]["fleet"]
-        if told["answered"] != count - frozen or told["late"] != frozen:
-            raise RuntimeError(f"not all stand-ins answered: {json.dumps(told)[:500]}")
-        name = f"{count} stand-ins" + (f", {frozen} of them frozen" if frozen else "")
-        print(f"| {name} | {shown:.0f} | {ended:.0f} | | {memory.most:.0f} |", flush=True)
+    told = state["walk"]["fleet"]
+    rows = state["walk"]["matches"]
+    if told["answered"] != count or rows != 4 * count:
+        raise RuntimeError(f"not all stand-ins answered: {json.dumps(state)[:800]}")
+    return shown, ended, told, memory.most
+
+
+def many(bin_dir, count, must):
+    shown, ended, _, memory = stand_ins(bin_dir, count)
+    name = f"{count:,} stand-ins"
+    yield row(f"{name}: first page", f"{shown:.0f} ms", f"≤ {must} ms" if must else "",
+              not must or shown <= must)
+    yield row(f"{name}: all rows", f"{ended:.0f} ms; {memory:.0f} MiB at most in a process")
+
+
+def troubled(bin_dir):
+    with socket.create_server(("127.0.0.1", 0), backlog=4096) as silent:
+        address = f"http://127.0.0.1:{silent.getsockname()[1]}"
+        shown, ended, told, _ = stand_ins(bin_dir, 9, [address], checked=False)
+    most = DEADLINE_MS + 250
+    yield row("10 stand-ins, one frozen: first page", f"{shown:.0f} ms", f"≤ {DEADLINE_MS} ms",
+              shown <= DEADLINE_MS)
+    yield row(f"10 stand-ins, one frozen: end, at a deadline of {DEADLINE_MS} ms",
+              f"{ended:.0f} ms; {told['answered']} answered, {told['late']} late", f"≤ {most} ms",
+              ended <= most and told["late"] == 1)
+    liars = Liars(100)
+    try:
+        for count in (1, 100):
+            shown, ended, told, memory = stand_ins(bin_dir, 9, liars.addresses[:count])
+            lost = told["down"] + told["late"]
+            yield row(f"9 stand-ins, and {count} that say 500 KB of lies at once",
+                      f"all rows of the 9, none of the others; {memory:.0f} MiB at most in a process",
+                      f"≤ {MOST_MEMORY} MiB", lost == count and memory <= MOST_MEMORY)
     finally:
-        shutil.rmtree(folder, ignore_errors=True)
+        liars.close()
 
 
-def real(bin_dir, count, files):
-    folder = pathlib.Path(tempfile.mkdtemp(prefix="arbory-bench-fleet-"))
-    folder.chmod(0o755)
-    with contextlib.ExitStack() as stack:
-        stack.callback(shutil.rmtree, folder, ignore_errors=True)
-        key = subprocess.run([str(bin_dir / "arbory"), "fleet", "key", str(folder / "front.key")],
+@contextlib.contextmanager
+def index_of(program, config):
+    """Once it is current."""
+    with process([program, "index", "--config", str(config)], stdout=subprocess.DEVNULL):
+        attributes = None
+        while attributes != "current":
+            time.sleep(0.1)
+            done = subprocess.run([program, "index", "--status", "--json", "--config", str(config)],
+                                  capture_output=True, text=True)
+            with contextlib.suppress(ValueError, KeyError, IndexError):
+                attributes = json.loads(done.stdout)["file_systems"][0]["attributes"]
+        yield
+
+
+def real(bin_dir, count, tree, files, indexed):
+    program = str(bin_dir / "arbory")
+    with folder() as place, contextlib.ExitStack() as stack:
+        key = subprocess.run([program, "fleet", "key", str(place / "front.key")],
                              check=True, capture_output=True, text=True).stdout.strip()
         boxes, own = {}, []
         for number in range(count):
             name = f"box{number}"
-            tree = folder / name
-            subprocess.run([str(bin_dir / "make_tree"), "names", str(tree), str(files)], check=True,
-                           stdout=subprocess.DEVNULL)
             box = stack.enter_context(server(
-                str(bin_dir / "arbory"), folder, name,
+                program, place, name,
                 f'[shares]\ndata = "{tree}"\n[server]\nlisten = "127.0.0.1:0"\naccess_log = false\n'
+                f'[index]\nfolders = ["data"]\n'
                 f'[fleet]\nname = "{name}"\nlowest_uid = 1\n[fleet.fronts.bench]\nkey = "{key}"\n'
                 f'users = ["{USER}"]\n'))
+            if indexed:
+                stack.enter_context(index_of(program, place / f"{name}.toml"))
             boxes[name] = box.address
             own.append(box)
-        front = stack.enter_context(Fleet(bin_dir, folder, boxes).running())
-        slowest = max(measure(box, ["/data"])[0] for box in own)
+        front = stack.enter_context(Fleet(bin_dir, place, boxes).running())
+        folders = [f"/{name}/data" for name in boxes]
+        pool = stack.enter_context(concurrent.futures.ThreadPoolExecutor(count))
+        shown, ended, at_once, alone = [], [], [], []
         with Memory(front.pid) as memory:
-            shown, ended, _ = measure(front, [f"/{name}/data" for name in boxes])
-        print(f"| {count} boxes of {files:,} files | {shown:.0f} | {ended:.0f} | "
-              f"{shown / slowest:.2f} of the slowest by itself, {slowest:.0f} ms | "
-              f"{memory.most:.0f} |", flush=True)
+            for turn in range(ROUNDS + 1):
+                fleets = front.first_page(folders)
+                all_boxes = [first for first, _, _ in
+                             pool.map(lambda box: box.first_page(["/data"]), own)]
+                one = own[turn % count].first_page(["/data"])
+                if turn == 0:
+                    continue
+                shown.append(fleets[0])
+                ended.append(fleets[1])
+                at_once.append(max(all_boxes))
+                alone.append(one[0])
+        said = fleets[2]["walk"]["fleet"]
+        if said["answered"] != count:
+            raise RuntimeError(f"not all boxes answered: {json.dumps(said)}")
+    took, slowest = statistics.median(shown), statistics.median(at_once)
+    most = MOST_OVER_SLOWEST * slowest + count
+    name = f"{count} boxes of {files:,} files, {'indexed' if indexed else 'walked'}"
+    yield row(f"{name}: first page", f"{took:.0f} ms", f"≤ {most:.0f} ms, {MOST_OVER_SLOWEST} of the "
+              "slowest and 1 ms a box", took <= most)
+    yield row(f"{name}: the slowest box, where people ask all of them at once",
+              f"{slowest:.0f} ms; one asked alone {statistics.median(alone):.0f} ms")
+    yield row(f"{name}: all rows", f"{statistics.median(ended):.0f} ms; {memory.most:.0f} MiB at "
+              "most in a process", f"≤ {MOST_MEMORY} MiB", memory.most <= MOST_MEMORY)
+
+
+def figures(asked, bin_dir):
+    musts = {100: 25, 1000: 250}
+    for count in asked.stand_ins:
+        yield from many(bin_dir, count, musts.get(count))
+    yield from troubled(bin_dir)
+    if not asked.boxes:
+        return
+    trees = run.Trees(bin_dir, asked.quick)
+    files = asked.files // trees.scale
+    with contextlib.ExitStack() as stack:
+        if asked.files == 1_000_000:
+            tree = trees.generated("names", asked.files)
+        else:  # a size that nothing else is measured with
+            tree = str(stack.enter_context(folder()) / "names")
+            subprocess.run([bin_dir / "make_tree", "names", tree, str(files)], check=True)
+        for indexed in (False, True) if os.geteuid() == 0 else (False,):
+            yield from real(bin_dir, asked.boxes, tree, files, indexed)
+
+
+def write(document, rows):
+    """The document with these rows in its table of a fleet, all else as it is."""
+    measured = {line[0] for line in rows}
+    blocks = document.read_text().rstrip("\n").split("\n\n")
+    mine = next((block for block in blocks if block.startswith(f"| {HEAD[0]} |")), None)
+    old = [line.strip("|").split("|") for line in mine.splitlines()[2:]] if mine else []
+    kept = [[cell.strip() for cell in line] for line in old if line[0].strip() not in measured]
+    text = run.table(HEAD, kept + rows).rstrip("\n")
+    blocks = [text if block == mine else block for block in blocks] + ([] if mine else [text])
+    document.write_text("\n\n".join(blocks) + "\n")
 
 
 def main():
-    parser = argparse.ArgumentParser(description=__doc__.split("\n", 1)[0])
-    parser.add_argument("bin_dir", type=pathlib.Path)
-    parser.add_argument("--boxes", type=int, default=5)
-    parser.add_argument("--files", type=int, default=1_000_000)
+    parser = argparse.ArgumentParser(prog="scripts/bench-fleet")
+    parser.add_argument("bin", type=pathlib.Path, help=argparse.SUPPRESS)
+    parser.add_argument("top", type=pathlib.Path, help=argparse.SUPPRESS)
+    parser.add_argument("--boxes", type=int, default=5, help="real ones; 0 for none")
+    parser.add_argument("--files", type=int, default=1_000_000, help="that each of them has")
     parser.add_argument("--stand-ins", type=int, nargs="*", default=[100, 1000])
+    parser.add_argument("--quick", action="store_true", help="boxes with a tenth of the files")
+    parser.add_argument("--write", action="store_true", help="write docs/benchmarks.md")
     asked = parser.parse_args()
-    bin_dir = asked.bin_dir.resolve()
     signal.signal(signal.SIGTERM, lambda *_: exit(1))
-    print("| over | first page, ms | end, ms | | most memory of a process, MiB |\n"
-          "|---|---|---|---|---|", flush=True)
-    for count in asked.stand_ins:
-        stand_ins(bin_dir, count)
-    stand_ins(bin_dir, 10, frozen=1)
-    if asked.boxes:
-        real(bin_dir, asked.boxes, asked.files)
+    print("| " + " | ".join(HEAD) + " |\n|---|---|---|", flush=True)
+    rows = list(figures(asked, asked.bin.resolve()))
+    if asked.write:
+        write(asked.top / "docs" / "benchmarks.md", rows)
 
 
 if __name__ == "__main__":

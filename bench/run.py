@@ -23,6 +23,7 @@ import rows as many_rows
 ROUNDS = 7
 COLD_ROUNDS = 3
 THREADS = str(os.cpu_count())
+FLEET = "| a fleet |"  # how the table begins that scripts/bench-fleet writes
 KERNEL_SOURCE = "/usr/src/linux-source-6.1.tar.xz"
 
 
@@ -294,21 +295,28 @@ def main():
 def write(args, tables):
     """The document with these rows; a run of some of them leaves the others as they stand."""
     document = args.top / "docs" / "benchmarks.md"
+    text = document.read_text()
     if args.only:
-        tables = merged(document.read_text(), tables)
+        tables = merged(text, tables)
     machine = subprocess.run(["lscpu"], capture_output=True, text=True, check=True).stdout
     model = next((line.split(":", 1)[1].strip() for line in machine.splitlines()
                   if line.startswith("Model name")), "unknown processor")
     intro = (args.top / "bench" / "benchmarks.md.in").read_text()
     intro = intro.replace("@MACHINE@", f"{os.cpu_count()} cores of {model}")
     intro = intro.replace("@SCALE@", "a tenth of the full size" if args.quick else "full size")
-    document.write_text(intro + "\n" + "\n".join(table(*one) for one in tables if one[1]))
+    # What another script has measured.
+    fleets = [block.strip("\n") + "\n" for block in text.split("\n\n")
+              if block.startswith(FLEET)]
+    document.write_text(
+        intro + "\n" + "\n".join([table(*one) for one in tables if one[1]] + fleets))
 
 
 def merged(document, tables):
     """The tables of the document, with the rows of those works that were measured replaced."""
     old = {}
     for block in document.split("\n\n"):
+        if block.startswith(FLEET):
+            continue
         cells = [line.strip("| ").split(" | ") for line in block.splitlines()
                  if line.startswith("| ")]
         if cells:
