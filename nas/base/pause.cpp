@@ -7,7 +7,7 @@ namespace nas {
 namespace {
 
 constexpr long long kNanosecondsPerSecond = 1'000'000'000;
-constexpr long long kNanosecondsPerTenth = kNanosecondsPerSecond / 10;
+constexpr long long kNanosecondsPerMillisecond = kNanosecondsPerSecond / 1000;
 // The first is about what a write takes; the last is below what a person notices.
 constexpr long long kFirstPause = 500'000;
 constexpr long long kLongestPause = 20'000'000;
@@ -23,8 +23,9 @@ long long Now() {
 
 }  // namespace
 
-GrowingPause::GrowingPause(int tenths)
-    : deadline_(Now() + std::max(tenths, 0) * kNanosecondsPerTenth), pause_(kFirstPause) {}
+GrowingPause::GrowingPause(std::chrono::milliseconds most)
+    : deadline_(Now() + std::max<long long>(most.count(), 0) * kNanosecondsPerMillisecond),
+      pause_(kFirstPause) {}
 
 bool GrowingPause::Wait() {
   const long long left = deadline_ - Now();

@@ -2,14 +2,18 @@
 // Polling without haste: pauses that grow from half a millisecond to twenty, up to a bound on the
 // whole. For what nobody announces, such as a change of a file by another process.
 
+#include <chrono>
+
 namespace nas {
 
 // For one wait of one thread.
 class GrowingPause {
  public:
-  // The bound, in tenths of a second, begins now and counts what the caller does between pauses
-  // too. 0 or less: no pause at all.
-  explicit GrowingPause(int tenths);
+  // The bound begins now and counts what the caller does between pauses too. 0 or less: no pause at
+  // all.
+  explicit GrowingPause(std::chrono::milliseconds most);
+  // The same, as the platform's waits are bounded.
+  explicit GrowingPause(int tenths) : GrowingPause(std::chrono::milliseconds(100) * tenths) {}
   // Sleeps, less long where a signal comes. False, at once, when the bound has passed; the caller
   // has then looked for the last time.
   bool Wait();

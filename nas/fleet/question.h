@@ -47,12 +47,14 @@ inline constexpr int kFleetProtocol = 1;
 inline constexpr unsigned kMostFleetRows = 2000;
 // A page ends with the row that makes it longer than that, however few there are.
 inline constexpr size_t kMostFleetPageBytes = size_t{192} << 10;
-// That a box may be asked to wait for rows.
+// That a box may be asked to wait.
 inline constexpr int kMostFleetWaitMs = 1000;
 
 struct FleetPageRequest {
   unsigned limit = kMostFleetRows;
-  int wait_ms = 0;          // for as many rows, or the search's end
+  // For as many rows, or the search's end; in an order, for the end alone. Further rows that are the
+  // first are told as soon as there is one.
+  int wait_ms = 0;
   std::uint64_t after = 0;  // the first row wanted
   SortColumn column = SortColumn::kFound;
   bool ascending = true;

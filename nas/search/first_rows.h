@@ -27,7 +27,7 @@ class FirstRowsMerge {
   bool wanted() const { return column_ != SortColumn::kFound && rows_ > 0; }
   FleetPageRequest FirstRequest(int wait_ms) const;
   unsigned most_rows() const { return rows_; }  // of one request
-  // What came. `more`: the box has further rows, or may have.
+  // What came. `more`: the box has further rows in that order.
   void Add(size_t box, const std::string& share, const FleetRow& row);
   void Told(size_t box, bool more);
   // The boxes of which the page has all rows that were told, though they have more; none of them

@@ -75,6 +75,7 @@ FleetSearch::FleetSearch(std::vector<FleetLocation> locations, Settings settings
       settings_(std::move(settings)),
       search_(search),
       fleet_(CurrentConfig().fleet),
+      order_wait_ms_(std::min(fleet_.first_page_ms, kMostFleetWaitMs)),
       next_id_(kFirstForeignId),
       next_share_(settings_.first_number) {
   for (const FleetLocation& location : locations_) {
@@ -113,14 +114,15 @@ const std::string& FleetSearch::QuestionFor(const Box& box) {
   question.query = search_.criteria.root;
   question.contents = settings_.contents;
   question.recursive = settings_.recursive;
-  question.page = first_ ? first_->FirstRequest(kWaitMs) : page_;
+  question.page = first_ ? first_->FirstRequest(order_wait_ms_) : page_;
   question.locations = question_locations_ = std::move(locations);
   return question_ = FleetQuestionText(question);
 }
 
 void FleetSearch::AskFirst(Box& box) {
   box.in_order = first_.has_value();
-  asker_->Ask(*box.box, {"POST", "/fleet/search", QuestionFor(box), kWaitMs},
+  asker_->Ask(*box.box,
+              {"POST", "/fleet/search", QuestionFor(box), box.in_order ? order_wait_ms_ : kWaitMs},
               [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
 }
 
@@ -182,7 +184,8 @@ bool FleetSearch::TakePage(Box& box, const FleetPage& page) {
     first_->Add(BoxPlace(box), box.box->name + "/" + row->share, *row);
     held_.push_back({&box, *row});
   }
-  if (first_) first_->Told(BoxPlace(box), !page.finished || page.next < page.total);
+  // Of one that still searches, nobody knows which rows are the first.
+  if (first_) first_->Told(BoxPlace(box), page.finished && page.next < page.total);
   search_.progress.AddMatches(fresh.size());
   box.told_any = box.told_any || !fresh.empty();
   box.task = page.task;
@@ -229,7 +232,7 @@ void FleetSearch::LookAtFirstPage() {
     Box& box = boxes_[place];
     if (!box.waits) continue;
     whole = box.waits = false;
-    AskRows(box, first_->FurtherRequest(place, kWaitMs));
+    AskRows(box, first_->FurtherRequest(place, order_wait_ms_));
   }
   if (whole) ReleaseFirstPage();
 }
@@ -251,7 +254,7 @@ void FleetSearch::AskRows(Box& box, const FleetPageRequest& page) {
   Json::Value body = FleetPageRequestJson(asked);
   body["task"] = box.task;
   box.in_order = page.column != SortColumn::kFound;
-  asker_->Ask(*box.box, {"POST", "/fleet/rows", JsonText(body, JsonBytes::kRaw), kWaitMs},
+  asker_->Ask(*box.box, {"POST", "/fleet/rows", JsonText(body, JsonBytes::kRaw), page.wait_ms},
               [this, &box](BoxAnswer answer) { Took(box, std::move(answer)); });
 }
 

@@ -9,7 +9,8 @@
 //
 // Where it is known in what order the first page will be listed (first_page.h), the rows of that
 // page come first, all together: boxes are asked for their first ones in that order, and those that
-// had more for the page for further ones. All other rows come in the order found.
+// had more for the page for further ones. A box that takes longer than first_page_ms to find all
+// tells what it has found by then. All other rows come in the order found.
 
 #include <json/value.h>
 
@@ -108,6 +109,7 @@ class FleetSearch {
   const Settings settings_;
   SharedSearch& search_;
   const FleetSettings& fleet_;
+  const int order_wait_ms_;
   FleetPageRequest page_;
   std::string question_;  // the last one, and of which folders
   std::vector<std::string> question_locations_;

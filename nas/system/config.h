@@ -107,6 +107,7 @@ struct FleetSettings {
   // What the proxy shows boxes, front.pem, and by whom their certificates are signed, ca.pem.
   std::string tls_folder = "/etc/arbory/fleet";
   int deadline_ms = 2000;        // for a box to say something
+  int first_page_ms = 10;        // for a box to find all, so that its first rows are in order
   int rows_per_box = 1'000'000;  // of one search; what is over stays where it is
   std::vector<FleetBox> boxes;   // in the order of their names
 

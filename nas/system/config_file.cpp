@@ -121,7 +121,9 @@ class Reader {
         {"tls_folder", [&](const toml::node& node) { fleet->tls_folder = Path(node); }},
         {"boxes", [&](const toml::node& node) { fleet->boxes = Boxes(node); }},
     };
-    AddLimits({{"deadline_ms", &fleet->deadline_ms}, {"rows_per_box", &fleet->rows_per_box}},
+    AddLimits({{"deadline_ms", &fleet->deadline_ms},
+               {"first_page_ms", &fleet->first_page_ms},
+               {"rows_per_box", &fleet->rows_per_box}},
               &keys);
     ReadTable(Parse(*text), keys);
     for (const auto& [missing, what] :

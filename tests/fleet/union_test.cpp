@@ -117,7 +117,7 @@ TEST_F(UnionTest, TellsTheSortedUnionOfWhatEachBoxTells) {
     boxes.push_back(StartBox("box" + std::to_string(boxes.size() + 1)));
     MakeTree(boxes.back(), files);
   }
-  const Server front = StartFront(boxes, "deadline_ms = 40000\n");
+  const Server front = StartFront(boxes, "deadline_ms = 40000\nfirst_page_ms = 1000\n");
   std::map<std::string, std::vector<Server>> sessions;  // of each user, at the boxes and the front
   for (const std::string& user : users_) {
     for (const Box& box : boxes) sessions[user].push_back(LoggedIn(box.server, user));

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <csignal>
 #include <memory>
 #include <utility>
@@ -202,24 +203,24 @@ void Remove(const std::string& user, const std::string& id, const RunningSearch&
   OKT::Task(user.c_str(), id.c_str()).remove();
 }
 
-// Waits, as long as the front likes, for a full page or the search's end.
+// Waits, as long as the front likes, for so many rows or the search's end.
 RunningSearch WaitForRows(const std::string& user, const std::string& id,
-                          const nas::FleetPageRequest& page) {
-  constexpr int kMillisecondsPerTenth = 100;
-  nas::GrowingPause pause((page.wait_ms + kMillisecondsPerTenth - 1) / kMillisecondsPerTenth);
+                          const nas::FleetPageRequest& page, std::uint64_t enough) {
+  nas::GrowingPause pause{std::chrono::milliseconds(page.wait_ms)};
   for (;;) {
     RunningSearch search = ReadSearch(user, id);
     if (!search.exists || search.finished) return search;
     // The first in an order are known when all are.
-    const bool enough = page.column == nas::SortColumn::kFound &&
-                        ReadRows(search, page, nullptr).next == page.after + page.limit;
-    if (enough || !pause.Wait()) return search;
+    if (page.column == nas::SortColumn::kFound) {
+      if (ReadRows(search, page, nullptr).next >= page.after + enough) return search;
+    }
+    if (!pause.Wait()) return search;
   }
 }
 
 void AnswerPage(const std::string& user, const std::string& id, const nas::FleetPageRequest& page,
-                NUVA::APIResponse* response) try {
-  const RunningSearch search = WaitForRows(user, id, page);
+                std::uint64_t enough, NUVA::APIResponse* response) try {
+  const RunningSearch search = WaitForRows(user, id, page, enough);
   if (!search.exists) return RefuseOwn(response, kNotFound, "There is no such search.");
   nas::FleetPageWriter writer;
   const Rows rows = page.column == nas::SortColumn::kFound ? ReadRows(search, page, &writer)
@@ -266,7 +267,7 @@ void SearchEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
     return RefuseOwn(response, kUnavailable, "This user has as many searches as a user may.");
   }
   nas::GiveUpRoot();
-  AnswerPage(user, id, question->page, response);
+  AnswerPage(user, id, question->page, question->page.limit, response);
 }
 
 void RowsEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
@@ -275,7 +276,9 @@ void RowsEntry(NUVA::APIRequest* request, NUVA::APIResponse* response) {
       ParamsOf(*request, {"limit", "wait_ms", "after", "sort_by", "descending", "behind"}));
   const Json::Value id = request->GetParam(kTask, Json::Value());
   if (!page || !id.isString()) return RefuseOwn(response, kBadRequest, kNotUnderstood);
-  AnswerPage(request->GetLoginUserName(), id.asString(), *page, response);
+  // Where there was none so far, somebody may be waiting for the first.
+  const std::uint64_t enough = page->after == 0 ? 1 : page->limit;
+  AnswerPage(request->GetLoginUserName(), id.asString(), *page, enough, response);
 }
 
 // Names of files need not be UTF-8, and go on as they are.
