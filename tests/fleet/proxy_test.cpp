@@ -1,86 +1,24 @@
 // A fleet behind HAProxy, as `arbory fleet config` sets it up. Left out where there is none.
 
-#include <fcntl.h>
-#include <netinet/in.h>
 #include <signal.h>
-#include <sys/prctl.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
-#include <algorithm>
 #include <cstdlib>
 #include <map>
 
-#include "tests/fleet/front.h"
+#include "tests/fleet/proxy.h"
 
 namespace fleet_test {
 namespace {
 
-using nas_test::AmRoot;
 using nas_test::Eventually;
 
-constexpr char kProxy[] = "/usr/sbin/haproxy";
-
-class ProxyTest : public FrontTest {
+class ProxyTest : public ProxiedTest {
  protected:
   void SetUp() override {
-    FrontTest::SetUp();
-    if (access(kProxy, X_OK) != 0) GTEST_SKIP() << "haproxy is not installed";
-  }
-  void TearDown() override {
-    if (proxy_ > 0) {
-      kill(proxy_, SIGTERM);
-      waitpid(proxy_, nullptr, 0);
-    }
-    FrontTest::TearDown();
-  }
-
-  std::string Settings() const {
-    return "deadline_ms = 3000\nproxy = \"" + dir_ + "/proxy.sock\"\ntls_folder = \"" + dir_ +
-           "/tls\"\n";
-  }
-  std::string ConfigCommand(const std::string& reload = "") const {
-    return ARBORY_BIN_DIR "/arbory fleet config " + dir_ + "/fleet.toml --write " + dir_ +
-           "/haproxy.cfg" + (reload.empty() ? "" : " --reload '" + reload + "'");
-  }
-
-  // With what the front's file says.
-  void StartProxy() {
-    ASSERT_EQ(std::system(ConfigCommand().c_str()), 0);
-    proxy_ = StartHaproxy(dir_ + "/haproxy.cfg");
-    ASSERT_TRUE(Eventually([&] { return access((dir_ + "/proxy.sock").c_str(), F_OK) == 0; }));
-  }
-
-  // `taken_over` are the descriptors that it gets as they are.
-  pid_t StartHaproxy(const std::string& config, const std::vector<int>& taken_over = {}) {
-    const pid_t pid = fork();
-    if (pid != 0) return pid;
-    for (const int fd : taken_over) fcntl(fd, F_SETFD, 0);
-    prctl(PR_SET_PDEATHSIG, SIGTERM);
-    const int log = open((dir_ + "/haproxy.log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
-    dup2(log, STDOUT_FILENO);
-    dup2(log, STDERR_FILENO);
-    execl(kProxy, kProxy, "-W", "-db", "-f", config.c_str(), nullptr);
-    _exit(98);
-  }
-
-  // Listens at a port of 127.0.0.1 that nobody else can have meanwhile; a proxy takes it over.
-  struct Listener {
-    nas::UniqueFd socket_fd;
-    std::string port;
-  };
-  static Listener Listen() {
-    Listener listener{nas::UniqueFd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)), {}};
-    sockaddr_in address = {};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t length = sizeof address;
-    const int fd = listener.socket_fd.get();
-    EXPECT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), length), 0);
-    EXPECT_EQ(listen(fd, SOMAXCONN), 0);
-    EXPECT_EQ(getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length), 0);
-    listener.port = std::to_string(ntohs(address.sin_port));
-    return listener;
+    ProxiedTest::SetUp();
+    if (!HaveProxy()) GTEST_SKIP() << "haproxy is not installed";
   }
 
   // The states of the boxes that do not answer a search for all of them.
@@ -97,7 +35,6 @@ class ProxyTest : public FrontTest {
     return states;
   }
 
-  pid_t proxy_ = -1;
   size_t rows_ = 0;
 };
 
@@ -124,7 +61,7 @@ TEST_F(ProxyTest, BoxesFailAndComeBack) {
   boxes[1] = StartBox("box2");
   WriteFleetFile(boxes, Settings());
   const std::string before = nas_test::ReadFile(dir_ + "/haproxy.cfg");
-  ASSERT_EQ(std::system(ConfigCommand("kill -USR2 " + std::to_string(proxy_)).c_str()), 0);
+  ReloadProxy();
   EXPECT_NE(nas_test::ReadFile(dir_ + "/haproxy.cfg"), before);
   EXPECT_TRUE(Eventually([&] { return Troubles(front, boxes).empty(); }))
       << nas_test::ReadFile(dir_ + "/haproxy.log");
