@@ -84,6 +84,13 @@ TEST_F(HostileTest, ALieCostsTheBoxsOwnRows) {
     change(page);
     return FakeBox::Reply(page.Text());
   };
+  const std::string plain = Page().Text();
+  std::string older = plain;
+  for (const char* word : {R"("version":"9",)", R"("source":"walk","index":"no index",)"}) {
+    older.erase(older.find(word), std::string_view(word).size());
+  }
+  const std::string without_news = FakeBox::Reply(older);
+  const std::string with_more = FakeBox::Reply("{\"colour\":[1]," + plain.substr(1));
   const struct {
     const char* what;
     std::string reply;
@@ -113,6 +120,9 @@ TEST_F(HostileTest, ALieCostsTheBoxsOwnRows) {
       {"no JSON", FakeBox::Reply("rows"), "down", 0},
       {"an error's page", FakeBox::Reply("<html>", "", "500 Internal Server Error"), "down", 0},
       {"an older box's words", FakeBox::Reply("{}", "", "404 Not Found"), "old", 0},
+      {"a question not understood", FakeBox::Reply("{}", "", "400 Bad Request"), "old", 0},
+      {"less than boxes tell now", without_news, "answered", 3},
+      {"more than boxes tell now", with_more, "answered", 3},
   };
   std::string said;
   const FakeBox fake([&](const std::string&, const auto& send) { send(said); });

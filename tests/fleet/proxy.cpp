@@ -27,9 +27,9 @@ void ProxiedTest::TearDown() {
 
 bool ProxiedTest::HaveProxy() { return access(kProxy, X_OK) == 0; }
 
-std::string ProxiedTest::Settings() const {
-  return "deadline_ms = 3000\nproxy = \"" + dir_ + "/proxy.sock\"\ntls_folder = \"" + dir_ +
-         "/tls\"\n";
+std::string ProxiedTest::Settings(int deadline_ms) const {
+  return "deadline_ms = " + std::to_string(deadline_ms) + "\nproxy = \"" + dir_ +
+         "/proxy.sock\"\ntls_folder = \"" + dir_ + "/tls\"\n";
 }
 
 std::string ProxiedTest::ConfigCommand(const std::string& reload) const {

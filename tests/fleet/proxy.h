@@ -16,8 +16,8 @@ class ProxiedTest : public FrontTest {
   void TearDown() override;
 
   static bool HaveProxy();
-  // For a front's file: where the proxy listens, and short deadlines.
-  std::string Settings() const;
+  // For a front's file: where the proxy listens, and a deadline.
+  std::string Settings(int deadline_ms = 3000) const;
   std::string ConfigCommand(const std::string& reload = "") const;
   // With what the front's file says.
   void StartProxy();

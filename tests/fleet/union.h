@@ -12,6 +12,9 @@
 
 namespace fleet_test {
 
+// For a front's file: boxes have the time to find all before they tell the first rows.
+inline constexpr char kInOrder[] = "first_page_ms = 1000\n";
+
 class UnionTest : public ProxiedTest {
  protected:
   void SetUp() override;

@@ -23,7 +23,10 @@ TEST_F(UnionTest, TellsTheSortedUnionOfWhatEachBoxTells) {
     boxes.push_back(StartBox("box" + std::to_string(boxes.size() + 1)));
     MakeTree(boxes.back(), files);
   }
-  const Server front = StartFront(boxes, "deadline_ms = 40000\nfirst_page_ms = 1000\n");
+  constexpr int kPatience = 40'000;
+  const std::string direct = "deadline_ms = " + std::to_string(kPatience) + "\n";
+  const Server front = StartFront(boxes, kInOrder + (HaveProxy() ? Settings(kPatience) : direct));
+  if (HaveProxy()) StartProxy();
   std::map<std::string, std::vector<Server>> sessions;  // of each user, at the boxes and the front
   for (const std::string& user : users_) {
     for (const Box& box : boxes) sessions[user].push_back(LoggedIn(box.server, user));
@@ -125,7 +128,7 @@ class MishapTest : public UnionTest {
   void Announce() {
     std::vector<Box> boxes;
     for (const Member& member : members_) boxes.push_back(member.box);
-    WriteFleetFile(boxes, kMore + Settings());
+    WriteFleetFile(boxes, kInOrder + Settings());
     ReloadProxy();
     for (const Member& member : members_) {
       if (member.mishap == Mishap::kFrozen || member.mishap == Mishap::kKilled) continue;
@@ -191,7 +194,6 @@ class MishapTest : public UnionTest {
   // What a search through the front has told of all boxes.
   void CheckAnswer(const std::vector<Listed>& listed);
 
-  static constexpr char kMore[] = "first_page_ms = 1000\n";
   bool can_shift_ = false;
   std::vector<Member> members_;
   int unanswered_ = 0;
@@ -248,11 +250,11 @@ TEST_F(MishapTest, WhatABoxDoesNotTellIsSaidToBeMissing) {
   for (const size_t indexed : {0, 3}) StartIndex(members_[indexed].box);
   std::vector<Box> boxes;
   for (const Member& member : members_) boxes.push_back(member.box);
-  const Server front = StartFront(boxes, kMore + Settings());
+  const Server front = StartFront(boxes, kInOrder + Settings());
   std::map<std::string, Server> sessions;
   for (const std::string& user : users_) sessions[user] = LoggedIn(front, user);
   StartProxy();
-  constexpr int kRounds = 14;
+  constexpr int kRounds = 10;
   for (int round = 0; round < kRounds; ++round) {
     const std::string& user = users_[static_cast<size_t>(round) % users_.size()];
     Json::Value params;
