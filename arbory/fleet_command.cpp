@@ -100,7 +100,7 @@ struct BoxLine {
   bool answered = false;
   std::string state = nas::BoxStateName(nas::BoxState::kAsked);
   std::string version = "-";
-  std::string files = "-";
+  std::string names = "-";  // that its index knows
   std::string index = "-";
   std::string clock = "-";  // seconds that the box is ahead
   std::string spent = "-";  // milliseconds
@@ -114,7 +114,7 @@ struct BoxLine {
                said.isObject() && said["version"].isString() && said["now"].isInt64();
     if (!answered) return;
     version = Plain(said["version"].asString());
-    if (said["files"].isUInt64()) files = std::to_string(said["files"].asUInt64());
+    if (said["names"].isUInt64()) names = std::to_string(said["names"].asUInt64());
     if (said["index"].isString()) index = Plain(said["index"].asString());
     clock = std::to_string(said["now"].asInt64() - std::time(nullptr));
     spent = std::to_string(std::chrono::ceil<std::chrono::milliseconds>(time).count());
@@ -132,9 +132,9 @@ struct BoxLine {
     return text + "\n";
   }
   static std::string Head() {
-    return Row({"BOX", "STATE", "VERSION", "FILES", "INDEX", "CLOCK", "MS", "WHY"});
+    return Row({"BOX", "STATE", "VERSION", "NAMES", "INDEX", "CLOCK", "MS", "WHY"});
   }
-  std::string Text() const { return Row({name, state, version, files, index, clock, spent, why}); }
+  std::string Text() const { return Row({name, state, version, names, index, clock, spent, why}); }
 };
 
 }  // namespace

@@ -1,7 +1,14 @@
 #include "tests/fleet/front.h"
 
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <cctype>
+#include <cstdlib>
 
 #include "nas/base/json_text.h"
 
@@ -57,6 +64,36 @@ std::vector<std::string> KeysOf(const std::vector<Listed>& files, const std::str
   std::vector<std::string> keys;
   for (const Listed& file : files) keys.push_back(KeyOf(file, column));
   return keys;
+}
+
+void FrontTest::TearDown() {
+  for (const pid_t pid : indexes_) {
+    kill(pid, SIGTERM);
+    waitpid(pid, nullptr, 0);
+  }
+  FleetTest::TearDown();
+}
+
+void FrontTest::StartIndex(const Box& box) {
+  const std::string config = dir_ + "/" + box.name + "-index.toml";
+  const std::string state =
+      AmRoot() ? dir_ + "/" + box.name + "-root-state" : dir_ + "/" + box.name + "-state";
+  nas_test::WriteFile(config, "state_dir = \"" + state + "\"\nvolumes = []\n[shares]\ndata = \"" +
+                                  box.share + "\"\n");
+  const pid_t pid = fork();
+  if (pid == 0) {
+    prctl(PR_SET_PDEATHSIG, SIGTERM);
+    const int log = open((dir_ + "/index.log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+    dup2(log, STDOUT_FILENO);
+    dup2(log, STDERR_FILENO);
+    execl(ARBORY_BIN_DIR "/arbory", "arbory", "index", "--config", config.c_str(), nullptr);
+    _exit(98);
+  }
+  indexes_.push_back(pid);
+  const std::string ask = ARBORY_BIN_DIR "/arbory index --status --json --config " + config +
+                          " 2>&1 | grep -q '\"attributes\": *\"current\"'";
+  EXPECT_TRUE(Eventually([&] { return std::system(ask.c_str()) == 0; }))
+      << nas_test::ReadFile(dir_ + "/index.log");
 }
 
 void FrontTest::WriteFleetFile(const std::vector<Box>& boxes, const std::string& more) {

@@ -29,6 +29,10 @@ std::vector<std::string> KeysOf(const std::vector<Listed>& files, const std::str
 
 class FrontTest : public FleetTest {
  protected:
+  void TearDown() override;
+
+  // An index daemon of the box's own, that knows all when this returns.
+  void StartIndex(const Box& box);
   // A front that asks these; `more` goes into its file, before the boxes.
   Server StartFront(const std::vector<Box>& boxes,
                     const std::string& more = "deadline_ms = 5000\n");
@@ -45,6 +49,9 @@ class FrontTest : public FleetTest {
   Json::Value status_;
   std::uint64_t total_ = 0;
   std::set<std::string> owners_;
+
+ private:
+  std::vector<pid_t> indexes_;
 };
 
 }  // namespace fleet_test

@@ -1,10 +1,7 @@
 #include "tests/fleet/union.h"
 
-#include <fcntl.h>
 #include <grp.h>
 #include <pwd.h>
-#include <signal.h>
-#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -19,7 +16,6 @@ namespace fleet_test {
 namespace {
 
 using nas_test::AmRoot;
-using nas_test::Eventually;
 
 constexpr const char* kPatterns[] = {"invoice",  "*.pdf",   "1",          "photo ext:txt",
                                      "size:>20", "nothing", "owner:root", ""};
@@ -33,14 +29,6 @@ std::string FolderName(int number) { return "folder " + std::to_string(number); 
 void UnionTest::SetUp() {
   ProxiedTest::SetUp();
   users_ = AmRoot() ? std::vector<std::string>{kAnn, kBob} : std::vector<std::string>{User()};
-}
-
-void UnionTest::TearDown() {
-  for (const pid_t pid : indexes_) {
-    kill(pid, SIGTERM);
-    waitpid(pid, nullptr, 0);
-  }
-  ProxiedTest::TearDown();
 }
 
 void UnionTest::MakeTree(const Box& box, int files) {
@@ -81,28 +69,6 @@ void UnionTest::ChangeTree(const Box& box) {
   const std::string folder = box.share + "/" + FolderName(Below(kFolders));
   if (!AmRoot() || !fs::exists(folder)) return;
   EXPECT_EQ(chmod(folder.c_str(), Below(2) == 0 ? 0700 : 0755), 0);
-}
-
-void UnionTest::StartIndex(const Box& box) {
-  const std::string config = dir_ + "/" + box.name + "-index.toml";
-  const std::string state =
-      AmRoot() ? dir_ + "/" + box.name + "-root-state" : dir_ + "/" + box.name + "-state";
-  nas_test::WriteFile(config, "state_dir = \"" + state + "\"\nvolumes = []\n[shares]\ndata = \"" +
-                                  box.share + "\"\n");
-  const pid_t pid = fork();
-  if (pid == 0) {
-    prctl(PR_SET_PDEATHSIG, SIGTERM);
-    const int log = open((dir_ + "/index.log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
-    dup2(log, STDOUT_FILENO);
-    dup2(log, STDERR_FILENO);
-    execl(ARBORY_BIN_DIR "/arbory", "arbory", "index", "--config", config.c_str(), nullptr);
-    _exit(98);
-  }
-  indexes_.push_back(pid);
-  const std::string ask = ARBORY_BIN_DIR "/arbory index --status --json --config " + config +
-                          " 2>&1 | grep -q '\"attributes\": *\"current\"'";
-  EXPECT_TRUE(Eventually([&] { return std::system(ask.c_str()) == 0; }))
-      << nas_test::ReadFile(dir_ + "/index.log");
 }
 
 std::string UnionTest::RandomPattern() { return kPatterns[Below(std::size(kPatterns))]; }

@@ -18,7 +18,6 @@ inline constexpr char kInOrder[] = "first_page_ms = 1000\n";
 class UnionTest : public ProxiedTest {
  protected:
   void SetUp() override;
-  void TearDown() override;
 
   int Below(int most) { return static_cast<int>(random_() % static_cast<unsigned>(most)); }
   // The first boxes have most files, so that rows are not spread evenly. Half of the folders are
@@ -26,8 +25,6 @@ class UnionTest : public ProxiedTest {
   void MakeTree(const Box& box, int files);
   // Makes, removes and moves files and opens and closes folders, a few each.
   void ChangeTree(const Box& box);
-  // An index daemon of the box's own, that knows all.
-  void StartIndex(const Box& box);
 
   std::string RandomPattern();
   Json::Value RandomListing();
@@ -44,7 +41,6 @@ class UnionTest : public ProxiedTest {
 
   std::mt19937 random_{20261122};
   std::vector<std::string> users_;
-  std::vector<pid_t> indexes_;
 };
 
 }  // namespace fleet_test

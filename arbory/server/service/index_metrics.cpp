@@ -1,6 +1,5 @@
 #include "arbory/server/service/index_metrics.h"
 
-#include <algorithm>
 #include <cstdint>
 
 #include "nas/base/json_text.h"
@@ -61,15 +60,14 @@ std::string IndexMetrics() {
 void AddIndexState(Json::Value* body) {
   const Json::Value report = AskForReport();
   if (report.isNull()) return;
-  std::uint64_t files = 0;
+  std::uint64_t names = 0;
   std::string state = "current";
   for (const Json::Value& item : report["file_systems"]) {
-    files += item["entries"].asUInt64() -
-             std::min(item["entries"].asUInt64(), item["folders"].asUInt64());
+    names += item["entries"].asUInt64();
     const std::string its = item["state"].asString();
     if (!report["current"].asBool() && its != nas::kIndexCurrent) state = its;
   }
-  (*body)["files"] = Json::UInt64{files};
+  (*body)["names"] = Json::UInt64{names};
   (*body)["index"] = state;
 }
 

@@ -10,7 +10,7 @@ namespace arbory {
 // In the Prometheus text format; empty where no daemon answers at once.
 std::string IndexMetrics();
 
-// How many files the index knows and, in its words, how it is, as "files" and "index"; nothing is
+// How many names the index knows and, in its words, how it is, as "names" and "index"; nothing is
 // added where no daemon answers.
 void AddIndexState(Json::Value* body);
 
