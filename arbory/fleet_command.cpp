@@ -43,6 +43,13 @@ std::pair<std::string, bool> ServerOf(const nas::FleetBox& box) {
   return {has_port ? host : host + (tls ? kTlsPort : kUsualPort), tls};
 }
 
+// Between two checks of a box: a hundred a second of all.
+size_t CheckSeconds(size_t boxes) {
+  constexpr size_t kFewest = 2;
+  constexpr size_t kChecksASecond = 100;
+  return std::max(kFewest, boxes / kChecksASecond);
+}
+
 // Each box has a backend of its own: a pool of connections that are kept, and a check that makes a
 // dead one be told of at once.
 std::string ProxyConfig(const nas::FleetSettings& fleet) {
@@ -59,10 +66,14 @@ std::string ProxyConfig(const nas::FleetSettings& fleet) {
       "    timeout connect 1s\n"
       "    timeout client 1m\n"
       "    timeout server 1m\n"
+      "    timeout check 2s\n"
       "    retries 0\n"
       "    http-reuse always\n"
       "    option httpchk\n"
-      "    default-server check inter 2s fall 2 rise 1\n"
+      // A name that is not known now is that of one box that is down, no reason not to start.
+      "    default-server check inter " +
+      std::to_string(CheckSeconds(fleet.boxes.size())) +
+      "s fall 2 rise 1 fastinter 1s init-addr last,libc,none\n"
       "\n"
       "frontend arbory_fleet\n"
       "    bind unix@" +

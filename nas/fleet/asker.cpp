@@ -101,6 +101,11 @@ void FleetAsker::SendSigned() {
     const std::string token = tokens_.Take();
     Waiting first = std::move(waiting_.front());
     waiting_.pop_front();
+    if (token.empty()) {
+      // The box would say that it does not know this front, which is not what is wrong.
+      first.done({BoxState::kRefused, "this machine's key cannot be used", 0, {}});
+      continue;
+    }
     Send(std::move(first), token);
     if (sent % kSentAtOnce == 0) client_->Step();
   }

@@ -1,6 +1,7 @@
 // One search over several boxes, through a front.
 
 #include <pwd.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <map>
@@ -54,6 +55,18 @@ TEST_F(FrontTest, NamesBoxesThatDoNotAnswer) {
     EXPECT_EQ(fleet[count], 1) << count;
   }
   for (const auto& [box, state] : wanted) EXPECT_EQ(shares["boxes"][box]["state"], state) << box;
+}
+
+TEST_F(FrontTest, AKeyThatOthersCanReadIsNotUsed) {
+  const std::vector<Box> boxes = {StartBox("box1"), StartBox("box2")};
+  const Server front = LoggedIn(StartFront(boxes), User());
+  EXPECT_EQ(front.Get("/shares").json()["shares"].size(), 2U);
+  ASSERT_EQ(chmod((dir_ + "/office.key").c_str(), 0644), 0);
+  const Json::Value shares = front.Get("/shares").json();
+  EXPECT_EQ(shares["shares"].size(), 0U);
+  for (const Box& box : boxes) {
+    EXPECT_EQ(shares["boxes"][box.name]["why"], "this machine's key cannot be used");
+  }
 }
 
 TEST_F(FrontTest, ASearchIsStoppedAndCleanedWithWhatBoxesKeep) {
