@@ -13,6 +13,7 @@ export interface Options {
   logins?: boolean; // as root, with people logging in by PAM
   settings?: string; // more lines of the [server] table
   top?: string; // and before it
+  words?: string[]; // of the command line
 }
 
 // A folder that the server may use, removed at the end.
@@ -61,7 +62,7 @@ export class Server {
     );
     const drop = process.getuid?.() === 0 && !options.logins;
     const user = drop ? ['--user', 'nobody'] : [];
-    const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config, ...user], {
+    const child = spawn(process.env.ARBORY_PROGRAM!, ['serve', '--config', config, ...user, ...(options.words ?? [])], {
       stdio: ['ignore', 'pipe', 'pipe'],
       env: { PATH: process.env.PATH, HOME: state, TZ: process.env.TZ },
     });
@@ -77,6 +78,11 @@ export class Server {
 
   stop(): Promise<void> {
     return stopped(this.child);
+  }
+
+  // Held still, or let go on.
+  freeze(frozen = true): void {
+    this.child.kill(frozen ? 'SIGSTOP' : 'SIGCONT');
   }
 
   // Without a word.

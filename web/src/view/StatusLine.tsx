@@ -65,7 +65,9 @@ export function StatusLine({ app, search, actions }: { app: App; search: Search;
 
 function found(search: Search): string {
   const all = browses(search.criteria) ? plural(search.matches, 'item') : plural(search.matches, 'match', 'matches');
-  return search.filter === '' ? all : `${count(search.found)} of ${all}`;
+  // What a machine that did not answer has is among neither.
+  const least = search.walk.fleet?.boxes.length ? 'at least ' : '';
+  return search.filter === '' ? least + all : `${count(search.found)} of ${least}${all}`;
 }
 
 // Narrows the rows that were found to some of them; nothing is searched anew.
