@@ -2,6 +2,9 @@
 
 #include <pwd.h>
 #include <signal.h>
+#include <sys/stat.h>
+
+#include <cstdio>
 
 #include "tests/fleet/fake_box.h"
 #include "tests/fleet/front.h"
@@ -120,6 +123,43 @@ TEST_F(FilesTest, OfABoxThatDoesNotAnswerAreToldOfByItsName) {
   kill(boxes[1].server.pid, SIGCONT);
   EXPECT_TRUE(
       nas_test::Eventually([&] { return front.Get("/files/box2/data/a.txt").status == 200; }));
+}
+
+TEST_F(FilesTest, OfSeveralBoxesGoIntoOneArchive) {
+  std::vector<Box> boxes = {StartBox("box1"), StartBox("box2"), StartBox("box3")};
+  std::string large(3 << 20, '\0');
+  for (size_t i = 0; i < large.size(); ++i) large[i] = static_cast<char>(i * 7 % 251);
+  MakeFile(boxes[0], "plans/plan of 1.bin", "", large);
+  MakeFile(boxes[1], "plans/plan of 2.txt", "", "two");
+  MakeFile(boxes[2], "plan of 3.txt", "", "three");
+  const Server front = LoggedIn(StartFront(boxes), User());
+  Json::Value params;
+  params["pattern"] = "plan";
+  for (const Box& box : boxes) params["folder_path"].append("/" + box.name + "/data");
+  Search(front, params);
+  MakeFile(boxes[1], "plans/plan of 2.txt", "", "changed");
+  EXPECT_EQ(Stop(boxes[2].server), 0);
+  nas_test::WriteFile(dir_ + "/list.py",
+                      "import http.client, io, sys, zipfile\n"
+                      "front = http.client.HTTPConnection('127.0.0.1', int(sys.argv[1]))\n"
+                      "front.request('GET', sys.argv[2], headers={'Cookie': sys.argv[3]})\n"
+                      "archive = zipfile.ZipFile(io.BytesIO(front.getresponse().read()))\n"
+                      "for one in archive.infolist():\n"
+                      "    text = archive.read(one)\n"
+                      "    print(one.filename, text.decode() if len(text) < 400 else len(text))\n");
+  const std::string words = std::to_string(front.port) + " '/searches/" + task_ +
+                            "/zip?rows=all' '" + front.cookie + "' 2>&1";
+  FILE* const out = popen(("python3 " + dir_ + "/list.py " + words).c_str(), "r");
+  std::string told(4096, '\0');
+  told.resize(fread(told.data(), 1, told.size(), out));
+  EXPECT_EQ(pclose(out), 0) << told;
+  EXPECT_EQ(told,
+            "box1/data/plans/plan of 1.bin 3145728\n"
+            "box2/data/plans/plan of 2.txt changed\n"
+            "not included.txt Left out of this archive:\r\n\r\n"
+            "box1/data/plans/: it is a folder of another machine; choose its files\r\n"
+            "box2/data/plans/: it is a folder of another machine; choose its files\r\n"
+            "box3/data/plan of 3.txt: its machine does not answer\r\n\n");
 }
 
 TEST_F(FilesTest, ABoxSpeaksOnlyOfItsBytes) {

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <clocale>
+#include <cstdint>
 #include <cstdio>
 #include <ctime>
 #include <memory>
@@ -48,6 +49,9 @@ class Zip : public ZipStream {
 
   void AddFolder(const std::string& name, const struct stat& info) override;
   bool AddFile(const std::string& name, int fd, const struct stat& info) override;
+  bool BeginFile(const std::string& name, const struct stat& info) override;
+  void AddBytes(std::string_view bytes) override;
+  bool EndFile() override;
   void AddText(const std::string& name, std::string_view text) override;
   void Finish() override;
   bool broken() const override { return broken_; }
@@ -60,6 +64,7 @@ class Zip : public ZipStream {
   const int pipe_;
   std::string chunk_;
   archive* const archive_;
+  std::uint64_t left_ = 0;  // bytes of the file that was begun
   bool broken_ = false;
 };
 
@@ -117,21 +122,32 @@ void Zip::AddFolder(const std::string& name, const struct stat& info) {
 }
 
 bool Zip::AddFile(const std::string& name, int fd, const struct stat& info) {
-  if (!Begin(name, info, info.st_size > 0 && !IsPacked(name))) return false;
+  if (!BeginFile(name, info)) return false;
   std::string buffer(kReadBytes, '\0');
-  bool whole = true;
-  for (auto left = static_cast<std::uint64_t>(info.st_size); left > 0 && !broken_;) {
-    const size_t wanted = std::min<std::uint64_t>(left, buffer.size());
-    const ssize_t got =
-        whole ? nas::Uninterrupted([&] { return read(fd, buffer.data(), wanted); }) : 0;
-    if (got <= 0) {
-      if (whole) buffer.assign(kReadBytes, '\0');
-      whole = false;
-    }
-    const size_t count = got > 0 ? static_cast<size_t>(got) : wanted;
-    Write({buffer.data(), count});
-    left -= count;
+  while (left_ > 0 && !broken_) {
+    const size_t wanted = std::min<std::uint64_t>(left_, buffer.size());
+    const ssize_t got = nas::Uninterrupted([&] { return read(fd, buffer.data(), wanted); });
+    if (got <= 0) break;
+    AddBytes({buffer.data(), static_cast<size_t>(got)});
   }
+  return EndFile();
+}
+
+bool Zip::BeginFile(const std::string& name, const struct stat& info) {
+  left_ = static_cast<std::uint64_t>(info.st_size);
+  return Begin(name, info, info.st_size > 0 && !IsPacked(name));
+}
+
+void Zip::AddBytes(std::string_view bytes) {
+  const size_t count = std::min<std::uint64_t>(left_, bytes.size());
+  Write(bytes.substr(0, count));
+  left_ -= count;
+}
+
+bool Zip::EndFile() {
+  const bool whole = left_ == 0;
+  const std::string zeros(whole ? 0 : kReadBytes, '\0');
+  while (left_ > 0 && !broken_) AddBytes(zeros);
   return whole;
 }
 

@@ -9,14 +9,17 @@
 #include <exception>
 #include <map>
 #include <memory>
+#include <optional>
 #include <unordered_set>
 
 #include "arbory/running_search.h"
+#include "arbory/server/service/fleet_files.h"
 #include "arbory/server/service/library.h"
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/paths.h"
 #include "nas/files/directory_reader.h"
 #include "nas/fleet/asker.h"
+#include "nas/fleet/signer.h"
 #include "nas/match/query.h"
 #include "nas/system/config.h"
 #include "nas/system/identity.h"
@@ -33,7 +36,7 @@ constexpr size_t kMostRanges = 5000;
 constexpr char kLeftOut[] = "not included.txt";
 constexpr char kWholeResult[] = "all";
 
-// A row's file, as it is known to the person: "SHARE/below".
+// A row's file, as it is known to the person: "SHARE/below"; of a box's folder, with a "/" behind.
 using Paths = std::vector<std::string>;
 
 std::vector<std::uint32_t> NumbersOf(nas::ResultReader& reader, const ArchiveRequest& request,
@@ -60,6 +63,8 @@ Paths ReadPaths(const std::string& file, const ArchiveRequest& request,
     for (const std::string_view part : {row.folder, row.name}) {
       if (!part.empty()) path.append(part.starts_with('/') ? "" : "/").append(part);
     }
+    const bool elsewhere = nas::FindFleetBox(path.substr(0, path.find('/'))) != nullptr;
+    if (elsewhere && S_ISDIR(row.attributes->mode)) path += '/';
     paths.push_back(std::move(path));
   }
   reader.End();
@@ -84,7 +89,7 @@ class Archiver {
   void Add(const std::string& path) {
     if (IsInFolderAdded(path)) return;
     const size_t slash = path.find('/');
-    if (nas::FindFleetBox(path.substr(0, slash)) != nullptr) return LeaveOut(path, EREMOTE);
+    if (nas::FindFleetBox(path.substr(0, slash)) != nullptr) return AddFromBox(path);
     const nas::UniqueFd& root = RootOf(path.substr(0, slash));
     if (!root) return LeaveOut(path, ENOENT);
     const std::string below = slash == std::string::npos ? "." : path.substr(slash + 1);
@@ -159,6 +164,28 @@ class Archiver {
     }
   }
 
+  void AddFromBox(const std::string& path) {
+    if (path.ends_with('/')) return LeaveOut(path, EISDIR);
+    if (++files_ > kMostFiles) return LeaveOut(path, E2BIG);
+    if (!boxes_) boxes_.emplace();
+    bool begun = false;
+    const int trouble = boxes_->Fetch(
+        path,
+        [&](std::uint64_t bytes, std::time_t modified) {
+          struct stat info = {};
+          info.st_mode = S_IFREG | S_IRUSR | S_IWUSR | S_IRGRP | S_IROTH;
+          info.st_size = static_cast<off_t>(bytes);
+          info.st_mtime = modified;
+          return begun = zip_->BeginFile(NameOf(path), info);
+        },
+        [&](std::string_view piece) {
+          zip_->AddBytes(piece);
+          return !zip_->broken();
+        });
+    const bool whole = begun && zip_->EndFile();
+    if (trouble != 0 || !whole) LeaveOut(path, trouble != 0 ? trouble : EIO);
+  }
+
   std::string NameOf(const std::string& path) const { return path.substr(common_bytes_); }
 
   void LeaveOut(const std::string& path, int error) {
@@ -168,13 +195,15 @@ class Archiver {
     if (error == ENOENT) why = "it is no longer there";
     if (error == ELOOP) why = "it is a link, or lies too deep";
     if (error == EINVAL || error == ENXIO) why = "it is neither a file nor a folder";
-    if (error == EREMOTE) why = "it is on another machine; save it by itself";
+    if (error == EHOSTDOWN) why = "its machine does not answer";
+    if (error == EISDIR) why = "it is a folder of another machine; choose its files";
     if (error == E2BIG) why = "there are too many files for one archive";
     told_ += path + ": " + why + "\r\n";
   }
 
   const std::unique_ptr<ZipStream> zip_;
   const size_t common_bytes_;
+  std::optional<BoxFiles> boxes_;
   std::map<std::string, nas::UniqueFd> roots_;  // of shares; invalid where there is none
   std::unordered_set<std::string> folders_;     // chosen ones
   size_t files_ = 0;
@@ -188,6 +217,7 @@ void Refuse(int pipe, int status, const char* sentence) {
 
 void Serve(const ArchiveRequest& request, int pipe) {
   LoadServerLibrary();
+  nas::StartFleetSigner(request.user);
   if (!nas::BecomeUser(request.user)) {
     return Refuse(pipe, kUnavailable, "The server cannot act as this user.");
   }

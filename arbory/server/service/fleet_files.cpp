@@ -1,10 +1,12 @@
 #include "arbory/server/service/fleet_files.h"
 
+#include <algorithm>
+#include <cerrno>
 #include <charconv>
-#include <cstdint>
-#include <ctime>
+#include <sstream>
 #include <stdexcept>
 #include <utility>
+#include <vector>
 
 #include "arbory/server/transport/http_text.h"
 #include "nas/base/file_io.h"
@@ -24,9 +26,9 @@ using nas::BoxState;
 constexpr size_t kMostAnswerBytes = size_t{1} << 20;
 
 // What the box has as /SHARE/PATH.
-std::string TargetOf(const char* route, const FileRequest& request) {
+std::string TargetOf(const char* route, const std::vector<std::string>& parts) {
   std::string target = std::string("/fleet/") + route;
-  for (const std::string& part : request.path) target += "/" + PercentEncoded(part);
+  for (const std::string& part : parts) target += "/" + PercentEncoded(part);
   return target;
 }
 
@@ -158,7 +160,7 @@ void PassFileOn(const FileRequest& request, int pipe) {
   bool begun = false;
   nas::FleetAsker::Request asked;
   asked.method = request.head_only ? "HEAD" : "GET";
-  asked.target = TargetOf("files", request);
+  asked.target = TargetOf("files", request.path);
   if (request.range) asked.target += "?range=" + PercentEncoded(*request.range);
   asked.take_head = [&](const nas::FleetHead& head) {
     const auto said = ReadHead(head);
@@ -180,7 +182,7 @@ void PassFirstLineOn(const FileRequest& request, const std::string& pattern, boo
   }
   nas::FleetAsker::Request asked;
   asked.method = "GET";
-  asked.target = TargetOf("lines", request) + "?pattern=" + PercentEncoded(pattern) +
+  asked.target = TargetOf("lines", request.path) + "?pattern=" + PercentEncoded(pattern) +
                  (with_text ? "&text=1" : "");
   AskBox(request, pipe, std::move(asked), false, [&](const nas::BoxAnswer& answer) {
     const Json::Value line = CheckedLine(answer.body, with_text);
@@ -188,6 +190,38 @@ void PassFirstLineOn(const FileRequest& request, const std::string& pattern, boo
     nas::SendReply(pipe,
                    AsChildsReply(JsonReply(kOk, nas::JsonText(line, nas::JsonBytes::kClean))));
   });
+}
+
+BoxFiles::BoxFiles() : asker_(nas::CurrentConfig().fleet, kMostAnswerBytes) {}
+
+int BoxFiles::Fetch(const std::string& path,
+                    const std::function<bool(std::uint64_t bytes, std::time_t modified)>& begin,
+                    const std::function<bool(std::string_view piece)>& take) {
+  std::vector<std::string> parts;
+  std::istringstream text(path);
+  for (std::string part; std::getline(text, part, '/');) parts.push_back(part);
+  const nas::FleetBox* box = nas::FindFleetBox(parts.front());
+  if (box == nullptr) return ENOENT;
+  parts.erase(parts.begin());
+  bool begun = false;
+  nas::FleetAsker::Request asked;
+  asked.method = "GET";
+  asked.target = TargetOf("files", parts);
+  asked.take_head = [&](const nas::FleetHead& head) {
+    const auto said = ReadHead(head);
+    begun =
+        said && head.status == kOk && begin(said->size, std::max<std::int64_t>(head.modified, 0));
+    return begun;
+  };
+  asked.take_piece = take;
+  int trouble = EHOSTDOWN;
+  asker_.Ask(*box, std::move(asked), [&](const nas::BoxAnswer& answer) {
+    if (answer.status == kNotFound) trouble = ENOENT;
+    if (answer.status == kForbidden) trouble = EACCES;
+    if (answer.state == BoxState::kAnswered) trouble = 0;
+  });
+  asker_.Run([] { return false; });
+  return begun && trouble != 0 ? EIO : trouble;
 }
 
 }  // namespace arbory

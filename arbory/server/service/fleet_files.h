@@ -5,9 +5,14 @@
 // policies) the front says itself, as a box that says otherwise would speak for the front's own
 // page.
 
+#include <cstdint>
+#include <ctime>
+#include <functional>
 #include <string>
+#include <string_view>
 
 #include "arbory/server/service/files.h"
+#include "nas/fleet/asker.h"
 
 namespace arbory {
 
@@ -19,5 +24,21 @@ bool IsOnBox(const FileRequest& request);
 void PassFileOn(const FileRequest& request, int pipe);
 void PassFirstLineOn(const FileRequest& request, const std::string& pattern, bool with_text,
                      int pipe);
+
+// Files of boxes for an archive, one after the other. For a child that has a signer and is its user
+// for good.
+class BoxFiles {
+ public:
+  BoxFiles();
+  // Passes /BOX/SHARE/PATH, whose first "/" is left out, on: its length and time first, then its
+  // bytes, until one of them says false. Gives 0, or why not: ENOENT, EACCES, EIO where it broke
+  // off, and EHOSTDOWN where the box cannot be asked.
+  int Fetch(const std::string& path,
+            const std::function<bool(std::uint64_t bytes, std::time_t modified)>& begin,
+            const std::function<bool(std::string_view piece)>& take);
+
+ private:
+  nas::FleetAsker asker_;
+};
 
 }  // namespace arbory

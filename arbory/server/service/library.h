@@ -29,6 +29,11 @@ class ZipStream {
   // The file open at `fd`, as long as `info` says: what is missing by then is filled up with zeros,
   // what has grown is left out. False where bytes could not be read.
   virtual bool AddFile(const std::string& name, int fd, const struct stat& info) = 0;
+  // The same in pieces, of a file that is not here. Where the first is false the others are not to
+  // be called.
+  virtual bool BeginFile(const std::string& name, const struct stat& info) = 0;
+  virtual void AddBytes(std::string_view bytes) = 0;
+  virtual bool EndFile() = 0;
   virtual void AddText(const std::string& name, std::string_view text) = 0;
   // The end, without which a client knows that it has not got all.
   virtual void Finish() = 0;
