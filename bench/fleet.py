@@ -2,9 +2,9 @@
 """What a search over many machines costs: fleet.py BIN_DIR TOP [--boxes N] [--files N]
 [--stand-ins N ...] [--quick] [--write]
 
-Real boxes, each an `arbory serve`, walking and with an index; and stand-ins, which give the same short
-page at once, so that what is left is the front. HAProxy stands between them and the front, as it does
-outside, and plays the stand-ins. Prints rows of a table, in medians of all rounds."""
+Real boxes, each an `arbory serve`, walking and with an index; and stand-ins, which give the same
+short page at once, so that what is left is the front. HAProxy stands between them and the front, as
+it does outside, and plays the stand-ins. Prints rows of a table, in medians of all rounds."""
 
 import argparse
 import asyncio
