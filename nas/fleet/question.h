@@ -52,8 +52,8 @@ inline constexpr int kMostFleetWaitMs = 1000;
 
 struct FleetPageRequest {
   unsigned limit = kMostFleetRows;
-  // For as many rows, or the search's end; in an order, for the end alone. Further rows that are the
-  // first are told as soon as there is one.
+  // For as many rows, or the search's end; in an order, for the end alone. Further rows that are
+  // the first are told as soon as there is one.
   int wait_ms = 0;
   std::uint64_t after = 0;  // the first row wanted
   SortColumn column = SortColumn::kFound;
