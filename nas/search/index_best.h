@@ -23,7 +23,7 @@ struct BestBounds {
   // From the beginning: for the best to be looked up, which is worth waiting for; and for others,
   // which are only counted.
   std::chrono::milliseconds best{200};
-  std::chrono::milliseconds further{4};
+  std::chrono::milliseconds further{2};
   // Names looked at in the table's order: beyond it, all are as quickly looked at in the order in
   // which they lie.
   size_t in_order = size_t{16} << 10;
