@@ -177,7 +177,7 @@ TEST_F(BadInput, CommandLine) {
     EXPECT_EQ(Pieces(output.err, '\n').size(), 1U) << output.err;
     EXPECT_THAT(output.err, testing::HasSubstr(row.said));
   }
-  EXPECT_TRUE(Remains().empty());
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
 }
 
 // Whoever reads the output has to hear that it is not whole, and no file of the program's own gets
@@ -207,7 +207,7 @@ TEST_F(BadInput, OutputThatNobodyTakesIsAnError) {
     EXPECT_THAT(errors, testing::StartsWith("arbory: cannot write to standard output: "));
     EXPECT_EQ(Pieces(errors, '\n').size(), 1U);
   }
-  EXPECT_TRUE(Remains().empty());
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
 }
 
 TEST_F(BadInput, NinthSearchIsRefused) {
