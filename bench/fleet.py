@@ -145,10 +145,12 @@ def server(program, folder, name, more, *words):
 
 
 class Memory:
-    """The most that any process of the front's has had, in MiB, while this is entered."""
+    """The most that any search's worker of the front's has had, in MiB, while this is entered, and
+    any other of its processes, such as those that sort large results afterwards."""
 
     def __init__(self, pid):
-        self.pid, self.most, self.ended = pid, 0, False
+        self.pid, self.most, self.others, self.ended = pid, 0, 0, False
+        self.workers = set()
 
     def __enter__(self):
         self.thread = threading.Thread(target=self.watch)
@@ -165,8 +167,18 @@ class Memory:
                 with contextlib.suppress(OSError):
                     text = status.read_text()
                     if f"\nPPid:\t{self.pid}\n" in text and "VmHWM:" in text:
-                        self.most = max(self.most, int(text.split("VmHWM:")[1].split()[0]) / 1024)
+                        self.saw(status.parent.name, text)
             time.sleep(0.01)
+
+    def saw(self, pid, text):
+        had = int(text.split("VmHWM:")[1].split()[0]) / 1024
+        # No other process has threads.
+        if int(text.split("Threads:")[1].split()[0]) > 1:
+            self.workers.add(pid)
+        if pid in self.workers:
+            self.most = max(self.most, had)
+        else:
+            self.others = max(self.others, had)
 
 
 def measure(front, folders):
@@ -261,7 +273,7 @@ def many(bin_dir, count, must):
     name = f"{count:,} stand-ins"
     yield row(f"{name}: first page", f"{shown:.0f} ms", f"≤ {must} ms" if must else "",
               not must or shown <= must)
-    yield row(f"{name}: all rows", f"{ended:.0f} ms; {memory:.0f} MiB at most in a process")
+    yield row(f"{name}: all rows", f"{ended:.0f} ms; {memory:.0f} MiB of the search")
 
 
 def troubled(bin_dir):
@@ -280,7 +292,7 @@ def troubled(bin_dir):
             shown, ended, told, memory = stand_ins(bin_dir, 9, liars.addresses[:count])
             lost = told["down"] + told["late"]
             yield row(f"9 stand-ins, and {count} that say 500 KB of lies at once",
-                      f"all rows of the 9, none of the others; {memory:.0f} MiB at most in a process",
+                      f"all rows of the 9, none of the others; {memory:.0f} MiB of the search",
                       f"≤ {MOST_MEMORY} MiB", lost == count and memory <= MOST_MEMORY)
     finally:
         liars.close()
@@ -344,8 +356,10 @@ def real(bin_dir, count, tree, files, indexed):
               "slowest and 1 ms a box", took <= most)
     yield row(f"{name}: the slowest box, where people ask all of them at once",
               f"{slowest:.0f} ms; one asked alone {statistics.median(alone):.0f} ms")
-    yield row(f"{name}: all rows", f"{statistics.median(ended):.0f} ms; {memory.most:.0f} MiB at "
-              "most in a process", f"≤ {MOST_MEMORY} MiB", memory.most <= MOST_MEMORY)
+    yield row(f"{name}: all rows",
+              f"{statistics.median(ended):.0f} ms; {memory.most:.0f} MiB of the search, "
+              f"{memory.others:.0f} to sort its rows", f"≤ {MOST_MEMORY} MiB of the search",
+              memory.most <= MOST_MEMORY)
 
 
 def figures(asked, bin_dir):
