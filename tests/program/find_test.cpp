@@ -14,7 +14,6 @@ namespace program_test {
 namespace {
 
 using testing::HasSubstr;
-using testing::IsEmpty;
 using testing::Not;
 
 class Find : public ProgramTest {
@@ -139,7 +138,7 @@ TEST_F(Find, PrintsTheBestOrSaysWhyNot) {
   const std::vector<std::string> choices = Pieces(Ask({"find", "odd", "--choices"}).out, '\0');
   ASSERT_EQ(choices.size(), 1u);
   EXPECT_EQ(arbory::PathOfChoice(choices[0]), odd);
-  EXPECT_THAT(Remains(), IsEmpty()) << "nothing is stored";
+  EXPECT_TRUE(Eventually([&] { return Remains().empty(); })) << "nothing is stored";
 }
 
 TEST_F(Find, ShowsAUserWhatTheyMaySee) {
