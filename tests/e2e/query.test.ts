@@ -236,7 +236,7 @@ test('the panel and the text are two views of one query', async () => {
   // An address of old says it in the query now.
   await holds('type:image size:1KB.. plan');
   await page.click('text=Criteria');
-  assert.equal(await page.getByRole('radio', { name: 'Pictures' }).isChecked(), true);
+  await page.locator('input[type=radio]:checked').and(page.getByRole('radio', { name: 'Pictures' })).waitFor({ state: 'attached' });
   assert.equal(await page.getByLabel('Size from').inputValue(), '1KB');
   await page.getByRole('radio', { name: 'Anything' }).check({ force: true });
   await holds('size:1KB.. plan');
