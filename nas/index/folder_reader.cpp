@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <ctime>
 
 namespace nas {
 namespace {
@@ -23,9 +24,11 @@ constexpr std::chrono::nanoseconds kStep = std::chrono::milliseconds(20);
 constexpr std::chrono::nanoseconds kLongStep = std::chrono::seconds(2);
 
 NameTable::Stamp StampOf(const statx_timestamp& changed) {
-  const auto since_epoch =
-      std::chrono::seconds(changed.tv_sec) + std::chrono::nanoseconds(changed.tv_nsec);
-  const auto age = std::chrono::system_clock::now().time_since_epoch() - since_epoch;
+  // That clock itself: where the machine stands still, a step of it takes longer.
+  timespec now = {};
+  clock_gettime(CLOCK_REALTIME_COARSE, &now);
+  const auto age = std::chrono::seconds(now.tv_sec - changed.tv_sec) +
+                   std::chrono::nanoseconds(now.tv_nsec - std::int64_t{changed.tv_nsec});
   if (age < (changed.tv_nsec == 0 ? kLongStep : kStep)) return {};
   return {changed.tv_sec, changed.tv_nsec};
 }

@@ -378,6 +378,12 @@ class Equality:
         words = [self.house.program, "index", "--status", "--config", self.house.config]
         return subprocess.run(words, capture_output=True).returncode == 0
 
+    def checked(self):
+        """In what the index finds that it differs from the files."""
+        words = [self.house.program, "index", "--check", "--config", self.house.config]
+        told = subprocess.run(words, capture_output=True, text=True, errors="replace")
+        return (told.stdout + told.stderr)[:2000]
+
     def how_it_is(self):
         """For whoever looks into it: what the daemon tells, and what its processes do."""
         words = [self.house.program, "index", "--status", "--config", self.house.config]
@@ -460,6 +466,7 @@ class Equality:
             time.sleep(0.02)
             status, rows, said = self.search(user, always, question, folder)
         if status != 2:
+            self.said = f"{status} {said}"
             return rows
         if said.rstrip().endswith("busy") and self.is_current():
             self.outcome.count("questions with no answer in time")
@@ -489,8 +496,8 @@ class Equality:
                           for one, other in ((got, walked), (walked, got))]
             self.outcome.breaks(
                 f"{self.kind}, question {self.asked}, {user} {question} {folder}: {len(more)} rows "
-                f"too many, {len(less)} missing, such as {more[:2]} {less[:9]}; mounted are "
-                f"{self.place.mounted}", self.repeat())
+                f"too many, {len(less)} missing, such as {more[:2]} {less[:9]}; it ended with {self.said}; "
+                f"mounted are {self.place.mounted}; {self.checked()}", self.repeat())
 
     def ask_during_swaps(self):
         """Folders of one user and of another take each other's place while a third asks: no row may
