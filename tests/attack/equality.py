@@ -380,7 +380,7 @@ class Equality:
 
     def checked(self):
         """In what the index finds that it differs from the files."""
-        words = [self.house.program, "index", "--check", "--config", self.house.config]
+        words = [*self.before, self.house.program, "index", "--check", "--config", self.house.config]
         told = subprocess.run(words, capture_output=True, text=True, errors="replace")
         return (told.stdout + told.stderr)[:2000]
 
