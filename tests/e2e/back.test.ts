@@ -2,41 +2,16 @@
 // what becomes of searches that were left.
 import assert from 'node:assert/strict';
 import * as fs from 'node:fs';
-import { after, before, test } from 'node:test';
+import { test } from 'node:test';
 import { join } from 'node:path';
-import type { Browser } from 'playwright-core';
-import { openBrowser, type Cookies, sessionOf, Tab } from './browser.ts';
-import { Place, Server } from './server.ts';
+import type { Response } from 'playwright-core';
+import { Stage } from './stage.ts';
 import { itemName, makeFiles, makeMany } from './tree.ts';
 
-let place: Place;
-let server: Server;
-let browser: Browser;
-let cookies: Cookies;
-
-before(async () => {
-  place = new Place();
-  const shares = { files: makeFiles(place), many: makeMany(place) };
-  for (const folder of Object.values(shares)) place.giveAway(folder);
-  server = await Server.start(place, { shares });
-  browser = await openBrowser();
-  cookies = await sessionOf(browser, server.address);
-});
-after(async () => {
-  await browser?.close();
-  await server?.stop();
-  place?.remove();
-});
-
-// With the search in its address, until that is over.
-async function openTab(hash = ''): Promise<Tab> {
-  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`);
-  if (hash) await tab.over();
-  return tab;
-}
+const stage = new Stage((place) => ({ files: makeFiles(place), many: makeMany(place) }));
 
 test('reload and a shared link repeat the search; the way back leads to the one before', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   const { page } = tab;
   await page.fill('#pattern', 'plan');
   await page.click('text=Criteria');
@@ -60,7 +35,7 @@ test('reload and a shared link repeat the search; the way back leads to the one 
 });
 
 test('a found folder opens; the way back leads to its row, and closes details first', async () => {
-  const tab = await openTab('#q=*&in=/many&sort=-name');
+  const tab = await stage.openTab('#q=*&in=/many&sort=-name');
   const { page, tasks } = tab;
   const details = page.locator('.details');
   await page.focus('.table');
@@ -100,18 +75,22 @@ test('a found folder opens; the way back leads to its row, and closes details fi
 });
 
 test('past searches are offered, repeated and cleared', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   const { page } = tab;
-  await tab.search('notes');
+  // A search is remembered a moment after its rows are there.
+  const isRemembering = (reply: Response) => reply.url().endsWith('/past') && reply.request().method() === 'POST';
+  const remembered = (search: Promise<void>) => Promise.all([search, page.waitForResponse(isRemembering)]);
+  await remembered(tab.search('plan type:file'));
+  await remembered(tab.search('notes'));
   // All that was asked for comes back, days as they were chosen.
-  await page.goto(`${server.origin}/#q=needle&ext=txt&in=/files/docs&contents=1&modified=last-7-days`);
-  await tab.over();
+  const needleAddress = '#q=needle&ext=txt&in=/files/docs&contents=1&modified=last-7-days';
+  await remembered(page.goto(`${stage.server.origin}/${needleAddress}`).then(() => tab.over()));
   assert.deepEqual(await tab.names(), ['notes.txt']);
   // The key is pressed before the history has come, which waits for it here.
   let come = () => {};
   const pressed = new Promise<void>((go) => (come = go));
   await page.route('**/past', (route) => void pressed.then(() => route.continue()));
-  await page.goto(server.origin + '/');
+  await page.goto(stage.server.origin + '/');
   await page.reload();
   await page.press('#pattern', 'ArrowDown');
   come();
@@ -147,9 +126,9 @@ test('past searches are offered, repeated and cleared', async () => {
   assert.equal(await page.getByRole('option').count(), 0);
   // A damaged file of other clients' history: what stays as it is must not be told as if it would pass.
   await tab.search('notes');
-  await page.goto(`${server.origin}/#q=plan&ext=txt&in=/files/docs`);
+  await page.goto(`${stage.server.origin}/#q=plan&ext=txt&in=/files/docs`);
   await tab.over();
-  const users = join(place.root, 'state/users');
+  const users = join(stage.place.root, 'state/users');
   const store = join(users, fs.readdirSync(users)[0]!, 'preference/search_history.db');
   fs.writeFileSync(store, 'no database'.repeat(100));
   await page.fill('#pattern', '');
@@ -162,9 +141,9 @@ test('past searches are offered, repeated and cleared', async () => {
 });
 
 test('leaving the page cleans its searches; coming back repeats them', async () => {
-  const tab = await openTab('#q=plan');
+  const tab = await stage.openTab('#q=plan');
   const { page, tasks } = tab;
-  const known = async (task: string) => (await page.request.get(`${server.origin}/searches/${task}`)).status();
+  const known = async (task: string) => (await page.request.get(`${stage.server.origin}/searches/${task}`)).status();
   const gone = async (task: string) => {
     for (let tries = 0; tries < 100 && (await known(task)) !== 404; ++tries) await page.waitForTimeout(100);
     assert.equal(await known(task), 404);

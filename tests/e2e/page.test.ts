@@ -1,50 +1,27 @@
 // What people do with the page, from the address that the server prints to leaving it.
 import assert from 'node:assert/strict';
 import * as fs from 'node:fs';
-import { after, before, test } from 'node:test';
-import type { Browser } from 'playwright-core';
-import { openBrowser, type Cookies, Tab } from './browser.ts';
-import { Index, Place, Server } from './server.ts';
+import { test } from 'node:test';
+import { Tab } from './browser.ts';
+import { Index } from './server.ts';
+import { Stage } from './stage.ts';
 import { HOSTILE, itemName, makeFiles, makeMany, MANY } from './tree.ts';
 
-let place: Place;
-let server: Server;
-let browser: Browser;
-let cookies: Cookies;
-
-before(async () => {
-  place = new Place();
-  const shares = { files: makeFiles(place), many: makeMany(place) };
-  for (const folder of Object.values(shares)) place.giveAway(folder);
-  server = await Server.start(place, { shares });
-  browser = await openBrowser();
-});
-after(async () => {
-  await browser?.close();
-  await server?.stop();
-  place?.remove();
-});
-
-// A tab with the session that the first test opened; `hash` is the search in its address.
-async function openTab(hash = '', options = {}): Promise<Tab> {
-  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`, options);
-  if (hash) await tab.over();
-  return tab;
-}
+const stage = new Stage((place) => ({ files: makeFiles(place), many: makeMany(place) }));
 
 test('without a session the page tells to open the printed address, which works', async () => {
-  const tab = await Tab.open(browser);
-  await tab.page.goto(server.origin);
+  const tab = await Tab.open(stage.browser);
+  await tab.page.goto(stage.server.origin);
   await tab.page.getByRole('heading', { name: 'Open the printed address' }).waitFor();
-  await tab.page.goto(server.address + '#q=plan');
+  await tab.page.goto(stage.server.address + '#q=plan');
   await tab.page.waitForSelector('#pattern:focus');
   assert.equal(new URL(tab.page.url()).search, '', 'the token does not stay in the address');
-  cookies = await tab.page.context().cookies();
+  stage.cookies = await tab.page.context().cookies();
   await tab.close();
 });
 
 test('a search shows what was found, marked, and how it went', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   const { page } = tab;
   await tab.search('PLAN !middle');
   assert.equal(await tab.count(), '3 matches'); // the folder "plans" too
@@ -57,7 +34,7 @@ test('a search shows what was found, marked, and how it went', async () => {
 });
 
 test('columns sort, and back to the order found', async () => {
-  const tab = await openTab('#q=plan*.txt');
+  const tab = await stage.openTab('#q=plan*.txt');
   const { page } = tab;
   const order = async (column: string) => {
     await page.getByRole('columnheader', { name: column }).getByRole('button').click();
@@ -85,7 +62,7 @@ test('columns sort, and back to the order found', async () => {
 });
 
 test('a table of many rows is scrolled to any of them, and fetches only what is seen', async () => {
-  const tab = await openTab('#q=item&in=/many&sort=name');
+  const tab = await stage.openTab('#q=item&in=/many&sort=name');
   const { page } = tab;
   let fetched = 0;
   page.on('request', (request) => request.url().endsWith('/list') && ++fetched);
@@ -97,7 +74,7 @@ test('a table of many rows is scrolled to any of them, and fetches only what is 
 
 test('so is one that is higher than a browser can lay out', async () => {
   const million = 1_000_000;
-  const tab = await openTab();
+  const tab = await stage.openTab();
   // More files than a test can make: the replies tell of them, once the search has begun without any.
   await tab.page.route('**/searches', async (route) => {
     const reply = await route.fetch();
@@ -147,7 +124,7 @@ async function walkTable(tab: Tab, rows: number): Promise<void> {
 }
 
 test('a running search is stopped, and says so', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   const { page } = tab;
   await page.fill('#pattern', 'needle|slow');
   await page.click('text=Criteria');
@@ -162,7 +139,7 @@ test('a running search is stopped, and says so', async () => {
 });
 
 test('hostile names are shown as text, everywhere', async () => {
-  const tab = await openTab('#q=hostile+&sort=name');
+  const tab = await stage.openTab('#q=hostile+&sort=name');
   const { page } = tab;
   const names = await tab.names();
   const visible: Record<string, string> = { '\n': '\\n', '\t': '\\t', '\u202e': 'U+202E', '\x1b': '\\x1B' };
@@ -179,7 +156,7 @@ test('hostile names are shown as text, everywhere', async () => {
   await tab.search('"<img src=x onerror=alert(2)>"');
   assert.equal(await page.textContent('.row mark >> nth=0'), '<img src=x onerror=alert(2)>');
   assert.equal(await page.title(), '"<img src=x onerror=alert(2)>" · Arbory Search');
-  await page.goto(`${server.origin}/#q=${encodeURIComponent('"><script>alert(4)</script>')}`);
+  await page.goto(`${stage.server.origin}/#q=${encodeURIComponent('"><script>alert(4)</script>')}`);
   await page.reload();
   await tab.over();
   await page.getByText('Nothing found').waitFor();
@@ -187,7 +164,7 @@ test('hostile names are shown as text, everywhere', async () => {
 });
 
 test('files are previewed, downloaded and their paths copied, by keyboard', async () => {
-  const tab = await openTab('#q=*&in=/files/docs&sort=name', { acceptDownloads: true });
+  const tab = await stage.openTab('#q=*&in=/files/docs&sort=name', { acceptDownloads: true });
   const { page } = tab;
   await page.context().grantPermissions(['clipboard-read', 'clipboard-write']);
   await page.press('#pattern', 'ArrowDown');
@@ -220,7 +197,7 @@ test('files are previewed, downloaded and their paths copied, by keyboard', asyn
 });
 
 test('the whole result is saved, page by page', async () => {
-  const tab = await openTab('#q=item+00&in=/many&sort=name', { acceptDownloads: true });
+  const tab = await stage.openTab('#q=item+00&in=/many&sort=name', { acceptDownloads: true });
   const { page } = tab;
   const saved = async (format: string) => {
     await page.getByRole('button', { name: 'Save result' }).click();
@@ -241,7 +218,7 @@ test('the whole result is saved, page by page', async () => {
 });
 
 test('folders are chosen from a tree', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   const { page } = tab;
   await page.getByRole('button', { name: 'All folders' }).click();
   await page.getByRole('button', { name: 'Folders in files' }).click();
@@ -262,12 +239,12 @@ test('failures are sentences that say what to do', async () => {
     ['#q=x&in=/files/locked', 'ask their owner for access'],
   ];
   for (const [hash, sentence] of rows) {
-    const tab = await openTab();
-    await tab.page.goto(`${server.origin}/${hash}`);
+    const tab = await stage.openTab();
+    await tab.page.goto(`${stage.server.origin}/${hash}`);
     await tab.page.getByText(sentence).waitFor();
     await tab.close();
   }
-  const tab = await openTab();
+  const tab = await stage.openTab();
   await tab.page.click('text=Criteria');
   await tab.search('plan');
   await tab.page.getByLabel('Size from').fill('huge');
@@ -286,7 +263,7 @@ test('failures are sentences that say what to do', async () => {
 });
 
 test('what finds nothing tells what is in the way, and what is near', async () => {
-  const tab = await openTab();
+  const tab = await stage.openTab();
   await tab.search('plam ext:txt');
   await tab.page.getByText('Without plam there would be').waitFor();
   await tab.page.getByRole('button', { name: 'plan large.txt' }).click();
@@ -299,7 +276,7 @@ test('what finds nothing tells what is in the way, and what is near', async () =
 });
 
 test('a lost session asks to sign in again', async () => {
-  const tab = await openTab('#q=plan');
+  const tab = await stage.openTab('#q=plan');
   await tab.page.context().clearCookies();
   await tab.page.press('#pattern', 'Enter');
   await tab.page.getByRole('heading', { name: 'Open the printed address' }).waitFor();
@@ -307,7 +284,7 @@ test('a lost session asks to sign in again', async () => {
 });
 
 test('it is usable on a phone', async () => {
-  const tab = await openTab('#q=plan', { viewport: { width: 390, height: 800 }, hasTouch: true, isMobile: true });
+  const tab = await stage.openTab('#q=plan', { viewport: { width: 390, height: 800 }, hasTouch: true, isMobile: true });
   const { page } = tab;
   assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 390);
   await page.getByLabel('Sort by').selectOption('size');
@@ -338,7 +315,7 @@ test('screen readers find names, roles and contrast in order, light and dark', a
   const axe = fs.readFileSync(require.resolve('axe-core/axe.min.js'), 'utf8');
   for (const colorScheme of ['light', 'dark'] as const) {
     for (const [state, hash, action] of [...states, ...typed]) {
-      const tab = await openTab(hash.startsWith('#') ? hash : '', { colorScheme });
+      const tab = await stage.openTab(hash.startsWith('#') ? hash : '', { colorScheme });
       if (hash && !hash.startsWith('#')) {
         await tab.page.locator('#pattern').pressSequentially(hash);
         await tab.page.waitForSelector(action!);
@@ -366,9 +343,9 @@ interface Axe {
 }
 
 test('with an index, the best results are there while one types', async () => {
-  const index = await Index.start(place);
+  const index = await Index.start(stage.place);
   try {
-    const tab = await openTab();
+    const tab = await stage.openTab();
     const { page } = tab;
     await page.fill('#pattern', 'pla');
     await page.getByText('from the index').waitFor();

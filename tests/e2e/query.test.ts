@@ -2,36 +2,18 @@
 // another view of the same query.
 import assert from 'node:assert/strict';
 import * as fs from 'node:fs';
-import { after, before, test } from 'node:test';
+import { test } from 'node:test';
 import { join } from 'node:path';
-import type { Browser } from 'playwright-core';
 import { Highlighter } from '../../web/src/model/highlight.ts';
 import { wordsOf, type Span } from '../../web/src/model/query.ts';
-import { openBrowser, type Cookies, sessionOf, Tab } from './browser.ts';
-import { Place, Server } from './server.ts';
+import type { Tab } from './browser.ts';
+import { Stage } from './stage.ts';
 import { makeFiles } from './tree.ts';
 
-let place: Place;
-let server: Server;
-let browser: Browser;
-let cookies: Cookies;
-
-before(async () => {
-  place = new Place();
-  const shares = { files: makeFiles(place), photos: place.folder('photos') };
-  for (const folder of Object.values(shares)) place.giveAway(folder);
-  server = await Server.start(place, { shares });
-  browser = await openBrowser();
-  cookies = await sessionOf(browser, server.address);
-});
-after(async () => {
-  await browser?.close();
-  await server?.stop();
-  place?.remove();
-});
+const stage = new Stage((place) => ({ files: makeFiles(place), photos: place.folder('photos') }));
 
 async function openTab(hash = '', options = {}): Promise<Tab> {
-  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`, options);
+  const tab = await stage.openTab(hash, options);
   await tab.page.waitForSelector('#pattern:focus');
   return tab;
 }
@@ -57,7 +39,7 @@ test('what is marked in a name is what the engine has found there', async () => 
   for (const { pattern, name, marks, why } of rows) {
     // The engine judges; only of a single term is nothing marked where it says no.
     if (marks === null && !isOneTerm(pattern)) continue;
-    const reply = await tab.page.request.post(`${server.origin}/query`, { data: { pattern }, headers: { Origin: server.origin } });
+    const reply = await tab.page.request.post(`${stage.server.origin}/query`, { data: { pattern }, headers: { Origin: stage.server.origin } });
     const { spans } = (await reply.json()) as { spans: Span[] };
     let text = '';
     let at = 0;

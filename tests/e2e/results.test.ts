@@ -1,37 +1,12 @@
 // What people do with rows they have found: choosing several of them, and looking at them.
 import assert from 'node:assert/strict';
 import { execFileSync } from 'node:child_process';
-import { after, before, test } from 'node:test';
+import { test } from 'node:test';
 import { join } from 'node:path';
-import type { Browser } from 'playwright-core';
-import { openBrowser, type Cookies, sessionOf, Tab } from './browser.ts';
-import { Place, Server } from './server.ts';
+import { Stage } from './stage.ts';
 import { makeFiles } from './tree.ts';
 
-let place: Place;
-let server: Server;
-let browser: Browser;
-let cookies: Cookies;
-
-before(async () => {
-  place = new Place();
-  const files = makeFiles(place);
-  place.giveAway(files);
-  server = await Server.start(place, { shares: { files } });
-  browser = await openBrowser();
-  cookies = await sessionOf(browser, server.address);
-});
-after(async () => {
-  await browser?.close();
-  await server?.stop();
-  place?.remove();
-});
-
-async function openTab(hash: string, options = {}): Promise<Tab> {
-  const tab = await Tab.openAt(browser, cookies, `${server.origin}/${hash}`, options);
-  await tab.over();
-  return tab;
-}
+const stage = new Stage((place) => ({ files: makeFiles(place) }));
 
 // What an unpacker makes of it: names, and whether all that is in it is sound.
 const UNPACK = `
@@ -44,7 +19,7 @@ const unpacked = (path: string) =>
   execFileSync('python3', ['-c', UNPACK, path], { encoding: 'utf8' }).trim().split('\n');
 
 test('several rows are chosen by mouse and keys, copied and downloaded as one archive', async () => {
-  const tab = await openTab('#q=plan*.txt|notes|view&sort=name', { acceptDownloads: true });
+  const tab = await stage.openTab('#q=plan*.txt|notes|view&sort=name', { acceptDownloads: true });
   const { page } = tab;
   await page.context().grantPermissions(['clipboard-read', 'clipboard-write']);
   const all = ['notes.txt', 'plan large.txt', 'plan middle.txt', 'plan small.txt', 'view.png'];
@@ -102,7 +77,7 @@ test('several rows are chosen by mouse and keys, copied and downloaded as one ar
 });
 
 test('what was found is narrowed while one types, and columns are chosen', async () => {
-  const tab = await openTab('#q=plan*.txt&sort=name', { acceptDownloads: true });
+  const tab = await stage.openTab('#q=plan*.txt&sort=name', { acceptDownloads: true });
   const { page, tasks } = tab;
   const shows = (figures: string) => page.locator('.figures strong', { hasText: figures }).waitFor();
   await page.focus('.table');
@@ -134,7 +109,7 @@ test('what was found is narrowed while one types, and columns are chosen', async
   await page.getByRole('checkbox', { name: 'Small pictures' }).check();
   await page.keyboard.press('Escape');
   assert.deepEqual(await heads(), ['Name', 'Folder', 'Size', 'Modified', 'Created', 'Owner']);
-  const owner = execFileSync('stat', ['-c', '%U', join(place.root, 'files/plans/plan large.txt')], { encoding: 'utf8' }).trim();
+  const owner = execFileSync('stat', ['-c', '%U', join(stage.place.root, 'files/plans/plan large.txt')], { encoding: 'utf8' }).trim();
   assert.equal(await page.textContent('#row-0 .user'), owner);
   await page.getByRole('columnheader', { name: 'Created' }).getByRole('button').click();
   await page.waitForURL(/sort=-crtime/);
@@ -144,7 +119,7 @@ test('what was found is narrowed while one types, and columns are chosen', async
   await page.setViewportSize({ width: 720, height: 700 });
   await page.waitForFunction(() => document.querySelectorAll('[role=columnheader]').length < 6);
   assert.equal(await page.evaluate(() => document.documentElement.scrollWidth), 720);
-  await page.goto(`${server.origin}/#q=view.png`);
+  await page.goto(`${stage.server.origin}/#q=view.png`);
   await page.waitForFunction(() => document.querySelector<HTMLImageElement>('#row-0 .thumbnail')?.naturalWidth === 1);
   await tab.close();
 });

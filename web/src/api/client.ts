@@ -119,8 +119,9 @@ export async function beginSearch(
 
 type Past = Promise<{ searches: PastSearch[] }>;
 export const getPast = () => request('past') as Past;
+// Outlives the page too: a search whose page was left at once is remembered.
 export const changePast = (change: { add: string } | { pin: string; name: string } | { remove: string } | { clear: true }) =>
-  post('past', change) as Past;
+  post('past', change, { keepalive: true }) as Past;
 // The histories that other clients read, into which the searches of the page go too.
 export const clearHistory = (search_type: HistoryKind) =>
   call<null>(HISTORY, 'delete', { search_type });
