@@ -31,15 +31,16 @@ class ResultWriter : public RowSink {
   std::uint64_t rows();
 
  private:
-  std::mutex mutex_;  // guards everything below
-  Database db_;
-  void WriteLocations();
-
   struct Location {
     std::uint16_t id;
     std::string share_name;
     std::string share_root;
   };
+
+  void WriteLocations();
+
+  std::mutex mutex_;  // guards everything below
+  Database db_;
   std::vector<Location> locations_;  // not yet written
   Statement insert_location_;
   Statement insert_names_;

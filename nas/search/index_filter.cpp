@@ -9,6 +9,7 @@
 
 #include "nas/match/required_texts.h"
 #include "nas/match/word_finder.h"
+#include "nas/search/spans.h"
 
 namespace nas {
 
@@ -97,24 +98,9 @@ void IndexFilter::PrepareScan(const QueryNode& root) {
 
 namespace {
 
-// The text, of `end` that lie end to end, that holds the byte at `offset`: that of `from` or of a
-// later one, and most often of one that is near.
-template <class BeginOf>
-EntryId TextFrom(const BeginOf& begin_of, EntryId from, EntryId end, std::uint64_t offset) {
-  EntryId step = 1;
-  while (from + step < end && begin_of(from + step) <= offset) {
-    from += step;
-    step *= 2;
-  }
-  for (; step > 0; step /= 2) {
-    if (from + step < end && begin_of(from + step) <= offset) from += step;
-  }
-  return from;
-}
-
 EntryId EntryFrom(const NameTable& table, EntryId from, std::uint64_t offset) {
   const auto begin_of = [&table](EntryId entry) { return table.text_begin(entry); };
-  return TextFrom(begin_of, from, table.entries(), offset);
+  return SpanFrom(begin_of, from, table.entries(), offset);
 }
 
 // Takes those of the texts [begin, end), which lie end to end, in which the expression finds
@@ -127,11 +113,11 @@ bool ScanTexts(const RegexScan& scan, std::string_view texts, EntryId begin, Ent
   for (size_t at = 0; at < texts.size(); at = begin_of(text + 1) - base, ++text) {
     const auto place = scan.Find(texts, at);
     if (!place) {
-      for (text = TextFrom(begin_of, text, end, base + at); text < end; ++text) take(text);
+      for (text = SpanFrom(begin_of, text, end, base + at); text < end; ++text) take(text);
       return false;
     }
     if (*place >= texts.size()) break;
-    text = TextFrom(begin_of, text, end, base + *place);
+    text = SpanFrom(begin_of, text, end, base + *place);
     take(text);
   }
   return true;

@@ -8,6 +8,8 @@
 #include <iterator>
 #include <thread>
 
+#include "nas/search/spans.h"
+
 namespace nas {
 namespace {
 
@@ -91,18 +93,10 @@ std::string_view FoldedNameOf(const NameTable& table, EntryId entry) {
   return text.substr(0, text.find('\1'));
 }
 
-// The folder that the entry lies in, which is most often near `from`, or that itself.
+// The folder that the entry lies in: `from` or a later one.
 FolderId FolderFrom(const NameTable& table, FolderId from, EntryId entry) {
-  const FolderId last = table.folders() - 1;
-  FolderId step = 1;
-  while (step <= last - from && table.entries_begin(from + step) <= entry) {
-    from += step;
-    step *= 2;
-  }
-  for (; step > 0; step /= 2) {
-    if (step <= last - from && table.entries_begin(from + step) <= entry) from += step;
-  }
-  return from;
+  const auto begin_of = [&table](FolderId folder) { return table.entries_begin(folder); };
+  return SpanFrom(begin_of, from, table.folders(), entry);
 }
 
 }  // namespace
