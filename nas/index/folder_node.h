@@ -42,7 +42,7 @@ struct FolderNode {
   enum class State : std::uint8_t {
     kWaiting,
     kGone,       // no such folder any more
-    kElsewhere,  // of another mount, file system or tree: an entry without a folder
+    kElsewhere,  // not of this tree, or out of reach: an entry without a folder
     kRead,       // `entries` are what it holds
     kKept,       // it holds what the older table says of `old`, but for `changed`
   };

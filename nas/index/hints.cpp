@@ -10,6 +10,11 @@ namespace {
 constexpr size_t kMostNames = 64;
 constexpr size_t kNamesPerEntries = 16;
 
+bool HasStrays(const NameTable& table, NameTable::FolderId folder) {
+  const auto first = std::ranges::lower_bound(table.strays(), table.entries_begin(folder));
+  return first != table.strays().end() && *first < table.entries_end(folder);
+}
+
 }  // namespace
 
 NameTable::FolderId Hints::IdOf(std::string_view folder) const {
@@ -108,10 +113,10 @@ void Hints::NoteTree(NameTable::FolderId folder, std::string_view name) {
   tree_came_ = true;
 }
 
-// Its permissions may have changed, and with them whether the entries can be read.
+// Its permissions may have changed, and with them whether the entries can be read or looked up.
 void Hints::NoteFolder(NameTable::FolderId folder) {
   changes_.AddInode(table_->folder_inode(folder));
-  if (table_->unreadable(folder)) changes_.AddFolder(folder);
+  if (table_->unreadable(folder) || HasStrays(*table_, folder)) changes_.AddFolder(folder);
 }
 
 void Hints::CheckBounds() {

@@ -12,6 +12,13 @@
 #include "nas/index/open_path.h"
 
 namespace nas {
+namespace {
+
+// Whether there is no folder of that name: of that its parent's events tell.
+bool IsGone(int error) { return error == ENOENT || error == ENOTDIR || error == ELOOP; }
+
+}  // namespace
+
 NameTable::FolderId OldTable::FirstHint(NameTable::FolderId begin, NameTable::FolderId end) const {
   const auto first = hinted.lower_bound(begin);
   return first != hinted.end() && *first < end ? *first : NameTable::kNoFolder;
@@ -51,6 +58,8 @@ UniqueFd TreeReader::Worker::Open(const Queue::Task& task, bool& readable) {
   UniqueFd reopened;
   if (!task.parent && node.parent != nullptr) {
     reopened = reader_.OpenByPath(*node.parent);
+    // It may come back, and nothing be told of what lies in it.
+    if (!reopened && IsGone(errno)) errno = ESTALE;
     if (!reopened) return reopened;
   }
   int parent = reader_.roots_[node.tree].fd;
@@ -58,8 +67,8 @@ UniqueFd TreeReader::Worker::Open(const Queue::Task& task, bool& readable) {
   constexpr int kFlags = O_DIRECTORY | O_NOFOLLOW;
   UniqueFd fd = OpenOnSameMount(parent, node.name.data(), O_RDONLY | O_NONBLOCK | kFlags);
   readable = static_cast<bool>(fd);
-  const bool forbidden = errno != ENOENT && errno != ENOTDIR && errno != ELOOP && errno != EXDEV &&
-                         errno != ESTALE && errno != EMFILE && errno != ENFILE && errno != ENOMEM;
+  const bool forbidden = !IsGone(errno) && errno != EXDEV && errno != ESTALE && errno != EMFILE &&
+                         errno != ENFILE && errno != ENOMEM;
   if (!fd && forbidden) fd = OpenOnSameMount(parent, node.name.data(), O_PATH | kFlags);
   return fd;
 }
@@ -73,7 +82,8 @@ void TreeReader::Worker::ReadNode(const Queue::Task& task) {
       return reader_.queue_.Fail(ErrnoError());
     if (node.parent == nullptr)
       return reader_.queue_.Fail(ErrnoError(reader_.roots_[node.tree].name));
-    node.state = errno == EXDEV ? FolderNode::State::kElsewhere : FolderNode::State::kGone;
+    // One that is there and cannot be had may be had by whoever asks, as once its parent opens.
+    node.state = IsGone(errno) ? FolderNode::State::kGone : FolderNode::State::kElsewhere;
     return Mismatch(node);
   }
   node.folder.key = KeyOf(fd.get()).value_or({});
