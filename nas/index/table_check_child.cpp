@@ -1,7 +1,9 @@
 #include "nas/index/table_check_child.h"
 
+#include <sys/prctl.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <cstdlib>
 #include <string>
 
@@ -50,10 +52,14 @@ void Compare(int connection, const NameTable& table, const Changes& changes, boo
 
 pid_t StartCheck(int connection, const NameTable& table, const Changes& changes, bool attributes,
                  const std::vector<TableRoot>& roots) {
+  const pid_t parent = getpid();
   const pid_t pid = fork();
   if (pid != 0) return pid;
   ResetSignals();
   OfferToOutOfMemoryKiller();
+  // It holds the watcher's lock on the folder of tables, which the next watcher waits for.
+  prctl(PR_SET_PDEATHSIG, SIGKILL);
+  if (getppid() != parent) _exit(EXIT_FAILURE);
   try {
     Compare(connection, table, changes, attributes, roots);
   } catch (...) {

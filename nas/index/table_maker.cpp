@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <unistd.h>
@@ -96,6 +97,8 @@ Result<TableMaker> TableMaker::Make(const FileSystem& file_system, const std::st
   if (!opened) return ErrnoError(folder);
   const Status own = CheckPrivateTo(opened.get(), geteuid());
   if (!own) return own.error().Of(folder);
+  // Whoever is killed leaves it to the child that still writes for it.
+  if (flock(opened.get(), LOCK_EX | LOCK_NB) != 0) return ErrnoError(folder);
   return TableMaker(file_system, std::move(opened), trees, figures);
 }
 

@@ -30,7 +30,8 @@ class TableMaker {
     kMergeAll,  // the same, with all attributes read anew
   };
 
-  // `trees` and `figures` must outlive it. Makes the folder, 0700. For one thread.
+  // `trees` and `figures` must outlive it. Makes the folder, 0700. For one thread. EWOULDBLOCK
+  // while another one has the folder, or a child that it has left behind.
   static Result<TableMaker> Make(const FileSystem& file_system, const std::string& folder,
                                  const Trees& trees, Figures& figures);
 

@@ -43,6 +43,8 @@ constexpr size_t kMostQuestions = 64;
 constexpr std::chrono::seconds kFirstRetry{5};
 constexpr std::chrono::seconds kLongestRetry{600};
 constexpr std::chrono::seconds kBetweenGaps{5};
+// The one before has nothing to wait for.
+constexpr std::chrono::milliseconds kUntilOtherIsGone{20};
 // A clean end waits so long for the last table; the broker a little longer.
 constexpr int kEndMilliseconds = 15'000;
 
@@ -103,6 +105,7 @@ class Watcher {
   std::optional<Clock::time_point> gap_;
   std::map<pid_t, uid_t> questions_;
   bool ending_ = false;
+  bool orphaned_ = false;
 };
 
 int Watcher::Run() {
@@ -150,6 +153,11 @@ void Watcher::Begin() {
   trees_ = std::move(*trees);
   figures_.by_folder = trees_->by_folder() != nullptr;
   auto maker = TableMaker::Make(setup_.file_system, setup_.folder, *trees_, figures_);
+  if (!maker && maker.error().error_number == EWOULDBLOCK) {
+    trees_.reset();
+    retry_ = Clock::now() + kUntilOtherIsGone;
+    return;
+  }
   if (!maker) return Fail(maker.error().error_number);
   maker_.emplace(std::move(*maker));
   Watch(trees_->events().fd(), Mark::kEvents, EPOLLIN);
@@ -351,11 +359,12 @@ void Watcher::Publish() {
   figures_.watches = by_folder == nullptr ? 0 : by_folder->watches();
 }
 
-// What was not written would be found by comparing, at the next start; it is sooner so.
+// What was not written would be found by comparing, at the next start; it is sooner so. But where
+// the broker was killed, the next one may have started already, and waits for this process to end.
 void Watcher::Finish() {
   Abandon();
-  const bool worth = setup_.file_system.keeps && Answers(state_) && table_ && maker_ &&
-                     trees_->by_folder() == nullptr && hints_.changes().size() > 0;
+  const bool worth = !orphaned_ && setup_.file_system.keeps && Answers(state_) && table_ &&
+                     maker_ && trees_->by_folder() == nullptr && hints_.changes().size() > 0;
   if (!worth) return;
   StartJob(TableMaker::Kind::kMerge);
   if (!maker_->working()) return;
@@ -369,7 +378,7 @@ void Watcher::TakeMessages() {
     const MessageState got = ReceiveMessage(setup_.broker.get(), &message);
     if (got == MessageState::kNone) return;
     if (got == MessageState::kEnded) {
-      ending_ = true;
+      ending_ = orphaned_ = true;
       return;
     }
     Serve(message);

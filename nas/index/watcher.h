@@ -34,8 +34,9 @@ struct WatcherSetup {
   AnswerFunction answer;
 };
 
-// Runs until SIGTERM, writing the table anew where something has changed since it was, or until
-// the broker is gone. For a process of its own with one thread. Returns its exit status.
+// Begins once no other watcher has the same folder, whose broker may have been killed. Runs until
+// SIGTERM, writing the table anew where something has changed since it was, or until the broker is
+// gone. For a process of its own with one thread. Returns its exit status.
 int RunWatcher(WatcherSetup setup);
 
 }  // namespace nas

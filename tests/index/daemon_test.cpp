@@ -163,6 +163,14 @@ TEST_F(Events, OfSingleFolders) {
 class Life : public DaemonTest {
  protected:
   pid_t Watcher() { return Report()["file_systems"][0]["pid"].asInt(); }
+  ino_t InodeOfTable() {
+    for (const auto& file : fs::recursive_directory_iterator(state_ + "/index")) {
+      struct stat status;
+      if (file.path().filename() != "names") continue;
+      if (stat(file.path().c_str(), &status) == 0) return status.st_ino;
+    }
+    return 0;
+  }
   void Change(int round) {
     const std::string folder = tree_ + "/round" + std::to_string(round);
     fs::create_directories(folder + "/x/y");
@@ -206,8 +214,12 @@ TEST_F(Life, SurvivesEveryEnd) {
       {"the daemon killed",
        [&] {
          const pid_t watcher = Watcher();
+         Change(round++);
+         EXPECT_FALSE(See(tree_)["changes"].empty());
+         const ino_t before = InodeOfTable();
          StopDaemon(SIGKILL);
          EXPECT_TRUE(Eventually([&] { return kill(watcher, 0) != 0; })) << "a watcher is left";
+         EXPECT_EQ(InodeOfTable(), before) << "written while the next daemon may have its own";
          Change(round++);
          StartDaemon();
        }},
@@ -232,6 +244,32 @@ TEST_F(Life, SurvivesEveryEnd) {
     end();
     ExpectEqual();
   }
+}
+
+// Whose table it would be, and what has happened since that was made, only one of them knows.
+TEST_F(Life, BeginsOnceTheWatcherBeforeItIsGone) {
+  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
+  MountTree("ext4");
+  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
+  MakeTree(tree_);
+  StartDaemon();
+  ExpectEqual();
+  const pid_t watcher = Watcher();
+  Change(0);
+  kill(watcher, SIGSTOP);
+  StopDaemon(SIGKILL);
+  const ino_t before = InodeOfTable();
+  StartDaemon();
+  ASSERT_TRUE(Eventually([&] { return StateIs("starting"); }));
+  EXPECT_TRUE(Eventually([&] { return Watcher() > 0; }));
+  // Long enough for one that did not wait.
+  for (int look = 0; look < 50; ++look) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    ASSERT_TRUE(StateIs("starting"));
+  }
+  EXPECT_EQ(InodeOfTable(), before);
+  kill(watcher, SIGCONT);
+  ExpectEqual();
 }
 
 TEST_F(Life, FindsItsWayAfterLostEvents) {
