@@ -12,8 +12,9 @@
 namespace nas {
 
 // Of two nodes of one folder the one that was looked at earlier becomes kElsewhere: the events of
-// the move tell of both names.
-void DropMovedFolders(const std::vector<FolderNode*>& tops);
+// the move tell of both names. So does one of a folder that is taken from `old`, which may be null,
+// in another place.
+void DropMovedFolders(const std::vector<FolderNode*>& tops, const NameTable* old);
 
 // Folders of `old` in which a folder is kept that has been met as a new one elsewhere.
 std::set<NameTable::FolderId> FoldersLeft(const std::vector<FolderNode*>& tops,

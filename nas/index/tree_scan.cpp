@@ -135,7 +135,7 @@ bool HasTheseRoots(const NameTable& old, const std::vector<TableRoot>& roots) {
 
 Status WriteTable(const TreeReader& reader, const NameTable* old, ClassTable& classes,
                   const std::vector<TableRoot>& roots, const TablePlace& place) {
-  DropMovedFolders(reader.tops());
+  DropMovedFolders(reader.tops(), old);
   std::vector<std::uint16_t> rows;
   if (old != nullptr) {
     for (const TableClass& row : old->class_rows()) {

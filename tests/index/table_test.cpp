@@ -119,6 +119,39 @@ TEST_F(Table, HasAFolderOnceThatIsMovedMeanwhile) {
   EXPECT_EQ(PictureOf(*Open("merged")), PictureOf(tree_));
 }
 
+// A tree that changes faster than it is read again.
+TEST_F(Table, HasAFolderOnceThatIsMovedEachTimeItIsRead) {
+  constexpr int kMoves = 5;
+  const auto place = [](int move) { return "from" + std::to_string(move); };
+  for (int i = 0; i < kMoves; ++i) fs::create_directories(Path(place(i) + "/moved/below"));
+  fs::create_directories(Path("to"));
+  const nas::NameTable before = Scan("before");
+  const FolderId to = before.Find(KeyAt(Path("to")));
+  nas::Changes changes;
+  changes.AddName(to, "x");
+  nas::Changes told;
+  int moves = 0;
+  nas::ScanOptions options;
+  options.threads = 1;
+  std::vector<std::string> moved;
+  options.before_reading = [&](int, const nas::FolderKey& key) {
+    if (key != before.key(to) || moves == kMoves) return;
+    const std::string name = place(moves++);
+    moved.push_back(KeyAt(Path(name + "/moved/below")));
+    fs::rename(Path(name + "/moved"), Path("to/" + name));
+  };
+  ASSERT_TRUE(nas::MergeTable(before, changes, false, Roots(), Place("merged"), options));
+  ASSERT_LT(moves, kMoves);
+  const auto merged = Open("merged");
+  ASSERT_TRUE(merged);
+  for (const std::string& key : moved) EXPECT_EQ(Knowing(*merged, key), 1U);
+  for (int i = 0; i < moves; ++i) {
+    Note(*merged, place(i) + "/moved", told);
+    Note(*merged, "to/" + place(i), told);
+  }
+  EXPECT_EQ(Differences(*merged, told), "");
+}
+
 // Each, done behind the table's back with only the folder hinted at that an event would name.
 TEST_F(Table, MergesWhatIsMore) {
   struct Case {
