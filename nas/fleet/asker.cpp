@@ -114,8 +114,14 @@ void FleetAsker::SendSigned() {
 void FleetAsker::Send(Waiting waiting, const std::string& token) {
   const Request& request = waiting.request;
   FleetRequest sent;
-  // A proxy finds the box by the name that it is asked for.
-  sent.address = fleet_.proxy.empty() ? waiting.box->address : "http://" + waiting.box->name;
+  if (fleet_.proxy.empty()) {
+    sent.address = waiting.box->address;
+  } else {
+    // It finds the box by this name. The address is the same for all boxes, so that a connection to
+    // the proxy that one box has answered on is free to ask the next.
+    sent.address = "http://proxy";
+    sent.host = waiting.box->name;
+  }
   sent.method = request.method;
   sent.target = request.target;
   sent.body = request.body;
