@@ -1,9 +1,12 @@
 #include "nas/fleet/question.h"
 
 #include <cerrno>
-#include <limits>
+#include <optional>
+#include <set>
+#include <tuple>
 #include <utility>
 
+#include "nas/base/json_pull.h"
 #include "nas/base/json_text.h"
 #include "nas/match/query_json.h"
 
@@ -24,7 +27,6 @@ constexpr char kBehind[] = "behind";
 
 // As many as a search may have.
 constexpr unsigned kMostLocations = 65'535;
-constexpr Json::ArrayIndex kRowParts = 11;
 constexpr size_t kMostNameBytes = 255;  // of every file system
 constexpr size_t kMostPathBytes = 64 << 10;
 
@@ -106,76 +108,98 @@ bool IsFolderPath(std::string_view path) {
   return true;
 }
 
-// Takes a page's rows apart. Each part says false for what is not in order.
-class RowsReader {
+// Takes a page apart. Its lists may stand behind the rows that name places in them, so what a row
+// says is looked up last. Each part says false for what is not in order.
+class PageReader {
  public:
-  explicit RowsReader(const Json::Value& page) : page_(page) {}
+  explicit PageReader(std::string_view text) : text_(std::string(text)) {}
 
-  bool Read(std::vector<FleetRow>* rows) {
-    for (const char* list : {"users", "groups", "folders", "rows"}) {
-      if (!page_[list].isArray()) return false;
-    }
-    if (page_["rows"].size() > kMostFleetRows) return false;
-    for (const Json::Value& row : page_["rows"]) {
-      if (!ReadRow(row, &rows->emplace_back())) return false;
+  bool Read(FleetPage* page) {
+    const auto member = [this, page](const std::string& name) { return TakeMember(name, page); };
+    if (!text_.TakeObject(member) || !text_.AtEnd() || seen_.size() != kNeeded) return false;
+    for (size_t i = 0; i < page->rows.size(); ++i) {
+      if (!LookUp(places_[i], &page->rows[i])) return false;
     }
     return true;
   }
 
  private:
-  bool ReadRow(const Json::Value& json, FleetRow* row) {
-    if (!json.isArray() || json.size() != kRowParts || !json[1].isString()) return false;
-    row->name = json[1].asString();
-    const Json::Value* folder = Named("folders", json[0]);
-    if (folder == nullptr || !folder->isArray() || folder->size() != 2 ||
-        !(*folder)[0].isString() || !(*folder)[1].isString()) {
-      return false;
-    }
-    row->share = (*folder)[0].asString();
-    row->folder = (*folder)[1].asString();
-    return IsEntryName(row->name) && IsEntryName(row->share) && IsFolderPath(row->folder) &&
-           ReadOwner("users", json[3], &row->user) && ReadOwner("groups", json[4], &row->group) &&
-           ReadNumbers(json, &row->attributes) && ReadNumber(json[kRowParts - 1], &row->number);
+  // In a page's lists.
+  struct Places {
+    size_t folder = 0;
+    size_t user = 0;
+    size_t group = 0;
+  };
+  static constexpr size_t kNeeded = 9;  // members, of those that TakeNeeded takes
+
+  bool TakeMember(const std::string& name, FleetPage* page) {
+    if (name == "version") return text_.TakeString(&page->version);
+    if (name == "task") return text_.TakeString(&page->task);
+    if (name == "index") return text_.TakeString(&page->index);
+    if (name == "source") return text_.TakeString(&page->source);
+    const auto taken = TakeNeeded(name, page);
+    if (!taken) return text_.Skip();  // of a later version
+    return *taken && seen_.insert(name).second;
   }
 
-  static bool ReadNumber(const Json::Value& json, std::uint32_t* number) {
-    if (!json.isUInt()) return false;
-    *number = json.asUInt();
-    return true;
+  // Nothing for a name that is not known.
+  std::optional<bool> TakeNeeded(const std::string& name, FleetPage* page) {
+    int protocol = 0;
+    if (name == kProtocol) return text_.TakeNumber(&protocol) && protocol == kFleetProtocol;
+    if (name == "finished") return text_.TakeBool(&page->finished);
+    if (name == "error") return text_.TakeNumber(&page->error);
+    if (name == "total") return text_.TakeNumber(&page->total);
+    if (name == "next") return text_.TakeNumber(&page->next);
+    if (name == "users") return TakeNames(&users_);
+    if (name == "groups") return TakeNames(&groups_);
+    if (name == "folders") return text_.TakeArray([this] { return TakeFolder(); });
+    if (name == "rows") return text_.TakeArray([this, page] { return TakeRow(&page->rows); });
+    return std::nullopt;
   }
 
-  bool ReadOwner(const char* list, const Json::Value& place, std::string* name) {
-    const Json::Value* text = Named(list, place);
-    if (text == nullptr || !text->isString()) return false;
-    *name = text->asString();
+  bool TakeNames(std::vector<std::string>* names) {
+    return text_.TakeArray([&] { return text_.TakeString(&names->emplace_back()); });
+  }
+
+  bool TakeFolder() {
+    auto& [share, path] = folders_.emplace_back();
+    return text_.EnterArray() && text_.TakeString(&share) && text_.TakeString(&path) &&
+           text_.LeaveArray() && IsEntryName(share) && IsFolderPath(path);
+  }
+
+  bool TakeRow(std::vector<FleetRow>* rows) {
+    if (rows->size() == kMostFleetRows) return false;
+    FleetRow& row = rows->emplace_back();
+    Places& places = places_.emplace_back();
+    FileAttributes& file = row.attributes;
+    const bool taken = text_.EnterArray() && text_.TakeNumber(&places.folder) &&
+                       text_.TakeString(&row.name) && text_.TakeNumber(&file.mode) &&
+                       text_.TakeNumber(&places.user) && text_.TakeNumber(&places.group) &&
+                       text_.TakeNumber(&file.size) && text_.TakeNumber(&file.mtime) &&
+                       text_.TakeNumber(&file.atime) && text_.TakeNumber(&file.ctime) &&
+                       (text_.TakeNull() || text_.TakeNumber(&file.crtime)) &&
+                       text_.TakeNumber(&row.number) && text_.LeaveArray();
+    return taken && IsEntryName(row.name) && std::in_range<std::int64_t>(file.size);
+  }
+
+  bool LookUp(const Places& places, FleetRow* row) const {
+    if (places.folder >= folders_.size()) return false;
+    std::tie(row->share, row->folder) = folders_[places.folder];
+    return LookUp(users_, places.user, &row->user) && LookUp(groups_, places.group, &row->group);
+  }
+
+  static bool LookUp(const std::vector<std::string>& names, size_t place, std::string* name) {
+    if (place >= names.size()) return false;
+    *name = names[place];
     return name->size() <= kMostNameBytes && name->find('\0') == std::string::npos;
   }
 
-  static bool ReadNumbers(const Json::Value& json, FileAttributes* file) {
-    if (!json[2].isUInt() || !json[5].isUInt64()) return false;
-    file->mode = json[2].asUInt();
-    file->size = json[5].asUInt64();
-    if (file->size > static_cast<std::uint64_t>(std::numeric_limits<std::int64_t>::max())) {
-      return false;
-    }
-    std::int64_t* const times[] = {&file->mtime, &file->atime, &file->ctime, &file->crtime};
-    for (Json::ArrayIndex i = 0; i < std::size(times); ++i) {
-      const Json::Value& time = json[6 + i];
-      if (time.isInt64()) {
-        *times[i] = time.asInt64();
-      } else if (times[i] != &file->crtime || !time.isNull()) {
-        return false;
-      }
-    }
-    return true;
-  }
-
-  const Json::Value* Named(const char* list, const Json::Value& place) const {
-    return place.isUInt() && place.asUInt() < page_[list].size() ? &page_[list][place.asUInt()]
-                                                                 : nullptr;
-  }
-
-  const Json::Value& page_;
+  JsonPull text_;
+  std::set<std::string> seen_;
+  std::vector<std::string> users_;
+  std::vector<std::string> groups_;
+  std::vector<std::pair<std::string, std::string>> folders_;
+  std::vector<Places> places_;  // of each row
 };
 
 // False for what is no order.
@@ -200,8 +224,6 @@ size_t TextBytes(std::string_view name) {
   }
   return bytes;
 }
-
-std::string TextOf(const Json::Value& value) { return value.isString() ? value.asString() : ""; }
 
 }  // namespace
 
@@ -305,22 +327,8 @@ void FleetPageWriter::Finish(Json::Value* page) {
 }
 
 Result<FleetPage> ReadFleetPage(std::string_view text) {
-  Json::Value json;
-  if (!ParseJson(text, &json) || !json.isObject() || json[kProtocol] != kFleetProtocol ||
-      !json["finished"].isBool() || !json["total"].isUInt64() || !json["next"].isUInt64() ||
-      !json["error"].isInt()) {
-    return kIllegal;
-  }
   FleetPage page;
-  page.version = TextOf(json["version"]);
-  page.task = TextOf(json["task"]);
-  page.index = TextOf(json["index"]);
-  page.source = TextOf(json["source"]);
-  page.finished = json["finished"].asBool();
-  page.error = json["error"].asInt();
-  page.total = json["total"].asUInt64();
-  page.next = json["next"].asUInt64();
-  if (!RowsReader(json).Read(&page.rows)) return kIllegal;
+  if (!PageReader(text).Read(&page)) return kIllegal;
   return page;
 }
 

@@ -6,7 +6,10 @@
 #include <cstdio>
 #include <limits>
 #include <new>
+#include <optional>
+#include <string_view>
 
+#include "nas/base/json_pull.h"
 #include "nas/base/json_text.h"
 #include "nas/system/memory.h"
 #include "nas/system/request_bounds.h"
@@ -113,6 +116,63 @@ TEST(Json, TellsNoMemoryFromNoDocument) {
       }
     }));
   }
+}
+
+struct PullRow {
+  const char* text;
+  const char* taken;  // its strings and numbers, each with a blank behind it; null: not in order
+  const char* why;
+};
+
+// What a page of rows is made of: ["name", number, number or null], after what is skipped.
+std::optional<std::string> Pulled(std::string_view text) {
+  nas::JsonPull pull{std::string(text)};
+  std::string name;
+  std::uint32_t small = 0;
+  std::int64_t large = 0;
+  const bool taken = pull.TakeObject([&](const std::string& member) {
+    if (member != "row") return pull.Skip();
+    return pull.EnterArray() && pull.TakeString(&name) && pull.TakeNumber(&small) &&
+           (pull.TakeNull() || pull.TakeNumber(&large)) && pull.LeaveArray();
+  });
+  if (!taken || !pull.AtEnd()) return std::nullopt;
+  return name + " " + std::to_string(small) + " " + std::to_string(large);
+}
+
+TEST(Json, IsReadInPieces) {
+  const PullRow rows[] = {
+      {" {\t\"row\" :\r\n[ \"a\" , 1 , null ] } \n", "a 1 0", "blanks, and null"},
+      {R"({"row":["\u0041\"\\\/\n\u00e9\u20ac\ud83d\ude00",1,2]})",
+       "A\"\\/\n\u00e9\u20ac\U0001F600 1 2", "every escape"},
+      {"{\"row\":[\"\xFF\xC3\",1,2]}", "\xFF\xC3 1 2", "bytes that are not UTF-8"},
+      {R"({"x":{"a":[1,-2.5e3,true,false,null,"]}"],"b":{}},"row":["a",1,2],"y":[]})", "a 1 2",
+       "what is not known is passed over"},
+      {R"({"row":["a",4294967295,-9223372036854775808]})", "a 4294967295 -9223372036854775808",
+       "edges of numbers"},
+      {R"({"row":["a",4294967296,2]})", nullptr, "beyond them"},
+      {R"({"row":["a",1,9223372036854775808]})", nullptr, "beyond the signed ones"},
+      {R"({"row":["a",1,99999999999999999999]})", nullptr, "beyond all"},
+      {R"({"row":["a",-1,2]})", nullptr, "below"},
+      {R"({"row":["a",1.0,2]})", nullptr, "a fraction"},
+      {R"({"row":["a","1",2]})", nullptr, "a string for a number"},
+      {R"({"row":["a",1,2,3]})", nullptr, "one too many"},
+      {R"({"row":["a",1]})", nullptr, "one too few"},
+      {R"({"row":["a",1,2]} x)", nullptr, "something behind it"},
+      {R"({"row":["a",1,2])", nullptr, "not ended"},
+      {R"({"row":["a)", nullptr, "a string not ended"},
+      {"{\"row\":[\"a\nb\",1,2]}", nullptr, "a control character as it is"},
+      {R"(["row"])", nullptr, "no object"},
+      {"", nullptr, "nothing"},
+  };
+  for (const PullRow& row : rows) {
+    SCOPED_TRACE(row.text);
+    EXPECT_EQ(Pulled(row.text).value_or("nothing"), row.taken == nullptr ? "nothing" : row.taken)
+        << row.why;
+  }
+  using std::string_literals::operator""s;
+  EXPECT_FALSE(Pulled("{\"row\":[\"a\",1,2]}\0, x"s)) << "something behind a NUL";
+  EXPECT_FALSE(Pulled("{\"x\":" + std::string(100'000, '[')));
+  EXPECT_TRUE(Pulled("{\"x\":" + std::string(100'000, '[') + std::string(100'000, ']') + "}"));
 }
 
 class JsonFileTest : public PlatformTest {};
