@@ -126,13 +126,13 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
       CurrentConfig().call_memory_bytes());
 }
 
-Reply FinishCall(Child child, const ReplyEncoder& encode) {
+Reply FinishCall(Child child, const ReplyEncoder& encode, ChildsEnd end) {
   Incoming incoming;
   if (child.pid > 0) {
     const UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, child.pid, 0)));
     Collect(child, process.get(), &incoming);
     child.fd.Reset();
-    Reap(child.pid);
+    if (end == ChildsEnd::kAwaited) Reap(child.pid);
   }
   return incoming.whole() ? incoming.Take() : encode(kCodeUnknownFailure, Json::Value());
 }

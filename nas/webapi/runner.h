@@ -55,7 +55,10 @@ Child StartCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEnco
 // be made or answers nothing yields encode(kCodeUnknownFailure, null).
 Reply RunCall(const NUVA::APIMethod& row, const ApiCall& call, const ReplyEncoder& encode);
 
-// The second half of RunCall, for a call begun with StartCall.
-Reply FinishCall(Child child, const ReplyEncoder& encode);
+// The second half of RunCall, for a call begun with StartCall. A process that is about to end
+// itself need not wait for the child's end, which takes as long as a short call: whoever reaps the
+// one then reaps the other.
+enum class ChildsEnd { kAwaited, kLeft };
+Reply FinishCall(Child child, const ReplyEncoder& encode, ChildsEnd end = ChildsEnd::kAwaited);
 
 }  // namespace nas

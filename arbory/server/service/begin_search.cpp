@@ -32,17 +32,23 @@ nas::ApiCall CallOf(const nas::ApiCall& outer, const NUVA::APIMethod& row, Json:
   return call;
 }
 
-// The data of a reply of the module; null where it failed, with its code in `code`.
-Json::Value DataOf(const nas::Reply& reply, int* code) {
-  *code = reply.head.code;
-  Json::Value body;
-  if (*code != 0 || !nas::ParseJson(reply.body, &body)) return {};
-  return body["data"];
+nas::Reply Ask(const NUVA::APIMethod& row, const nas::ApiCall& call,
+               const nas::ReplyEncoder& encode) {
+  return nas::FinishCall(nas::StartCall(row, call, encode), encode, nas::ChildsEnd::kLeft);
+}
+
+// The data of a reply of the module, as JSON; empty where it failed. A page is not taken apart to
+// be put together again.
+std::string DataOf(const nas::Reply& reply) {
+  constexpr std::string_view kBefore = "{\"code\":0,\"data\":";
+  const std::string_view body = reply.body;
+  if (reply.head.code != 0 || !body.starts_with(kBefore) || !body.ends_with('}')) return {};
+  return std::string(body.substr(kBefore.size(), body.size() - kBefore.size() - 1));
 }
 
 // What the search has found once that is something, or it has ended. The child that lists waits for
 // it, as one that lists again and again would take from the search what it needs to find anything.
-Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Json::Value params) {
+std::string FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Json::Value params) {
   const Json::Value& limit = params[kLimit];
   if (!limit.isInt() || limit.asInt() <= 0 || limit.asInt() > kMostRows) params[kLimit] = kMostRows;
   nas::ApiCall listing = CallOf(outer, list, {});
@@ -54,8 +60,7 @@ Json::Value FirstPage(const nas::ApiCall& outer, const NUVA::APIMethod& list, Js
     asked->swap(params);
     return std::nullopt;
   };
-  int code = 0;
-  return DataOf(nas::RunCall(list, listing, EncodeWithAddresses), &code);
+  return DataOf(Ask(list, listing, EncodeWithAddresses));
 }
 
 // What the listing will ask for, which the search may find first.
@@ -82,20 +87,21 @@ nas::Reply Begin(const nas::ApiCall& call, const NUVA::APIMethod& start,
   Json::Value listing = body["params"]["list"];
   body["params"].removeMember("list");
   ExpectPage(listing);
-  int code = 0;
   nas::ApiCall starting = CallOf(call, start, body["params"]);
   starting.asks_fleet = true;
-  const Json::Value begun = DataOf(nas::RunCall(start, starting, nas::EncodeJsonReply), &code);
-  if (code != 0) {
-    body = Json::Value();
-    body["code"] = code;
-  } else {
+  const nas::Reply reply = Ask(start, starting, nas::EncodeJsonReply);
+  std::string page;
+  if (Json::Value begun; nas::ParseJson(DataOf(reply), &begun) && begun.isObject()) {
     if (!listing.isObject()) listing = Json::Value(Json::objectValue);
     listing["taskid"] = body["taskid"] = begun["taskid"];
-    Json::Value page = FirstPage(call, list, std::move(listing));
-    if (!page.isNull()) body["page"] = std::move(page);
+    page = FirstPage(call, list, std::move(listing));
+  } else {
+    body = Json::Value();
+    body["code"] = reply.head.code;
   }
-  return AsChildsReply(JsonReply(kOk, nas::JsonText(body, nas::JsonBytes::kClean)));
+  std::string text = nas::JsonText(body, nas::JsonBytes::kClean);
+  if (!page.empty()) text.replace(text.size() - 1, 1, ",\"page\":" + page + "}");
+  return AsChildsReply(JsonReply(kOk, std::move(text)));
 }
 
 }  // namespace

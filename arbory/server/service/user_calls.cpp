@@ -333,7 +333,7 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id) 
 nas::Child StartReadQuery(const nas::ApiCall& call) { return StartOwn(ReadQueryEntry, call); }
 
 nas::Reply ReadQuery(const nas::ApiCall& call) {
-  return nas::RunCall({"arbory", 1, "", ReadQueryEntry}, call, EncodeOwnReply);
+  return nas::FinishCall(StartReadQuery(call), EncodeOwnReply, nas::ChildsEnd::kLeft);
 }
 
 nas::Child StartInstant(const nas::ApiCall& call) { return StartOwn(InstantEntry, call); }

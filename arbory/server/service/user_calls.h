@@ -40,7 +40,7 @@ nas::Child StartReadSearch(const std::string& user, const std::string& task_id);
 // bounds as "mtime", "crtime" and "atime". With a place in the pattern as "caret" there is
 // "completion" too, where something can be offered.
 nas::Child StartReadQuery(const nas::ApiCall& call);
-// The same reply, waited for in the process that calls it.
+// The same reply, waited for in the process that calls it, which is to end soon.
 nas::Reply ReadQuery(const nas::ApiCall& call);
 
 // What the index knows at once: {"index","found","more","rows"} (nas/search/instant.h), or
