@@ -17,6 +17,8 @@ namespace {
 
 namespace record = task_record;
 
+constexpr int kLooksAfterWriting = 2;
+
 int IntOf(const Json::Value& value) { return value.isInt() ? value.asInt() : 0; }
 std::uint64_t CountOf(const Json::Value& value) { return value.isUInt64() ? value.asUInt64() : 0; }
 
@@ -87,13 +89,23 @@ void WaitForFirstRows(const std::string& user, const std::string& task_id, int t
   if (!tasks) return;
   nas::GrowingPause pause(tenths);
   std::optional<nas::ResultReader> results;
+  std::optional<nas::ResultWatch> watch;
+  // What is written becomes visible a moment later, so the first look may come too soon.
+  int looks = 0;
+  const auto written = [&] {
+    if (watch && watch->Changed()) looks = kLooksAfterWriting;
+    return looks > 0 && looks-- > 0;
+  };
   do {
     // In this order, so that the last rows are seen.
     const bool ended = !tasks->IsAlive(task_id);
     if (!results) {
       // The file's name is known when it is whole.
       const std::string path = ReadSearch(user, task_id).results;
-      if (!path.empty()) results.emplace(path);
+      if (!path.empty()) {
+        watch.emplace(path);
+        results.emplace(path);
+      }
     }
     if (results) {
       results->Begin();
@@ -102,7 +114,7 @@ void WaitForFirstRows(const std::string& user, const std::string& task_id, int t
       if (any) return;
     }
     if (ended) return;
-  } while (pause.Wait());
+  } while (pause.Wait(written));
 } catch (const std::exception&) {
   // Whoever lists them says what is wrong.
 }

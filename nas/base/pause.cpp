@@ -21,6 +21,13 @@ long long Now() {
   return now.tv_sec * kNanosecondsPerSecond + now.tv_nsec;
 }
 
+// A signal may end it early: the caller then looks once more than needed.
+void Sleep(long long nanoseconds) {
+  const timespec length = {static_cast<time_t>(nanoseconds / kNanosecondsPerSecond),
+                           static_cast<long>(nanoseconds % kNanosecondsPerSecond)};
+  nanosleep(&length, nullptr);
+}
+
 }  // namespace
 
 GrowingPause::GrowingPause(std::chrono::milliseconds most)
@@ -30,11 +37,18 @@ GrowingPause::GrowingPause(std::chrono::milliseconds most)
 bool GrowingPause::Wait() {
   const long long left = deadline_ - Now();
   if (left <= 0) return false;
-  const long long pause = std::min(pause_, left);
-  const timespec length = {static_cast<time_t>(pause / kNanosecondsPerSecond),
-                           static_cast<long>(pause % kNanosecondsPerSecond)};
-  // A signal may end it early: the caller then looks once more than needed.
-  nanosleep(&length, nullptr);
+  Sleep(std::min(pause_, left));
+  pause_ = std::min(pause_ + pause_ / kGrowth, kLongestPause);
+  return true;
+}
+
+bool GrowingPause::Wait(const std::function<bool()>& over) {
+  const long long begun = Now();
+  if (begun >= deadline_) return false;
+  const long long end = std::min(begun + pause_, deadline_);
+  do {
+    Sleep(kFirstPause);
+  } while (!over() && Now() < end);
   pause_ = std::min(pause_ + pause_ / kGrowth, kLongestPause);
   return true;
 }

@@ -3,6 +3,7 @@
 // whole. For what nobody announces, such as a change of a file by another process.
 
 #include <chrono>
+#include <functional>
 
 namespace nas {
 
@@ -17,6 +18,9 @@ class GrowingPause {
   // Sleeps, less long where a signal comes. False, at once, when the bound has passed; the caller
   // has then looked for the last time.
   bool Wait();
+  // The same, and at once when `over` says so, which is to cost next to nothing: it is asked every
+  // half a millisecond.
+  bool Wait(const std::function<bool()>& over);
 
  private:
   long long deadline_;  // monotonic, in nanoseconds
