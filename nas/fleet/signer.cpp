@@ -113,6 +113,8 @@ void StartFleetSigner(const std::string& user) {
 
 void FleetTokens::Ask(const FleetBox& box, const std::string& hash, int clock_offset) {
   questions_.push_back(box.name + " " + hash + " " + std::to_string(clock_offset) + "\n");
+  // The first are signed while the others are still thought of.
+  if (questions_.size() >= kMostQuestions) Send();
 }
 
 std::string FleetTokens::Take() {
