@@ -323,7 +323,9 @@ class Search {
     if (state.progress < 0 && walk_refused) {
       Complain("not answered, as --index always forbids to walk: " + state.index);
     } else if (state.progress < 0) {
-      Complain(FailureSentence(state.error, options_.query.folders));
+      // Why is said of each of them already.
+      Complain(NobodyAnswered(state) ? "no box answered"
+                                     : FailureSentence(state.error, options_.query.folders));
     } else if (!state.exists || (state.finished && state.progress == 0)) {
       Complain("the search was stopped before it was complete");
     } else if (ending == Ending::kFailed) {
@@ -348,8 +350,19 @@ class Search {
     tell(state.not_text, "file is", "files are", " not text");
   }
 
+  static const Json::Value& FleetOf(const RunningSearch& state) {
+    return state.walk.isObject() ? state.walk[task_record::kFleet] : kNoBoxes;
+  }
+
+  // A search that asked boxes alone.
+  static bool NobodyAnswered(const RunningSearch& state) {
+    const Json::Value& fleet = FleetOf(state);
+    return fleet.isObject() && fleet["total"].isUInt64() &&
+           fleet["total"].asUInt64() == fleet["boxes"].size();
+  }
+
   static void TellOfBoxes(const RunningSearch& state) {
-    const Json::Value& fleet = state.walk.isObject() ? state.walk[task_record::kFleet] : kNoBoxes;
+    const Json::Value& fleet = FleetOf(state);
     for (const Json::Value& box : fleet.isObject() ? fleet["boxes"] : kNoBoxes) {
       Complain(box["name"].asString() + ": " + box["state"].asString() + " (" +
                box["why"].asString() + ")");
