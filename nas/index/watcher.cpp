@@ -74,7 +74,7 @@ class Watcher {
   void StartJob(TableMaker::Kind kind);
   void EndJob();
   void Abandon();
-  void UseTable();
+  bool UseTable();
   void AfterSweep();
   void LoseTrack(Clock::time_point now);
   void AfterGap();
@@ -265,8 +265,7 @@ void Watcher::EndJob() {
   }
   patience_ = kFirstRetry;
   if (kind == TableMaker::Kind::kSweep) return AfterSweep();
-  UseTable();
-  if (table_ && kind != TableMaker::Kind::kMerge) {
+  if (UseTable() && kind != TableMaker::Kind::kMerge) {
     state_ = trees_->events().TellsAttributes() ? IndexState::kCurrent : IndexState::kNames;
   }
 }
@@ -278,9 +277,13 @@ void Watcher::Abandon() {
   hints_.AbandonTable();
 }
 
-void Watcher::UseTable() {
+bool Watcher::UseTable() {
   auto table = maker_->OpenTable();
-  if (!table) return Fail(table.error().error_number);
+  if (!table) {
+    hints_.AbandonTable();
+    Fail(table.error().error_number);
+    return false;
+  }
   InotifySource* by_folder = trees_->by_folder();
   // What came of folders that are watched since this table was begun is told now, and kept for it.
   if (by_folder != nullptr) by_folder->Adopt(maker_->TakeWatches(), hints_);
@@ -293,6 +296,7 @@ void Watcher::UseTable() {
   }
   figures_.made_at = std::time(nullptr);
   if (!setup_.file_system.keeps) maker_->RemoveTable();
+  return true;
 }
 
 void Watcher::AfterSweep() {
