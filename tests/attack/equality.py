@@ -377,7 +377,7 @@ class Equality:
         return [self.daemon, *below(self.daemon)]
 
     def is_current(self):
-        words = [self.house.program, "index", "--status", "--config", self.house.config]
+        words = [*self.before, self.house.program, "index", "--status", "--config", self.house.config]
         return subprocess.run(words, capture_output=True).returncode == 0
 
     def checked(self):
@@ -388,7 +388,7 @@ class Equality:
 
     def how_it_is(self):
         """For whoever looks into it: what the daemon tells, and what its processes do."""
-        words = [self.house.program, "index", "--status", "--config", self.house.config]
+        words = [*self.before, self.house.program, "index", "--status", "--config", self.house.config]
         told = subprocess.run(words, capture_output=True, text=True)
         lines = [told.stdout + told.stderr]
         for process in self.processes():
