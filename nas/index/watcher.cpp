@@ -203,7 +203,7 @@ void Watcher::Handle(Mark mark) {
 
 void Watcher::Act(Clock::time_point now) {
   if (gathering_ && now >= gathered_) TakeEvents();
-  if (hints_.lost() && !retry_) LoseTrack(now);
+  if (hints_.lost() && (!retry_ || Answers(state_))) LoseTrack(now);
   if (retry_ && now >= *retry_) {
     retry_.reset();
     if (!trees_ || !maker_) {
@@ -263,9 +263,10 @@ void Watcher::EndJob() {
     hints_.AbandonTable();
     return Fail(error);
   }
-  patience_ = kFirstRetry;
   if (kind == TableMaker::Kind::kSweep) return AfterSweep();
-  if (UseTable() && kind != TableMaker::Kind::kMerge) {
+  if (!UseTable()) return;
+  patience_ = kFirstRetry;
+  if (kind != TableMaker::Kind::kMerge) {
     state_ = trees_->events().TellsAttributes() ? IndexState::kCurrent : IndexState::kNames;
   }
 }
@@ -321,6 +322,7 @@ void Watcher::LoseTrack(Clock::time_point now) {
 
 // Nothing is believed of what happened before now.
 void Watcher::AfterGap() {
+  retry_.reset();
   Abandon();
   hints_.ForgetAll();
   const bool compare = table_ && trees_->by_folder() == nullptr;
@@ -345,7 +347,9 @@ void Watcher::Fail(int error) {
     trees_.reset();
     maker_.reset();
   }
-  if (state_ == IndexState::kUnavailable) retry_ = Clock::now() + patience_;
+  const bool names_alone =
+      state_ == IndexState::kNames && trees_ && trees_->events().TellsAttributes();
+  if (state_ == IndexState::kUnavailable || names_alone) retry_ = Clock::now() + patience_;
   patience_ = std::min<Clock::duration>(patience_ * 2, kLongestRetry);
 }
 

@@ -163,13 +163,15 @@ TEST_F(Events, OfSingleFolders) {
 class Life : public DaemonTest {
  protected:
   pid_t Watcher() { return Report()["file_systems"][0]["pid"].asInt(); }
-  ino_t InodeOfTable() {
+  std::string TablePath() {
     for (const auto& file : fs::recursive_directory_iterator(state_ + "/index")) {
-      struct stat status;
-      if (file.path().filename() != "names") continue;
-      if (stat(file.path().c_str(), &status) == 0) return status.st_ino;
+      if (file.path().filename() == "names") return file.path();
     }
-    return 0;
+    return "(none)";
+  }
+  ino_t InodeOfTable() {
+    struct stat status;
+    return stat(TablePath().c_str(), &status) == 0 ? status.st_ino : 0;
   }
   void Change(int round) {
     const std::string folder = tree_ + "/round" + std::to_string(round);
@@ -269,6 +271,32 @@ TEST_F(Life, BeginsOnceTheWatcherBeforeItIsGone) {
   }
   EXPECT_EQ(InodeOfTable(), before);
   kill(watcher, SIGCONT);
+  ExpectEqual();
+}
+
+// Names are answered meanwhile; files' attributes are looked up.
+TEST_F(Life, TriesAgainToMakeATable) {
+  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
+  MountTree("ext4");
+  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
+  MakeTree(tree_);
+  StartDaemon();
+  ExpectEqual();
+  EXPECT_TRUE(StopDaemon());
+  const std::string unfinished = TablePath() + ".new";
+  fs::create_directory(unfinished);
+  StartDaemon();
+  const auto idle = [&] {
+    const std::string watcher = std::to_string(Watcher());
+    return StateIs("current") &&
+           nas_test::ReadFile("/proc/" + watcher + "/task/" + watcher + "/children").empty();
+  };
+  int looks = 0;
+  ASSERT_TRUE(Eventually([&] { return (looks = idle() ? looks + 1 : 0) > 3; }));
+  EXPECT_FALSE(Report()["current"].asBool());
+  Change(0);
+  EXPECT_EQ(Differences(tree_), std::vector<std::string>());
+  fs::remove(unfinished);
   ExpectEqual();
 }
 
