@@ -45,7 +45,7 @@ MOST_OVER_SLOWEST = 1.3
 def page_of(count, name="invoice"):
     rows = [[0, f"{name} {number}.txt", 33188, 0, 0, 5, 1, 1, 1, None, number]
             for number in range(count)]
-    return json.dumps({"protocol": 1, "version": "0", "task": "0" * 32, "error": 0, "source": "walk",
+    return json.dumps({"protocol": 2, "version": "0", "task": "0" * 32, "error": 0, "source": "walk",
                        "index": "none", "users": ["u"], "groups": ["g"], "folders": [["data", "f"]],
                        "finished": True, "total": count, "next": count, "rows": rows})
 

@@ -202,6 +202,16 @@ class PageReader {
   std::vector<Places> places_;  // of each row
 };
 
+// Whatever else it may hold.
+bool IsOfAnotherProtocol(std::string_view text) {
+  JsonPull pull{std::string(text)};
+  int protocol = kFleetProtocol;
+  const auto member = [&](const std::string& name) {
+    return name == kProtocol ? pull.TakeNumber(&protocol) : pull.Skip();
+  };
+  return pull.TakeObject(member) && protocol != kFleetProtocol;
+}
+
 // False for what is no order.
 bool ReadOrder(const Json::Value& json, FleetPageRequest* page) {
   const Json::Value& word = json[kSortBy];
@@ -328,8 +338,8 @@ void FleetPageWriter::Finish(Json::Value* page) {
 
 Result<FleetPage> ReadFleetPage(std::string_view text) {
   FleetPage page;
-  if (!PageReader(text).Read(&page)) return kIllegal;
-  return page;
+  if (PageReader(text).Read(&page)) return page;
+  return IsOfAnotherProtocol(text) ? Error{kErrorIllegal, EPROTONOSUPPORT} : kIllegal;
 }
 
 }  // namespace nas

@@ -41,8 +41,10 @@
 
 namespace nas {
 
-// Of what both ends say; a box that does not know a word of a question refuses it.
-inline constexpr int kFleetProtocol = 1;
+// Of what both ends say. A box that does not know a word of a query refuses the question. Members
+// that are not known are passed over, those of questions and those of pages, so one that changes
+// what is meant needs another protocol. In the first one rows had no numbers.
+inline constexpr int kFleetProtocol = 2;
 // Of one page.
 inline constexpr unsigned kMostFleetRows = 2000;
 // A page ends with the row that makes it longer than that, however few there are.
@@ -124,6 +126,7 @@ struct FleetPage {
 };
 
 // kErrorIllegal for what is no page: among others names that hold "/" or NUL, or mean a folder.
+// With EPROTONOSUPPORT where it says that it is of another protocol.
 Result<FleetPage> ReadFleetPage(std::string_view text);
 
 }  // namespace nas

@@ -135,6 +135,8 @@ void FleetSearch::Took(Box& box, BoxAnswer answer) {
     const auto page = ReadFleetPage(answer.body);
     if (page && TakePage(box, *page)) {
       TookPage(box, *page);
+    } else if (!page && page.error().error_number == EPROTONOSUPPORT) {
+      Finish(box, BoxState::kOld, "speaks another version's language");
     } else {
       Finish(box, BoxState::kDown, "says what is no answer");
     }

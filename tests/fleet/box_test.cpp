@@ -213,11 +213,12 @@ TEST_F(BoxTest, AQuestionInOtherWordsIsRefusedWhole) {
     return text.replace(text.find(old), old.size(), other);
   };
   for (const std::string& bad :
-       {with("\"protocol\":1", "\"protocol\":2"), with("[\"all\"]", "[\"colour\",\"red\"]"),
-        with("[\"all\"]", "[\"all\",[\"colour\"]]"), with("[\"all\"]", "[]"),
-        with("\"limit\":10", "\"limit\":100000"), with("\"wait_ms\":1000", "\"wait_ms\":-1"),
-        with("[\"/data\"]", "[]"), with("[\"/data\"]", "\"/data\""),
-        with("[\"all\"]", "[\"owner\",7]"), std::string("[]"), std::string("{")}) {
+       {with("\"protocol\":2", "\"protocol\":1"), with("\"protocol\":2", "\"protocol\":3"),
+        with("[\"all\"]", "[\"colour\",\"red\"]"), with("[\"all\"]", "[\"all\",[\"colour\"]]"),
+        with("[\"all\"]", "[]"), with("\"limit\":10", "\"limit\":100000"),
+        with("\"wait_ms\":1000", "\"wait_ms\":-1"), with("[\"/data\"]", "[]"),
+        with("[\"/data\"]", "\"/data\""), with("[\"all\"]", "[\"owner\",7]"), std::string("[]"),
+        std::string("{")}) {
     EXPECT_EQ(Ask(box, User(), "POST", "/fleet/search", bad).status, 400) << bad;
   }
   const Json::Value nowhere =

@@ -2,6 +2,8 @@
 
 #include <pwd.h>
 
+#include <cstdlib>
+
 #include "nas/base/random_name.h"
 #include "nas/fleet/library.h"
 
@@ -28,8 +30,16 @@ Box FleetTest::StartBox(const std::string& name, const std::string& more,
                             "[fleet.fronts.office]\nkey = \"" + nas::ToHex(public_key_) +
                             "\"\nrealm = \"OFFICE\"\nusers = [\"" + User() + "\", \"" + kBob +
                             "\", \"root\"]\n" + of_front;
-  box.server = Start(lines, "", AmRoot() ? As::kRootWithLogins : As::kOrdinaryUser);
+  const bool odd = (name.back() - '0') % 2 != 0;
+  box.server = StartOf(odd ? std::getenv(kOtherBoxes) : nullptr, lines);
   return box;
+}
+
+Server FleetTest::StartOf(const char* other_bin_dir, const std::string& lines) {
+  if (other_bin_dir != nullptr) program_ = std::string(other_bin_dir) + "/arbory";
+  Server server = Start(lines, "", AmRoot() ? As::kRootWithLogins : As::kOrdinaryUser);
+  program_ = ARBORY_BIN_DIR "/arbory";
+  return server;
 }
 
 std::string FleetTest::PamLines() {
@@ -75,7 +85,7 @@ Reply FleetTest::Ask(const Box& box, const std::string& user, const std::string&
 
 std::string FleetTest::Question(unsigned limit, const std::string& locations,
                                 const std::string& query) {
-  return R"({"protocol":1,"contents":false,"recursive":true,"after":0,"wait_ms":1000,"limit":)" +
+  return R"({"protocol":2,"contents":false,"recursive":true,"after":0,"wait_ms":1000,"limit":)" +
          std::to_string(limit) + ",\"locations\":" + locations + ",\"query\":" + query + "}";
 }
 

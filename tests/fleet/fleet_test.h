@@ -17,6 +17,11 @@ using server_test::Server;
 inline constexpr char kAnn[] = "nobody";
 inline constexpr char kBob[] = "daemon";
 
+// Variables of the environment, for tests that are run by hand: folders of programs of another
+// version, for every second box and for fronts.
+inline constexpr char kOtherBoxes[] = "ARBORY_OTHER_BOXES";
+inline constexpr char kOtherFront[] = "ARBORY_OTHER_FRONT";
+
 struct Box {
   std::string name;
   Server server;
@@ -31,6 +36,8 @@ class FleetTest : public server_test::ServerTest {
   // of the front, and `of_front` into the latter. Root's, where the tests are root's.
   Box StartBox(const std::string& name, const std::string& more = "lowest_uid = 1\n",
                const std::string& of_front = "");
+  // A server as these tests start them, of the program in that folder; null: of this build's.
+  Server StartOf(const char* other_bin_dir, const std::string& lines);
   // Of a server's settings: everybody's password is "right".
   std::string PamLines();
   // A file of a box's share, `user`'s own and closed to others where a user is given.

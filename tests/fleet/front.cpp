@@ -117,7 +117,7 @@ Server FrontTest::StartFront(const std::vector<Box>& boxes, const std::string& m
   share_lines_ = "";
   state_ = MakeFolder("front-state");
   root_state_ = dir_ + "/front-root-state";
-  Server front = Start(PamLines(), "", AmRoot() ? As::kRootWithLogins : As::kOrdinaryUser);
+  const Server front = StartOf(std::getenv(kOtherFront), PamLines());
   fleet_file_ = "";
   return front;
 }

@@ -25,7 +25,7 @@ struct Page {
   std::uint64_t step = 1;  // of the rows' numbers
 
   std::string Text() const {
-    std::string text = R"({"protocol":1,"version":"9","task":")" + std::string(kTask) +
+    std::string text = R"({"protocol":2,"version":"9","task":")" + std::string(kTask) +
                        R"(","error":0,"source":"walk","index":"no index","users":["u"],)" +
                        R"("groups":["g"],"folders":[[")" + share + "\",\"" + folder +
                        "\"]],\"finished\":" + (finished ? "true" : "false") +
@@ -121,6 +121,7 @@ TEST_F(HostileTest, ALieCostsTheBoxsOwnRows) {
       {"an error's page", FakeBox::Reply("<html>", "", "500 Internal Server Error"), "down", 0},
       {"an older box's words", FakeBox::Reply("{}", "", "404 Not Found"), "old", 0},
       {"a question not understood", FakeBox::Reply("{}", "", "400 Bad Request"), "old", 0},
+      {"another version's page", FakeBox::Reply(R"({"rows":{},"protocol":3})"), "old", 0},
       {"less than boxes tell now", without_news, "answered", 3},
       {"more than boxes tell now", with_more, "answered", 3},
   };

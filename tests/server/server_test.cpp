@@ -34,8 +34,8 @@ void GiveTo(const std::string& path, const std::string& user) {
   ASSERT_EQ(chown(path.c_str(), account->pw_uid, account->pw_gid), 0);
 }
 
-[[noreturn]] void Exec(const std::string& config, const std::string& fleet, const std::string& log,
-                       int out, bool step_down) {
+[[noreturn]] void Exec(const std::string& program, const std::string& config,
+                       const std::string& fleet, const std::string& log, int out, bool step_down) {
   const int null = open("/dev/null", O_RDONLY);
   const int err = open(log.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0666);
   dup2(null, STDIN_FILENO);
@@ -48,7 +48,7 @@ void GiveTo(const std::string& path, const std::string& user) {
   if (!fleet.empty()) words.insert(words.end(), {"--fleet", fleet.c_str()});
   if (step_down) words.insert(words.end(), {"--user", nas_test::kOtherUser});
   words.push_back(nullptr);
-  execv(ARBORY_BIN_DIR "/arbory", const_cast<char**>(words.data()));
+  execv(program.c_str(), const_cast<char**>(words.data()));
   _exit(98);
 }
 
@@ -210,7 +210,8 @@ Server ServerTest::Start(const std::string& server_lines, const std::string& top
   const nas::UniqueFd out(ends[0]);
   Server server;
   server.pid = fork();
-  if (server.pid == 0) Exec(config, fleet_file_, dir_ + "/log", ends[1], AmRoot() && !logins);
+  if (server.pid == 0)
+    Exec(program_, config, fleet_file_, dir_ + "/log", ends[1], AmRoot() && !logins);
   close(ends[1]);
   servers_.push_back(server.pid);
   std::string said;

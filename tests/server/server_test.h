@@ -90,6 +90,7 @@ class ServerTest : public nas_test::PlatformTest {
 
   // The user whom the server acts for in single-user mode.
   static std::string User();
+  std::string program_ = ARBORY_BIN_DIR "/arbory";  // that servers are started of
   std::string fleet_file_;   // what a front is started with; empty: it is none
   std::string root_state_;   // the state folder of root's server
   std::string share_;        // the folder of the share "photo", the user's own
