@@ -564,6 +564,8 @@ class Equality:
         if self.house:
             self.house.remove()
         self.place.remove()
+        if self.house:
+            shutil.rmtree(self.house.dir, ignore_errors=True)  # where the volume was mounted
 
 
 def options(parser):
