@@ -4,8 +4,10 @@
 #include <sys/prctl.h>
 #include <sys/syscall.h>
 
+#include <algorithm>
 #include <array>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 
 #include "nas/base/json_text.h"
@@ -13,6 +15,9 @@
 #include "nas/index/frames.h"
 
 namespace index_test {
+
+namespace fs = std::filesystem;
+
 namespace {
 
 std::string PathOf(const nas::NameTable& table, nas::NameTable::FolderId id) {
@@ -104,6 +109,27 @@ std::vector<std::string> Differences(const std::string& folder) {
   }
   told.emplace_back("broke off");
   return told;
+}
+
+std::vector<std::string> Texts(const Json::Value& list) {
+  std::vector<std::string> texts;
+  for (const Json::Value& item : list) texts.push_back(item.asString());
+  std::ranges::sort(texts);
+  return texts;
+}
+
+bool Tells(const Json::Value& list, const std::string& path) {
+  struct stat status = {};
+  if (lstat(path.c_str(), &status) != 0) return false;
+  return std::ranges::any_of(
+      list, [&](const Json::Value& item) { return item.asUInt64() == status.st_ino; });
+}
+
+void MakeTree(const std::string& tree) {
+  fs::create_directories(tree + "/a/b");
+  fs::create_directories(tree + "/c");
+  for (const char* file : {"/a/one", "/a/b/two", "/c/three"})
+    nas_test::WriteFile(tree + file, "text");
 }
 
 void DaemonTest::SetUp() {

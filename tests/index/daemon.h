@@ -24,6 +24,12 @@ Json::Value Report();
 // Every difference that the daemon finds of the folder's file system, or why it cannot tell.
 std::vector<std::string> Differences(const std::string& folder);
 
+// Of what See tells: the texts of a list, sorted, and whether a list of inodes has that of a path.
+std::vector<std::string> Texts(const Json::Value& list);
+bool Tells(const Json::Value& list, const std::string& path);
+// Two folders, one in them, and a file in each.
+void MakeTree(const std::string& tree);
+
 class DaemonTest : public nas_test::PlatformTest {
  protected:
   void SetUp() override;
