@@ -22,7 +22,7 @@ PROMISE = "Nobody waits for another: a hostile user costs the others little, and
 ATTACK = "users search, page, stop, clean, download and log in, half of the time beside a hostile one"
 
 USERS, SECONDS, SLICE, THINK = 50, 600, 20, 1.0
-SHORT_USERS, SHORT_SECONDS, SHORT_SLICE, SHORT_THINK = 6, 8, 2, 0.05
+SHORT_USERS, SHORT_SECONDS, SHORT_SLICE, SHORT_THINK = 6, 8, 1, 0.05
 FIRST_UID = 23000
 HOSTILE = "hostile"
 FOLDERS, FILES_OF_A_FOLDER = 60, 40
