@@ -10,6 +10,7 @@
 #include <memory>
 #include <sstream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "arbory/call_command.h"
@@ -128,8 +129,7 @@ class Formatter : public CLI::Formatter {
   }
 };
 
-CLI::App* AddCall(CLI::App* app, CallOptions* options) {
-  CLI::App* call = app->add_subcommand("call", "Make one API call and print its reply");
+void DefineCall(CLI::App* call, CallOptions* options) {
   call->add_option("API", options->api, "Name of the API")->required();
   const CLI::Validator number(
       [](const std::string& text) {
@@ -145,47 +145,39 @@ CLI::App* AddCall(CLI::App* app, CallOptions* options) {
   call->add_option("JSON", options->params, "Parameters");
   AddCommonOptions(call, &options->common);
   call->footer(kCallHelp);
-  return call;
 }
 
-CLI::App* AddServe(CLI::App* app, ServeOptions* options) {
-  CLI::App* serve = app->add_subcommand("serve", "Serve the search page and the API over HTTP");
+void DefineServe(CLI::App* serve, ServeOptions* options) {
   serve->add_option("--listen", options->listen, "Address to listen on; 127.0.0.1:8750 by default")
       ->type_name("HOST:PORT");
   serve->add_option("--fleet", options->fleet, "Search the machines too that this file names")
       ->type_name("FILE");
   AddCommonOptions(serve, &options->common);
   serve->footer(kServeHelp);
-  return serve;
 }
 
-// The commands that look after a fleet.
-struct FleetCommands {
-  CLI::App* key = nullptr;
-  CLI::App* config = nullptr;
-  CLI::App* status = nullptr;
-};
-
-FleetCommands AddFleet(CLI::App* app, FleetOptions* options) {
-  CLI::App* fleet = app->add_subcommand("fleet", "Look after a fleet of machines");
+void DefineFleet(CLI::App* fleet, FleetOptions* options) {
   fleet->require_subcommand(1);
   fleet->footer(kFleetHelp);
-  FleetCommands commands;
-  commands.key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
-  commands.key->add_option("FILE", options->key_file, "A new file for the secret one")->required();
-  commands.config = fleet->add_subcommand("config", "Print the configuration of HAProxy");
+  CLI::App* key = fleet->add_subcommand("key", "Make a front's keys and print the public one");
+  key->add_option("FILE", options->key_file, "A new file for the secret one")->required();
+  CLI::App* config = fleet->add_subcommand("config", "Print the configuration of HAProxy");
   CLI::Option* write =
-      commands.config->add_option("--write", options->write, "Write it there, where it has changed")
+      config->add_option("--write", options->write, "Write it there, where it has changed")
           ->type_name("PATH");
-  commands.config
-      ->add_option("--reload", options->reload, "And run this then: 'systemctl reload haproxy'")
+  config->add_option("--reload", options->reload, "And run this then: 'systemctl reload haproxy'")
       ->type_name("COMMAND")
       ->needs(write);
-  commands.status = fleet->add_subcommand("status", "Tell of every box how it is");
-  for (CLI::App* command : {commands.config, commands.status}) {
+  CLI::App* status = fleet->add_subcommand("status", "Tell of every box how it is");
+  for (CLI::App* command : {config, status}) {
     command->add_option("FILE", options->file, "The file that names the boxes")->required();
   }
-  return commands;
+}
+
+int RunFleet(const CLI::App& fleet, const FleetOptions& options) {
+  if (fleet.got_subcommand("key")) return RunFleetKeyCommand(options);
+  if (fleet.got_subcommand("config")) return RunFleetConfigCommand(options);
+  return RunFleetStatusCommand(options);
 }
 
 constexpr int kMostThreads = static_cast<int>(nas::NameSource::kMostThreads);
@@ -223,8 +215,7 @@ void AddOutput(CLI::App* search, SearchOptions* options, const char* group) {
       ->transform(OneOf({"auto", "always", "never"}));
 }
 
-void AddSearch(CLI::App* app, SearchOptions* options) {
-  CLI::App* search = app->add_subcommand("search", "Search folders and print what is found");
+void DefineSearch(CLI::App* search, SearchOptions* options) {
   AddQueryOptions(search, &options->query);
   AddOutput(search, options, "Output");
   search->option_defaults()->group("Where and as whom");
@@ -236,8 +227,7 @@ void AddSearch(CLI::App* app, SearchOptions* options) {
   search->footer(std::string(kQueryHelp) + kSearchHelp);
 }
 
-CLI::App* AddFind(CLI::App* app, FindOptions* options) {
-  CLI::App* find = app->add_subcommand("find", "Print the best matches that the index knows");
+void DefineFind(CLI::App* find, FindOptions* options) {
   AddFindQuery(find, options);
   find->option_defaults()->group("Output");
   const CLI::Validator count(
@@ -261,23 +251,18 @@ CLI::App* AddFind(CLI::App* app, FindOptions* options) {
       ->allow_extra_args(false);
   AddCommonOptions(find, &options->common);
   find->footer(kFindHelp);
-  return find;
 }
 
-CLI::App* AddWhy(CLI::App* app, WhyOptions* options) {
-  CLI::App* why = app->add_subcommand("why", "Tell why a search does not find a file");
+void DefineWhy(CLI::App* why, WhyOptions* options) {
   why->add_option("FILE", options->file, "The file, or folder, that it should find")->required();
   AddQueryOptions(why, &options->search.query);
   AddOutput(why, &options->search, "");
   why->option_defaults()->group("Where and as whom");
   AddCommonOptions(why, &options->search.common);
   why->footer(std::string(kQueryHelp) + "\n" + kWhyHelp);
-  return why;
 }
 
-CLI::App* AddIndex(CLI::App* app, IndexOptions* options) {
-  CLI::App* index =
-      app->add_subcommand("index", "Keep an index of names, so that searches are quick");
+void DefineIndex(CLI::App* index, IndexOptions* options) {
   CLI::Option* status = index->add_flag("--status", options->status, "Tell what the daemon does");
   index->add_flag("--json", options->json, "The same as JSON")->needs(status);
   CLI::Option* rebuild =
@@ -287,17 +272,12 @@ CLI::App* AddIndex(CLI::App* app, IndexOptions* options) {
       ->excludes(rebuild);
   AddCommonOptions(index, &options->common);
   index->footer(kIndexHelp);
-  return index;
 }
 
-// For whoever builds the program, so no part of the help.
-CLI::App* AddGenerate(CLI::App* app, GenerateOptions* options) {
-  CLI::App* generate = app->add_subcommand("generate", "Write the manual and the completions");
-  generate->group("");
+void DefineGenerate(CLI::App* generate, GenerateOptions* options) {
   generate->add_option("FOLDER", options->folder, "Where to")->required();
   generate->add_option("DATE", options->date, "Of the manual: 2026-01-31")->required();
   generate->add_option("SAMPLE", options->sample, "The configuration file's")->required();
-  return generate;
 }
 
 // Of the program, whatever the command.
@@ -309,9 +289,9 @@ void AddVersion(CLI::App* app) {
 }
 
 std::string Explain(const CLI::App& app, const CLI::ParseError& error, const char* first_word) {
+  if (first_word == nullptr) return "give a command; see arbory --help";
   const auto chosen = app.get_subcommands();
-  if (chosen.empty()) {
-    if (first_word == nullptr) return "give a command; see arbory --help";
+  if (chosen.empty() || chosen.front()->get_name() != first_word) {
     return "'" + std::string(first_word) + "' is no command; see arbory --help";
   }
   const auto left = chosen.front()->remaining();
@@ -325,6 +305,62 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error, const cha
   return text + "; see arbory " + command + " --help";
 }
 
+int RunSearch(SearchOptions* options) {
+  options->query.content |= options->output.lines;
+  if (options->output.quiet) options->limit = 1;
+  return RunSearchCommand(*options);
+}
+
+struct Options {
+  CallOptions call;
+  ServeOptions serve;
+  FleetOptions fleet;
+  IndexOptions index;
+  SearchOptions search;
+  FindOptions find;
+  WhyOptions why;
+  GenerateOptions generate;
+};
+
+struct Command {
+  std::string_view name;
+  const char* description;
+  void (*define)(CLI::App* command, Options* options);  // of one that was added by its name
+  int (*run)(CLI::App* command, Options* options);
+};
+
+// For whoever builds the program, so no part of the help. Tells of all options.
+constexpr char kGenerate[] = "generate";
+
+constexpr Command kCommands[] = {
+    {"call", "Make one API call and print its reply",
+     [](CLI::App* command, Options* options) { DefineCall(command, &options->call); },
+     [](CLI::App*, Options* options) { return RunCallCommand(options->call); }},
+    {"serve", "Serve the search page and the API over HTTP",
+     [](CLI::App* command, Options* options) { DefineServe(command, &options->serve); },
+     [](CLI::App*, Options* options) { return RunServeCommand(options->serve); }},
+    {"fleet", "Look after a fleet of machines",
+     [](CLI::App* command, Options* options) { DefineFleet(command, &options->fleet); },
+     [](CLI::App* command, Options* options) { return RunFleet(*command, options->fleet); }},
+    {"index", "Keep an index of names, so that searches are quick",
+     [](CLI::App* command, Options* options) { DefineIndex(command, &options->index); },
+     [](CLI::App*, Options* options) { return RunIndexCommand(options->index); }},
+    {"search", "Search folders and print what is found",
+     [](CLI::App* command, Options* options) { DefineSearch(command, &options->search); },
+     [](CLI::App*, Options* options) { return RunSearch(&options->search); }},
+    {"find", "Print the best matches that the index knows",
+     [](CLI::App* command, Options* options) { DefineFind(command, &options->find); },
+     [](CLI::App*, Options* options) { return RunFindCommand(options->find); }},
+    {"why", "Tell why a search does not find a file",
+     [](CLI::App* command, Options* options) { DefineWhy(command, &options->why); },
+     [](CLI::App*, Options* options) { return RunWhyCommand(options->why); }},
+    {kGenerate, "Write the manual and the completions",
+     [](CLI::App* command, Options* options) { DefineGenerate(command, &options->generate); },
+     [](CLI::App* command, Options* options) {
+       return RunGenerateCommand(options->generate, Describe(command->get_parent()));
+     }},
+};
+
 int Run(int argc, char** argv) {
   constexpr size_t kHelpColumn = 24;  // where descriptions begin
   CLI::App app("Searches folders by name, attributes and contents.", "arbory");
@@ -333,23 +369,15 @@ int Run(int argc, char** argv) {
   app.formatter(formatter);
   app.require_subcommand(1);
   app.footer(kProgramHelp);
-  CallOptions call_options;
-  SearchOptions search_options;
-  ServeOptions serve_options;
-  CLI::App* call = AddCall(&app, &call_options);
-  CLI::App* serve = AddServe(&app, &serve_options);
-  FleetOptions fleet_options;
-  const FleetCommands fleet = AddFleet(&app, &fleet_options);
-  IndexOptions index_options;
-  CLI::App* index = AddIndex(&app, &index_options);
-  FindOptions find_options;
-  find_options.arguments.assign(argv + std::min(argc, 1), argv + argc);
-  WhyOptions why_options;
-  AddSearch(&app, &search_options);
-  CLI::App* find = AddFind(&app, &find_options);
-  CLI::App* why = AddWhy(&app, &why_options);
-  GenerateOptions generate_options;
-  CLI::App* generate = AddGenerate(&app, &generate_options);
+  Options options;
+  options.find.arguments.assign(argv + std::min(argc, 1), argv + argc);
+  // To define the options of all takes as long as a short search.
+  const std::string_view first = argc > 1 ? argv[1] : "";
+  for (const Command& command : kCommands) {
+    CLI::App* added = app.add_subcommand(std::string(command.name), command.description);
+    if (command.name == first || first == kGenerate) command.define(added, &options);
+  }
+  app.get_subcommand(kGenerate)->group("");
   AddVersion(&app);
   UnmarkValues(&app);
   try {
@@ -362,18 +390,8 @@ int Run(int argc, char** argv) {
   } catch (const CLI::ParseError& error) {
     throw UsageError(Explain(app, error, argc > 1 ? argv[1] : nullptr));
   }
-  if (call->parsed()) return RunCallCommand(call_options);
-  if (fleet.key->parsed()) return RunFleetKeyCommand(fleet_options);
-  if (fleet.config->parsed()) return RunFleetConfigCommand(fleet_options);
-  if (fleet.status->parsed()) return RunFleetStatusCommand(fleet_options);
-  if (index->parsed()) return RunIndexCommand(index_options);
-  if (find->parsed()) return RunFindCommand(find_options);
-  if (generate->parsed()) return RunGenerateCommand(generate_options, Describe(&app));
-  if (serve->parsed()) return RunServeCommand(serve_options);
-  if (why->parsed()) return RunWhyCommand(why_options);
-  search_options.query.content |= search_options.output.lines;
-  if (search_options.output.quiet) search_options.limit = 1;
-  return RunSearchCommand(search_options);
+  CLI::App* chosen = app.get_subcommands().front();
+  return std::ranges::find(kCommands, chosen->get_name(), &Command::name)->run(chosen, &options);
 }
 
 // Libraries end the process in places where they have no memory, or have an error of their own.
