@@ -80,10 +80,20 @@ nas::UniqueFd Open(const std::string& folder) {
   return nas::UniqueFd(open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
 }
 
+// On a machine with much else to do an answer may be late, which a search does not wait for.
+nas::IndexAnswer Patiently(const std::function<nas::IndexAnswer()>& ask) {
+  nas::IndexAnswer answer;
+  nas_test::Eventually([&] {
+    answer = ask();
+    return answer.state != "busy";
+  });
+  return answer;
+}
+
 }  // namespace
 
 Json::Value See(const std::string& folder, bool asks_times) {
-  return Ask(nas::AskIndex(Open(folder).get(), asks_times));
+  return Ask(Patiently([&] { return nas::AskIndex(Open(folder).get(), asks_times); }));
 }
 
 nas::IndexAnswer Hold(const std::string& folder) {
@@ -98,7 +108,7 @@ Json::Value Report() {
 }
 
 std::vector<std::string> Differences(const std::string& folder) {
-  const nas::IndexAnswer answer = nas::AskToCheck(Open(folder).get());
+  const nas::IndexAnswer answer = Patiently([&] { return nas::AskToCheck(Open(folder).get()); });
   if (!answer.connection) return {"state: " + answer.state};
   std::vector<std::string> told;
   nas::FrameReader reader(answer.connection.get(), nas::kMaxAnswerBytes);
