@@ -2,6 +2,8 @@
 
 #include <rapidjson/reader.h>
 
+#include "nas/base/json_text.h"
+
 namespace nas {
 
 // Notes what the reader tells of.
@@ -33,6 +35,7 @@ class JsonPullHandler {
 
  private:
   bool Add(JsonPull::Piece piece) {
+    if (pieces_.size() == kJsonMaxValues) return false;
     pieces_.push_back(piece);
     return true;
   }

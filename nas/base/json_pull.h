@@ -17,7 +17,8 @@ namespace nas {
 // nothing more can be read then. Of what is no JSON nothing can be.
 class JsonPull {
  public:
-  // Takes up to 33 times the memory of the text. Throws std::bad_alloc.
+  // A text of more than kJsonMaxValues (json_text.h) pieces, the ends of objects and arrays and the
+  // names of members among them, is none either. Throws std::bad_alloc.
   explicit JsonPull(std::string text);
   JsonPull(const JsonPull&) = delete;
   JsonPull& operator=(const JsonPull&) = delete;

@@ -43,8 +43,8 @@ constexpr size_t kMostQuestions = 64;
 constexpr std::chrono::seconds kFirstRetry{5};
 constexpr std::chrono::seconds kLongestRetry{600};
 constexpr std::chrono::seconds kBetweenGaps{5};
-// The one before has nothing to wait for.
-constexpr std::chrono::milliseconds kUntilOtherIsGone{20};
+// The one before has nothing to wait for, but may be held up by its file system for long.
+constexpr std::chrono::milliseconds kUntilOtherIsGone{100};
 // A clean end waits so long for the last table; the broker a little longer.
 constexpr int kEndMilliseconds = 15'000;
 

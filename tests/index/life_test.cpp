@@ -54,15 +54,20 @@ class Life : public DaemonTest {
     EXPECT_EQ(Differences(tree_), std::vector<std::string>());
     EXPECT_TRUE(See(tree_)["attributes"].asBool());
   }
+  // A daemon that knows a tree on a disk of its own. False where there can be none.
+  bool StartOnADisk() {
+    if (!CanWatchFileSystems()) return false;
+    MountTree("ext4");
+    if (HasFailure()) return false;
+    MakeTree(tree_);
+    StartDaemon();
+    ExpectEqual();
+    return true;
+  }
 };
 
 TEST_F(Life, SurvivesEveryEnd) {
-  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
-  MountTree("ext4");
-  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
-  MakeTree(tree_);
-  StartDaemon();
-  ExpectEqual();
+  if (!StartOnADisk()) GTEST_SKIP() << "needs root that may watch file systems, and a loop device";
   int round = 0;
   const struct {
     const char* why;
@@ -112,12 +117,7 @@ TEST_F(Life, SurvivesEveryEnd) {
 
 // Whose table it would be, and what has happened since that was made, only one of them knows.
 TEST_F(Life, BeginsOnceTheWatcherBeforeItIsGone) {
-  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
-  MountTree("ext4");
-  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
-  MakeTree(tree_);
-  StartDaemon();
-  ExpectEqual();
+  if (!StartOnADisk()) GTEST_SKIP() << "needs root that may watch file systems, and a loop device";
   const pid_t watcher = Watcher();
   Change(0);
   kill(watcher, SIGSTOP);
@@ -138,12 +138,7 @@ TEST_F(Life, BeginsOnceTheWatcherBeforeItIsGone) {
 
 // Names are answered meanwhile; files' attributes are looked up.
 TEST_F(Life, TriesAgainToMakeATable) {
-  if (!CanWatchFileSystems()) GTEST_SKIP() << "needs root that may watch file systems";
-  MountTree("ext4");
-  if (HasFailure()) GTEST_SKIP() << "needs a loop device";
-  MakeTree(tree_);
-  StartDaemon();
-  ExpectEqual();
+  if (!StartOnADisk()) GTEST_SKIP() << "needs root that may watch file systems, and a loop device";
   EXPECT_TRUE(StopDaemon());
   const std::string unfinished = TablePath() + ".new";
   fs::create_directory(unfinished);

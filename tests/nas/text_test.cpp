@@ -172,7 +172,12 @@ TEST(Json, IsReadInPieces) {
   using std::string_literals::operator""s;
   EXPECT_FALSE(Pulled("{\"row\":[\"a\",1,2]}\0, x"s)) << "something behind a NUL";
   EXPECT_FALSE(Pulled("{\"x\":" + std::string(100'000, '[')));
-  EXPECT_TRUE(Pulled("{\"x\":" + std::string(100'000, '[') + std::string(100'000, ']') + "}"));
+  const auto deep = [](size_t levels) {
+    return "{\"x\":" + std::string(levels, '[') + std::string(levels, ']') + "}";
+  };
+  EXPECT_TRUE(Pulled(deep(nas::kJsonMaxValues / 2 - 2)));
+  EXPECT_FALSE(Pulled(deep(nas::kJsonMaxValues / 2)))
+      << "a little text that would take much memory";
 }
 
 class JsonFileTest : public PlatformTest {};
