@@ -21,6 +21,13 @@ FakeBox::FakeBox(Answer answer)
   thread_ = std::thread([this] { Serve(); });
 }
 
+FakeBox::FakeBox() : FakeBox([this](const std::string&, const auto& send) { send(said_); }) {}
+
+void FakeBox::Say(std::string reply) {
+  const auto paused = Paused();
+  said_ = std::move(reply);
+}
+
 FakeBox::~FakeBox() {
   ended_ = true;
   thread_.join();
@@ -35,6 +42,7 @@ void FakeBox::Serve() {
     std::string request(size_t{64} << 10, '\0');
     const ssize_t count = recv(peer.get(), request.data(), request.size(), 0);
     request.resize(count > 0 ? static_cast<size_t>(count) : 0);
+    const auto answering = Paused();
     answer_(request, [&](const std::string& bytes) {
       size_t done = 0;
       while (done < bytes.size() && !ended_) {

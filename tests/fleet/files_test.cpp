@@ -163,15 +163,14 @@ TEST_F(FilesTest, OfSeveralBoxesGoIntoOneArchive) {
 }
 
 TEST_F(FilesTest, ABoxSpeaksOnlyOfItsBytes) {
-  std::string said;
-  const FakeBox fake([&](const std::string&, const auto& send) { send(said); });
+  FakeBox fake;
   const Server front = LoggedIn(StartFront({fake.AsBox("box1")}, "deadline_ms = 700\n"), User());
   const auto get = [&](const std::string& route = "/files") {
     return front.Get(route + "/box1/data/a.txt?pattern=x&text=1");
   };
-  said = FakeBox::Reply("<script>",
-                        "Content-Type: text/html\r\nSet-Cookie: a=b\r\n"
-                        "Content-Disposition: inline\r\nX-More: 1\r\n");
+  fake.Say(FakeBox::Reply("<script>",
+                          "Content-Type: text/html\r\nSet-Cookie: a=b\r\n"
+                          "Content-Disposition: inline\r\nX-More: 1\r\n"));
   auto reply = get();
   EXPECT_EQ(reply.status, 200);
   EXPECT_EQ(reply.body, "<script>");
@@ -199,25 +198,25 @@ TEST_F(FilesTest, ABoxSpeaksOnlyOfItsBytes) {
       {"nothing", ""},
   };
   for (const auto& row : rows) {
-    said = row.reply;
+    fake.Say(row.reply);
     reply = get();
     EXPECT_EQ(reply.status, 503) << row.what << reply.body;
     EXPECT_EQ(reply.fields["content-type"], "application/json") << row.what;
   }
   // One that breaks off is not filled up with anything else.
-  said = "HTTP/1.1 200 OK\r\nContent-Length: 10\r\n\r\nabc";
+  fake.Say("HTTP/1.1 200 OK\r\nContent-Length: 10\r\n\r\nabc");
   EXPECT_EQ(get().status, 0) << "the connection must end before the file does";
-  said = "HTTP/1.1 200 OK\r\nContent-Length: 3\r\n\r\nabcdef";
+  fake.Say("HTTP/1.1 200 OK\r\nContent-Length: 3\r\n\r\nabcdef");
   EXPECT_EQ(get().body, "abc");
   for (const char* body : {"[]", "{}", R"({"line":"1","parts":[],"text":null})",
                            R"({"line":1,"parts":[1],"text":null})",
                            R"({"line":1,"parts":[],"text":{"text":1}})", "{"}) {
-    said = FakeBox::Reply(body);
+    fake.Say(FakeBox::Reply(body));
     EXPECT_EQ(get("/lines").status, 503) << body;
   }
-  said = FakeBox::Reply(R"({"line":1,"parts":["a"],"text":null,"more":1})");
+  fake.Say(FakeBox::Reply(R"({"line":1,"parts":["a"],"text":null,"more":1})"));
   EXPECT_EQ(get("/lines").body, R"({"line":1,"parts":["a"],"text":null})") << "and no more";
-  said = FakeBox::Reply(std::string(size_t{2} << 20, ' '));
+  fake.Say(FakeBox::Reply(std::string(size_t{2} << 20, ' ')));
   EXPECT_EQ(get("/lines").status, 503) << "longer than any answer";
 }
 

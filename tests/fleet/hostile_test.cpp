@@ -125,12 +125,11 @@ TEST_F(HostileTest, ALieCostsTheBoxsOwnRows) {
       {"less than boxes tell now", without_news, "answered", 3},
       {"more than boxes tell now", with_more, "answered", 3},
   };
-  std::string said;
-  const FakeBox fake([&](const std::string&, const auto& send) { send(said); });
+  FakeBox fake;
   Prepare(fake);
   for (const auto& row : rows) {
     SCOPED_TRACE(row.what);
-    said = row.reply;
+    fake.Say(row.reply);
     EXPECT_EQ(SearchBoth(), row.state);
     EXPECT_LE(told_, row.rows);
     if (std::string_view(row.state) == "answered") {
@@ -163,7 +162,7 @@ TEST_F(HostileTest, EndlessRowsEndAtTheBoundAndTakeLittleMemory) {
   size_t memory = 0;
   bool ended = false;
   // Each row in a name as long as it may be.
-  const FakeBox fake([&](const std::string& request, const auto& send) {
+  FakeBox fake([&](const std::string& request, const auto& send) {
     if (request.starts_with("POST /fleet/end")) {
       ended = true;
       send(FakeBox::Reply("{}"));
@@ -181,6 +180,7 @@ TEST_F(HostileTest, EndlessRowsEndAtTheBoundAndTakeLittleMemory) {
   });
   Prepare(fake, "rows_per_box = " + std::to_string(kBound) + "\n");
   EXPECT_EQ(SearchBoth(), "refused");
+  const auto paused = fake.Paused();
   EXPECT_EQ(told, kBound);
   EXPECT_TRUE(ended) << "the box goes on for nobody";
   constexpr size_t kMostKilobytes = 64 << 10;
@@ -194,7 +194,7 @@ TEST_F(HostileTest, EndlessRowsEndAtTheBoundAndTakeLittleMemory) {
 TEST_F(HostileTest, AClockThatIsOffIsFollowedOnceAndNotFar) {
   int off = 0;
   std::vector<std::int64_t> issued;
-  const FakeBox fake([&](const std::string& request, const auto& send) {
+  FakeBox fake([&](const std::string& request, const auto& send) {
     const size_t token = request.find("Arbory-Fleet ");
     if (token == std::string::npos) return;
     const auto read =
@@ -209,10 +209,14 @@ TEST_F(HostileTest, AClockThatIsOffIsFollowedOnceAndNotFar) {
   Prepare(fake);
   for (const int seconds : {200, -200, 900}) {
     SCOPED_TRACE(seconds);
-    off = seconds;
-    issued.clear();
-    const bool near = std::abs(off) <= nas::kMostClockOff;
+    {
+      const auto paused = fake.Paused();
+      off = seconds;
+      issued.clear();
+    }
+    const bool near = std::abs(seconds) <= nas::kMostClockOff;
     EXPECT_EQ(SearchBoth(), near ? "answered" : "refused");
+    const auto paused = fake.Paused();
     EXPECT_EQ(issued.size(), near ? 2U : 1U);
     EXPECT_EQ(told_, near ? 3U : 0U);
   }
