@@ -42,13 +42,21 @@ constexpr std::chrono::milliseconds kReportInterval(200);
 // Rows name their location in 16 bits.
 constexpr size_t kMostLocations = 65'535;
 
-// Each location and each level of a tree that is being read holds a descriptor, so the usual soft
-// bound of 1,024 would end at some hundred folders.
-void RaiseDescriptorLimit() {
+// Descriptors that there is room for before any thread is there: as many as a thousand boxes take.
+constexpr int kDescriptorsAtFirst = 2048;
+
+// Each location and each level of a tree that is being read holds a descriptor, and so does each
+// connection to a box, so the usual soft bound of 1,024 would end at some hundred folders. The
+// kernel's table of them grows at once for a process of one thread; where there are more, each
+// doubling waits until all processors have passed through the scheduler, which takes a first page's
+// time.
+void MakeRoomForDescriptors() {
   rlimit limit;
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
   limit.rlim_cur = limit.rlim_max;
   setrlimit(RLIMIT_NOFILE, &limit);
+  const nas::UniqueFd any(open("/", O_PATH | O_CLOEXEC));
+  const nas::UniqueFd last(fcntl(any.get(), F_DUPFD_CLOEXEC, kDescriptorsAtFirst - 1));
 }
 
 // Turns what a job threw into the last error. To be called in a catch block.
@@ -209,7 +217,7 @@ nas::Status WfmSearchWalker::Impl::OpenLocations(const std::vector<std::string>&
 bool WfmSearchWalker::Impl::Init(const std::vector<std::string>& texts,
                                  const std::vector<FindComp*>& comps) try {
   comps_ = comps;
-  RaiseDescriptorLimit();
+  MakeRoomForDescriptors();
   if (const nas::Status opened = OpenLocations(texts); !opened) {
     nas::Report(opened.error());
     return false;
