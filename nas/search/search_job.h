@@ -2,6 +2,8 @@
 // One search from its first entry to its last: starts threads, as many as the machine can use, on
 // each source of names in turn, makes their rows visible in time, reports, and ends them.
 
+#include <sys/types.h>
+
 #include <chrono>
 #include <condition_variable>
 #include <exception>
@@ -44,6 +46,8 @@ class SearchJob {
   void RunPhase(NameSource& source);
   void StartThread(NameSource& source);
   void Tend(NameSource& source);
+  void TakePlace();
+  void StepBehind();
   void LookForStuckThreads(std::chrono::steady_clock::time_point now);
   void Flush();
   void Fail(std::exception_ptr failure);
@@ -55,9 +59,11 @@ class SearchJob {
   std::optional<std::chrono::steady_clock::time_point> stop_seen_;
   bool told_stuck_ = false;
 
-  std::mutex mutex_;  // guards running_ and failure_
+  std::mutex mutex_;  // guards all up to failure_
   std::condition_variable ended_;
   int running_ = 0;
+  std::vector<pid_t> threads_;  // that run
+  bool behind_ = false;         // others
   std::exception_ptr failure_;
 
   // Last, so that they are joined before what they use goes.

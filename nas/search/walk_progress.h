@@ -26,6 +26,7 @@ class WalkProgress {
   }
   void AddMatches(std::uint64_t count) { matches_.fetch_add(count, std::memory_order_relaxed); }
   void AddMatch() { matches_.fetch_add(1, std::memory_order_relaxed); }
+  std::uint64_t matches() const { return matches_.load(std::memory_order_relaxed); }
   // A folder could not be read; `error_number` says why.
   void AddSkipped(int error_number) {
     if (error_number == EACCES || error_number == EPERM) {

@@ -4,12 +4,14 @@
 
 #include <dirent.h>
 #include <sys/mount.h>
+#include <sys/resource.h>
 
 #include <atomic>
 #include <cstdlib>
 #include <fstream>
 #include <set>
 
+#include "nas/base/deadline.h"
 #include "nas/results/result_reader.h"
 #include "nas/results/result_writer.h"
 #include "nas/search/content_reading.h"
@@ -111,6 +113,45 @@ TEST_F(Job, HugeFolderAndManyFolders) {
   EXPECT_EQ(progress_["entries"].asInt(), kFiles + 2 * kFolders);
   EXPECT_EQ(progress_["matches"].asInt(), kFiles + kFolders);
   EXPECT_EQ(progress_["phase"], "done");
+}
+
+// Its threads wait until others go first, or for longer than that may take.
+class Patient : public NameSource {
+ public:
+  Patient(SharedSearch& search, bool finds) : search_(search), finds_(finds) {}
+  void Feed(size_t /*thread*/, Judge& /*judge*/) override {
+    constexpr int kMostSeconds = 20;
+    if (finds_) search_.progress.AddMatch();
+    const Deadline end(1000 * kMostSeconds);
+    while (Niceness() == before_ && !end.passed()) usleep(1000);
+    if (Niceness() > before_) ++behind;
+  }
+  std::atomic<int> behind = 0;
+
+ private:
+  static int Niceness() { return getpriority(PRIO_PROCESS, 0); }
+
+  SharedSearch& search_;
+  const bool finds_;
+  const int before_ = Niceness();
+};
+
+TEST_F(Job, ItsThreadsLetOthersGoFirstAfterTheFirstRowsOrWithoutAny) {
+  constexpr int kThreads = 3;
+  for (const bool finds : {true, false}) {
+    ResultWriter writer(ResultPath(base_ + "/results", NewResultId()));
+    NodeComp word(Query::Parse("word")->root());
+    SharedSearch search({&word}, writer, stop_);
+    search.SearchContents(base_ + "/results", true);
+    Patient names(search, finds);
+    Patient contents(search, false);
+    SearchJob job(search, {.report = [](const WalkProgress&) {}, .threads = kThreads});
+    const int before = getpriority(PRIO_PROCESS, 0);
+    EXPECT_TRUE(job.Run(names, contents));
+    EXPECT_EQ(names.behind, kThreads);
+    EXPECT_EQ(contents.behind, kThreads) << "the second phase's too";
+    EXPECT_EQ(getpriority(PRIO_PROCESS, 0), before) << "but not the one that shows their rows";
+  }
 }
 
 TEST_F(Job, LocationsInsideOneAnotherAreWalkedOnce) {
