@@ -1,5 +1,6 @@
 #include "arbory/caller.h"
 
+#include <poll.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -7,6 +8,7 @@
 
 #include "arbory/parse.h"
 #include "nas/base/accounts.h"
+#include "nas/base/system_call.h"
 #include "platform/webfm.h"
 
 namespace arbory {
@@ -89,6 +91,15 @@ nas::Reply Caller::Call(const NUVA::APIMethod& row, const std::string& method,
 void Caller::Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
                    const nas::ReplyEncoder& encode) const {
   const nas::Child child = nas::StartCall(row, CallOf(method, params), encode);
+}
+
+nas::Child Caller::BeginAtEnd(const NUVA::APIMethod& row, const std::string& method,
+                              const Json::Value& params, const nas::ReplyEncoder& encode) const {
+  return nas::StartChild([&](int pipe) {
+    pollfd reader{pipe, 0, 0};
+    nas::Uninterrupted([&] { return poll(&reader, 1, -1); });
+    Call(row, method, params, encode);
+  });
 }
 
 }  // namespace arbory

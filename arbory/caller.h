@@ -55,6 +55,10 @@ class Caller {
   // The same without its reply: the call goes on by itself, also when this program has ended.
   void Begin(const NUVA::APIMethod& row, const std::string& method, const Json::Value& params,
              const nas::ReplyEncoder& encode) const;
+  // The same once this program has ended, or closed the child's descriptor; until then the child
+  // waits, and can be killed.
+  nas::Child BeginAtEnd(const NUVA::APIMethod& row, const std::string& method,
+                        const Json::Value& params, const nas::ReplyEncoder& encode) const;
 
  private:
   nas::ApiCall CallOf(const std::string& method, const Json::Value& params) const;

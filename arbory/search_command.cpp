@@ -1,10 +1,12 @@
 // The search itself runs in a worker process that outlives every call, so whatever happens here,
-// the worker is stopped and what it stored removed before the program ends. A program that is
-// killed can do neither: its search has a lease, and ends by itself.
+// the worker is stopped and what it stored removed before the program ends. For a program that is
+// killed another process does both, which waits from where it takes longer than a moment; and
+// should that be killed as well, the search has a lease, and ends by itself.
 
 #include "arbory/search_command.h"
 
 #include <fcntl.h>
+#include <signal.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -50,6 +52,10 @@ constexpr std::chrono::milliseconds kMostUnasked{1000};
 // found and not yet printed when it ends is what its user waits for.
 constexpr std::uint64_t kManyRows = 500;
 constexpr std::chrono::milliseconds kLately{300};
+// From here on, or before so much is printed at once that a reader may keep it waiting, somebody is
+// there to clean up for a program that is killed.
+constexpr std::chrono::milliseconds kMoment{100};
+constexpr size_t kMomentsText = size_t{32} << 10;  // half of what a pipe holds
 // Between two looks at whether the user's other searches leave a place.
 constexpr std::chrono::milliseconds kPlacePause{200};
 // Saying why nothing was found takes a part of the time that the search took, or that of a small
@@ -106,6 +112,8 @@ SearchOptions WithFleet(const SearchOptions& options, Caller* caller) {
 }
 
 const Json::Value kNoBoxes;
+
+nas::Reply Ignored(int /*code*/, const Json::Value& /*data*/) { return {}; }
 
 enum class Ending { kComplete, kEnough, kInterrupted, kUnwritable, kFailed };
 
@@ -238,6 +246,7 @@ class Search {
     printed_ += rows.count;
     if (rows.text.empty()) return true;
     progress_.Clear();
+    if (commands_ || rows.text.size() > kMomentsText) KeepCleaner();
     errno = 0;
     const bool taken = commands_ ? commands_->Take(rows.text) : WriteOut(STDOUT_FILENO, rows.text);
     if (!taken) failure_ = commands_ ? commands_->failure() : errno;
@@ -246,6 +255,7 @@ class Search {
 
   bool Spill(std::string* text) {
     progress_.Clear();
+    KeepCleaner();
     const bool written = WriteOut(STDOUT_FILENO, *text);
     text->clear();
     return written;
@@ -255,6 +265,7 @@ class Search {
     ShowProgress();
     const Clock::time_point now = Clock::now();
     const auto ran = std::chrono::duration_cast<std::chrono::milliseconds>(now - started_);
+    if (ran > kMoment) KeepCleaner();
     const auto most = now - busy_ < kLately ? kLeastPause : kMostPause;
     const auto pause = std::clamp(ran / kPauseShare, kLeastPause, most);
     const int records = records_ ? records_->fd() : -1;
@@ -369,13 +380,24 @@ class Search {
     }
   }
 
-  // The cleaning goes on by itself: nobody waits for its reply.
-  void CleanUp() {
+  Json::Value OfThis() const {
     Json::Value params(Json::objectValue);
     params["taskid"] = task_id_;
-    const auto ignore = [](int, const Json::Value&) { return nas::Reply(); };
-    if (running_) Call("stop", params, ignore);
-    caller_.Begin(caller_.Method("clean"), "clean", params, ignore);
+    return params;
+  }
+
+  void KeepCleaner() {
+    if (cleaner_) return;
+    cleaner_ = caller_.BeginAtEnd(caller_.Method("clean"), "clean", OfThis(), Ignored);
+  }
+
+  // The cleaning goes on by itself: nobody waits for its reply. It is begun here, by a child that
+  // has all that is open here: what watches files takes the kernel milliseconds to close, and the
+  // last who has it waits for that.
+  void CleanUp() {
+    if (running_) Call("stop", OfThis(), Ignored);
+    caller_.Begin(caller_.Method("clean"), "clean", OfThis(), Ignored);
+    if (cleaner_ && cleaner_->pid > 0) kill(cleaner_->pid, SIGKILL);
   }
 
   Caller& caller_;
@@ -385,8 +407,9 @@ class Search {
   std::optional<CommandRunner> commands_;
   ProgressLine progress_;
   std::string task_id_;
-  nas::UniqueFd asking_;  // by it the search knows that this program lives
-  nas::UniqueFd worker_;  // its pidfd, invalid where that cannot be had
+  nas::UniqueFd asking_;               // by it the search knows that this program lives
+  std::optional<nas::Child> cleaner_;  // should this program be killed
+  nas::UniqueFd worker_;               // its pidfd, invalid where that cannot be had
   std::optional<nas::RecordWatch> records_;
   std::optional<nas::ResultWatch> watch_;
   Clock::time_point busy_{};  // when a page last held many rows

@@ -61,6 +61,20 @@ class Lifecycle : public ProgramTest {
     const std::string stat = nas_test::ReadFile("/proc/" + std::to_string(process) + "/stat");
     return stat != "(none)" && stat.find(") Z") == std::string::npos;
   }
+  // The program's first child, once it is one that stays: calls end, who waits to clean up does
+  // not.
+  static pid_t ChildThatStays(pid_t program) {
+    const std::string name = std::to_string(program);
+    pid_t child = 0;
+    EXPECT_TRUE(Eventually([&] {
+      const pid_t before = std::exchange(child, 0);
+      std::istringstream(nas_test::ReadFile("/proc/" + name + "/task/" + name + "/children")) >>
+          child;
+      usleep(500'000);
+      return child > 0 && child == before;
+    }));
+    return child;
+  }
   static Json::Value Id(const std::string& id) {
     Json::Value params;
     params["taskid"] = id;
@@ -371,17 +385,40 @@ TEST_F(Lifecycle, AnInterruptedProgramCleansUp) {
   }
 }
 
-// Killed, the program can clean nothing up; its search notices. As long as it lives, even stopped
-// as by Ctrl-Z or while its reader takes nothing, its search goes on.
-TEST_F(Lifecycle, ASearchWhoseProgramWasKilledEndsAndLeavesNothing) {
+// Killed, the program can clean nothing up; another process does, also what has ended since, and
+// whatever the program has begun lives on.
+TEST_F(Lifecycle, WhatAKilledProgramHasFoundIsCleanedUp) {
+  MakeEndlessFile(share_ + "/endless.log");
+  const std::vector<std::string> runs = {"search", "one", "-x", "sh", "-c", "sleep 5"};
+  const std::vector<std::string> reads = {"search", "one", "--content"};
+  for (const auto& words : {runs, reads}) {
+    SCOPED_TRACE(words.back());
+    const size_t unfinished = words == reads ? 1 : 0;
+    const pid_t program = Launch(words);
+    ASSERT_TRUE(Eventually([&] {
+      return !Databases(dir_ + "/volume1", nas_test::Me()).empty() &&
+             arbory::UnfinishedSearches(nas_test::Me()).size() == unfinished;
+    }));
+    ChildThatStays(program);
+    kill(program, SIGKILL);
+    EXPECT_EQ(Finish(program).exit_code, -SIGKILL);
+    EXPECT_TRUE(Eventually([&] { return Remains().empty(); }));
+  }
+}
+
+// And where that process was killed too its search notices. As long as the program lives, even
+// stopped as by Ctrl-Z or while its reader takes nothing, the search goes on.
+TEST_F(Lifecycle, ASearchThatNobodyWantsEndsAndLeavesNothing) {
   const std::string config = dir_ + "/as-" + nas_test::Me() + "/arbory.toml";
   WriteFile(config, "lease_seconds = 1\n" + nas_test::ReadFile(config));
   MakeEndlessFile(share_ + "/endless.log");
   const pid_t program = Launch({"search", "one", "--content"});
   const pid_t worker = Worker(OneThatWalks(nas_test::Me()));
+  const pid_t cleaner = ChildThatStays(program);
   kill(program, SIGSTOP);
   usleep(2'500'000);  // more than twice the lease
   EXPECT_TRUE(Lives(worker));
+  EXPECT_EQ(kill(cleaner, SIGKILL), 0);
   kill(program, SIGKILL);
   EXPECT_EQ(Finish(program).exit_code, -SIGKILL);
   EXPECT_TRUE(Eventually([&] { return !Lives(worker) && Remains().empty(); }));
