@@ -126,6 +126,10 @@ def comparisons(index, fd):
     yield row("index: xylophone, few hits", ["xylophone"], ["xylophone"],
               ["-iname", "*xylophone*"], ["-i", "xylophone"],
               {"fd": "≤ 0.02 and 25 ms", "plocate": "≤ 1"})
+    if plocate:  # by the command that is most like it: best first, a hundred rows at most
+        yield ("index: the same, arbory find",
+               {"ours": [index.program, "find", "--config", index.config, "xylophone"],
+                "plocate": [plocate, "-d", database, "-b", "-i", "xylophone"]}, {})
     yield row("index: nothing", ["zzz-nothing"], ["zzz-nothing"], ["-iname", "*zzz-nothing*"],
               ["-i", "zzz-nothing"], {"fd": "≤ 0.02 and 25 ms", "plocate": "≤ 15 ms"})
     yield row("index: a glob", ["*xylo*.jpg"], ["-g", "*xylo*.jpg"], ["-iname", "*xylo*.jpg"],
