@@ -36,7 +36,7 @@ constexpr size_t kMostThreads = NameSource::kMostThreads;
 constexpr double kBusyShare = 0.7;
 
 // Somebody waits for a search's first rows, and nobody looks at all the others as they come: from
-// there on, or after so long without one, its threads leave two thirds of a busy processor to
+// there on, or after so long without one, its threads leave three quarters of a busy processor to
 // searches that begin and to pages. Alone on the machine they lose nothing.
 constexpr milliseconds kLongestFirst(100);
 constexpr int kBehind = 5;  // nicer than before

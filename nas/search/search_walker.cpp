@@ -10,6 +10,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
@@ -56,7 +57,8 @@ void MakeRoomForDescriptors() {
   limit.rlim_cur = limit.rlim_max;
   setrlimit(RLIMIT_NOFILE, &limit);
   const nas::UniqueFd any(open("/", O_PATH | O_CLOEXEC));
-  const nas::UniqueFd last(fcntl(any.get(), F_DUPFD_CLOEXEC, kDescriptorsAtFirst - 1));
+  const auto room = static_cast<int>(std::min<rlim_t>(limit.rlim_cur, kDescriptorsAtFirst));
+  const nas::UniqueFd last(fcntl(any.get(), F_DUPFD_CLOEXEC, room - 1));
 }
 
 // Turns what a job threw into the last error. To be called in a catch block.
