@@ -293,10 +293,11 @@ def main():
 
 
 def write(args, tables):
-    """The document with these rows; a run of some of them leaves the others as they stand."""
+    """The document with these rows; a run of some of them leaves the others as they stand, as one
+    without --large does."""
     document = args.top / "docs" / "benchmarks.md"
     text = document.read_text()
-    if args.only:
+    if args.only or not args.large:
         tables = merged(text, tables)
     machine = subprocess.run(["lscpu"], capture_output=True, text=True, check=True).stdout
     model = next((line.split(":", 1)[1].strip() for line in machine.splitlines()
