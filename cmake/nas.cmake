@@ -2,6 +2,8 @@
 file(GLOB NAS_SOURCES CONFIGURE_DEPENDS nas/*/*.cpp)
 add_library(arbory_nas SHARED ${NAS_SOURCES})
 set_target_properties(arbory_nas PROPERTIES LINKER_LANGUAGE CXX)
+# Its loops take many values at a time, which at -O2 this compiler does for few of them.
+set_source_files_properties(nas/search/index_ranges.cpp PROPERTIES COMPILE_OPTIONS -O3)
 target_link_libraries(
   arbory_nas
   PUBLIC PkgConfig::JSONCPP

@@ -115,6 +115,23 @@ class NameTable {
       }
     }
   }
+  // Whether the name is ASCII, and so its text.
+  bool is_ascii(EntryId id) const { return !Bit(others_, id); }
+  // Whether it is surely valid UTF-8 and in NFC: as IsComposed says (match/folded_name.h).
+  bool is_composed(EntryId id) const { return !Bit(loose_, id); }
+  // Calls `take` with each of [begin, end) whose name is not ASCII, in order.
+  template <class Take>
+  void EachOther(EntryId begin, EntryId end, const Take& take) const {
+    for (EntryId id = begin; id < end; id = (id / kWordBits + 1) * kWordBits) {
+      std::uint64_t word = others_[id / kWordBits] >> (id % kWordBits) << (id % kWordBits);
+      for (; word != 0; word &= word - 1) {
+        const auto bit = static_cast<EntryId>(std::countr_zero(word));
+        const EntryId other = id / kWordBits * kWordBits + bit;
+        if (other >= end) return;
+        take(other);
+      }
+    }
+  }
   unsigned char type(EntryId id) const;  // DT_*
   std::uint64_t inode(EntryId id) const {
     return columns_.inodes32 != nullptr ? columns_.inodes32[id] : columns_.inodes64[id];
@@ -134,6 +151,12 @@ class NameTable {
     const std::uint32_t size = columns_.sizes[id];
     return size == kLargeSize ? LargeSize(id) : size;
   }
+  // The same of the entries from `begin` on, as the file has them: sizes with kLargeSize, times of
+  // making with kNoCrtime (table_format.h).
+  const std::uint16_t* class_rows_from(EntryId begin) const { return columns_.classes + begin; }
+  const std::int32_t* mtimes_from(EntryId begin) const { return columns_.mtimes + begin; }
+  const std::int32_t* crtimes_from(EntryId begin) const { return columns_.crtimes + begin; }
+  const std::uint32_t* sizes_from(EntryId begin) const { return columns_.sizes + begin; }
   // The rows of mode, user and group that entries share (table_format.h).
   std::span<const TableClass> class_rows() const { return {columns_.class_rows, class_count_}; }
   // All entries, the fewest folders below their tree's topmost first; of these the newest, by what
@@ -195,6 +218,9 @@ class NameTable {
     const std::uint32_t* top_name_begins = nullptr;
   };
 
+  static bool Bit(const std::vector<std::uint64_t>& bits, EntryId id) {
+    return (bits[id / kWordBits] >> (id % kWordBits) & 1) != 0;
+  }
   // How many entries before this one, which may be entries(), have a name that is not their text.
   size_t NamedBefore(EntryId id) const {
     if (id == entries_) return named_count_;
@@ -206,6 +232,7 @@ class NameTable {
   NameTable() = default;
   void Swap(NameTable& other);
   void FindStrays();
+  void LookAtNames();
   // Texts that lie end to end, each with its NUL.
   static std::string_view Piece(const char* texts, const std::uint32_t* begins, size_t number) {
     return {texts + begins[number], begins[number + 1] - begins[number] - 1};
@@ -227,6 +254,9 @@ class NameTable {
   size_t key_slot_count_ = 0;
   Columns columns_;
   std::vector<EntryId> strays_;
+  // A bit an entry: its name is not ASCII; nor sure to be composed.
+  std::vector<std::uint64_t> others_;
+  std::vector<std::uint64_t> loose_;
 };
 
 }  // namespace nas

@@ -123,19 +123,31 @@ bool ScanTexts(const RegexScan& scan, std::string_view texts, EntryId begin, Ent
   return true;
 }
 
+// So many are asked at a time, which stay in the processor's own memory until they are.
+constexpr size_t kOtherBytes = size_t{16} << 10;
+
 // Names that are not ASCII, one after the other, as those of a table are.
 struct OtherNames {
   std::string texts = {};
   std::vector<size_t> begins = {};
   std::vector<EntryId> entries = {};
   // False where it is not UTF-8, and is left out.
-  bool Add(EntryId entry, std::string_view name) {
+  bool Add(const NameTable& table, EntryId entry) {
     const size_t begin = texts.size();
-    if (!AppendComposed(name, &texts)) return false;
+    if (table.is_composed(entry)) {
+      texts.append(table.name(entry));
+    } else if (!AppendComposed(table.name(entry), &texts)) {
+      return false;
+    }
     texts.push_back('\0');
     begins.push_back(begin);
     entries.push_back(entry);
     return true;
+  }
+  void Clear() {
+    texts.clear();
+    begins.clear();
+    entries.clear();
   }
   // Of all texts, and where the last ends.
   size_t begin(size_t number) const {
@@ -217,20 +229,36 @@ bool IndexFilter::Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) 
       [found](EntryId entry) { found->push_back(entry); });
 }
 
+bool IndexFilter::HasNeedle(std::string_view text) const {
+  const auto has = [text](const TextFinder& needle) {
+    return needle.Find(text, 0) != std::string_view::npos;
+  };
+  return needles_.empty() || std::ranges::any_of(needles_, has);
+}
+
 bool IndexFilter::ScanOthers(EntryId begin, EntryId end, std::vector<EntryId>* found) const {
   const NameTable& table = snapshot_.table;
-  std::erase_if(*found, [&table](EntryId entry) { return !IsAscii(table.name(entry)); });
+  std::erase_if(*found, [&table](EntryId entry) { return !table.is_ascii(entry); });
   const auto middle = static_cast<std::ptrdiff_t>(found->size());
   OtherNames others;
-  table.EachName(begin, end, [&](EntryId entry, std::string_view name) {
-    if (!IsAscii(name) && !others.Add(entry, name)) found->push_back(entry);
+  std::vector<EntryId> broken;
+  bool told = true;
+  const auto scan = [&] {
+    told &= ScanTexts(
+        *others_scan_, others.texts, 0, static_cast<EntryId>(others.entries.size()),
+        [&others](EntryId number) { return others.begin(number); },
+        [&](EntryId number) { found->push_back(others.entries[number]); });
+    others.Clear();
+  };
+  table.EachOther(begin, end, [&](EntryId entry) {
+    if (!HasNeedle(table.texts(entry, entry + 1))) return;
+    if (!others.Add(table, entry)) broken.push_back(entry);
+    if (others.texts.size() >= kOtherBytes) scan();
   });
-  const auto broken = static_cast<std::ptrdiff_t>(found->size());
-  const bool told = ScanTexts(
-      *others_scan_, others.texts, 0, static_cast<EntryId>(others.entries.size()),
-      [&others](EntryId number) { return others.begin(number); },
-      [&](EntryId number) { found->push_back(others.entries[number]); });
-  std::inplace_merge(found->begin() + middle, found->begin() + broken, found->end());
+  scan();
+  const auto behind = static_cast<std::ptrdiff_t>(found->size());
+  found->insert(found->end(), broken.begin(), broken.end());
+  std::inplace_merge(found->begin() + middle, found->begin() + behind, found->end());
   std::inplace_merge(found->begin(), found->begin() + middle, found->end());
   return told;
 }
@@ -337,23 +365,22 @@ bool EntryFilter::LearnAttributes(EntryId entry) {
 void EntryFilter::SetName(EntryId entry) {
   std::string_view text = table_.texts(entry, entry + 1);
   text.remove_suffix(1);
+  if (filter_.by_texts_ && table_.is_ascii(entry)) return name_.SetFolded(text);
   const bool by_text = filter_.by_texts_ && !filter_.has_regex_;
   const bool ascii = IsAscii(text);
   const size_t mark = text.find('\1');
   if (by_text && ascii && mark == std::string_view::npos) return name_.SetFolded(text);
   const std::string_view name = table_.name(entry);
-  const bool usable = by_text || (filter_.by_texts_ && IsAscii(name));
-  if (usable && ascii && mark == std::string_view::npos) return name_.SetFolded(text);
   const std::string_view folded = text.substr(0, mark);
   // What a broken name has is in no such form.
-  if (!usable || IsAscii(folded) || !IsComposed(folded) || name.find('\1') != name.npos) {
+  if (!by_text || IsAscii(folded) || !IsComposed(folded) || name.find('\1') != name.npos) {
     return name_.Set(name);
   }
   name_.SetFolded(folded, mark == std::string_view::npos ? folded : text.substr(mark + 1));
 }
 
 bool EntryFilter::Passes(EntryId entry, bool told) {
-  const bool sure = told && (!filter_.roughly_ || IsAscii(table_.texts(entry, entry + 1)));
+  const bool sure = told && (!filter_.roughly_ || table_.is_ascii(entry));
   return sure || MayMatch(entry);
 }
 

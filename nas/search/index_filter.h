@@ -46,6 +46,7 @@ class IndexFilter {
   void PrepareScan(const QueryNode& root);
   // False, with less than all of it, where they tell so little that scan_ is the quicker way.
   bool FindNeedles(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
+  bool HasNeedle(std::string_view text) const;
   bool Scan(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
   // Puts those whose name is not ASCII right, of which an expression that is run over texts tells
   // nothing.

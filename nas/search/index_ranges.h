@@ -32,17 +32,36 @@ class IndexRanges {
   bool KnowsTimeOfChange(EntryId entry) const;
 
  private:
-  enum class Verdict : std::uint8_t { kNo, kByValue, kMaybe };
+  class Batch;
+  static constexpr std::uint64_t kWordBits = 64;
+  // Whether a process may have it mapped. A page of a file that has none cannot be written to, and
+  // to get one takes an event.
+  enum class Mappable : std::uint8_t { kNo, kUnlessEmpty, kYes };
+  // Of all entries of a row of classes.
+  struct OfClass {
+    bool is_out = false;                // by what they share alone
+    bool is_unknown = false;            // what the table has of them means nothing
+    Mappable mappable = Mappable::kNo;  // kNo where all mappings are known
+  };
 
-  Verdict VerdictOf(const TableClass& row) const;
+  static Mappable MappableOf(unsigned char type);
+  bool KnowsTimeOfChange(Mappable mappable, EntryId entry) const {
+    return mappable == Mappable::kNo ||
+           (mappable == Mappable::kUnlessEmpty && snapshot_.table.size(entry) == 0);
+  }
+  OfClass Judge(const TableClass& row) const;
   void AddDoubtful(EntryId begin, EntryId end, std::vector<EntryId>* found) const;
-  bool DoubtsInode(std::uint64_t inode) const;
+  bool DoubtsInode(std::uint64_t inode) const {
+    if (inode_words_.empty()) return false;
+    const std::uint64_t word = inode_words_[inode / kWordBits & (inode_words_.size() - 1)];
+    return (word >> (inode % kWordBits) & 1) != 0 && snapshot_.changes.inodes().contains(inode);
+  }
 
   const IndexSnapshot& snapshot_;
   std::vector<const QueryNode*> leaves_;
-  std::vector<Verdict> verdicts_;  // of each row of classes
-  std::vector<EntryId> folders_;   // ascending: what lies in them, or elsewhere, changes them
-  std::vector<bool> inode_bits_;   // by their last digits; tells most apart
+  std::vector<OfClass> classes_;  // as the table's rows
+  std::vector<EntryId> folders_;  // ascending: what lies in them, or elsewhere, changes them
+  std::vector<std::uint64_t> inode_words_;  // a bit each, by their last digits; tells most apart
 };
 
 }  // namespace nas

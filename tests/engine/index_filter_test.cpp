@@ -3,6 +3,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <utf8proc.h>
 
 #include <algorithm>
@@ -165,6 +166,132 @@ TEST_F(IndexFilters, LeaveOutNoNameThatMatches) {
   }
   EXPECT_GT(matches, kPatterns * kNames / 20);
   EXPECT_GT(left_out, kPatterns * kNames / 4);
+}
+
+// Sizes and times beside the ends of what a table's columns hold, and of what is asked for.
+constexpr std::int64_t kSizes[] = {0,          1,          1000,       1001,
+                                   4294967294, 4294967295, 4294967296, 6000000000};
+constexpr std::int64_t kTimes[] = {-5000000000, -2147483649, -2147483648, -2147483647,
+                                   -1,          0,           1000000000,  1000000001,
+                                   2147483646,  2147483647,  2147483648,  5000000000};
+
+// Several ends, or one.
+std::string RangeOf(Pieces& pieces) {
+  const bool of_size = pieces.Below(2) == 0;
+  const auto some = [&] {
+    return of_size ? kSizes[pieces.Below(std::size(kSizes))]
+                   : std::max<std::int64_t>(kTimes[pieces.Below(std::size(kTimes))], 10000);
+  };
+  std::string range = of_size ? "size:" : pieces.Below(4) == 0 ? "created:" : "modified:";
+  const std::int64_t one = some();
+  const std::int64_t other = some();
+  switch (pieces.Below(4)) {
+    case 0:
+      range += '>' + std::to_string(one);
+      break;
+    case 1:
+      range += "<=" + std::to_string(one);
+      break;
+    case 2:
+      range += std::to_string(std::min(one, other)) + ".." + std::to_string(std::max(one, other));
+      break;
+    default:
+      range += std::to_string(one);
+  }
+  return range;
+}
+
+TEST_F(IndexFilters, LeaveOutNoFileOfTheseSizesAndTimes) {
+  constexpr size_t kFiles = 3'000;  // more than are looked at together
+  constexpr size_t kQueries = 150;
+  Pieces pieces(3);
+  const std::string tree = dir_ + "/tree";
+  ASSERT_EQ(mkdir(tree.c_str(), S_IRWXU), 0);
+  for (size_t i = 0; i < kFiles; ++i) {
+    const std::string path = tree + "/" + std::to_string(i);
+    const size_t kind = pieces.Below(20);
+    if (kind == 0) {
+      ASSERT_EQ(mkdir(path.c_str(), S_IRWXU), 0);
+    } else if (kind == 1) {
+      ASSERT_EQ(mkfifo(path.c_str(), S_IRUSR), 0);
+    } else if (kind == 2 && i > 0) {
+      (void)!link((tree + "/" + std::to_string(pieces.Below(i))).c_str(), path.c_str());
+    } else {
+      const UniqueFd file(open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, S_IRUSR | S_IWUSR));
+      ASSERT_EQ(ftruncate(file.get(), kSizes[pieces.Below(std::size(kSizes))]), 0);
+    }
+    const time_t time = kTimes[pieces.Below(std::size(kTimes))];
+    const timespec times[] = {{time, 0}, {time, 0}};
+    (void)utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW);
+  }
+  const UniqueFd top(open(tree.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const TablePlace place{AT_FDCWD, dir_ + "/table", "a test's"};
+  ASSERT_TRUE(ScanTree({{top.get(), "tree"}}, place));
+  const auto table = NameTable::Open(place.dir_fd, place.name, place.file_system);
+  ASSERT_TRUE(table);
+  std::vector<struct statx> files(table->entries());
+  for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
+    const std::string path = tree + "/" + std::string(table->name(entry));
+    ASSERT_EQ(statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME,
+                    &files[entry]),
+              0);
+  }
+  Changes changes;
+  for (const auto& file : files) {
+    if (pieces.Below(500) == 0) changes.AddInode(file.stx_ino);
+  }
+  size_t matches = 0;
+  size_t left_out = 0;
+  for (size_t i = 0; i < kQueries; ++i) {
+    std::string text = RangeOf(pieces);
+    if (pieces.Below(2) == 0) text += " " + RangeOf(pieces);
+    SCOPED_TRACE(text);
+    const auto query = Query::Parse(text);
+    ASSERT_TRUE(query);
+    NodeComp comp(query->root());
+    const int never = 0;
+    class : public RowSink {
+      void Append(RowBlock& block) override { block.Clear(); }
+    } nowhere;
+    const bool mappings_known = pieces.Below(2) == 0;
+    const bool of_more = text.find_first_of("sc") != std::string::npos;  // size, created
+    const bool of_time = text.find("modified:") != std::string::npos;
+    const IndexSnapshot snapshot{*table, changes, true, mappings_known};
+    const SharedSearch search({&comp}, nowhere, never);
+    const IndexFilter filter(snapshot, search);
+    const Location location;
+    EntryFilter entries(filter, location);
+    std::vector<NameTable::EntryId> found;
+    entries.Find(
+        0, table->folders(), [](NameTable::FolderId) { return ""; }, &found);
+    ASSERT_TRUE(std::ranges::is_sorted(found));
+    FoldedName name;
+    for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
+      const struct statx& file = files[entry];
+      const bool is_folder = S_ISDIR(file.stx_mode);
+      const bool is_file = S_ISREG(file.stx_mode);
+      QueryAttributes attributes;
+      attributes.size = static_cast<std::int64_t>(file.stx_size);
+      attributes.modified = file.stx_mtime.tv_sec;
+      attributes.created =
+          (file.stx_mask & STATX_BTIME) != 0 ? file.stx_btime.tv_sec : QueryAttributes::kNoTime;
+      name.Set(table->name(entry));
+      const bool match = search.Ask({.name = &name,
+                                     .is_folder = is_folder,
+                                     .is_file = is_file,
+                                     .attributes = &attributes}) == Answer::kYes;
+      const bool passes = std::ranges::binary_search(found, entry);
+      ASSERT_LE(match, passes) << table->name(entry);
+      // What may have changed unseen is looked at, whatever the table says.
+      const bool changed = changes.inodes().contains(file.stx_ino) || file.stx_nlink > 1;
+      const bool written = !mappings_known && file.stx_size > 0 && !of_more;
+      ASSERT_LE(is_file && (changed || written) && of_time, passes) << table->name(entry);
+      matches += match ? 1 : 0;
+      left_out += passes ? 0 : 1;
+    }
+  }
+  EXPECT_GT(matches, kQueries * kFiles / 20);
+  EXPECT_GT(left_out, kQueries * kFiles / 4);
 }
 
 std::string Composed(const std::string& text) {
