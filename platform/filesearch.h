@@ -90,8 +90,9 @@ class FindFactory {
 // search. Walk may use threads; all of them have ended when it returns.
 class WfmSearchWalker {
  public:
-  // `task` (borrowed) receives "result_ready" and "walk"; a non-zero `*stop_flag` ends the walk
-  // within 100 ms.
+  // `task` (borrowed) receives "result_ready" and "walk", what they are at the end in a batch that
+  // the caller's next write of the task takes along; a non-zero `*stop_flag` ends the walk within
+  // 100 ms.
   WfmSearchWalker(const char* user, const char* session, OKT::Task* task, int* stop_flag);
   ~WfmSearchWalker();
   WfmSearchWalker(const WfmSearchWalker&) = delete;

@@ -13,9 +13,11 @@ namespace {
 using Clock = std::chrono::steady_clock;
 using std::chrono::milliseconds;
 
-// How often the job looks at the stop flag while its threads work; bounds the time to stop. The
-// first time comes sooner, so that a first page can be asked for at once.
+// How often the job looks at the stop flag while its threads work; bounds the time to stop.
 constexpr milliseconds kTick(25);
+// The same until there is a first row, so that a first page can be asked for at once. Whoever waits
+// for it is told nothing before: an index has said all that it knows in less than a tick, and who
+// wakes meanwhile to look at nothing takes the processor from it.
 constexpr milliseconds kFirstTick(5);
 // What threads get to notice the stop flag; with a tick before it, a tenth of a second in all.
 constexpr milliseconds kStopPatience(75);
@@ -146,10 +148,12 @@ void SearchJob::Tend(NameSource& source) {
   milliseconds tick = kFirstTick;
   std::unique_lock lock(mutex_);
   while (!ended_.wait_for(lock, tick, [this] { return running_ == 0; })) {
+    const Clock::time_point now = Clock::now();
+    const bool nothing_yet = search_.progress.matches() == 0 && now - begun < kTick;
+    if (nothing_yet && !search_.stopping()) continue;
     lock.unlock();
     tick = kTick;
     if (search_.stopping()) source_->Abort();
-    const Clock::time_point now = Clock::now();
     const auto interval =
         std::clamp(std::chrono::duration_cast<milliseconds>((now - begun) / kFlushShare),
                    kFlushInterval, kSlowestFlush);

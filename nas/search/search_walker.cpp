@@ -139,6 +139,7 @@ class WfmSearchWalker::Impl {
  private:
   nas::Status OpenLocations(const std::vector<std::string>& texts);
   void Report(const nas::WalkProgress& progress, bool last);
+  void CollectReport(const nas::WalkProgress& progress);
   void AddLocations();
   void AskFleet(const Json::Value& options, nas::SharedSearch& search);
   nas::IndexedWalk::Settings NameSettings(const Json::Value& options) const;
@@ -309,13 +310,19 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
   const bool nobody = completed && fleet_ && locations_.empty() && fleet_->failed();
   // Who is told that everything was found does not wait for how it ends.
   if (nobody) search.progress.SetPhase(nas::WalkProgress::Phase::kNames);
-  Report(search.progress, true);
+  const bool sorts = writer_->rows() >= kWorthSorting && nas::CurrentConfig().keep_orderings;
+  // Where the end follows at once, one write of the record tells both.
+  if (sorts) {
+    Report(search.progress, true);
+  } else {
+    CollectReport(search.progress);
+  }
   writer_->EmptyLog();
   if (nobody) {
     nas::SetLastError(nas::kErrorOther);
     completed = false;
   }
-  if (writer_->rows() >= kWorthSorting && nas::CurrentConfig().keep_orderings) {
+  if (sorts) {
     writer_.reset();
     WaitForSorting(StartSorting(nas::ResultPath(folder_, id_)));
   }
@@ -357,10 +364,8 @@ void WfmSearchWalker::Impl::TellUnread(Json::Value* walk) const {
   }
 }
 
-void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {
-  const Clock::time_point now = Clock::now();
-  if (!last && told_ready_ && now - reported_ < kReportInterval) return;
-  reported_ = now;
+// For the next write of the task's record.
+void WfmSearchWalker::Impl::CollectReport(const nas::WalkProgress& progress) {
   task_->beginUpdate();
   Json::Value walk = progress.ToJson();
   if (names_ != nullptr) names_->Tell(&walk);
@@ -368,6 +373,13 @@ void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last)
   if (fleet_) fleet_->Tell(&walk);
   task_->setProperty(task_record::kWalk, walk);
   if (!told_ready_) task_->setProperty(task_record::kResultReady, true);
+}
+
+void WfmSearchWalker::Impl::Report(const nas::WalkProgress& progress, bool last) {
+  const Clock::time_point now = Clock::now();
+  if (!last && told_ready_ && now - reported_ < kReportInterval) return;
+  reported_ = now;
+  CollectReport(progress);
   // A task that was removed meanwhile has nobody left to tell.
   task_->endUpdate();
   told_ready_ = true;
