@@ -182,7 +182,7 @@ int RunFleetConfigCommand(const FleetOptions& options) {
   const auto before = nas::ReadWholeFile(AT_FDCWD, options.write, kMostConfigBytes);
   if (before && *before == text) return kExitSuccess;
   const nas::Status written =
-      nas::ReplaceFile(AT_FDCWD, options.write, text, kReadableByAll, /*durable=*/true);
+      nas::ReplaceFile(AT_FDCWD, options.write, text, kReadableByAll, nas::Durability::kFull);
   if (!written) throw UsageError("cannot write " + written.error().Text());
   if (!options.reload.empty() && std::system(options.reload.c_str()) != 0) {
     throw UsageError("written to " + options.write + ", but this failed: " + options.reload);

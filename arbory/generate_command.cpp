@@ -17,7 +17,7 @@ constexpr size_t kMaxSampleBytes = size_t{1} << 20;
 
 void Write(const std::filesystem::path& file, const std::string& text) {
   std::filesystem::create_directories(file.parent_path());
-  const nas::Status written = nas::ReplaceFile(AT_FDCWD, file, text, kMode, false);
+  const nas::Status written = nas::ReplaceFile(AT_FDCWD, file, text, kMode, nas::Durability::kNone);
   if (!written) throw std::runtime_error("cannot be written: " + written.error().Text());
 }
 

@@ -50,13 +50,13 @@ Result<std::string> ReadToEnd(int fd, size_t max_bytes) {
 }
 
 Status FillNew(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
-               bool durable) {
+               Durability durability) {
   constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
   const UniqueFd fd(openat(dir_fd, name.c_str(), kFlags, kPrivateMode));
   if (!fd) return ErrnoError();
   if (Status written = WriteAll(fd.get(), bytes); !written) return written;
   if (mode != kPrivateMode && fchmod(fd.get(), mode) != 0) return ErrnoError();
-  if (durable && fdatasync(fd.get()) != 0) return ErrnoError();
+  if (durability != Durability::kNone && fdatasync(fd.get()) != 0) return ErrnoError();
   return {};
 }
 
@@ -94,19 +94,19 @@ Result<std::string> ReadWholeFile(int dir_fd, const std::string& name, size_t ma
 }
 
 Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
-                   bool durable) {
+                   Durability durability) {
   const std::string fresh = NameBeside(name);
-  Status done = FillNew(dir_fd, fresh, bytes, mode, durable);
+  Status done = FillNew(dir_fd, fresh, bytes, mode, durability);
   if (done && renameat(dir_fd, fresh.c_str(), dir_fd, name.c_str()) != 0) done = ErrnoError();
   if (!done) unlinkat(dir_fd, fresh.c_str(), 0);
-  if (done && durable) done = SyncFolder(dir_fd, FolderOf(name));
+  if (done && durability == Durability::kFull) done = SyncFolder(dir_fd, FolderOf(name));
   if (done) return done;
   return done.error().Of(name);
 }
 
 Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode) {
   const std::string fresh = NameBeside(name);
-  Status done = FillNew(dir_fd, fresh, bytes, mode, /*durable=*/true);
+  Status done = FillNew(dir_fd, fresh, bytes, mode, Durability::kFull);
   if (done && linkat(dir_fd, fresh.c_str(), dir_fd, name.c_str(), 0) != 0) done = ErrnoError();
   unlinkat(dir_fd, fresh.c_str(), 0);
   if (done) done = SyncFolder(dir_fd, FolderOf(name));

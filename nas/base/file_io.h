@@ -21,16 +21,22 @@ Status WriteAll(int fd, std::string_view bytes);
 // pipe is not waited for), EFBIG for more than `max_bytes`.
 Result<std::string> ReadWholeFile(int dir_fd, const std::string& name, size_t max_bytes);
 
-// Puts a file with this content and mode in the place of `name`, at once: a reader finds the old
-// one or the new one, whole; after a failure it is the old one. The new content is first written to
-// a file of another name beside it, which a process killed meanwhile leaves behind
-// (kTemporaryPrefix tells it). A symbolic link is replaced, not followed. With `durable` it
-// survives a power cut once this returns: the file is synced to the disk and then its folder, and
-// only where that last step fails is the new one in place after a failure.
-Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
-                   bool durable);
+// What a power cut leaves of a replacement.
+enum class Durability {
+  kNone,    // what the file system leaves: most have the old one or the new one, whole
+  kAtomic,  // the old one or the new one, whole
+  kFull,    // the new one, once the call has returned
+};
 
-// The same for a file that must not exist yet, always durable: EEXIST where it does.
+// Puts a file with this content and mode in the place of `name`, at once: a reader finds the old
+// one or the new one, whole; after a failure it is the old one, but where the last step of kFull
+// fails, the syncing of the folder. The new content is first written to a file of another name
+// beside it, which a process killed meanwhile leaves behind (kTemporaryPrefix tells it). A symbolic
+// link is replaced, not followed.
+Status ReplaceFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode,
+                   Durability durability);
+
+// The same for a file that must not exist yet, with Durability::kFull: EEXIST where it does.
 Status CreateFile(int dir_fd, const std::string& name, std::string_view bytes, mode_t mode);
 
 // Takes away what a write to a file in the folder has left half done, once it is as old as what is

@@ -25,15 +25,16 @@ bool fromFile(const std::string& path, Value& out) {
   return good;
 }
 
-// Synced before it takes the old file's place: a settings file holds more than this system's
-// counter, and a power cut must not empty it.
+// A settings file holds more than this system's counter, and a power cut must not empty it. That
+// the counter may be short of the last searches then is worth no wait.
 bool toFile(const std::string& path, const Value& value) {
   struct stat info;
   const bool exists = lstat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode);
   const mode_t mode = exists ? (info.st_mode & kModeBits) : kNewFileMode;
   std::string text = nas::JsonText(value, nas::JsonBytes::kRaw);
   text += '\n';
-  const nas::Status replaced = nas::ReplaceFile(AT_FDCWD, path, text, mode, /*durable=*/true);
+  const nas::Status replaced =
+      nas::ReplaceFile(AT_FDCWD, path, text, mode, nas::Durability::kAtomic);
   if (!replaced) errno = replaced.error().error_number;
   return replaced.ok();
 }

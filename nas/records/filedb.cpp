@@ -58,9 +58,13 @@ bool CreatePrivately(const std::string& path) {
   return fd || errno == EEXIST;
 }
 
-// Committing ends with the removal of SQLite's journal: what was answered for is kept only once the
-// folder has reached the disk as well. The first commit brings the file's own name with it.
-constexpr char kDurable[] = "PRAGMA synchronous=EXTRA";
+// The journal stays, so that a commit writes over blocks that files have and no folder has to reach
+// the disk but with the first one, which brings the names of both files there. A commit ends with
+// the clearing of the journal's head, synced. It is kept short, whatever it once had to hold.
+constexpr char kDurable[] =
+    "PRAGMA journal_mode=PERSIST;"
+    "PRAGMA journal_size_limit=65536;"
+    "PRAGMA synchronous=FULL";
 
 std::int64_t Number(const nas::Database& db, const char* sql) {
   nas::Statement statement(db, sql);

@@ -181,7 +181,7 @@ Status TaskFiles::Store(const std::string& id, const TaskState& state) const {
   const std::string text = TextOf(state);
   if (text.size() > kMaxRecordBytes) return ErrnoError(EFBIG, RecordName(id));
   const auto replace = [&] {
-    return ReplaceFile(folder_.get(), RecordName(id), text, kPrivateMode, /*durable=*/false);
+    return ReplaceFile(folder_.get(), RecordName(id), text, kPrivateMode, Durability::kNone);
   };
   const Status stored = replace();
   const bool full = !stored && stored.error().kind == kErrorNoSpace;

@@ -38,30 +38,44 @@ Json::Value Record(const char* pattern) {
 
 TEST_F(DurableTest, WhatIsAnsweredForHasReachedTheDisk) {
   const std::string history = dir_ + "/history.db";
+  const std::string journal = history + "-journal";
   const std::string settings = dir_ + "/usersettings";
+  using nas::Durability;
+  const auto replace = [&](Durability durability) {
+    return nas::ReplaceFile(AT_FDCWD, settings, "x", 0600, durability).ok();
+  };
+  // Of what is replaced, a file of another name is synced before it takes this one.
+  const std::string fresh = dir_ + "/" + std::string(nas::kTemporaryPrefix);
   const struct {
     const char* why;
     std::function<bool()> write;
-    std::string file;
+    std::vector<std::string> synced;  // the last one at last
   } rows[] = {
-      {"a new history", [&] { return FileDB(history).Insert(Record("a")); }, history},
-      {"another record", [&] { return FileDB(history).Insert(Record("b")); }, history},
-      {"no records", [&] { return FileDB(history).Delete({}); }, history},
-      {"new settings", [&] { return Json::toFile(settings, Json::Value(1)); }, ""},
-      {"settings replaced", [&] { return Json::toFile(settings, Json::Value(2)); }, ""},
+      {"a new history",
+       [&] { return FileDB(history).Insert(Record("a")); },
+       {dir_, history, journal}},
+      {"another record", [&] { return FileDB(history).Insert(Record("b")); }, {history, journal}},
+      {"no records", [&] { return FileDB(history).Delete({}); }, {history, journal}},
+      {"new settings", [&] { return Json::toFile(settings, Json::Value(1)); }, {fresh}},
+      {"settings replaced", [&] { return Json::toFile(settings, Json::Value(2)); }, {fresh}},
+      {"to be there whole", [&] { return replace(Durability::kAtomic); }, {fresh}},
+      {"to be there", [&] { return replace(Durability::kFull); }, {fresh, dir_}},
+      {"of no use after a power cut", [&] { return replace(Durability::kNone); }, {}},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.why);
     g_synced.clear();
     ASSERT_TRUE(row.write());
-    ASSERT_FALSE(g_synced.empty());
-    EXPECT_EQ(g_synced.back(), dir_);
-    // Of what is replaced, a file of another name was synced before it took this one.
-    const bool known = std::any_of(g_synced.begin(), g_synced.end(), [&](const std::string& name) {
-      return row.file.empty() ? name.find(nas::kTemporaryPrefix) != std::string::npos
-                              : name == row.file;
-    });
-    EXPECT_TRUE(known) << "the file itself was not synced";
+    ASSERT_EQ(g_synced.empty(), row.synced.empty());
+    for (std::string& name : g_synced) {
+      if (name.starts_with(fresh)) name = fresh;
+    }
+    for (const std::string& file : row.synced) {
+      EXPECT_NE(std::ranges::find(g_synced, file), g_synced.end()) << file << " was not synced";
+    }
+    if (!row.synced.empty()) {
+      EXPECT_EQ(g_synced.back(), row.synced.back());
+    }
   }
 }
 
@@ -104,10 +118,11 @@ TEST_F(DurableTest, SoHaveTheFoldersItStandsIn) {
 TEST_F(DurableTest, AFailedReplacementLeavesNothing) {
   const std::string folder = MakeFolder("in");
   MakeFolder("in/taken");
-  const auto replace = [&](const char* name) {
-    return nas::ReplaceFile(AT_FDCWD, folder + "/" + name, "x", 0600, /*durable=*/true);
-  };
-  EXPECT_EQ(replace("taken").error().error_number, EISDIR);
+  for (const auto durability :
+       {nas::Durability::kNone, nas::Durability::kAtomic, nas::Durability::kFull}) {
+    const auto replaced = nas::ReplaceFile(AT_FDCWD, folder + "/taken", "x", 0600, durability);
+    EXPECT_EQ(replaced.error().error_number, EISDIR);
+  }
   EXPECT_EQ(nas::CreateFile(AT_FDCWD, folder + "/taken", "x", 0600).error().error_number, EEXIST);
   EXPECT_EQ(nas::NamesIn(AT_FDCWD, folder).value_or({}), std::vector<std::string>{"taken"});
 }

@@ -138,7 +138,7 @@ void Answer(NUVA::APIRequest* request, NUVA::APIResponse* response) {
   }
   const Json::Value body = ListJson(list);
   const std::string text = nas::JsonText(body, nas::JsonBytes::kRaw);
-  if (!locked || !nas::ReplaceFile(AT_FDCWD, path, text, kMode, /*durable=*/false)) {
+  if (!locked || !nas::ReplaceFile(AT_FDCWD, path, text, kMode, nas::Durability::kAtomic)) {
     return response->SetError(kUnavailable,
                               OwnError(kUnavailable, "The list of searches cannot be written."));
   }
