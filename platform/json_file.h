@@ -12,7 +12,8 @@ namespace Json {
 bool fromFile(const std::string& path, Value& out);
 
 // Replaces the file's content with the value as JSON text. The old content stays whole until the
-// new one is complete, also in a power cut; a file that existed keeps its mode. False with errno set on failure.
+// new one is complete, also in a power cut; a file that existed keeps its mode. False with errno
+// set on failure.
 bool toFile(const std::string& path, const Value& value);
 
 }  // namespace Json
