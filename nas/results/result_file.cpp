@@ -22,7 +22,7 @@ namespace {
 
 constexpr std::string_view kSuffix = ".db";
 constexpr char kLogSuffix[] = "-wal";
-// The journal is what a file has until it gets its log.
+// Files once had a journal until they got their log; who was killed early left one.
 constexpr std::array<const char*, 4> kCompanions = {"", kLogSuffix, "-shm", "-journal"};
 
 // The file and what there may be beside it.

@@ -6,12 +6,12 @@ namespace nas {
 namespace {
 
 // Large pages, because a block's columns are some tens of kilobytes each. The log is emptied into
-// the file now and then, so that it does not grow as large as the results.
+// the file now and then, so that it does not grow as large as the results. Nobody knows of the file
+// before it has one, so that its tables are made without any journal beside it.
 constexpr char kMakeFile[] =
     "PRAGMA synchronous=OFF;"
     "PRAGMA page_size=16384;"
-    "PRAGMA journal_mode=WAL;"
-    "PRAGMA wal_autocheckpoint=1024;"
+    "PRAGMA journal_mode=MEMORY;"
     "BEGIN;"
     "CREATE TABLE location(id INTEGER PRIMARY KEY, share_name BLOB, share_root BLOB);"
     "CREATE TABLE names(first INTEGER PRIMARY KEY, count INTEGER, folders BLOB, names BLOB);"
@@ -20,7 +20,9 @@ constexpr char kMakeFile[] =
     "CREATE TABLE complete(rows INTEGER);"
     "CREATE TABLE ordering(id INTEGER PRIMARY KEY, data BLOB);"
     "PRAGMA user_version=1;"
-    "COMMIT;";
+    "COMMIT;"
+    "PRAGMA journal_mode=WAL;"
+    "PRAGMA wal_autocheckpoint=1024;";
 static_assert(kResultVersion == 1, "the version is written above");
 
 Database MakeResultFile(const std::string& path) {

@@ -97,9 +97,7 @@ bool SearchJob::Run(NameSource& names, NameSource& contents) {
   }
   if (failure_) std::rethrow_exception(failure_);
   Flush();
-  const bool completed = !search_.stopping();
-  if (completed) search_.progress.SetPhase(WalkProgress::Phase::kDone);
-  return completed;
+  return !search_.stopping();
 }
 
 void SearchJob::RunPhase(NameSource& source) {
