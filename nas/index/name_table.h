@@ -97,28 +97,11 @@ class NameTable {
   // Entries. `id` < entries(). Names are NUL-ended, into the mapping.
   FolderId folder_of(EntryId id) const;  // that it lies in; logarithmic
   std::string_view name(EntryId id) const {
-    const std::uint64_t bit = std::uint64_t{1} << (id % kWordBits);
-    if ((columns_.named[id / kWordBits] & bit) == 0) {
-      return Piece(columns_.texts, columns_.text_begins, id);
-    }
-    return Piece(columns_.names, columns_.name_begins, NamedBefore(id));
-  }
-  // Calls `take` with each of [begin, end) and its name, in order: quicker than asking each.
-  template <class Take>
-  void EachName(EntryId begin, EntryId end, const Take& take) const {
-    size_t named = NamedBefore(begin);
-    for (EntryId id = begin; id < end; ++id) {
-      if ((columns_.named[id / kWordBits] >> (id % kWordBits) & 1) == 0) {
-        take(id, Piece(columns_.texts, columns_.text_begins, id));
-      } else {
-        take(id, Piece(columns_.names, columns_.name_begins, named++));
-      }
-    }
+    return Bit(columns_.named, id) ? Piece(columns_.names, columns_.name_begins, NamedBefore(id))
+                                   : Piece(columns_.texts, columns_.text_begins, id);
   }
   // Whether the name is ASCII, and so its text.
-  bool is_ascii(EntryId id) const { return !Bit(others_, id); }
-  // Whether it is surely valid UTF-8 and in NFC: as IsComposed says (match/folded_name.h).
-  bool is_composed(EntryId id) const { return !Bit(loose_, id); }
+  bool is_ascii(EntryId id) const { return !Bit(others_.data(), id); }
   // Calls `take` with each of [begin, end) whose name is not ASCII, in order.
   template <class Take>
   void EachOther(EntryId begin, EntryId end, const Take& take) const {
@@ -218,7 +201,7 @@ class NameTable {
     const std::uint32_t* top_name_begins = nullptr;
   };
 
-  static bool Bit(const std::vector<std::uint64_t>& bits, EntryId id) {
+  static bool Bit(const std::uint64_t* bits, EntryId id) {
     return (bits[id / kWordBits] >> (id % kWordBits) & 1) != 0;
   }
   // How many entries before this one, which may be entries(), have a name that is not their text.
@@ -232,7 +215,7 @@ class NameTable {
   NameTable() = default;
   void Swap(NameTable& other);
   void FindStrays();
-  void LookAtNames();
+  void FindOthers();
   // Texts that lie end to end, each with its NUL.
   static std::string_view Piece(const char* texts, const std::uint32_t* begins, size_t number) {
     return {texts + begins[number], begins[number + 1] - begins[number] - 1};
@@ -254,9 +237,7 @@ class NameTable {
   size_t key_slot_count_ = 0;
   Columns columns_;
   std::vector<EntryId> strays_;
-  // A bit an entry: its name is not ASCII; nor sure to be composed.
-  std::vector<std::uint64_t> others_;
-  std::vector<std::uint64_t> loose_;
+  std::vector<std::uint64_t> others_;  // a bit an entry: its name is not ASCII
 };
 
 }  // namespace nas

@@ -132,13 +132,9 @@ struct OtherNames {
   std::vector<size_t> begins = {};
   std::vector<EntryId> entries = {};
   // False where it is not UTF-8, and is left out.
-  bool Add(const NameTable& table, EntryId entry) {
+  bool Add(EntryId entry, std::string_view name) {
     const size_t begin = texts.size();
-    if (table.is_composed(entry)) {
-      texts.append(table.name(entry));
-    } else if (!AppendComposed(table.name(entry), &texts)) {
-      return false;
-    }
+    if (!AppendComposed(name, &texts)) return false;
     texts.push_back('\0');
     begins.push_back(begin);
     entries.push_back(entry);
@@ -252,7 +248,7 @@ bool IndexFilter::ScanOthers(EntryId begin, EntryId end, std::vector<EntryId>* f
   };
   table.EachOther(begin, end, [&](EntryId entry) {
     if (!HasNeedle(table.texts(entry, entry + 1))) return;
-    if (!others.Add(table, entry)) broken.push_back(entry);
+    if (!others.Add(entry, table.name(entry))) broken.push_back(entry);
     if (others.texts.size() >= kOtherBytes) scan();
   });
   scan();

@@ -308,7 +308,7 @@ bool WfmSearchWalker::Impl::RunJob(const Json::Value& options, nas::SharedSearch
   }
   writer_->Complete();
   const bool nobody = completed && fleet_ && locations_.empty() && fleet_->failed();
-  // Who is told that everything was found does not wait for how it ends.
+  // Who is told that everything was found does not wait for how it ends: as a failure, here.
   if (completed && !nobody) search.progress.SetPhase(nas::WalkProgress::Phase::kDone);
   const bool sorts = writer_->rows() >= kWorthSorting && nas::CurrentConfig().keep_orderings;
   // Where the end follows at once, one write of the record tells both.

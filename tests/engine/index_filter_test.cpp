@@ -115,23 +115,58 @@ std::string PatternOf(Pieces& pieces) {
   return prefix + begin + pieces.Some(kInExpressions, 4) + end + more;
 }
 
-using IndexFilters = nas_test::PlatformTest;
+// Of one folder `tree`.
+class IndexFilters : public nas_test::PlatformTest {
+ protected:
+  void SetUp() override {
+    PlatformTest::SetUp();
+    tree_ = dir_ + "/tree";
+    ASSERT_EQ(mkdir(tree_.c_str(), S_IRWXU), 0);
+  }
+  Result<NameTable> Scan() const {
+    const UniqueFd top(open(tree_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const TablePlace place{AT_FDCWD, dir_ + "/table", "a test's"};
+    if (const auto made = ScanTree({{top.get(), "tree"}}, place); !made) return made.error();
+    return NameTable::Open(place.dir_fd, place.name, place.file_system);
+  }
+  std::string tree_;
+};
+
+// A query, and what an index's filter lets pass for it.
+class Filtered {
+ public:
+  Filtered(const IndexSnapshot& snapshot, const Query& query)
+      : comp_(query.root()), search_({&comp_}, nowhere_, never_) {
+    const IndexFilter filter(snapshot, search_);
+    const Location location;
+    EntryFilter entries(filter, location);
+    entries.Find(
+        0, snapshot.table.folders(), [](NameTable::FolderId) { return ""; }, &found_);
+    EXPECT_TRUE(std::ranges::is_sorted(found_));
+  }
+  bool Passes(NameTable::EntryId entry) const { return std::ranges::binary_search(found_, entry); }
+  bool Matches(const QuerySubject& subject) const { return search_.Ask(subject) == Answer::kYes; }
+
+ private:
+  class : public RowSink {
+    void Append(RowBlock& block) override { block.Clear(); }
+  } nowhere_;
+  const int never_ = 0;
+  NodeComp comp_;
+  const SharedSearch search_;
+  std::vector<NameTable::EntryId> found_;
+};
 
 TEST_F(IndexFilters, LeaveOutNoNameThatMatches) {
   constexpr size_t kNames = 2'000;
   constexpr size_t kPatterns = 600;
   const char* const given = std::getenv("ARBORY_TEST_SEED");
   Pieces pieces(given != nullptr ? static_cast<unsigned>(std::atoi(given)) : 1);
-  const std::string tree = dir_ + "/tree";
-  ASSERT_EQ(mkdir(tree.c_str(), S_IRWXU), 0);
   for (size_t i = 0; i < kNames; ++i) {
-    const std::string path = tree + "/" + pieces.Some(kInNames, 7);
+    const std::string path = tree_ + "/" + pieces.Some(kInNames, 7);
     const UniqueFd file(open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, S_IRUSR | S_IWUSR));
   }
-  const UniqueFd top(open(tree.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  const TablePlace place{AT_FDCWD, dir_ + "/table", "a test's"};
-  ASSERT_TRUE(ScanTree({{top.get(), "tree"}}, place));
-  const auto table = NameTable::Open(place.dir_fd, place.name, place.file_system);
+  const auto table = Scan();
   ASSERT_TRUE(table);
   const Changes changes;
   const IndexSnapshot snapshot{*table, changes, true};
@@ -141,24 +176,12 @@ TEST_F(IndexFilters, LeaveOutNoNameThatMatches) {
     const std::string pattern = PatternOf(pieces);
     const auto query = Query::Parse(pattern);
     if (!query) continue;
-    NodeComp comp(query->root());
-    const int never = 0;
-    class : public RowSink {
-      void Append(RowBlock& block) override { block.Clear(); }
-    } nowhere;
-    const SharedSearch search({&comp}, nowhere, never);
-    const IndexFilter filter(snapshot, search);
-    const Location location;
-    EntryFilter entries(filter, location);
-    std::vector<NameTable::EntryId> found;
-    entries.Find(
-        0, table->folders(), [](NameTable::FolderId) { return ""; }, &found);
-    ASSERT_TRUE(std::ranges::is_sorted(found)) << pattern;
+    const Filtered filtered(snapshot, *query);
     FoldedName name;
     for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
       name.Set(table->name(entry));
-      const bool match = search.Ask({.name = &name, .is_file = true}) == Answer::kYes;
-      const bool passes = std::ranges::binary_search(found, entry);
+      const bool match = filtered.Matches({.name = &name, .is_file = true});
+      const bool passes = filtered.Passes(entry);
       ASSERT_LE(match, passes) << pattern << ": " << table->name(entry);
       matches += match ? 1 : 0;
       left_out += passes ? 0 : 1;
@@ -205,17 +228,15 @@ TEST_F(IndexFilters, LeaveOutNoFileOfTheseSizesAndTimes) {
   constexpr size_t kFiles = 3'000;  // more than are looked at together
   constexpr size_t kQueries = 150;
   Pieces pieces(3);
-  const std::string tree = dir_ + "/tree";
-  ASSERT_EQ(mkdir(tree.c_str(), S_IRWXU), 0);
   for (size_t i = 0; i < kFiles; ++i) {
-    const std::string path = tree + "/" + std::to_string(i);
+    const std::string path = tree_ + "/" + std::to_string(i);
     const size_t kind = pieces.Below(20);
     if (kind == 0) {
       ASSERT_EQ(mkdir(path.c_str(), S_IRWXU), 0);
     } else if (kind == 1) {
       ASSERT_EQ(mkfifo(path.c_str(), S_IRUSR), 0);
     } else if (kind == 2 && i > 0) {
-      (void)!link((tree + "/" + std::to_string(pieces.Below(i))).c_str(), path.c_str());
+      (void)!link((tree_ + "/" + std::to_string(pieces.Below(i))).c_str(), path.c_str());
     } else {
       const UniqueFd file(open(path.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, S_IRUSR | S_IWUSR));
       ASSERT_EQ(ftruncate(file.get(), kSizes[pieces.Below(std::size(kSizes))]), 0);
@@ -224,14 +245,11 @@ TEST_F(IndexFilters, LeaveOutNoFileOfTheseSizesAndTimes) {
     const timespec times[] = {{time, 0}, {time, 0}};
     (void)utimensat(AT_FDCWD, path.c_str(), times, AT_SYMLINK_NOFOLLOW);
   }
-  const UniqueFd top(open(tree.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  const TablePlace place{AT_FDCWD, dir_ + "/table", "a test's"};
-  ASSERT_TRUE(ScanTree({{top.get(), "tree"}}, place));
-  const auto table = NameTable::Open(place.dir_fd, place.name, place.file_system);
+  const auto table = Scan();
   ASSERT_TRUE(table);
   std::vector<struct statx> files(table->entries());
   for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
-    const std::string path = tree + "/" + std::string(table->name(entry));
+    const std::string path = tree_ + "/" + std::string(table->name(entry));
     ASSERT_EQ(statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME,
                     &files[entry]),
               0);
@@ -248,27 +266,14 @@ TEST_F(IndexFilters, LeaveOutNoFileOfTheseSizesAndTimes) {
     SCOPED_TRACE(text);
     const auto query = Query::Parse(text);
     ASSERT_TRUE(query);
-    NodeComp comp(query->root());
-    const int never = 0;
-    class : public RowSink {
-      void Append(RowBlock& block) override { block.Clear(); }
-    } nowhere;
     const bool mappings_known = pieces.Below(2) == 0;
-    const bool of_more = text.find_first_of("sc") != std::string::npos;  // size, created
     const bool of_time = text.find("modified:") != std::string::npos;
-    const IndexSnapshot snapshot{*table, changes, true, mappings_known};
-    const SharedSearch search({&comp}, nowhere, never);
-    const IndexFilter filter(snapshot, search);
-    const Location location;
-    EntryFilter entries(filter, location);
-    std::vector<NameTable::EntryId> found;
-    entries.Find(
-        0, table->folders(), [](NameTable::FolderId) { return ""; }, &found);
-    ASSERT_TRUE(std::ranges::is_sorted(found));
+    const bool of_more =
+        text.find("size:") != std::string::npos || text.find("created:") != std::string::npos;
+    const Filtered filtered({*table, changes, true, mappings_known}, *query);
     FoldedName name;
     for (NameTable::EntryId entry = 0; entry < table->entries(); ++entry) {
       const struct statx& file = files[entry];
-      const bool is_folder = S_ISDIR(file.stx_mode);
       const bool is_file = S_ISREG(file.stx_mode);
       QueryAttributes attributes;
       attributes.size = static_cast<std::int64_t>(file.stx_size);
@@ -276,11 +281,11 @@ TEST_F(IndexFilters, LeaveOutNoFileOfTheseSizesAndTimes) {
       attributes.created =
           (file.stx_mask & STATX_BTIME) != 0 ? file.stx_btime.tv_sec : QueryAttributes::kNoTime;
       name.Set(table->name(entry));
-      const bool match = search.Ask({.name = &name,
-                                     .is_folder = is_folder,
-                                     .is_file = is_file,
-                                     .attributes = &attributes}) == Answer::kYes;
-      const bool passes = std::ranges::binary_search(found, entry);
+      const bool match = filtered.Matches({.name = &name,
+                                           .is_folder = S_ISDIR(file.stx_mode),
+                                           .is_file = is_file,
+                                           .attributes = &attributes});
+      const bool passes = filtered.Passes(entry);
       ASSERT_LE(match, passes) << table->name(entry);
       // What may have changed unseen is looked at, whatever the table says.
       const bool changed = changes.inodes().contains(file.stx_ino) || file.stx_nlink > 1;
