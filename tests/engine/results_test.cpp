@@ -208,6 +208,21 @@ TEST_F(Results, FilesThatAreNone) {
   }
 }
 
+// A search may be cleaned at any time, its worker notices later.
+TEST_F(Results, RemovedBesideAWriterLeaveNothing) {
+  {
+    ResultWriter writer(path_);
+    ASSERT_TRUE(RemoveResultFile(path_));
+    RowBlock block;
+    block.SetFolder(0, "folder");
+    block.Add("name", {});
+    writer.Append(block);
+    writer.Complete();
+    writer.EmptyLog();
+  }
+  EXPECT_TRUE(std::filesystem::is_empty(folder_));
+}
+
 TEST_F(Results, SweepKeepsWhatIsInUse) {
   const std::string fresh = ResultPath(folder_, NewResultId());
   const std::string stale = ResultPath(folder_, NewResultId());

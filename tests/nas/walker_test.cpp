@@ -110,7 +110,6 @@ TEST_F(Walker, WhatIsLeftOfItsResultsCanBeCleaned) {
   auto walker = NewWalker();
   ASSERT_TRUE(walker->init({"/share"}, {}));
   NameInTask(*walker);
-  ASSERT_TRUE(Walk(*walker));
   const std::string id = walker->getDBTaskId();
   const std::string volume = walker->getDBVol();
   ASSERT_TRUE(fs::remove(nas::ResultPath(ResultFolder(), id)));
