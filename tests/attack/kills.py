@@ -50,9 +50,10 @@ def tree_of(process):
     return below.union(*(tree_of(child) for child in below))
 
 
-def kind_of(process):
+def kind_of(process, spared):
     """By its process group: a child leads one, and what it forks is in that. None for one that has
-    ended, or is none of the program's."""
+    ended, or is none of the program's. Nor is a child of those that are spared one: it has answered
+    before, and who kills it while it ends kills the search with it that it has started."""
     try:
         with open(f"/proc/{process}/stat") as file:
             name, _, rest = file.read().partition("(")[2].rpartition(")")
@@ -64,6 +65,8 @@ def kind_of(process):
             return "program"
         if int(group) != process:
             return "worker"
+        if int(parent) in spared:
+            return None
         return "child" if os.getpgid(int(parent)) == os.getpgrp() else "sorter"
     except (OSError, ValueError):
         return None
@@ -84,7 +87,7 @@ class Killer(threading.Thread):
             return
         while not self.over.is_set() and self.killed is None:
             for process in tree_of(os.getpid()) - self.spared:
-                if kind_of(process) == self.kind:
+                if kind_of(process, self.spared) == self.kind:
                     self.kill(process)
                     break
             else:
