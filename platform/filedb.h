@@ -53,7 +53,8 @@ class FileDB {
   // As Insert. `slots` is how many of the newest records a store that sorts by time need look at;
   // this one keeps its order by itself.
   bool UpdateLastByTime(const Json::Value& record, long slots);
-  // Removes every record that matches; true also when none did.
+  // Removes every record that matches; true also when none did. Of what a Delete of all removes
+  // nothing stays in a file.
   bool Delete(const Condition& condition);
   // Appends the matching records to `out`, newest first. One that cannot be read is passed over.
   bool Select(const Condition& condition, std::vector<Json::Value>& out) const;

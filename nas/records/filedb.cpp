@@ -66,6 +66,11 @@ constexpr char kDurable[] =
     "PRAGMA journal_size_limit=65536;"
     "PRAGMA synchronous=FULL";
 
+// From here on what a commit removes is in no file: not in the journal either, which it empties.
+constexpr char kLeaveNothing[] =
+    "PRAGMA journal_size_limit=0;"
+    "PRAGMA secure_delete=ON";
+
 std::int64_t Number(const nas::Database& db, const char* sql) {
   nas::Statement statement(db, sql);
   return statement.Step() ? statement.Integer(0) : 0;
@@ -75,17 +80,22 @@ bool IsEmpty(const nas::Database& db) {
   return Number(db, "SELECT count(*) FROM sqlite_schema") == 0;
 }
 
-// Makes the table in an empty file; otherwise tells whether the file is ours and whole.
+bool IsOurs(const nas::Database& db) {
+  return Number(db, "PRAGMA application_id") == kApplicationId &&
+         Number(db, "PRAGMA user_version") == kVersion;
+}
+
+// Makes the table in an empty file; otherwise tells whether the file is ours and whole. Until then
+// nothing is asked that would change it.
 bool IsStore(nas::Database& db) {
+  if (!IsEmpty(db) && !IsOurs(db)) return false;
+  db.Execute(kDurable);
   if (IsEmpty(db)) {
     nas::Transaction transaction(db, nas::Transaction::Kind::kWrite);
     if (IsEmpty(db)) db.Execute(kCreate);
     transaction.Commit();
   }
-  if (Number(db, "PRAGMA application_id") != kApplicationId ||
-      Number(db, "PRAGMA user_version") != kVersion) {
-    return false;
-  }
+  if (!IsOurs(db)) return false;
   nas::Statement check(db, "PRAGMA quick_check(1)");
   return check.Step() && check.Bytes(0) == "ok";
 }
@@ -115,7 +125,10 @@ std::vector<Row> Matching(const nas::Database& db, const FileDB::Condition& cond
 
 void DeleteMatching(nas::Database& db, const FileDB::Condition& condition) {
   // Whatever cannot be read goes with the others.
-  if (condition.equal.empty()) return db.Execute("DELETE FROM records");
+  if (condition.equal.empty()) {
+    db.Execute(kLeaveNothing);
+    return db.Execute("DELETE FROM records");
+  }
   nas::Statement remove(db, "DELETE FROM records WHERE position=?1");
   for (const Row& row : Matching(db, condition)) remove.Bind(1, row.position).Run();
 }
@@ -195,7 +208,6 @@ class FileDB::Store {
     bool is_store = false;
     const nas::Status status = Guard([&] {
       db_ = std::make_unique<nas::Database>(path_, SQLITE_OPEN_READWRITE, kBusyMilliseconds);
-      db_->Execute(kDurable);
       is_store = IsStore(*db_);
     });
     if (status && is_store) return status;

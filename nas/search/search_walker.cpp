@@ -43,6 +43,11 @@ constexpr std::chrono::milliseconds kReportInterval(200);
 // Rows name their location in 16 bits.
 constexpr size_t kMostLocations = 65'535;
 
+// A task's record holds 4 MiB, of which JSON can make six of one byte. An entry of the folders that
+// could not be read counts as its path and a little.
+constexpr size_t kMostUnreadBytes = size_t{256} << 10;
+constexpr size_t kUnreadEntryBytes = 32;
+
 // Descriptors that there is room for before any thread is there: as many as a thousand boxes take.
 constexpr int kDescriptorsAtFirst = 2048;
 
@@ -353,7 +358,10 @@ void WfmSearchWalker::Impl::EndWorker() {
 
 void WfmSearchWalker::Impl::TellUnread(Json::Value* walk) const {
   Json::Value& all = (*walk)[task_record::kUnread] = Json::arrayValue;
-  const auto tell = [&all](const std::string& path, int error_number) {
+  size_t bytes = 0;
+  const auto tell = [&](const std::string& path, int error_number) {
+    bytes += path.size() + kUnreadEntryBytes;
+    if (bytes > kMostUnreadBytes) return;
     Json::Value& one = all.append(Json::objectValue);
     one[task_record::kPath] = path;
     one[task_record::kUnreadErrno] = error_number;

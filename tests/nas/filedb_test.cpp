@@ -100,6 +100,17 @@ TEST_F(FileDBTest, ComparesValuesAsText) {
   EXPECT_EQ(Patterns(), "");
 }
 
+TEST_F(FileDBTest, WhatWasClearedIsInNoFile) {
+  for (const char* pattern : {"secret", "other", "secret"}) ASSERT_TRUE(Insert(Record(pattern)));
+  ASSERT_TRUE(Insert(Record(std::string(100'000, 's'))));
+  ASSERT_TRUE(FileDB(path()).Delete({}));
+  for (const std::string& file : {path(), path() + "-journal"}) {
+    const std::string bytes = ReadFile(file);
+    EXPECT_EQ(bytes.find("secret"), bytes.npos) << file;
+    EXPECT_EQ(bytes.find("ssss"), bytes.npos) << file;
+  }
+}
+
 TEST_F(FileDBTest, OneUnreadableRecordHidesNoOther) {
   for (const char* pattern : {"old", "middle", "new"}) ASSERT_TRUE(Insert(Record(pattern)));
   ChangeDatabase(path(),
@@ -138,6 +149,7 @@ TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   MakeFolder("directory");
   const std::string garbage(5000, 'g');
   ChangeDatabase(dir_ + "/other", "CREATE TABLE records(x)");
+  ChangeDatabase(dir_ + "/log", "PRAGMA journal_mode=WAL; CREATE TABLE records(x)");
   ASSERT_TRUE(Insert(Record(std::string(20000, 'x'))));
   const std::string store = ReadFile(path());
   WriteFile(dir_ + "/one", "g");
@@ -148,9 +160,10 @@ TEST_F(FileDBTest, LeavesAloneWhatIsNotAStore) {
   for (size_t at = 4096; at < 4196; ++at) flipped[at] = static_cast<char>(~flipped[at]);
   WriteFile(dir_ + "/flipped", flipped);
   const std::pair<const char*, int> rows[] = {
-      {"one", EBADMSG},      {"hundred", EBADMSG},        {"many", EBADMSG},
-      {"cut", EBADMSG},      {"flipped", EBADMSG},        {"other", EBADMSG},
-      {"directory", EISDIR}, {"missing/file.db", ENOENT}, {"one/file.db", ENOTDIR}};
+      {"one", EBADMSG},        {"hundred", EBADMSG},  {"many", EBADMSG},
+      {"cut", EBADMSG},        {"flipped", EBADMSG},  {"other", EBADMSG},
+      {"log", EBADMSG},        {"directory", EISDIR}, {"missing/file.db", ENOENT},
+      {"one/file.db", ENOTDIR}};
   for (const auto& [name, error] : rows) {
     const std::string file = dir_ + "/" + name;
     const std::string before = ReadFile(file);

@@ -95,6 +95,24 @@ TEST_F(Scope, FoldersThatCannotBeReadAreNamed) {
   }));
 }
 
+// Whatever their names, the search's outcome has a place beside them.
+TEST_F(Scope, VeryManyFoldersThatCannotBeReadAreCounted) {
+  constexpr int kFolders = 1'000;
+  const std::string long_name(240, '\1');
+  const std::string folder = share_ + "/" + long_name + "/" + long_name + "/" + long_name;
+  fs::create_directories(folder);
+  for (int number = 0; number < kFolders; ++number) {
+    const std::string closed = folder + "/" + std::to_string(number) + long_name;
+    ASSERT_EQ(mkdir(closed.c_str(), 0), 0);
+  }
+  EXPECT_TRUE(InOrdinaryChild([&](const std::string&) {
+    const Output output = Run({"search", "--show-errors", "nothing", share_});
+    EXPECT_EQ(output.exit_code, Run({"search", "nothing", share_}).exit_code);
+    EXPECT_NE(output.err.find(": Permission denied\n"), std::string::npos);
+    EXPECT_NE(output.err.find("1,000 folders could not be read (perm"), std::string::npos);
+  }));
+}
+
 TEST_F(Scope, TimesOfEveryCentury) {
   const struct {
     const char* name;
