@@ -80,22 +80,20 @@ bool IsEmpty(const nas::Database& db) {
   return Number(db, "SELECT count(*) FROM sqlite_schema") == 0;
 }
 
-bool IsOurs(const nas::Database& db) {
-  return Number(db, "PRAGMA application_id") == kApplicationId &&
-         Number(db, "PRAGMA user_version") == kVersion;
-}
-
-// Makes the table in an empty file; otherwise tells whether the file is ours and whole. Until then
-// nothing is asked that would change it.
+// Makes the table in an empty file; otherwise tells whether the file is ours and whole. Nothing is
+// asked of any other that would change it.
 bool IsStore(nas::Database& db) {
-  if (!IsEmpty(db) && !IsOurs(db)) return false;
-  db.Execute(kDurable);
   if (IsEmpty(db)) {
+    db.Execute(kDurable);
     nas::Transaction transaction(db, nas::Transaction::Kind::kWrite);
     if (IsEmpty(db)) db.Execute(kCreate);
     transaction.Commit();
   }
-  if (!IsOurs(db)) return false;
+  if (Number(db, "PRAGMA application_id") != kApplicationId ||
+      Number(db, "PRAGMA user_version") != kVersion) {
+    return false;
+  }
+  db.Execute(kDurable);
   nas::Statement check(db, "PRAGMA quick_check(1)");
   return check.Step() && check.Bytes(0) == "ok";
 }
